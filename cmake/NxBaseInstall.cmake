@@ -1,0 +1,23 @@
+include(CMakePackageConfigHelpers)
+
+install(TARGETS nxbase EXPORT NxBaseTargets
+    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+    ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR}
+    RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+if(EXISTS ${PROJECT_SOURCE_DIR}/platform/cmetry/include/klume)
+    install(DIRECTORY platform/cmetry/include/klume DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+endif()
+
+set(NXBASE_CMAKE_DIR ${CMAKE_INSTALL_LIBDIR}/cmake/NxBase)
+install(EXPORT NxBaseTargets NAMESPACE NxBase:: DESTINATION ${NXBASE_CMAKE_DIR})
+configure_package_config_file(cmake/NxBaseConfig.cmake.in
+    ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake INSTALL_DESTINATION ${NXBASE_CMAKE_DIR})
+write_basic_package_version_file(${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake
+    COMPATIBILITY SameMajorVersion)
+install(FILES ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake
+    ${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake DESTINATION ${NXBASE_CMAKE_DIR})
+
+configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
+install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)

@@ -1,0 +1,147 @@
+// LogFile appends time-stamped lines to one file; any thread, and any number
+// of processes sharing the file, may write to it. A line with a non-empty key
+// is written only while that key is enabled; an empty key always writes.
+// Every line reaches the file in one write() on an O_APPEND descriptor, so
+// lines never tear or interleave. Writing never throws: a file that cannot be
+// opened loses the line.
+#ifndef NXBASE_LOGFILE_H_
+#define NXBASE_LOGFILE_H_
+
+#include <atomic>
+#include <cstdint>
+#include <list>
+#include <map>
+#include <memory>
+#include <set>
+#include <shared_mutex>
+#include <string>
+
+#include <boost/shared_ptr.hpp>
+
+#include "nxbase/export.h"
+#include "toolkit/string.h"
+
+class NXBASE_EXPORT LogInterface {
+public:
+    virtual ~LogInterface() = default;
+    virtual bool IsLogOptionEnabled(const String& key) const = 0;
+    virtual void WriteLog(const String& text, const String& key) = 0;
+    virtual void WriteStackTrace() = 0;
+    virtual void UpdateInfo(const String& name, const String& value) = 0;
+};
+
+namespace nxbase {
+
+// Where a new LogFile finds its options. The configuration subsystem installs
+// one that reads the application's option file and the registry; without it
+// the log uses the temporary directory and the NXBASE_LOG_OPTIONS variable.
+class NXBASE_EXPORT LogOptionProvider {
+public:
+    virtual ~LogOptionProvider() = default;
+    // The option "Path" of the application's option file, "" when unset.
+    virtual std::string LogPath() = 0;
+    // The values below "Log" in the user's store: name to data.
+    virtual std::map<std::string, std::string> LogOptions() = 0;
+};
+
+// Installs the provider that log files created from now on consult (null:
+// the built-in default). Returns the previous one.
+NXBASE_EXPORT std::shared_ptr<LogOptionProvider> SetLogOptionProvider(
+    std::shared_ptr<LogOptionProvider> provider);
+
+}  // namespace nxbase
+
+class NXBASE_EXPORT LogFile : public LogInterface {
+public:
+    // Lines after which a limited log starts afresh.
+    static constexpr std::uint32_t kLineLimit = 50000;
+
+    // Opens a log named by the path rule: `name` (or the executable's base
+    // name when empty) plus ".log" in the temporary directory, unless the
+    // option "Path" names the file. Writes "Starting log", which truncates.
+    explicit LogFile(const std::string& name);
+    ~LogFile() override;
+    LogFile(const LogFile&) = delete;
+    LogFile& operator=(const LogFile&) = delete;
+
+    // Creates the process log unless one exists.
+    static void CreateLogFile(const std::string& name);
+    // The process log, created with an empty name on first use; never null.
+    static boost::shared_ptr<LogFile> Instance();
+    static void WriteToLog(const String& text, const String& key);
+
+    bool IsLogOptionEnabled(const String& key) const override;
+    void WriteLog(const String& text, const String& key) override;
+    // With "StackTrace" enabled, writes "\nStackTrace:\n" and the call stack.
+    void WriteStackTrace() override;
+    // Writes "<name>: <value>" under the key "Info".
+    void UpdateInfo(const String& name, const String& value) override;
+    // With "AvailableStack" enabled, writes the text and the bytes of stack
+    // left to the calling thread.
+    virtual void LogAvailableStack(const String& text);
+
+    void SetLogOption(const std::string& key, bool enable);
+    std::set<std::string> GetAvailableLogOptions() const;
+
+    void AddLogListener(boost::shared_ptr<LogInterface> listener);
+    void RemoveLogListener(boost::shared_ptr<LogInterface> listener);
+    void RemoveListeners();
+
+    const std::string& GetFileName() const { return fileName; }
+
+private:
+    struct PreparedLine;
+    void AnnounceKey(const std::string& key);
+    void WriteLine(const String& text, bool appendRequested);
+    void NotifyListeners(const String& text, const String& key);
+    void ApplyOptions(const std::map<std::string, std::string>& options);
+
+    std::string fileName = "NxBLog.log";
+    bool firstWrite = true;
+    bool secondFlag = false;
+    std::uint32_t loggedLines = 0;
+    bool unlimited = false;
+    std::atomic<bool> withThreadId{false};
+    std::set<std::string> availableKeys;
+    std::set<std::string> enabledKeys;
+    std::list<boost::shared_ptr<LogInterface>> listeners;
+    // Guards the two key sets; file writes use the named lock "LogWrite",
+    // listeners the named lock "LogListeners".
+    mutable std::shared_mutex keysMutex;
+    std::atomic<bool> hasListeners{false};
+};
+
+// AutoLog writes "|->text" on entry and "|<-text" on exit of a scope under a
+// key, indenting the lines between by two blanks. The indentation depth is
+// process-wide, shared by all threads.
+class NXBASE_EXPORT AutoLog {
+public:
+    AutoLog(const String& text, const String& key);
+    AutoLog(LogInterface* log, const String& text, const String& key);
+    ~AutoLog();
+    AutoLog(const AutoLog&) = delete;
+    AutoLog& operator=(const AutoLog&) = delete;
+
+    // Writes a line inside the block when the block is active.
+    void Log(const String& text);
+
+    static unsigned short GetIndent();
+    static String GetIndentString();
+    static std::uint32_t GetAutoLogCounter();
+
+private:
+    void StartBlock(const String& text, const String& key);
+    void WriteLog(const String& text);
+
+    String amText;
+    String amKey;
+    bool active = false;
+    LogInterface* pLog = nullptr;
+    // Shared by the owner of the process log, so that it outlives the block.
+    boost::shared_ptr<LogFile> amOwnedLog;
+
+    static std::atomic<unsigned short> smIndent;
+    static std::atomic<std::uint32_t> smAutoLogCounter;
+};
+
+#endif  // NXBASE_LOGFILE_H_

@@ -1,0 +1,87 @@
+// CriticalSection is a scoped lock on a process-wide recursive mutex chosen by
+// name; Thread is a base class for named worker threads with cooperative stop
+// requests. Named locks may be taken from any thread.
+#ifndef NXBASE_THREAD_H_
+#define NXBASE_THREAD_H_
+
+#include <atomic>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "nxbase/export.h"
+
+class NXBASE_EXPORT CriticalSection {
+public:
+    // Finds or creates the mutex named `name` and enters it (recursively).
+    explicit CriticalSection(const char* name);
+    // Leaves the mutex. Leaving "CleanCriticalSections" destroys every named
+    // mutex: take it once at the very end of the process.
+    virtual ~CriticalSection();
+    CriticalSection(const CriticalSection&) = delete;
+    CriticalSection& operator=(const CriticalSection&) = delete;
+
+    // Number of named mutexes alive (for diagnostics and tests).
+    static std::size_t NamedLockCount();
+
+private:
+    std::string amName;
+    std::shared_ptr<std::recursive_mutex> pMutex;
+};
+
+enum ThreadPriorityTYPE { NORMAL_PRIORITY = 0, BELOW_NORMAL_PRIORITY = 1, ABOVE_NORMAL_PRIORITY = 2 };
+
+class NXBASE_EXPORT Thread {
+public:
+    Thread(const std::string& id, ThreadPriorityTYPE priority);
+    // Stops and joins a thread still running.
+    virtual ~Thread();
+    Thread(const Thread&) = delete;
+    Thread& operator=(const Thread&) = delete;
+
+    // Registers the id in smRunningThreads, starts the body on a new thread
+    // and applies the stored priority.
+    void StartThread();
+    // Applies the priority to a started thread; the stored priority does not change.
+    void SetPriority(ThreadPriorityTYPE priority);
+    ThreadPriorityTYPE GetPriority() const { return amPriority; }
+    // Asks the body to return (it polls IsStopRequested()).
+    void RequestStop();
+    // Requests the stop and joins: Linux has no safe forced termination.
+    // Closes the handle and unregisters the id; callable in any state.
+    void KillThread();
+
+    bool IsRunning() const { return running.load(); }
+    bool IsFinished() const { return !running.load(); }
+    const std::string& GetId() const { return amId; }
+    // Exit code of the body once it returned (0 after an exception).
+    unsigned int GetExitCode() const { return exitCode.load(); }
+
+    static std::vector<std::string> GetRunningThreads();
+
+protected:
+    virtual unsigned int Run() = 0;
+    virtual void StopThread();
+    virtual void RequestChildrenStop() {}
+    virtual void KillChildThreads() {}
+    bool IsStopRequested() const { return stopRequested.load(); }
+
+private:
+    static void ThreadRoutine(Thread* self);
+    void ApplyPriority();
+
+    std::unique_ptr<std::thread> pHandle;
+    ThreadPriorityTYPE amPriority;
+    std::atomic<bool> stopRequested{false};
+    std::atomic<bool> running{false};
+    std::string amId;
+    std::atomic<unsigned int> exitCode{0};
+    std::atomic<int> systemThreadId{0};
+
+    static std::mutex smRunningMutex;
+    static std::vector<std::string> smRunningThreads;
+};
+
+#endif  // NXBASE_THREAD_H_

@@ -1,0 +1,103 @@
+// String is the toolkit's 8-bit string in the ANSI code page (Windows-1252)
+// with a 16-bit unsigned length: texts longer than String::kMaxLen are cut.
+// Positions are unsigned 16-bit; searches that fail answer STRING_NOTFOUND.
+// A String is a value; distinct objects may be used on distinct threads.
+#ifndef TOOLKIT_STRING_H_
+#define TOOLKIT_STRING_H_
+
+#include <cstdint>
+#include <iosfwd>
+#include <string>
+#include <string_view>
+
+#include "nxbase/export.h"
+
+using xub_StrLen = std::uint16_t;
+
+constexpr xub_StrLen STRING_NOTFOUND = 0xFFFF;
+// "To the end" for counts, as in Copy(5, STRING_LEN).
+constexpr xub_StrLen STRING_LEN = 0xFFFF;
+
+class NXBASE_EXPORT String {
+public:
+    // The longest text a String holds; one less than STRING_NOTFOUND so that
+    // no valid position equals it.
+    static constexpr std::size_t kMaxLen = 0xFFFE;
+
+    String() = default;
+    String(const char* text);  // NOLINT: implicit, as the toolkit's
+    String(const char* text, xub_StrLen length);
+    String(const std::string& text);  // NOLINT
+    String(std::string_view text);    // NOLINT
+    explicit String(char c);
+
+    // Decimal text of a number, without locale.
+    static String CreateFromInt(long value);
+
+    xub_StrLen Len() const { return static_cast<xub_StrLen>(text_.size()); }
+    bool IsEmpty() const { return text_.empty(); }
+    const char* GetBuffer() const { return text_.c_str(); }
+    const char* GetStr() const { return text_.c_str(); }
+    const std::string& str() const { return text_; }
+    operator std::string() const { return text_; }  // NOLINT
+
+    char GetChar(xub_StrLen index) const { return index < text_.size() ? text_[index] : '\0'; }
+    char operator[](xub_StrLen index) const { return GetChar(index); }
+    void SetChar(xub_StrLen index, char c);
+
+    // First position of `what` at or after `from`, or STRING_NOTFOUND. An
+    // empty `what` is never found.
+    xub_StrLen Search(const String& what, xub_StrLen from = 0) const;
+    xub_StrLen Search(char c, xub_StrLen from = 0) const;
+    xub_StrLen SearchBackward(char c) const;
+    // Replaces every occurrence, left to right; returns the count.
+    xub_StrLen SearchAndReplaceAll(const String& what, const String& with);
+
+    // Substring of at most `count` characters from `from` (empty past the end).
+    String Copy(xub_StrLen from, xub_StrLen count = STRING_LEN) const;
+    String& Erase(xub_StrLen from = 0, xub_StrLen count = STRING_LEN);
+    String& Insert(const String& text, xub_StrLen at = STRING_LEN);
+    String& Append(const String& text);
+    String& Append(char c);
+    String& EraseLeadingChars(char c = ' ');
+    String& EraseTrailingChars(char c = ' ');
+    String& EraseAllChars(char c = ' ');
+    String& ToUpper();  // ASCII letters only
+    String& ToLower();
+
+    // Token functions: the text cut at every separator. An empty text has no
+    // token; otherwise the count is the number of separators plus one.
+    xub_StrLen GetTokenCount(char separator = ';') const;
+    String GetToken(xub_StrLen index, char separator = ';') const;
+
+    // True for a non-empty text of ASCII digits only.
+    bool IsNumeric() const;
+    // Leading decimal integer (optional sign, blanks skipped); 0 when none.
+    long ToLong() const;
+    // Decimal number read with "." whatever the locale; 0 when none.
+    double ToDouble() const;
+
+    bool EqualsIgnoreCaseAscii(const String& other) const;
+
+    String& operator+=(const String& text) { return Append(text); }
+    String& operator+=(const char* text) { return Append(String(text)); }
+    String& operator+=(char c) { return Append(c); }
+
+    friend bool operator==(const String& a, const String& b) { return a.text_ == b.text_; }
+    friend bool operator!=(const String& a, const String& b) { return a.text_ != b.text_; }
+    friend bool operator<(const String& a, const String& b) { return a.text_ < b.text_; }
+    friend bool operator==(const String& a, const char* b) { return a.text_ == b; }
+    friend bool operator!=(const String& a, const char* b) { return a.text_ != b; }
+
+private:
+    void Clip();
+
+    std::string text_;
+};
+
+NXBASE_EXPORT String operator+(const String& a, const String& b);
+NXBASE_EXPORT String operator+(const String& a, const char* b);
+NXBASE_EXPORT String operator+(const char* a, const String& b);
+NXBASE_EXPORT std::ostream& operator<<(std::ostream& out, const String& text);
+
+#endif  // TOOLKIT_STRING_H_

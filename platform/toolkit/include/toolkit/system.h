@@ -1,0 +1,47 @@
+// Facts about the running process and the platform that the toolkit offered
+// on Windows: local date and time, the temporary directory, the executable's
+// file name, the calling thread's id. Any thread may call these.
+#ifndef TOOLKIT_SYSTEM_H_
+#define TOOLKIT_SYSTEM_H_
+
+#include <cstdint>
+#include <string>
+
+#include "nxbase/export.h"
+
+// Local calendar date.
+struct NXBASE_EXPORT Date {
+    int day = 1;
+    int month = 1;
+    int year = 1970;
+    static Date Today();
+};
+
+// Local time of day.
+struct NXBASE_EXPORT Time {
+    int hour = 0;
+    int minute = 0;
+    int second = 0;
+    static Time Now();
+};
+
+namespace toolkit {
+
+// Local date and time of one instant, read once so that date and time agree.
+NXBASE_EXPORT void LocalNow(Date& date, Time& time);
+
+// $TMPDIR if set and non-empty, else "/tmp"; without a trailing "/".
+NXBASE_EXPORT std::string TempDirectory();
+
+// Full path of the running executable ("/proc/self/exe"), or "" if unknown.
+NXBASE_EXPORT std::string ExecutableFileName();
+
+// The calling thread's operating-system id (gettid).
+NXBASE_EXPORT std::uint32_t CurrentThreadId();
+
+// Converts "\" to "/" so that paths written by Windows applications work.
+NXBASE_EXPORT std::string NormalizePath(const std::string& path);
+
+}  // namespace toolkit
+
+#endif  // TOOLKIT_SYSTEM_H_

@@ -1,0 +1,175 @@
+#include "toolkit/string.h"
+
+#include <algorithm>
+#include <charconv>
+#include <ostream>
+
+String::String(const char* text) : text_(text ? text : "") { Clip(); }
+
+String::String(const char* text, xub_StrLen length) : text_(text ? std::string(text, length) : "") {}
+
+String::String(const std::string& text) : text_(text) { Clip(); }
+
+String::String(std::string_view text) : text_(text) { Clip(); }
+
+String::String(char c) : text_(1, c) {}
+
+String String::CreateFromInt(long value) {
+    char buffer[24];
+    auto result = std::to_chars(buffer, buffer + sizeof buffer, value);
+    return String(std::string_view(buffer, static_cast<std::size_t>(result.ptr - buffer)));
+}
+
+void String::Clip() {
+    if (text_.size() > kMaxLen) text_.resize(kMaxLen);
+}
+
+void String::SetChar(xub_StrLen index, char c) {
+    if (index < text_.size()) text_[index] = c;
+}
+
+xub_StrLen String::Search(const String& what, xub_StrLen from) const {
+    if (what.text_.empty() || from >= text_.size()) return STRING_NOTFOUND;
+    std::size_t at = text_.find(what.text_, from);
+    return at == std::string::npos ? STRING_NOTFOUND : static_cast<xub_StrLen>(at);
+}
+
+xub_StrLen String::Search(char c, xub_StrLen from) const {
+    if (from >= text_.size()) return STRING_NOTFOUND;
+    std::size_t at = text_.find(c, from);
+    return at == std::string::npos ? STRING_NOTFOUND : static_cast<xub_StrLen>(at);
+}
+
+xub_StrLen String::SearchBackward(char c) const {
+    std::size_t at = text_.rfind(c);
+    return at == std::string::npos ? STRING_NOTFOUND : static_cast<xub_StrLen>(at);
+}
+
+xub_StrLen String::SearchAndReplaceAll(const String& what, const String& with) {
+    if (what.text_.empty()) return 0;
+    std::string result;
+    xub_StrLen count = 0;
+    std::size_t start = 0;
+    for (std::size_t at = text_.find(what.text_); at != std::string::npos;
+         at = text_.find(what.text_, start)) {
+        result.append(text_, start, at - start).append(with.text_);
+        start = at + what.text_.size();
+        ++count;
+    }
+    result.append(text_, start, std::string::npos);
+    text_ = std::move(result);
+    Clip();
+    return count;
+}
+
+String String::Copy(xub_StrLen from, xub_StrLen count) const {
+    if (from >= text_.size()) return String();
+    return String(std::string_view(text_).substr(from, count));
+}
+
+String& String::Erase(xub_StrLen from, xub_StrLen count) {
+    if (from < text_.size()) text_.erase(from, count);
+    return *this;
+}
+
+String& String::Insert(const String& text, xub_StrLen at) {
+    text_.insert(std::min<std::size_t>(at, text_.size()), text.text_);
+    Clip();
+    return *this;
+}
+
+String& String::Append(const String& text) {
+    text_.append(text.text_);
+    Clip();
+    return *this;
+}
+
+String& String::Append(char c) {
+    if (text_.size() < kMaxLen) text_.push_back(c);
+    return *this;
+}
+
+String& String::EraseLeadingChars(char c) {
+    text_.erase(0, text_.find_first_not_of(c));
+    return *this;
+}
+
+String& String::EraseTrailingChars(char c) {
+    std::size_t last = text_.find_last_not_of(c);
+    text_.erase(last == std::string::npos ? 0 : last + 1);
+    return *this;
+}
+
+String& String::EraseAllChars(char c) {
+    text_.erase(std::remove(text_.begin(), text_.end(), c), text_.end());
+    return *this;
+}
+
+String& String::ToUpper() {
+    for (char& c : text_) {
+        if (c >= 'a' && c <= 'z') c = static_cast<char>(c - 'a' + 'A');
+    }
+    return *this;
+}
+
+String& String::ToLower() {
+    for (char& c : text_) {
+        if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
+    }
+    return *this;
+}
+
+xub_StrLen String::GetTokenCount(char separator) const {
+    if (text_.empty()) return 0;
+    return static_cast<xub_StrLen>(std::count(text_.begin(), text_.end(), separator) + 1);
+}
+
+String String::GetToken(xub_StrLen index, char separator) const {
+    std::size_t start = 0;
+    for (xub_StrLen i = 0; i < index; ++i) {
+        std::size_t next = text_.find(separator, start);
+        if (next == std::string::npos) return String();
+        start = next + 1;
+    }
+    std::size_t end = text_.find(separator, start);
+    return String(std::string_view(text_).substr(start, end == std::string::npos ? end : end - start));
+}
+
+bool String::IsNumeric() const {
+    return !text_.empty() &&
+           std::all_of(text_.begin(), text_.end(), [](char c) { return c >= '0' && c <= '9'; });
+}
+
+long String::ToLong() const {
+    std::size_t at = text_.find_first_not_of(" \t");
+    if (at == std::string::npos) return 0;
+    if (text_[at] == '+') ++at;
+    long value = 0;
+    std::from_chars(text_.data() + at, text_.data() + text_.size(), value);
+    return value;
+}
+
+double String::ToDouble() const {
+    std::size_t at = text_.find_first_not_of(" \t");
+    if (at == std::string::npos) return 0.0;
+    if (text_[at] == '+') ++at;
+    double value = 0.0;
+    std::from_chars(text_.data() + at, text_.data() + text_.size(), value);
+    return value;
+}
+
+bool String::EqualsIgnoreCaseAscii(const String& other) const {
+    String a(*this), b(other);
+    return a.ToUpper().text_ == b.ToUpper().text_;
+}
+
+String operator+(const String& a, const String& b) {
+    String result(a);
+    return result.Append(b);
+}
+
+String operator+(const String& a, const char* b) { return a + String(b); }
+
+String operator+(const char* a, const String& b) { return String(a) + b; }
+
+std::ostream& operator<<(std::ostream& out, const String& text) { return out << text.str(); }
