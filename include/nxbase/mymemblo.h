@@ -158,9 +158,11 @@ class NXBASE_EXPORT MyMemoryBlock {
     void CheckSize(long alCount);
     // Moves the content into a new array of `alCapacity` bytes (>= length).
     void Reallocate(std::int32_t alCapacity);
-    // Fixed-size little-endian helpers for the scalar operators.
-    void PutBytes(const unsigned char* p, long alCount);
-    void GetBytes(unsigned char* p, long alCount);
+    // Fixed-size helpers for the scalar operators (defined in the .cpp only).
+    template <int N>
+    void PutBytes(const unsigned char* p);
+    template <int N>
+    void GetBytes(unsigned char* p);
 
     char* data = nullptr;
     char* getPointer = nullptr;

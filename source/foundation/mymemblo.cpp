@@ -224,36 +224,39 @@ void MyMemoryBlock::RestoreWritePointer() {
     if (rememberedRead > putPointer) rememberedRead = putPointer;
 }
 
-void MyMemoryBlock::PutBytes(const unsigned char* p, long alCount) {
-    // Fast path for the scalar writers: room is there, no growth check needed.
-    if (capacity - length >= alCount) {
-        std::memcpy(putPointer, p, static_cast<std::size_t>(alCount));
-        putPointer += alCount;
-        length += static_cast<std::int32_t>(alCount);
+template <int N>
+void MyMemoryBlock::PutBytes(const unsigned char* p) {
+    // Fast path for the scalar writers: when the room is there, a fixed-size
+    // copy without the growth check.
+    if (capacity - length >= N) {
+        std::memcpy(putPointer, p, N);
+        putPointer += N;
+        length += N;
         return;
     }
-    Put(p, alCount);
+    Put(p, N);
 }
 
-void MyMemoryBlock::GetBytes(unsigned char* p, long alCount) {
-    if (Remaining() >= alCount) {
-        std::memcpy(p, getPointer, static_cast<std::size_t>(alCount));
-        getPointer += alCount;
+template <int N>
+void MyMemoryBlock::GetBytes(unsigned char* p) {
+    if (Remaining() >= N) {
+        std::memcpy(p, getPointer, N);
+        getPointer += N;
         return;
     }
-    Get(p, alCount);
+    Get(p, N);
 }
 
 // ------------------------------------------------------------- writers
 
 MyMemoryBlock& MyMemoryBlock::operator<<(char axValue) {
     unsigned char byte = static_cast<unsigned char>(axValue);
-    PutBytes(&byte, 1);
+    PutBytes<1>(&byte);
     return *this;
 }
 
 MyMemoryBlock& MyMemoryBlock::operator<<(unsigned char axValue) {
-    PutBytes(&axValue, 1);
+    PutBytes<1>(&axValue);
     return *this;
 }
 
@@ -264,14 +267,14 @@ MyMemoryBlock& MyMemoryBlock::operator<<(short axValue) {
 MyMemoryBlock& MyMemoryBlock::operator<<(unsigned short axValue) {
     unsigned char bytes[2];
     Encode<2>(axValue, bytes);
-    PutBytes(bytes, 2);
+    PutBytes<2>(bytes);
     return *this;
 }
 
 MyMemoryBlock& MyMemoryBlock::operator<<(int axValue) {
     unsigned char bytes[4];
     Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
-    PutBytes(bytes, 4);
+    PutBytes<4>(bytes);
     return *this;
 }
 
@@ -281,9 +284,8 @@ MyMemoryBlock& MyMemoryBlock::operator<<(long axValue) {
 }
 
 MyMemoryBlock& MyMemoryBlock::operator<<(const String& asValue) {
-    Put(asValue.GetBuffer(), asValue.Len());
-    unsigned char zero = 0;
-    PutBytes(&zero, 1);
+    // GetBuffer() carries the terminating zero.
+    Put(asValue.GetBuffer(), static_cast<long>(asValue.Len()) + 1);
     return *this;
 }
 
@@ -298,7 +300,7 @@ MyMemoryBlock& MyMemoryBlock::operator<<(const FlagSet& axValue) {
     CheckSize(count);
     for (int i = 0; i < count; ++i) {
         unsigned char byte = axValue.GetFlag(i);
-        PutBytes(&byte, 1);
+        PutBytes<1>(&byte);
     }
     return *this;
 }
@@ -333,13 +335,13 @@ MyMemoryBlock& MyMemoryBlock::operator<<(std::iostream& axStream) {
 
 MyMemoryBlock& MyMemoryBlock::operator>>(char& axValue) {
     unsigned char byte = static_cast<unsigned char>(axValue);
-    GetBytes(&byte, 1);
+    GetBytes<1>(&byte);
     axValue = static_cast<char>(byte);
     return *this;
 }
 
 MyMemoryBlock& MyMemoryBlock::operator>>(unsigned char& axValue) {
-    GetBytes(&axValue, 1);
+    GetBytes<1>(&axValue);
     return *this;
 }
 
@@ -353,7 +355,7 @@ MyMemoryBlock& MyMemoryBlock::operator>>(short& axValue) {
 MyMemoryBlock& MyMemoryBlock::operator>>(unsigned short& axValue) {
     unsigned char bytes[2];
     Encode<2>(axValue, bytes);
-    GetBytes(bytes, 2);
+    GetBytes<2>(bytes);
     axValue = static_cast<unsigned short>(Decode<2>(bytes));
     return *this;
 }
@@ -361,7 +363,7 @@ MyMemoryBlock& MyMemoryBlock::operator>>(unsigned short& axValue) {
 MyMemoryBlock& MyMemoryBlock::operator>>(long& axValue) {
     unsigned char bytes[4];
     Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
-    GetBytes(bytes, 4);
+    GetBytes<4>(bytes);
     axValue = static_cast<long>(static_cast<std::int32_t>(Decode<4>(bytes)));
     return *this;
 }
