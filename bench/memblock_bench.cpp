@@ -1,11 +1,11 @@
 // Streaming one million mixed values (char, short, int, long, String) through
 // a memory block, against memcpy of the same byte image into a buffer of the
 // final size, in the same program.
+#include <benchmark/benchmark.h>
+
 #include <cstring>
 #include <string>
 #include <vector>
-
-#include <benchmark/benchmark.h>
 
 #include "nxbase/mymemblo.h"
 

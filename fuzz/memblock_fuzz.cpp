@@ -83,14 +83,30 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     for (size_t i = 0; i < opCount; ++i) {
         const uint8_t op = ops[i];
         switch (op % 14) {
-            case 0: ReadAndRewrite<char>(block); break;
-            case 1: ReadAndRewrite<unsigned char>(block); break;
-            case 2: ReadAndRewrite<short>(block); break;
-            case 3: ReadAndRewrite<unsigned short>(block); break;
-            case 4: ReadAndRewrite<int>(block); break;
-            case 5: ReadAndRewrite<long>(block); break;
-            case 6: ReadAndRewrite<String>(block); break;
-            case 7: ReadAndRewrite<FlagSet>(block); break;
+            case 0:
+                ReadAndRewrite<char>(block);
+                break;
+            case 1:
+                ReadAndRewrite<unsigned char>(block);
+                break;
+            case 2:
+                ReadAndRewrite<short>(block);
+                break;
+            case 3:
+                ReadAndRewrite<unsigned short>(block);
+                break;
+            case 4:
+                ReadAndRewrite<int>(block);
+                break;
+            case 5:
+                ReadAndRewrite<long>(block);
+                break;
+            case 6:
+                ReadAndRewrite<String>(block);
+                break;
+            case 7:
+                ReadAndRewrite<FlagSet>(block);
+                break;
             case 8: {
                 unsigned char buffer[16];
                 long wanted = op >> 4;
@@ -99,9 +115,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                 Require(got == (wanted < left ? wanted : left));
                 break;
             }
-            case 9: block.RememberReadPointer(); break;
-            case 10: block.RestoreReadPointer(); break;
-            case 11: block.Minimize(); break;
+            case 9:
+                block.RememberReadPointer();
+                break;
+            case 10:
+                block.RestoreReadPointer();
+                break;
+            case 11:
+                block.Minimize();
+                break;
             case 12: {
                 MyMemoryBlock copy(block);
                 Require(copy.Len() == block.Len());
@@ -109,7 +131,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                 block = copy;
                 break;
             }
-            case 13: block << static_cast<char>(op); break;
+            case 13:
+                block << static_cast<char>(op);
+                break;
         }
         RequireInside(block);
     }

@@ -33,17 +33,17 @@ TEST(MyMemoryBlock, WritesEveryTypeAsItsLittleEndianImage) {
           << 0x100000005L  // a long beyond 32 bits keeps its low 32
           << String("abc") << String() << "xy" << flags << FlagSet() << stream;
     const Bytes expected = {
-        0x41,                    // 'A'
-        0xFF,                    // unsigned char 255
-        0xFE, 0xFF,              // short -2
-        0x34, 0x12,              // unsigned short 0x1234
-        0x01, 0x00, 0x00, 0x00,  // int 1
-        0x78, 0x56, 0x34, 0x12,  // int 0x12345678
-        0xEB, 0x32, 0xA4, 0xF8,  // long -123456789 = 0xF8A432EB
-        0x05, 0x00, 0x00, 0x00,  // long 0x1'00000005
-        0x61, 0x62, 0x63, 0x00,  // String "abc" with its zero
-        0x00,                    // empty String: the zero alone
-        0x78, 0x79,              // const char* "xy": no zero
+        0x41,                                      // 'A'
+        0xFF,                                      // unsigned char 255
+        0xFE, 0xFF,                                // short -2
+        0x34, 0x12,                                // unsigned short 0x1234
+        0x01, 0x00, 0x00, 0x00,                    // int 1
+        0x78, 0x56, 0x34, 0x12,                    // int 0x12345678
+        0xEB, 0x32, 0xA4, 0xF8,                    // long -123456789 = 0xF8A432EB
+        0x05, 0x00, 0x00, 0x00,                    // long 0x1'00000005
+        0x61, 0x62, 0x63, 0x00,                    // String "abc" with its zero
+        0x00,                                      // empty String: the zero alone
+        0x78, 0x79,                                // const char* "xy": no zero
         0x03, 0x00, 0x00, 0x00, 0x00, 0x01, 0x00,  // 3 flags, flag 1 set
         0x00, 0x00, 0x00, 0x00,                    // empty FlagSet: count only
         0x02, 0x00, 0x00, 0x00, 0x68, 0x69,        // stream "hi"

@@ -128,8 +128,8 @@ class CommaLocaleTest : public ::testing::Test {
   protected:
     void SetUp() override {
         if (std::setlocale(LC_ALL, "de_DE.UTF-8") == nullptr) {
-            std::string command = "localedef -i de_DE -f UTF-8 '" + dir_.File("de_DE.UTF-8") +
-                                  "' >/dev/null 2>&1";
+            std::string command =
+                "localedef -i de_DE -f UTF-8 '" + dir_.File("de_DE.UTF-8") + "' >/dev/null 2>&1";
             if (std::system(command.c_str()) == 0) {
                 locpath_.emplace("LOCPATH", dir_.path().string());
                 std::setlocale(LC_ALL, "de_DE.UTF-8");

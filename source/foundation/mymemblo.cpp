@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <functional>
 #include <istream>
 #include <limits>
 #include <new>
@@ -41,7 +42,9 @@ std::uint32_t Decode(const unsigned char* p) {
     return value;
 }
 
-int WordCount(int alCount) { return (alCount + kWordBits - 1) / kWordBits; }
+int WordCount(int alCount) {
+    return (alCount + kWordBits - 1) / kWordBits;
+}
 
 }  // namespace
 
@@ -83,7 +86,9 @@ void FlagSet::SetAll() {
     ClearUnusedBits();
 }
 
-void FlagSet::ClearAll() { std::fill(amWords.begin(), amWords.end(), 0); }
+void FlagSet::ClearAll() {
+    std::fill(amWords.begin(), amWords.end(), 0);
+}
 
 bool FlagSet::IsEmpty() const {
     return std::all_of(amWords.begin(), amWords.end(), [](std::uint64_t w) { return w == 0; });
@@ -127,10 +132,18 @@ FlagSet FlagSet::operator~() const {
     return result;
 }
 
-FlagSet operator|(FlagSet a, const FlagSet& b) { return a |= b; }
-FlagSet operator&(FlagSet a, const FlagSet& b) { return a &= b; }
-FlagSet operator-(FlagSet a, const FlagSet& b) { return a -= b; }
-FlagSet operator^(FlagSet a, const FlagSet& b) { return a ^= b; }
+FlagSet operator|(FlagSet a, const FlagSet& b) {
+    return a |= b;
+}
+FlagSet operator&(FlagSet a, const FlagSet& b) {
+    return a &= b;
+}
+FlagSet operator-(FlagSet a, const FlagSet& b) {
+    return a -= b;
+}
+FlagSet operator^(FlagSet a, const FlagSet& b) {
+    return a ^= b;
+}
 
 // ---------------------------------------------------------- MyMemoryBlock
 
@@ -160,7 +173,9 @@ MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     return *this;
 }
 
-MyMemoryBlock::~MyMemoryBlock() { delete[] data; }
+MyMemoryBlock::~MyMemoryBlock() {
+    delete[] data;
+}
 
 void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
     char* fresh = AllocateBytes(alCapacity);
@@ -186,7 +201,8 @@ void MyMemoryBlock::CheckSize(long alCount) {
 long MyMemoryBlock::Put(const void* p, long alCount) {
     if (alCount <= 0) return 0;
     const char* source = static_cast<const char*>(p);
-    if (source >= data && source < data + capacity) {
+    if (!std::less<const char*>()(source, data) &&
+        std::less<const char*>()(source, data + capacity)) {
         // Copying from inside this block: keep the source valid across growth.
         long offset = static_cast<long>(source - data);
         CheckSize(alCount);
@@ -378,7 +394,8 @@ MyMemoryBlock& MyMemoryBlock::operator>>(int& axValue) {
 MyMemoryBlock& MyMemoryBlock::operator>>(String& asValue) {
     std::size_t available = static_cast<std::size_t>(Remaining());
     const char* zero = static_cast<const char*>(std::memchr(getPointer, 0, available));
-    std::size_t textLength = zero != nullptr ? static_cast<std::size_t>(zero - getPointer) : available;
+    std::size_t textLength =
+        zero != nullptr ? static_cast<std::size_t>(zero - getPointer) : available;
     asValue = String(std::string_view(getPointer, textLength));
     if (zero != nullptr) {
         getPointer += textLength + 1;

@@ -138,11 +138,11 @@ GString::GString(double axValue, int alDecimals, int alWidth, char axDecimalSepa
                                       std::chars_format::fixed, alDecimals);
     std::string text = error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
     const bool finite = std::isfinite(axValue);
-    if (finite && text[0] == '-' &&
-        text.find_first_not_of("0.", 1) == std::string::npos) {
+    if (finite && text[0] == '-' && text.find_first_not_of("0.", 1) == std::string::npos) {
         text.erase(0, 1);  // -0.00 reads as 0.00
     }
-    if (finite && axDecimalSeparator != '.') std::replace(text.begin(), text.end(), '.', axDecimalSeparator);
+    if (finite && axDecimalSeparator != '.')
+        std::replace(text.begin(), text.end(), '.', axDecimalSeparator);
     if (axPlusSign && text[0] != '-' && text != "nan") text.insert(0, 1, '+');
     const bool signed_ = text[0] == '-' || text[0] == '+';
     if (axZeroPad && finite) {
@@ -156,7 +156,8 @@ GString::GString(double axValue, int alDecimals, int alWidth, char axDecimalSepa
 GString::GString(int axValue, int alWidth) {
     std::array<char, 16> buffer;
     auto result = std::to_chars(buffer.data(), buffer.data() + buffer.size(), axValue);
-    static_cast<String&>(*this) = String(PadLeft(std::string(buffer.data(), result.ptr), alWidth, ' ', 0));
+    static_cast<String&>(*this) =
+        String(PadLeft(std::string(buffer.data(), result.ptr), alWidth, ' ', 0));
 }
 
 GString::operator double() const {
@@ -208,9 +209,13 @@ String* DynStringArray::Get(unsigned long alIndex) const {
     return alIndex < amSlots.size() ? amSlots[alIndex] : nullptr;
 }
 
-void DynStringArray::ChangeSize(unsigned long alNewSize) { amSlots.resize(alNewSize, nullptr); }
+void DynStringArray::ChangeSize(unsigned long alNewSize) {
+    amSlots.resize(alNewSize, nullptr);
+}
 
-void DynStringArray::Clear() { std::fill(amSlots.begin(), amSlots.end(), nullptr); }
+void DynStringArray::Clear() {
+    std::fill(amSlots.begin(), amSlots.end(), nullptr);
+}
 
 bool operator==(const DynStringArray& a, const DynStringArray& b) {
     if (a.amSlots.size() != b.amSlots.size()) return false;
