@@ -246,6 +246,18 @@ TEST(MyMemoryBlock, ReadingPastTheEndStopsAtTheWrittenData) {
     EXPECT_EQ(unterminated.Remaining(), 0);
     EXPECT_TRUE(unterminated.ReadPastEnd());
 
+    // A text beyond the String limit is cut, and the reader still lands
+    // after its zero byte.
+    MyMemoryBlock overlong;
+    const std::string run(70000, 'q');
+    overlong.Put(run.data(), static_cast<long>(run.size()));
+    overlong << String() << 7;
+    int seven = 0;
+    overlong >> text >> seven;
+    EXPECT_EQ(text.Len(), String::kMaxLen);
+    EXPECT_EQ(seven, 7);
+    EXPECT_FALSE(overlong.ReadPastEnd());
+
     // A flag count beyond the data, or below zero, leaves the target alone.
     FlagSet flags(2);
     flags.SetFlag(0);
