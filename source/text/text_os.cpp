@@ -168,9 +168,10 @@ std::string Utf8ToWindows1252(std::string_view utf8) {
         position = utf8.size() - inLeft;
         if (result != static_cast<std::size_t>(-1)) break;
         if (errno == E2BIG) continue;
-        // EILSEQ: a character the code page lacks or a malformed byte;
-        // EINVAL: a sequence cut off by the end of the text.
+        // EINVAL: a sequence cut off by the end of the text; EILSEQ: a
+        // character the code page lacks or a malformed byte.
         out.push_back('?');
+        if (errno == EINVAL) break;
         std::size_t length = Utf8SequenceLength(utf8.substr(position));
         position += length == 0 ? 1 : length;
         converter.Reset();
