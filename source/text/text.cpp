@@ -60,11 +60,13 @@ void Log(const std::string& text, const char* key = kLogKey) { LogFile::WriteToL
 
 std::string Quoted(const std::string& text) { return "\"" + text + "\""; }
 
+using LineMatch = boost::match_results<std::string_view::const_iterator>;
+
 // Matches `line` against `expression` over the whole line and stores
-// capture 1 in `capture`. A match that exceeds Boost's complexity bound
-// counts as no match.
-bool MatchLine(std::string_view line, const boost::regex& expression, std::string& capture) {
-    boost::match_results<std::string_view::const_iterator> match;
+// capture 1 in `capture`; `match` is scratch space reused between lines. A
+// match that exceeds Boost's complexity bound counts as no match.
+bool MatchLine(std::string_view line, const boost::regex& expression, LineMatch& match,
+               std::string& capture) {
     try {
         if (!boost::regex_match(line.begin(), line.end(), match, expression)) return false;
     } catch (const std::runtime_error&) {
@@ -108,6 +110,9 @@ void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
     const bool logLines = LogFile::Instance()->IsLogOptionEnabled(kLineLogKey);
     TextTable& table = Store().table;
     std::string currentGroup;
+    // The texts of the current group once it holds one.
+    std::vector<std::string>* currentTexts = nullptr;
+    LineMatch match;
     bool groupOpened = false;
     bool utf8 = false;
     std::string capture;
@@ -130,16 +135,18 @@ void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
         // Each expression needs its opening bracket: lines without one are
         // skipped before the regular expressions run.
         if (line.find('{') != std::string_view::npos &&
-            MatchLine(line, GroupExpression(), capture)) {
+            MatchLine(line, GroupExpression(), match, capture)) {
             currentGroup.clear();
+            currentTexts = nullptr;
             if (table.find(capture) == table.end()) {
                 currentGroup = capture;
                 if (!currentGroup.empty()) groupOpened = true;
             }
         } else if (line.find('[') != std::string_view::npos &&
-                   MatchLine(line, TextExpression(), capture)) {
+                   MatchLine(line, TextExpression(), match, capture)) {
             if (currentGroup.empty()) continue;
-            table[currentGroup].push_back(utf8 ? Utf8ToWindows1252(capture) : capture);
+            if (currentTexts == nullptr) currentTexts = &table[currentGroup];
+            currentTexts->push_back(utf8 ? Utf8ToWindows1252(capture) : capture);
         }
     }
 }
