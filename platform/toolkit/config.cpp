@@ -1,7 +1,9 @@
 #include "toolkit/config.h"
 
-// Plain bytes in and out: no wide-character conversion is needed.
+// Plain bytes in and out (no wide-character conversion); the template
+// bodies are compiled here (Debian splits them behind SI_IMPLEMENTATION).
 #define SI_NO_CONVERSION
+#define SI_IMPLEMENTATION
 #include <SimpleIni.h>
 #include <fcntl.h>
 #include <sys/file.h>
@@ -152,14 +154,40 @@ bool WriteAll(int fd, const std::string& bytes) {
     return true;
 }
 
-void Parse(Ini& ini, const std::string& text) {
-    ini.Reset();
-    // SimpleIni stops at a NUL byte; the rest of such a file is unreadable
-    // anyway and is skipped like any malformed line.
-    ini.LoadData(text.data(), text.size());
+bool IsBlank(char c) { return c == ' ' || c == '\t'; }
+
+// Whether one line (without its terminator) is blank, a comment, a group
+// header or a key line. Anything else is malformed: a header without "]", a
+// line without "=", an empty key name, a NUL byte.
+bool IsWellFormed(const char* begin, const char* end) {
+    if (std::find(begin, end, '\0') != end) return false;
+    while (begin != end && IsBlank(*begin)) ++begin;
+    if (begin == end || *begin == ';' || *begin == '#') return true;
+    if (*begin == '[') return std::find(begin, end, ']') != end;
+    const char* equals = std::find(begin, end, '=');
+    return equals != end && equals != begin;
 }
 
-bool IsBlank(char c) { return c == ' ' || c == '\t'; }
+// Hands SimpleIni the well-formed lines only, so that a malformed line is
+// skipped on its own and never changes how the lines after it read (SimpleIni
+// would file the keys after an unclosed "[" under a garbage group).
+void Parse(Ini& ini, const std::string& text) {
+    ini.Reset();
+    std::string clean;
+    clean.reserve(text.size());
+    const char* p = text.data();
+    const char* const end = p + text.size();
+    while (p < end) {
+        const char* eol = p;
+        while (eol < end && *eol != '\n' && *eol != '\r') ++eol;
+        if (IsWellFormed(p, eol)) {
+            clean.append(p, eol);
+            clean += '\n';
+        }
+        p = eol < end ? eol + 1 : end;
+    }
+    ini.LoadData(clean.data(), clean.size());
+}
 
 bool HasLineBreakOrNul(const std::string& s) {
     return s.find_first_of(std::string("\r\n\0", 3)) != std::string::npos;
@@ -184,7 +212,7 @@ struct Config::Impl {
     String pathName;
     std::string path;
     String group;
-    Ini ini{false, false, false};
+    std::unique_ptr<Ini> ini{new Ini(false, false, false)};
     bool loaded = false;
     FileId id;
     std::string lastError;
@@ -204,7 +232,7 @@ struct Config::Impl {
         std::string error;
         FileId readId;
         if (!ReadWhole(path, text, readId, error)) text.clear();
-        Parse(ini, text);
+        Parse(*ini, text);
         id = readId;
         loaded = true;
         orderValid = false;
@@ -215,7 +243,7 @@ struct Config::Impl {
         if (orderValid && orderGroup == group.str()) return order;
         order.clear();
         Ini::TNamesDepend keys;
-        ini.GetAllKeys(group.GetBuffer(), keys);
+        ini->GetAllKeys(group.GetBuffer(), keys);
         keys.sort(Ini::Entry::LoadOrder());
         for (const auto& key : keys) order.emplace_back(key.pItem);
         orderGroup = group.str();
@@ -230,7 +258,8 @@ struct Config::Impl {
     }
 
     // The write protocol: lock, re-read, change, write a temporary file,
-    // fsync, rename over the file, fsync the directory. `change` returns
+    // fsync, rename over the file. The directory is not synced: after a power
+    // loss the rename may be lost, which leaves the old file, never a torn one. `change` returns
     // false when the file needs no rewrite.
     template <class Change>
     bool Modify(Change change) {
@@ -245,10 +274,10 @@ struct Config::Impl {
         FileId oldId;
         std::string error;
         if (!ReadWhole(path, text, oldId, error)) return Fail(error);
-        Ini fresh(false, false, false);
-        Parse(fresh, text);
-        if (!change(fresh)) {
-            Parse(ini, text);
+        std::unique_ptr<Ini> fresh(new Ini(false, false, false));
+        Parse(*fresh, text);
+        if (!change(*fresh)) {
+            ini = std::move(fresh);
             id = oldId;
             loaded = true;
             orderValid = false;
@@ -256,7 +285,7 @@ struct Config::Impl {
         }
 
         std::string out;
-        if (fresh.Save(out) != SI_OK) return Fail("cannot format the file");
+        if (fresh->Save(out) != SI_OK) return Fail("cannot format the file");
 
         // One temporary name per file: only the holder of the lock writes it,
         // and a leftover from a killed writer is simply overwritten.
@@ -293,14 +322,8 @@ struct Config::Impl {
             ::unlink(temp.c_str());
             return Fail(reason);
         }
-        const std::size_t slash = path.find_last_of('/');
-        const std::string dir = slash == std::string::npos ? std::string(".")
-                                : slash == 0               ? std::string("/")
-                                                           : path.substr(0, slash);
-        Fd dirFd(::open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-        if (dirFd.get() >= 0) (void)::fsync(dirFd.get());
-
-        Parse(ini, out);
+        // Values are stored trimmed, so the saved text reads back as `fresh`.
+        ini = std::move(fresh);
         id = FileId::Of(written);
         loaded = true;
         orderValid = false;
@@ -323,7 +346,7 @@ const String& Config::GetGroup() const { return pImpl->group; }
 
 String Config::ReadKey(const String& key, const String& defaultValue) {
     pImpl->Refresh();
-    const char* value = pImpl->ini.GetValue(pImpl->group.GetBuffer(), key.GetBuffer(), nullptr);
+    const char* value = pImpl->ini->GetValue(pImpl->group.GetBuffer(), key.GetBuffer(), nullptr);
     return value != nullptr ? String(value) : defaultValue;
 }
 
@@ -332,10 +355,13 @@ bool Config::WriteKey(const String& key, const String& value) {
     if (!IsStorableGroup(group)) return pImpl->Fail("the group name \"" + group + "\" cannot be stored");
     if (!IsStorableKey(key.str())) return pImpl->Fail("the key name \"" + key.str() + "\" cannot be stored");
     if (HasLineBreakOrNul(value.str())) return pImpl->Fail("the value of \"" + key.str() + "\" has a line break");
+    std::string trimmed = value.str();
+    trimmed.erase(0, trimmed.find_first_not_of(" \t"));
+    trimmed.erase(trimmed.find_last_not_of(" \t") + 1);
     return pImpl->Modify([&](Ini& ini) {
         const char* old = ini.GetValue(group.c_str(), key.GetBuffer(), nullptr);
-        if (old != nullptr && value.str() == old) return false;
-        return ini.SetValue(group.c_str(), key.GetBuffer(), value.GetBuffer()) >= 0;
+        if (old != nullptr && trimmed == old) return false;
+        return ini.SetValue(group.c_str(), key.GetBuffer(), trimmed.c_str()) >= 0;
     });
 }
 
@@ -367,21 +393,21 @@ String Config::GetKeyName(std::uint16_t index) {
 String Config::ReadKey(std::uint16_t index) {
     const auto& order = pImpl->KeyOrder();
     if (index >= order.size()) return String();
-    const char* value = pImpl->ini.GetValue(pImpl->group.GetBuffer(), order[index].c_str(), "");
+    const char* value = pImpl->ini->GetValue(pImpl->group.GetBuffer(), order[index].c_str(), "");
     return String(value);
 }
 
 std::uint16_t Config::GetGroupCount() {
     pImpl->Refresh();
     Ini::TNamesDepend groups;
-    pImpl->ini.GetAllSections(groups);
+    pImpl->ini->GetAllSections(groups);
     return static_cast<std::uint16_t>(std::min<std::size_t>(groups.size(), 0xFFFF));
 }
 
 String Config::GetGroupName(std::uint16_t index) {
     pImpl->Refresh();
     Ini::TNamesDepend groups;
-    pImpl->ini.GetAllSections(groups);
+    pImpl->ini->GetAllSections(groups);
     groups.sort(Ini::Entry::LoadOrder());
     if (index >= groups.size()) return String();
     auto it = groups.begin();
@@ -391,7 +417,7 @@ String Config::GetGroupName(std::uint16_t index) {
 
 bool Config::HasGroup(const String& group) {
     pImpl->Refresh();
-    return pImpl->ini.GetSection(group.GetBuffer()) != nullptr;
+    return pImpl->ini->GetSection(group.GetBuffer()) != nullptr;
 }
 
 const std::string& Config::GetLastError() const { return pImpl->lastError; }
