@@ -135,6 +135,9 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
     ASSERT_TRUE(config.WriteKey("C", "4"));
     EXPECT_EQ(ReadFile(path), withC("4"));
     EXPECT_EQ(Keys(config, "Alpha"), (std::vector<std::string>{"b=2", "a=1", "c=4"}));
+    std::vector<std::string> bulk;
+    for (const auto& [key, value] : config.ReadGroup()) bulk.push_back(key.str() + "=" + value.str());
+    EXPECT_EQ(bulk, Keys(config, "Alpha"));
     EXPECT_EQ(config.GetGroupName(0), "Zeta");
     EXPECT_EQ(config.GetGroupName(1), "Alpha");
     EXPECT_EQ(config.GetGroupName(2), "");

@@ -397,6 +397,17 @@ String Config::ReadKey(std::uint16_t index) {
     return String(value);
 }
 
+std::vector<std::pair<String, String>> Config::ReadGroup() {
+    const auto& order = pImpl->KeyOrder();
+    std::vector<std::pair<String, String>> entries;
+    entries.reserve(order.size());
+    for (const std::string& key : order) {
+        const char* value = pImpl->ini->GetValue(pImpl->group.GetBuffer(), key.c_str(), "");
+        entries.emplace_back(String(key), String(value));
+    }
+    return entries;
+}
+
 std::uint16_t Config::GetGroupCount() {
     pImpl->Refresh();
     Ini::TNamesDepend groups;

@@ -23,6 +23,8 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "toolkit/string.h"
@@ -64,6 +66,10 @@ class NXBASE_EXPORT Config {
     String GetKeyName(std::uint16_t index);
     // The value of the key at `index` in file order, "" past the end.
     String ReadKey(std::uint16_t index);
+
+    // Every key of the selected group with its value, in file order: the
+    // same as GetKeyName and ReadKey by index, with one look at the file.
+    std::vector<std::pair<String, String>> ReadGroup();
 
     // Groups of the file, in file order.
     std::uint16_t GetGroupCount();
