@@ -165,6 +165,23 @@ TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {
     EXPECT_EQ(Keys(reread, "Second"), (std::vector<std::string>{"x=1", "y=2"}));
 }
 
+TEST(IniFile, ALinkedFileStaysALinkAndKeepsItsPermissions) {
+    TempDir dir;
+    const std::string real = dir.File("real.ini");
+    const std::string link = dir.File("link.ini");
+    WriteFile(real, "[G]\nOld = 1\n");
+    ::chmod(real.c_str(), 0640);
+    std::filesystem::create_symlink(real, link);
+    Config config(link);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("New", "2"));
+    EXPECT_TRUE(std::filesystem::is_symlink(link));
+    EXPECT_EQ(ReadFile(real), "[G]\nOld = 1\nNew = 2\n");
+    struct stat st {};
+    ASSERT_EQ(::stat(real.c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 0777, 0640u);
+}
+
 TEST(IniFile, RefusesNamesAndValuesThatWouldCorruptTheFile) {
     TempDir dir;
     const std::string path = dir.File("refuse.ini");
