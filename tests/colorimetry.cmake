@@ -1,1 +1,3 @@
-# Tests: colorimetry.
+# Tests: colorimetry (the CIE data provider, spectra, filters, measuring
+# conditions, the colorimetry facade).
+nxbase_add_test(cmetry_provider_test cmetry_provider_test.cpp LABELS colorimetry)
