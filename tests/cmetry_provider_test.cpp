@@ -44,7 +44,7 @@ void ExpectWeightsMatch(const std::string& illuminant, const std::string& observ
             EXPECT_EQ(filter->GetFloatWeights(c)[i], static_cast<float>(actual));
         }
     }
-    ::testing::Test::RecordProperty("worst_relative_error_" + illuminant + "_" + observer, std::to_string(worst));
+    ::testing::Test::RecordProperty("worst_relative_error_" + illuminant + "_" + observer, nxtest::Scientific(worst));
 }
 
 std::string D65Table() {

@@ -3,6 +3,7 @@
 #ifndef NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 #define NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 
+#include <cstdio>
 #include <cstdlib>
 #include <sstream>
 #include <string>
@@ -28,6 +29,12 @@ inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path
         rows.push_back(fields);
     }
     return rows;
+}
+
+inline std::string Scientific(double value) {
+    char text[32];
+    std::snprintf(text, sizeof text, "%.3e", value);
+    return text;
 }
 
 inline double ToDouble(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
