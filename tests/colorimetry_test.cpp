@@ -117,6 +117,7 @@ TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
     for (unsigned short c = 0; c < 3; ++c) {
         for (int i = 0; i < Filter::kSize; ++i) {
             EXPECT_EQ(defaults[c].GetWeights()[i], static_cast<float>(provider->GetWeights(c)[i]));
+            EXPECT_EQ(defaults.GetWeightTable()[c * Filter::kSize + i], defaults[c].GetWeights()[i]);
         }
     }
     EXPECT_NEAR(defaults.GetWeightSum(1), 100.0f, 1e-4f);

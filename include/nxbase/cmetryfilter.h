@@ -192,6 +192,11 @@ public:
     const float* GetWeights(unsigned short channel) const {
         return amFilters[channel]->GetWeights();
     }
+    // The provider's weights as one contiguous, 32-byte aligned float[3][36]
+    // block (X row, Y row, Z row) shared by every filter of the pair, for
+    // vectorised and batch sums. It shows the weights as computed: changes
+    // made through a Filter's non-const pointer do not reach it.
+    const float* GetWeightTable() const { return amFilter->GetFloatWeights(0); }
     // The sum of the weights of a channel (Y: 100 up to float rounding).
     float GetWeightSum(unsigned short channel) const { return amFilters[channel]->FilterSumme(); }
     // Raw weighted sums S_i = sum over the 36 samples of W_i * R, in single
