@@ -381,3 +381,24 @@ TEST(CMetry, ToEqualStrengthMatchesKubelkaMunkSums) {
     for (int i = 0; i < Spectrum::kSize; ++i) EXPECT_NEAR(sample[i], reference, 1e-5f);
     EXPECT_EQ(ref, Flat(reference));  // the reference is not changed
 }
+
+TEST_F(CMetryFacade, InstalledIlluminantWorksThroughTheFacade) {
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
+    std::filesystem::create_directories(dir.path() / "illuminants");
+    // A flat light: the same weights as illuminant E.
+    nxtest::WriteFile(dir.File("illuminants/Flat.csv"), "wavelength,value\n300,7\n900,7\n");
+    const IllumClass flat(std::string("Flat"));
+    EXPECT_EQ(flat.GetName(), "Flat");
+    EXPECT_EQ(flat.GetIllumType(), ILLUM_UNKNOWN);
+
+    CMetry& cmetry = *CMetry::Instance();
+    cmetry.SetCMetry(flat, ObserverClass(OBSERVER_2DEG));
+    EXPECT_EQ(cmetry.GetMeasuringConditions().GetMeasuringConditionString().substr(0, 2), "?,");
+    const CMetryFilter e2(Lichtart(IllumClass(ILLUM_E, 0)), Observer(OBSERVER_2DEG));
+    for (unsigned short c = 0; c < 3; ++c) {
+        for (int i = 0; i < Filter::kSize; ++i) {
+            EXPECT_FLOAT_EQ(cmetry.GetLXYZFilter()->GetWeights(c)[i], e2.GetWeights(c)[i]);
+        }
+    }
+}
