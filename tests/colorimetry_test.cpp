@@ -14,6 +14,9 @@
 
 namespace {
 
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
+
 // XYZ from float weights and a float sum of 36 products against the double
 // reference: float rounding of weights and sums explains about 1e-6 relative,
 // some 1e-5 on the scale Y = 100 (measured worst 2.6e-5).
@@ -207,7 +210,6 @@ TEST(ActualFilterClass, NamesGeometriesAndDisplayNames) {
 
 TEST(DStdClass, TypesSelectStandardsAndMissingOnesFallBackToStatusE) {
     nxtest::TempDir dir;
-    nxtest::ScopedEnv log("NXBASE_LOG_PATH", dir.File("log"));
     nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
     EXPECT_EQ(DStdClass(DSTD_STATUS_A).GetName(), "Status A");
     EXPECT_EQ(DStdClass(DSTD_STATUS_T).GetDStdType(), DSTD_STATUS_T);

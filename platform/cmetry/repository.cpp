@@ -190,8 +190,13 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
-    boost::shared_ptr<IIlluminant> illuminant = Find(name);
-    return illuminant ? illuminant : GetDefault();
+    std::string error;
+    boost::shared_ptr<IIlluminant> illuminant = Find(name, &error);
+    if (illuminant) return illuminant;
+    LogFile::WriteToLog(String("Illuminant \"" + name + "\" not available (" + error +
+                               "); using \"" + kDefaultIlluminant + "\""),
+                        String());
+    return GetDefault();
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::GetDefault() {
