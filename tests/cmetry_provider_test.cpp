@@ -188,6 +188,8 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
         {"Binary", std::string("\0\xff\x01,\n", 5), "line 1"},
         {"Infinite", "wavelength,value\n380,1\n390,1e999\n", "line 3: not a number"},
         {"Columns", "wavelength,value,more\n380,1,2\n390,1,2\n", "expected the columns"},
+        {"Negative", "wavelength,value\n380,1\n390,-1\n", "negative power at 390"},
+        {"Dark", "wavelength,value\n300,5\n310,0\n900,0\n", "no power between 360 and 780"},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);

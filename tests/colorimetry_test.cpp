@@ -404,3 +404,32 @@ TEST_F(CMetryFacade, InstalledIlluminantWorksThroughTheFacade) {
         }
     }
 }
+
+namespace {
+
+// An application's own light source that gives no light at all.
+class DarkLamp : public klume::cmetry::IIlluminant {
+public:
+    const std::string& GetName() const override { return amName; }
+    const std::string& GetDescription() const override { return amName; }
+    const std::vector<double>& GetWavelengths() const override { return amWavelengths; }
+    const std::vector<double>& GetPowers() const override { return amPowers; }
+
+private:
+    std::string amName = "Dark";
+    std::vector<double> amWavelengths{300.0, 900.0};
+    std::vector<double> amPowers{0.0, 0.0};
+};
+
+}  // namespace
+
+TEST(CMetryFilter, AnIlluminantWithoutLightFallsBackToTheDefaultWithALogLine) {
+    nxtest::LogCapture log;
+    const boost::shared_ptr<klume::cmetry::IIlluminant> dark(new DarkLamp);
+    EXPECT_FALSE(klume::cmetry::CMetryFilter::Find(dark, klume::cmetry::ObserverRepository::Get("2")));
+    const CMetryFilter filter{Lichtart(IllumClass(dark)), Observer(OBSERVER_2DEG)};
+    EXPECT_EQ(filter.GetIllum().GetName(), "D50");
+    EXPECT_NEAR(filter.GetWeightSum(1), 100.0f, 1e-4f);
+    EXPECT_NE(log.Text().find("Illuminant \"Dark\" has no weights"), std::string::npos)
+        << log.Text();
+}

@@ -182,10 +182,15 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
         SetError(error, path + ": expected the columns wavelength,value");
         return {};
     }
+    std::string message;
     boost::shared_ptr<IIlluminant> illuminant =
         MakeIlluminant(name, "Illuminant " + name + " (" + path + ")",
-                       std::move(table.wavelengths), std::move(table.values[0]), error);
-    if (illuminant) cache.illuminants[path] = illuminant;
+                       std::move(table.wavelengths), std::move(table.values[0]), &message);
+    if (!illuminant) {
+        SetError(error, path + ": " + message);
+        return {};
+    }
+    cache.illuminants[path] = illuminant;
     return illuminant;
 }
 

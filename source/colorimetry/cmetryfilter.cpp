@@ -5,6 +5,8 @@
 #include <mutex>
 #include <stdexcept>
 
+#include "nxbase/logfile.h"
+
 namespace {
 
 using klume::cmetry::IIlluminant;
@@ -232,7 +234,14 @@ void CMetryFilter::Build(boost::shared_ptr<IIlluminant> illuminant,
                          boost::shared_ptr<IObserver> observer) {
     if (!observer) observer = ObserverRepository::GetDefault();
     if (!illuminant) illuminant = IlluminantRepository::GetDefault();
-    amFilter = klume::cmetry::CMetryFilter::Find(std::move(illuminant), std::move(observer));
+    amFilter = klume::cmetry::CMetryFilter::Find(illuminant, observer);
+    if (!amFilter) {
+        LogFile::WriteToLog(String("Illuminant \"" + illuminant->GetName() +
+                                   "\" has no weights; using \"" +
+                                   IlluminantRepository::GetDefault()->GetName() + "\""),
+                            String());
+        amFilter = klume::cmetry::CMetryFilter::Find(IlluminantRepository::GetDefault(), observer);
+    }
     for (unsigned short c = 0; c < 3; ++c) {
         amFilters[c].reset(new Filter(amFilter->GetFloatWeights(c)));
     }
