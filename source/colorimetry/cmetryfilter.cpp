@@ -27,6 +27,13 @@ constexpr IllumName kIllumNames[] = {
     {ILLUM_D55, "D55"},   {ILLUM_D75, "D75"},   {ILLUM_E, "E"},
 };
 
+// The data provider's diagnostics go to the process log, always written.
+void LogProviderMessage(const std::string& message) { LogFile::WriteToLog(String(message), String()); }
+
+// Installed when the library is loaded, before any colour work.
+const bool kProviderLogInstalled =
+    (klume::cmetry::SetMessageHandler(&LogProviderMessage), true);
+
 constexpr const char* kObserver2 = "2";
 constexpr const char* kObserver10 = "10";
 

@@ -25,6 +25,14 @@
 namespace klume {
 namespace cmetry {
 
+// Receives the provider's diagnostic lines (a table that is missing or does
+// not parse, a fallback to a default). The host application installs one at
+// load time; without one the lines are dropped. Any thread may call the
+// handler, so it must be thread-safe.
+using MessageHandler = void (*)(const std::string& message);
+// Installs `handler` (null: drop the lines) and returns the previous one.
+NXBASE_EXPORT MessageHandler SetMessageHandler(MessageHandler handler);
+
 class NXBASE_EXPORT IlluminantRepository {
 public:
     // The illuminant of that name: built in, or installed in the data
