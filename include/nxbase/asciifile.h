@@ -119,7 +119,11 @@ public:
 
 namespace nxbase::detail {
 class DataFileStream;
-}
+// The body of SetVersion with the application's version text given: the
+// "File" title, "Application" and "Version" lines; stores the version.
+NXBASE_EXPORT void WriteVersionSection(ASCIIFile& axFile, int alVersion,
+                                       const String& asApplication);
+}  // namespace nxbase::detail
 
 // The full implementation over an input or an output stream.
 class NXBASE_EXPORT ASCIIFileImpl : public ASCIIFile {

@@ -681,11 +681,15 @@ bool ASCIIFileImpl::CheckVersion(int alHighestKnown) {
 
 void ASCIIFileImpl::SetVersion(int alVersion) {
     // Asked first, so that a missing AppName leaves nothing half-written.
-    String application = ApplicationVersionText();
-    PutTitel(kVersionTitle);
-    amVersion = alVersion;
-    PutString(kApplicationKey, application);
-    PutInt(kVersionKey, alVersion);
+    nxbase::detail::WriteVersionSection(*this, alVersion, ApplicationVersionText());
+}
+
+void nxbase::detail::WriteVersionSection(ASCIIFile& axFile, int alVersion,
+                                         const String& asApplication) {
+    axFile.PutTitel(kVersionTitle);
+    axFile.Version() = alVersion;
+    axFile.PutString(kApplicationKey, asApplication);
+    axFile.PutInt(kVersionKey, alVersion);
 }
 
 float ASCIIFileImpl::GetPercentDone() const {
