@@ -226,6 +226,25 @@ TEST_F(ASCIIFileTest, AFileWithoutLineFeedInItsHeadIsReadWithTheLegacyRules) {
     EXPECT_EQ(name.str(), "\x01\r\x81");
 }
 
+TEST_F(ASCIIFileTest, LinesAroundTheReadChunkSizeAreKeptWhole) {
+    // Lines are collected in chunks of 1024 bytes; lines that end just
+    // before, on and after a chunk boundary, the last one without a line feed.
+    std::string content;
+    std::vector<std::string> values;
+    for (std::size_t length = 1018; length <= 1030; ++length) {
+        values.push_back(std::string(length - 2, static_cast<char>('a' + length % 26)));
+        content += "V=" + values.back() + (length == 1030 ? "" : "\n");
+    }
+    std::stringstream stream(content);
+    ASCIIFileImpl file(&stream, true);
+    for (const std::string& expected : values) {
+        String value;
+        ASSERT_TRUE(file.GetString("V", value));
+        EXPECT_EQ(value.str(), expected);
+    }
+    EXPECT_TRUE(file.AtEnd());
+}
+
 TEST_F(ASCIIFileTest, CarriageReturnsAreDroppedSoCrLfFilesReadLikeLfFiles) {
     std::string path = Write("crlf.dat", "[File]\r\nApplication=K-Lume\r\nVersion=3\r\n"
                                          "Date=2026 - 11 -22   10 : 15:\r30\r\nName=a\rb\r\n");
