@@ -181,7 +181,7 @@ ASCIIFileImpl::ASCIIFileImpl(std::iostream* pStream, bool axForReading, bool axT
 }
 
 ASCIIFileImpl::~ASCIIFileImpl() {
-    if (!pOwned) return;
+    if (!amOwnsStream || !pOwned) return;
     if (pOutput != nullptr) CheckOutError();
     if (!pOwned->Close(!amError) || amError) {
         LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; file not replaced",
@@ -565,7 +565,7 @@ void ASCIIFileImpl::LatchStreamState() {
 
 void ASCIIFileImpl::CheckOutError() {
     if (pOutput == nullptr) return;
-    if (pOwned) {
+    if (amOwnsStream && pOwned) {
         if (!pOwned->Flush()) amError = true;
     } else {
         pOutput->flush();
