@@ -3,10 +3,12 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <charconv>
 #include <clocale>
 #include <cmath>
 #include <filesystem>
 #include <functional>
+#include <limits>
 #include <sstream>
 #include <stdexcept>
 
@@ -202,6 +204,42 @@ TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
     EXPECT_EQ(h, 2147483647);  // out of range saturates
     EXPECT_EQ(i, 0);
     EXPECT_DOUBLE_EQ(j, 0.5);
+}
+
+TEST_F(ASCIIFileTest, RealsAreTheCorrectlyRoundedValueOfTheirDigits) {
+    // Short reals take a quick path; every real must equal the full
+    // conversion bit for bit, whatever its length.
+    std::uint64_t seed = 12345;
+    auto next = [&seed](unsigned bound) {
+        seed = seed * 6364136223846793005u + 1442695040888963407u;
+        return static_cast<unsigned>((seed >> 33) % bound);
+    };
+    std::string content;
+    std::vector<double> expected;
+    for (int n = 0; n < 5000; ++n) {
+        std::string digits;
+        for (unsigned i = 0, count = 1 + next(20); i < count; ++i) digits += char('0' + next(10));
+        std::string decimals;
+        for (unsigned i = 0, count = next(26); i < count; ++i) decimals += char('0' + next(10));
+        std::string text = digits + "." + decimals;
+        double value = 0;
+        std::from_chars(text.data(), text.data() + text.size(), value);
+        expected.push_back(value);
+        content += "R=" + digits + (n % 2 ? "," : ".") + decimals + "\n";
+    }
+    content += "R=0." + std::string(400, '0') + "1\nR=-" + std::string(400, '9') + "\n";
+    std::stringstream stream(content);
+    ASCIIFileImpl file(&stream, true);
+    for (double value : expected) {
+        double back = -1;
+        ASSERT_TRUE(file.GetReal("R", back));
+        ASSERT_EQ(back, value);
+    }
+    double tiny = -1, huge = 0;
+    ASSERT_TRUE(file.GetReal("R", tiny));
+    ASSERT_TRUE(file.GetReal("R", huge));
+    EXPECT_EQ(tiny, 0.0);
+    EXPECT_EQ(huge, -std::numeric_limits<double>::infinity());
 }
 
 TEST_F(ASCIIFileTest, AFileWithoutLineFeedInItsHeadIsReadWithTheLegacyRules) {

@@ -6,6 +6,7 @@
 #include <cmath>
 #include <cstring>
 #include <iostream>
+#include <iterator>
 #include <limits>
 #include <stdexcept>
 
@@ -26,6 +27,13 @@ constexpr int kMaxPrecision = 40;
 // Field widths of the array writers, so that columns line up.
 constexpr int kShortField = 6;
 constexpr int kIntField = 7;
+// Reals whose digits form an integer of at most 2^53 with at most 22
+// decimals convert exactly by one division; 19 digits cannot overflow.
+constexpr std::size_t kExactDigits = 19;
+constexpr std::uint64_t kExactMantissa = std::uint64_t{1} << 53;
+constexpr double kPowersOfTen[] = {1e0,  1e1,  1e2,  1e3,  1e4,  1e5,  1e6,  1e7,
+                                   1e8,  1e9,  1e10, 1e11, 1e12, 1e13, 1e14, 1e15,
+                                   1e16, 1e17, 1e18, 1e19, 1e20, 1e21, 1e22};
 // Oldest format version CheckVersion accepts.
 constexpr int kOldestVersion = 2;
 
@@ -371,32 +379,54 @@ bool ASCIIFileImpl::ScanReal(double& axValue) {
         ++collected;
         while (pos < size && IsBlank(line[pos])) ++pos;
     }
+    // The digits are gathered into an integer mantissa as they are scanned.
+    std::uint64_t mantissa = 0;
     std::size_t start = pos;
-    while (pos < size && IsDigit(line[pos])) ++pos;
+    while (pos < size && IsDigit(line[pos])) {
+        mantissa = mantissa * 10 + static_cast<unsigned>(line[pos] - '0');
+        ++pos;
+    }
+    std::size_t integerDigits = pos - start;
     std::size_t separator = size;
+    std::size_t decimals = 0;
     if (pos < size && (line[pos] == '.' || line[pos] == ',')) {
         separator = pos++;
-        while (pos < size && IsDigit(line[pos])) ++pos;
+        std::size_t first = pos;
+        while (pos < size && IsDigit(line[pos])) {
+            mantissa = mantissa * 10 + static_cast<unsigned>(line[pos] - '0');
+            ++pos;
+        }
+        decimals = pos - first;
     }
     collected += pos - start;
     if (collected == 0) return false;
     amPos = static_cast<std::uint32_t>(pos);
 
     double value = 0.0;
-    std::from_chars_result result{};
-    if (separator < size && line[separator] == ',') {
-        amNumberScratch.assign(line + start, pos - start);
-        amNumberScratch[separator - start] = '.';
-        const char* text = amNumberScratch.data();
-        result = std::from_chars(text, text + amNumberScratch.size(), value,
-                                 std::chars_format::fixed);
+    if (integerDigits + decimals <= kExactDigits && mantissa <= kExactMantissa &&
+        decimals < std::size(kPowersOfTen)) {
+        // Both operands are exact doubles and IEEE division rounds correctly
+        // (Clinger's fast path), so this equals the full conversion.
+        value = static_cast<double>(mantissa) / kPowersOfTen[decimals];
     } else {
-        result = std::from_chars(line + start, line + pos, value, std::chars_format::fixed);
-    }
-    if (result.ec == std::errc::result_out_of_range) {
-        value = std::numeric_limits<double>::infinity();
-    } else if (result.ec != std::errc()) {
-        value = 0.0;  // a lone "-" or separator
+        std::from_chars_result result{};
+        if (separator < size && line[separator] == ',') {
+            amNumberScratch.assign(line + start, pos - start);
+            amNumberScratch[separator - start] = '.';
+            const char* text = amNumberScratch.data();
+            result = std::from_chars(text, text + amNumberScratch.size(), value,
+                                     std::chars_format::fixed);
+        } else {
+            result = std::from_chars(line + start, line + pos, value, std::chars_format::fixed);
+        }
+        if (result.ec == std::errc::result_out_of_range) {
+            // Too large when a non-zero digit precedes the separator, else too small.
+            bool large = std::find_if(line + start, line + start + integerDigits,
+                                      [](char c) { return c != '0'; }) != line + start + integerDigits;
+            value = large ? std::numeric_limits<double>::infinity() : 0.0;
+        } else if (result.ec != std::errc()) {
+            value = 0.0;  // a lone "-" or separator
+        }
     }
     axValue = negative ? -value : value;
     return true;
