@@ -154,8 +154,12 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     bool tabMode = programLength > 0 && (program[0] & 0x20) != 0;
 
     if (byName) {
-        static const std::string path =
-            "/tmp/nxbase-asciifile-fuzz-" + std::to_string(::getpid()) + ".dat";
+        // One scratch file per process, removed at exit.
+        static const struct Scratch {
+            std::string path = "/tmp/nxbase-asciifile-fuzz-" + std::to_string(::getpid()) + ".dat";
+            ~Scratch() { std::remove(path.c_str()); }
+        } scratch;
+        const std::string& path = scratch.path;
         {
             std::ofstream out(path, std::ios::binary | std::ios::trunc);
             out << content;

@@ -63,6 +63,7 @@ public:
     virtual bool GetInt(const String& asKey, int& axValue) = 0;
     virtual bool GetIntArray(const String& asKey, int* pValues, int alCount) = 0;
     // Optional "-", digits, optional "." or "," and digits; no exponent.
+    // Beyond the range of double the value is +-infinity, below it 0.
     virtual bool GetReal(const String& asKey, double& axValue) = 0;
     virtual bool GetRealArray(const String& asKey, double* pValues, int alCount) = 0;
     // The line "a3-a2-a1 a4:a5:a6".
