@@ -104,6 +104,16 @@ std::string NormalizeKey(std::string_view asKey) {
     return result;
 }
 
+// The key as the store keeps it, without a copy when it is already clean.
+std::string_view KeyView(const std::string& asKey, std::string& asBuffer) {
+    if (!asKey.empty() && (asKey.front() == '\\' || asKey.back() == '\\' ||
+                           asKey.find("\\\\") != std::string::npos)) {
+        asBuffer = NormalizeKey(asKey);
+        return asBuffer;
+    }
+    return asKey;
+}
+
 std::string HomeDirectory() {
     if (const char* home = std::getenv("HOME"); home && *home) return home;
     if (const passwd* entry = ::getpwuid(::getuid()); entry && entry->pw_dir) return entry->pw_dir;
@@ -113,6 +123,17 @@ std::string HomeDirectory() {
 bool FileExists(const std::string& asFile) {
     struct stat info;
     return ::stat(asFile.c_str(), &info) == 0;
+}
+
+void HiveFileInto(RegistryHive axHive, std::string& asFile) {
+    const char* variable =
+        std::getenv(axHive == RegistryHive::LocalMachine ? "NXBASE_MACHINE_REGISTRY"
+                                                         : "NXBASE_USER_REGISTRY");
+    if (variable && *variable) {
+        asFile.assign(variable);
+    } else {
+        asFile = RegistryHiveFile(axHive);
+    }
 }
 
 // ---- connections ----
@@ -314,7 +335,10 @@ Connection* Connect(RegistryHive axHive, bool abForWrite) {
         tlCache.Abandon();
         tlCache.amPid = ::getpid();
     }
-    std::string file = RegistryHiveFile(axHive);
+    // Resolved on every call, since the environment may point elsewhere, but
+    // into a buffer that is reused.
+    thread_local std::string file;
+    HiveFileInto(axHive, file);
     auto& connections = tlCache.amConnections;
     for (auto at = connections.begin(); at != connections.end(); ++at) {
         if ((*at)->File() != file) continue;
@@ -383,7 +407,7 @@ bool EnsureKey(Connection& axConnection, const std::string& asKey) {
 }
 
 // Writes a value into an existing key; false when the key is missing.
-bool Upsert(Connection& axConnection, const std::string& asKey, const RegistryValue& axValue) {
+bool Upsert(Connection& axConnection, std::string_view asKey, const RegistryValue& axValue) {
     sqlite3_stmt* upsert = axConnection.Get(kUpsertValue);
     Reset reset(upsert);
     BindText(upsert, 1, asKey);
@@ -490,7 +514,8 @@ std::optional<RegistryValue> RegistryStore::Read(RegistryHive axHive, const std:
                                                  const std::string& asName) {
     Connection* connection = Connect(axHive, false);
     if (!connection) return std::nullopt;
-    std::string key = NormalizeKey(asKey);
+    std::string normalized;
+    std::string_view key = KeyView(asKey, normalized);
     sqlite3_stmt* read = connection->Get(kReadValue);
     Reset reset(read);
     BindText(read, 1, key);
@@ -504,11 +529,12 @@ std::optional<RegistryValue> RegistryStore::Read(RegistryHive axHive, const std:
 void RegistryStore::Write(RegistryHive axHive, const std::string& asKey,
                           const RegistryValue& axValue) {
     Connection* connection = Connect(axHive, true);
-    std::string key = NormalizeKey(asKey);
+    std::string normalized;
+    std::string_view key = KeyView(asKey, normalized);
     // The common case, an existing key, is one autocommit statement.
     if (Upsert(*connection, key, axValue)) return;
     Transaction transaction(*connection);
-    EnsureKey(*connection, key);
+    EnsureKey(*connection, std::string(key));
     Upsert(*connection, key, axValue);
     transaction.Commit();
 }
