@@ -11,6 +11,7 @@
 // Each thread keeps its own connections (one per hive file) with their
 // prepared statements; a child process after fork() abandons its parent's
 // connections without closing them, as SQLite requires.
+#include <pthread.h>
 #include <pwd.h>
 #include <sqlite3.h>
 #include <sys/stat.h>
@@ -18,6 +19,7 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
@@ -312,13 +314,18 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
     return connection;
 }
 
+// Counts fork() calls, so that a child notices that its connections are its
+// parent's without a getpid() system call on every access.
+std::atomic<unsigned> gForkGeneration{0};
+const int kForkHandler = ::pthread_atfork(nullptr, nullptr, [] { ++gForkGeneration; });
+
 // The calling thread's connections.
 struct ConnectionCache {
-    pid_t amPid = ::getpid();
+    unsigned amGeneration = gForkGeneration.load();
     std::vector<std::unique_ptr<Connection>> amConnections;  // most recently used last
 
     ~ConnectionCache() {
-        if (amPid != ::getpid()) Abandon();
+        if (amGeneration != gForkGeneration.load()) Abandon();
     }
     void Abandon() {
         for (auto& connection : amConnections) connection.release();  // never closed here
@@ -331,9 +338,9 @@ thread_local ConnectionCache tlCache;
 // The connection to a hive; null when the hive has no file yet and
 // `forWrite` is false. For writing, the file and its directory are created.
 Connection* Connect(RegistryHive axHive, bool abForWrite) {
-    if (tlCache.amPid != ::getpid()) {
+    if (tlCache.amGeneration != gForkGeneration.load(std::memory_order_relaxed)) {
         tlCache.Abandon();
-        tlCache.amPid = ::getpid();
+        tlCache.amGeneration = gForkGeneration.load();
     }
     // Resolved on every call, since the environment may point elsewhere, but
     // into a buffer that is reused.
