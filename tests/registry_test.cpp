@@ -151,6 +151,7 @@ TEST_F(RegistryTest, FullPathsCreateKeysOnReadingAndIgnoreOtherHives) {
 TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
     constexpr int kProcesses = 2;
     constexpr int kKeysEach = 1000;
+    constexpr int kMachineEvery = 10;
     // The parent holds an open connection across fork().
     RegistryStore::Write(RegistryHive::CurrentUser, "Software\\K-Lume", RegistryValue::Text("x", "1"));
     pid_t children[kProcesses];
@@ -163,6 +164,10 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
                 for (int i = 0; i < kKeysEach; ++i) {
                     std::string key = "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
                     RegistryStore::Write(RegistryHive::CurrentUser, key, RegistryValue::Text("V", std::to_string(i)));
+                    // The machine's hive does not exist yet: both create it.
+                    if (i % kMachineEvery == 0) {
+                        RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("V", i));
+                    }
                 }
             } catch (const std::exception& error) {
                 std::fprintf(stderr, "child %d: %s\n", p, error.what());
@@ -184,6 +189,12 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
             auto value = RegistryStore::Read(RegistryHive::CurrentUser, parent + "\\K" + std::to_string(i), "V");
             ASSERT_TRUE(value) << parent << " K" << i;
             EXPECT_EQ(value->text, std::to_string(i));
+            if (i % kMachineEvery == 0) {
+                auto machineValue = RegistryStore::Read(RegistryHive::LocalMachine,
+                                                        parent + "\\K" + std::to_string(i), "V");
+                ASSERT_TRUE(machineValue) << parent << " K" << i;
+                EXPECT_EQ(machineValue->dword, static_cast<std::uint32_t>(i));
+            }
         }
     }
 }

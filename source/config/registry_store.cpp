@@ -20,10 +20,12 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
 #include <string_view>
+#include <thread>
 
 #include "nxbase/registry.h"
 
@@ -272,6 +274,36 @@ void PrepareSchema(Connection& axConnection) {
     }
 }
 
+// Switching a new file to WAL mode needs a lock for which SQLite does not
+// call the busy handler, so a process that races another one creating the
+// same hive waits here.
+void SwitchToWal(Connection& axConnection) {
+    constexpr auto kPause = std::chrono::milliseconds(2);
+    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(kBusyTimeoutMs);
+    while (true) {
+        sqlite3_stmt* pragma = nullptr;
+        int result = sqlite3_prepare_v2(axConnection.Db(), "PRAGMA journal_mode = WAL", -1, &pragma,
+                                        nullptr);
+        std::string mode;
+        if (result == SQLITE_OK) {
+            result = sqlite3_step(pragma);
+            if (result == SQLITE_ROW) {
+                mode = ColumnText(pragma, 0);
+                result = SQLITE_OK;
+            }
+        }
+        sqlite3_finalize(pragma);
+        if (result == SQLITE_OK && mode == "wal") return;
+        // Another mode back means the switch could not take its lock either.
+        bool busy = result == SQLITE_OK || (result & 0xFF) == SQLITE_BUSY ||
+                    (result & 0xFF) == SQLITE_LOCKED;
+        if (!busy || std::chrono::steady_clock::now() > deadline) {
+            Fail(axConnection, result, "cannot switch to WAL mode");
+        }
+        std::this_thread::sleep_for(kPause);
+    }
+}
+
 // Opens a hive file. Without `create` a missing file gives null, and a file
 // that cannot be written is opened for reading.
 std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive, bool abCreate) {
@@ -307,7 +339,7 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
             int persist = 1;
             sqlite3_file_control(pDb, "main", SQLITE_FCNTL_PERSIST_WAL, &persist);
         }
-        connection->Exec("PRAGMA journal_mode = WAL", "cannot switch to WAL mode");
+        SwitchToWal(*connection);
         connection->Exec("PRAGMA synchronous = NORMAL", "cannot set the sync mode");
     }
     PrepareSchema(*connection);
