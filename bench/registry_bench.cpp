@@ -1,9 +1,9 @@
 // Registry point reads and autocommit writes against their floor: a raw
 // SQLite loop (WAL, synchronous=NORMAL, one prepared statement, a plain
 // key/value table) in the same program on the same disk.
+#include <benchmark/benchmark.h>
 #include <sqlite3.h>
 
-#include <benchmark/benchmark.h>
 #include <string>
 
 #include "nxbase/registry.h"
@@ -18,21 +18,25 @@ using nxbase::RegistryValue;
 constexpr int kValues = 1000;  // distinct values read or written in turn
 const std::string kKey = "Software\\K-Lume\\Bench\\Settings";
 
-std::string Name(int i) { return "Value" + std::to_string(i); }
+std::string Name(int i) {
+    return "Value" + std::to_string(i);
+}
 
 // ---- the raw SQLite floor ----
 
 class RawSqlite {
   public:
     explicit RawSqlite(const std::string& path) {
-        sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX,
-                        nullptr);
+        sqlite3_open_v2(path.c_str(), &db,
+                        SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
         sqlite3_exec(db,
                      "PRAGMA journal_mode = WAL; PRAGMA synchronous = NORMAL;"
                      "CREATE TABLE kv(k TEXT PRIMARY KEY, v TEXT) WITHOUT ROWID;",
                      nullptr, nullptr, nullptr);
         sqlite3_prepare_v2(db, "SELECT v FROM kv WHERE k = ?1", -1, &select, nullptr);
-        sqlite3_prepare_v2(db, "INSERT OR REPLACE INTO kv(k, v) VALUES(?1, ?2)", -1, &upsert, nullptr);
+        sqlite3_prepare_v2(
+            db, "INSERT INTO kv(k, v) VALUES(?1, ?2) ON CONFLICT(k) DO UPDATE SET v = excluded.v",
+            -1, &upsert, nullptr);
     }
     ~RawSqlite() {
         sqlite3_finalize(select);
@@ -113,7 +117,8 @@ void BM_RegistryStorePointRead(benchmark::State& state) {
     RegistryFixture fixture;
     int i = 0;
     for (auto _ : state) {
-        benchmark::DoNotOptimize(RegistryStore::Read(RegistryHive::CurrentUser, kKey, fixture.names[i]));
+        benchmark::DoNotOptimize(
+            RegistryStore::Read(RegistryHive::CurrentUser, kKey, fixture.names[i]));
         i = (i + 1) % kValues;
     }
     state.SetItemsProcessed(state.iterations());

@@ -17,7 +17,8 @@ struct Result {
 class NxregTest : public ::testing::Test {
   protected:
     Result Run(const std::string& arguments) {
-        std::string command = std::string(NXBASE_BINARY_DIR) + "/tools/nxreg " + arguments + " 2>&1";
+        std::string command =
+            std::string(NXBASE_BINARY_DIR) + "/tools/nxreg " + arguments + " 2>&1";
         Result result;
         FILE* pipe = ::popen(command.c_str(), "r");
         if (pipe == nullptr) return result;
@@ -41,14 +42,17 @@ TEST_F(NxregTest, RegistersTheServerAndPeersAndShowsThem) {
     EXPECT_EQ(Run("set " + server + " Executable /opt/k-lume/bin/LumaServer").status, 0);
     EXPECT_EQ(Run("set " + server + " Version 3.2").status, 0);
     EXPECT_EQ(Run("set 'HKEY_LOCAL_MACHINE\\Software\\K-Lume\\ChromaLink\\Applications' "
-                  "ColorLab '/opt/k-lume/bin/ColorLab'").status, 0);
+                  "ColorLab '/opt/k-lume/bin/ColorLab'")
+                  .status,
+              0);
 
     Result version = Run("get 'hklm\\software\\k-lume\\lumaserver' VERSION");
     EXPECT_EQ(version.status, 0);
     EXPECT_EQ(version.out, "3.2\n");
     Result list = Run("list 'HKLM\\software\\k-lume'");
     EXPECT_EQ(list.status, 0);
-    EXPECT_NE(list.out.find("HKEY_LOCAL_MACHINE\\Software\\K-Lume\n"), std::string::npos) << list.out;
+    EXPECT_NE(list.out.find("HKEY_LOCAL_MACHINE\\Software\\K-Lume\n"), std::string::npos)
+        << list.out;
     EXPECT_NE(list.out.find("[ChromaLink]"), std::string::npos) << list.out;
     EXPECT_NE(list.out.find("[LumaServer]"), std::string::npos) << list.out;
 

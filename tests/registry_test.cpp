@@ -40,8 +40,8 @@ TEST_F(RegistryTest, UserValueWinsOverMachineValueWhichWinsOverDefault) {
     ASSERT_TRUE(RegistryHandler::AddRegistryEntry(entry, "5000"));
     EXPECT_EQ(RegistryHandler::GetValue("Server", "Port", "default"), "5000");
     EXPECT_EQ(RegistryHandler::GetValue(HKEY_LOCAL_MACHINE, "Server", "Port"), "4000");
-    EXPECT_EQ(RegistryHandler::GetGlobalValue(HKEY_LOCAL_MACHINE,
-                                              std::string(kRoot) + "\\Server", "Port"),
+    EXPECT_EQ(RegistryHandler::GetGlobalValue(HKEY_LOCAL_MACHINE, std::string(kRoot) + "\\Server",
+                                              "Port"),
               "4000");
 
     // The machine entry sits in the machine's file only.
@@ -59,21 +59,23 @@ TEST_F(RegistryTest, KeyPathsAndValueNamesIgnoreCaseAndKeepTheirCase) {
 
     // Writing under another case replaces the value and keeps the first name.
     RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "colour\\DISPLAY", "GAMMAVALUE", "1.8");
-    std::map<std::string, std::string> values = RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Colour\\Display");
+    std::map<std::string, std::string> values =
+        RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Colour\\Display");
     EXPECT_EQ(values, (std::map<std::string, std::string>{{"GammaValue", "1.8"}}));
     EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "colour\\display"), 1u);
 
     EXPECT_EQ(RegistryStore::SubKeys(RegistryHive::CurrentUser, "SOFTWARE\\k-lume\\registrytest"),
               (std::vector<std::string>{"Colour"}));
-    EXPECT_EQ(RegistryStore::Tree(RegistryHive::CurrentUser, "software\\k-lume\\REGISTRYTEST\\colour"),
-              (std::vector<std::string>{std::string(kRoot) + "\\Colour",
-                                        std::string(kRoot) + "\\Colour\\Display"}));
+    EXPECT_EQ(
+        RegistryStore::Tree(RegistryHive::CurrentUser, "software\\k-lume\\REGISTRYTEST\\colour"),
+        (std::vector<std::string>{std::string(kRoot) + "\\Colour",
+                                  std::string(kRoot) + "\\Colour\\Display"}));
 
     // A sibling whose name extends the key's is not below it.
     RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Colour2", "x", "1");
     RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Colour-B", "x", "1");
-    EXPECT_EQ(RegistryStore::Tree(RegistryHive::CurrentUser, std::string(kRoot) + "\\Colour").size(),
-              2u);
+    EXPECT_EQ(
+        RegistryStore::Tree(RegistryHive::CurrentUser, std::string(kRoot) + "\\Colour").size(), 2u);
     EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "Missing"), 0u);
     EXPECT_TRUE(RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Missing").empty());
 }
@@ -84,16 +86,21 @@ TEST_F(RegistryTest, DeletesOnlyInsideTheMakersBranches) {
     NxWriteRegistryKeyString("HKEY_CURRENT_USER\\Software\\Other\\Group", "c", "3");
     NxWriteRegistryKeyString("HKEY_CURRENT_USER\\software\\veltramond\\Old", "d", "4");
 
-    EXPECT_FALSE(RegistryHandler::DeleteGroup(RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "")));
-    EXPECT_FALSE(RegistryHandler::DeleteKey(RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "c")));
+    EXPECT_FALSE(RegistryHandler::DeleteGroup(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "")));
+    EXPECT_FALSE(RegistryHandler::DeleteKey(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "c")));
     EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\Other\\Group", "c"), "3");
 
-    EXPECT_TRUE(RegistryHandler::DeleteKey(RegistryEntry(HKEY_CURRENT_USER, "Software\\VeltraMond\\Old", "D")));
+    EXPECT_TRUE(RegistryHandler::DeleteKey(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\VeltraMond\\Old", "D")));
     EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\software\\veltramond\\Old", "d"), "");
 
     EXPECT_TRUE(RegistryHandler::DeleteGroup(HKEY_CURRENT_USER, "group"));
-    EXPECT_FALSE(RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group"));
-    EXPECT_FALSE(RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group\\Sub"));
+    EXPECT_FALSE(
+        RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group"));
+    EXPECT_FALSE(
+        RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group\\Sub"));
     EXPECT_FALSE(RegistryHandler::DeleteGroup(HKEY_CURRENT_USER, "group"));
     EXPECT_THROW(RegistryStore::DeleteKey(RegistryHive::CurrentUser, "\\"), std::invalid_argument);
 }
@@ -105,10 +112,13 @@ TEST_F(RegistryTest, ReadingADwordAsAStringRaisesTheKeyTypeError) {
     EXPECT_THROW(NxReadRegistryKeyString(path, "Count"), nxbase::RegistryKeyTypeError);
     EXPECT_THROW(NxReadRegistryKeysString(path), nxbase::RegistryKeyTypeError);
     EXPECT_THROW(RegistryHandler::GetValue("Numbers", "Count"), nxbase::RegistryKeyTypeError);
-    EXPECT_THROW(RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Numbers"), nxbase::RegistryKeyTypeError);
+    EXPECT_THROW(RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Numbers"),
+                 nxbase::RegistryKeyTypeError);
     EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "Numbers"), 1u);
-    EXPECT_EQ(RegistryStore::Read(RegistryHive::CurrentUser, std::string(kRoot) + "\\Numbers", "count")->dword,
-              10u);
+    EXPECT_EQ(
+        RegistryStore::Read(RegistryHive::CurrentUser, std::string(kRoot) + "\\Numbers", "count")
+            ->dword,
+        10u);
 
     // A string written over it changes its type.
     NxWriteRegistryKeyString(path, "Count", "eleven");
@@ -153,7 +163,8 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
     constexpr int kKeysEach = 1000;
     constexpr int kMachineEvery = 10;
     // The parent holds an open connection across fork().
-    RegistryStore::Write(RegistryHive::CurrentUser, "Software\\K-Lume", RegistryValue::Text("x", "1"));
+    RegistryStore::Write(RegistryHive::CurrentUser, "Software\\K-Lume",
+                         RegistryValue::Text("x", "1"));
     pid_t children[kProcesses];
     for (int p = 0; p < kProcesses; ++p) {
         children[p] = ::fork();
@@ -162,11 +173,14 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
             int status = 0;
             try {
                 for (int i = 0; i < kKeysEach; ++i) {
-                    std::string key = "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
-                    RegistryStore::Write(RegistryHive::CurrentUser, key, RegistryValue::Text("V", std::to_string(i)));
+                    std::string key =
+                        "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
+                    RegistryStore::Write(RegistryHive::CurrentUser, key,
+                                         RegistryValue::Text("V", std::to_string(i)));
                     // The machine's hive does not exist yet: both create it.
                     if (i % kMachineEvery == 0) {
-                        RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("V", i));
+                        RegistryStore::Write(RegistryHive::LocalMachine, key,
+                                             RegistryValue::Dword("V", i));
                     }
                 }
             } catch (const std::exception& error) {
@@ -186,7 +200,8 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
         ASSERT_EQ(RegistryStore::SubKeys(RegistryHive::CurrentUser, parent).size(),
                   static_cast<std::size_t>(kKeysEach));
         for (int i = 0; i < kKeysEach; ++i) {
-            auto value = RegistryStore::Read(RegistryHive::CurrentUser, parent + "\\K" + std::to_string(i), "V");
+            auto value = RegistryStore::Read(RegistryHive::CurrentUser,
+                                             parent + "\\K" + std::to_string(i), "V");
             ASSERT_TRUE(value) << parent << " K" << i;
             EXPECT_EQ(value->text, std::to_string(i));
             if (i % kMachineEvery == 0) {
@@ -209,7 +224,8 @@ TEST_F(RegistryTest, ThreadsWritingAndReadingShareNothingButTheFile) {
             for (int i = 0; i < kWrites; ++i) {
                 std::string name = "T" + std::to_string(t) + "_" + std::to_string(i);
                 RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Threads", name, name);
-                if (RegistryHandler::GetValue(HKEY_CURRENT_USER, "Threads", name) != name) ++failures;
+                if (RegistryHandler::GetValue(HKEY_CURRENT_USER, "Threads", name) != name)
+                    ++failures;
             }
         });
     }
@@ -239,23 +255,29 @@ TEST_F(RegistryTest, CorruptFileGivesAnErrorNamingItAndStaysUntouched) {
     const std::string foreign = dir.File("foreign.sqlite");
     nxtest::ScopedEnv other("NXBASE_USER_REGISTRY", foreign);
     ASSERT_EQ(std::system(("sqlite3 '" + foreign + "' 'CREATE TABLE t(a)'").c_str()), 0);
-    EXPECT_THROW(RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup"), nxbase::RegistryError);
+    EXPECT_THROW(RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup"),
+                 nxbase::RegistryError);
 }
 
 TEST_F(RegistryTest, Regedit4ExportImportRoundTripKeepsEscapesAndDwords) {
     const std::string key = "Software\\K-Lume\\Trip";
-    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Text("Quote\"d", "say \"hi\""));
-    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Text("Path", "C:\\Program Files\\K-Lume\\"));
-    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Text("Lines", "one\r\ntwo"));
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Quote\"d", "say \"hi\""));
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Path", "C:\\Program Files\\K-Lume\\"));
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Lines", "one\r\ntwo"));
     RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Text("", "unnamed"));
     RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("Count", 10));
     RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("Max", 0xFFFFFFFFu));
-    RegistryStore::Write(RegistryHive::LocalMachine, key + "\\Empty\\Deeper", RegistryValue::Text("x", ""));
+    RegistryStore::Write(RegistryHive::LocalMachine, key + "\\Empty\\Deeper",
+                         RegistryValue::Text("x", ""));
 
     std::string text = nxbase::ExportRegedit4(RegistryHive::LocalMachine, key);
     EXPECT_NE(text.find("\"Count\"=dword:0000000a\n"), std::string::npos) << text;
     EXPECT_NE(text.find("\"Max\"=dword:ffffffff\n"), std::string::npos) << text;
-    EXPECT_NE(text.find("\"Path\"=\"C:\\\\Program Files\\\\K-Lume\\\\\"\n"), std::string::npos) << text;
+    EXPECT_NE(text.find("\"Path\"=\"C:\\\\Program Files\\\\K-Lume\\\\\"\n"), std::string::npos)
+        << text;
     EXPECT_NE(text.find("\"Quote\\\"d\"=\"say \\\"hi\\\"\"\n"), std::string::npos) << text;
     EXPECT_NE(text.find("@=\"unnamed\"\n"), std::string::npos) << text;
     EXPECT_EQ(text.rfind("REGEDIT4\n", 0), 0u);
@@ -270,9 +292,10 @@ TEST_F(RegistryTest, Regedit4ExportImportRoundTripKeepsEscapesAndDwords) {
     EXPECT_EQ(RegistryStore::Read(RegistryHive::LocalMachine, key, "Lines")->text, "one\r\ntwo");
 
     // Deletions: a value and a whole key.
-    RegistryStore::Apply(nxbase::ParseRegedit4(
-        "REGEDIT4\n[HKLM\\Software\\K-Lume\\Trip]\n\"Count\"=-\n[-HKEY_LOCAL_MACHINE\\Software\\K-Lume\\Trip\\Empty]\n",
-        "delete.reg"));
+    RegistryStore::Apply(
+        nxbase::ParseRegedit4("REGEDIT4\n[HKLM\\Software\\K-Lume\\Trip]\n\"Count\"=-\n[-HKEY_LOCAL_"
+                              "MACHINE\\Software\\K-Lume\\Trip\\Empty]\n",
+                              "delete.reg"));
     EXPECT_FALSE(RegistryStore::Read(RegistryHive::LocalMachine, key, "Count"));
     EXPECT_FALSE(RegistryStore::KeyExists(RegistryHive::LocalMachine, key + "\\Empty"));
 }
@@ -346,7 +369,8 @@ TEST_F(RegistryTest, KeyHolderOwnsOpenedKeysOnly) {
     entry.SetKey(HKEY_LOCAL_MACHINE, "c");
     EXPECT_EQ(entry.GetHKey(), HKEY_LOCAL_MACHINE);
     EXPECT_EQ(entry.GetKey(), "c");
-    EXPECT_THROW(RegistryHandler::GetRegistryEntry(RegistryEntry(nullptr, "a", "b")), nxbase::RegistryError);
+    EXPECT_THROW(RegistryHandler::GetRegistryEntry(RegistryEntry(nullptr, "a", "b")),
+                 nxbase::RegistryError);
 }
 
 }  // namespace

@@ -138,8 +138,8 @@ class NXBASE_EXPORT RegistryHandler {
     // Creates the key when needed and writes the value as a string. Returns
     // true; store failures throw RegistryError.
     static bool AddRegistryEntry(const RegistryEntry& axEntry, const std::string& asValue);
-    static bool AddRegistryEntry(HKEY axHKey, const std::string& asSubKey,
-                                 const std::string& asKey, const std::string& asValue);
+    static bool AddRegistryEntry(HKEY axHKey, const std::string& asSubKey, const std::string& asKey,
+                                 const std::string& asValue);
 
     // Every value of the entry's key (its value name is ignored), name to text,
     // ordered by name; a missing key gives an empty map. Throws

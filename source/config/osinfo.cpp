@@ -37,12 +37,13 @@ unsigned long OSInfo::GetOSMajorVersion() {
     return major;
 }
 
-bool OSInfo::IsWindowsNT() { return false; }
+bool OSInfo::IsWindowsNT() {
+    return false;
+}
 
 bool OSInfo::IsTerminalServer() {
     bool remote = IsSet("SSH_CONNECTION") || IsSet("SSH_CLIENT") || IsSet("SSH_TTY");
-    LogFile::WriteToLog(String(remote ? "TerminalServer: 1" : "TerminalServer: 0"),
-                        String("Info"));
+    LogFile::WriteToLog(String(remote ? "TerminalServer: 1" : "TerminalServer: 0"), String("Info"));
     return remote;
 }
 
@@ -50,8 +51,7 @@ std::string OSInfo::GetMachineName() {
     char buffer[kMachineNameLength + 1] = {};
     std::string name;
     if (::gethostname(buffer, kMachineNameLength) == 0) name = Limited(buffer, kMachineNameLength);
-    LogFile::WriteToLog(String("Computername length: " + std::to_string(name.size())),
-                        String());
+    LogFile::WriteToLog(String("Computername length: " + std::to_string(name.size())), String());
     return name;
 }
 

@@ -9,7 +9,7 @@ namespace nxbase {
 namespace {
 
 constexpr std::size_t kMaxLineLength = 1 << 20;  // longer lines are refused
-constexpr std::size_t kMaxExcerpt = 60;           // of the offending text in errors
+constexpr std::size_t kMaxExcerpt = 60;          // of the offending text in errors
 constexpr std::size_t kMaxDwordDigits = 8;
 
 class ParseError : public std::runtime_error {
@@ -88,7 +88,8 @@ RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDele
     if (asData.substr(0, kDword.size()) == kDword) {
         std::string_view digits = asData.substr(kDword.size());
         std::uint32_t number = 0;
-        auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), number, 16);
+        auto [end, error] =
+            std::from_chars(digits.data(), digits.data() + digits.size(), number, 16);
         if (digits.empty() || digits.size() > kMaxDwordDigits || error != std::errc() ||
             end != digits.data() + digits.size()) {
             throw ParseError("a dword needs 1 to 8 hexadecimal digits");
@@ -145,8 +146,8 @@ void ParseLine(std::string_view asLine, bool& axHeaderSeen, bool& axInSection,
     bool remove = false;
     RegistryStore::Change change = axSection;
     change.value = ReadData(line, name, remove);
-    change.kind = remove ? RegistryStore::Change::Kind::DeleteValue
-                         : RegistryStore::Change::Kind::SetValue;
+    change.kind =
+        remove ? RegistryStore::Change::Kind::DeleteValue : RegistryStore::Change::Kind::SetValue;
     axChanges.push_back(std::move(change));
 }
 

@@ -162,7 +162,9 @@ RegistryEntry RegistryEntry::CreateUserRegistryEntry(const std::string& asSubKey
 
 // ---- HKeyHolder ----
 
-HKeyHolder::~HKeyHolder() { RegistryHandler::CloseKey(amHKey); }
+HKeyHolder::~HKeyHolder() {
+    RegistryHandler::CloseKey(amHKey);
+}
 
 HKEY* HKeyHolder::GetHKeyPtr() {
     RegistryHandler::CloseKey(amHKey);
@@ -179,7 +181,9 @@ void RegistryHandler::SetRootPath(const std::string& asRootPath) {
     if (!asRootPath.empty()) nxbase::InstallRegistryLogOptions();
 }
 
-const std::string& RegistryHandler::GetRootPath() { return smRootPath; }
+const std::string& RegistryHandler::GetRootPath() {
+    return smRootPath;
+}
 
 std::string RegistryHandler::GetRegistryEntry(const RegistryEntry& axEntry,
                                               const std::string& asDefault) {
@@ -271,8 +275,7 @@ bool RegistryHandler::OpenKey(const RegistryEntry& axEntry, HKeyHolder& axHolder
 
 bool RegistryHandler::HasKey(const RegistryEntry& axEntry, HKeyHolder& axHolder) {
     if (!OpenKey(axEntry, axHolder)) return false;
-    return RegistryStore::Read(axHolder.GetHKey()->hive, axHolder.GetHKey()->path,
-                               axEntry.GetKey())
+    return RegistryStore::Read(axHolder.GetHKey()->hive, axHolder.GetHKey()->path, axEntry.GetKey())
         .has_value();
 }
 
@@ -288,14 +291,18 @@ bool RegistryHandler::CanDeleteEntry(const RegistryEntry& axEntry) {
 
 void RegistryHandler::HandleResult(long alResult) {
     if (alResult == 0) return;
-    throw nxbase::RegistryError(alResult,
-                                "Registry operation failed (code " + std::to_string(alResult) + ")");
+    throw nxbase::RegistryError(
+        alResult, "Registry operation failed (code " + std::to_string(alResult) + ")");
 }
 
 // ---- full paths ----
 
-std::string GetHKeyLocalMachine() { return nxbase::kLocalMachine; }
-std::string GetHKeyCurrentUser() { return nxbase::kCurrentUser; }
+std::string GetHKeyLocalMachine() {
+    return nxbase::kLocalMachine;
+}
+std::string GetHKeyCurrentUser() {
+    return nxbase::kCurrentUser;
+}
 
 std::string NxReadRegistryKeyString(const std::string& asPath, const std::string& asValueName) {
     RegistryHive hive;

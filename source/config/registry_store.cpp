@@ -32,7 +32,7 @@
 namespace nxbase {
 namespace {
 
-constexpr int kBusyTimeoutMs = 30000;      // a writer holds the lock for microseconds
+constexpr int kBusyTimeoutMs = 30000;       // a writer holds the lock for microseconds
 constexpr int kApplicationId = 0x4E785267;  // "NxRg"
 constexpr int kSchemaVersion = 1;
 constexpr std::size_t kMaxCachedConnections = 4;  // per thread
@@ -89,9 +89,8 @@ constexpr std::array<const char*, kStatementCount> kStatementText = {
 
 // Drops empty components: "\a\\b\" becomes "a\b".
 std::string NormalizeKey(std::string_view asKey) {
-    bool clean = asKey.empty() ||
-                 (asKey.front() != '\\' && asKey.back() != '\\' &&
-                  asKey.find("\\\\") == std::string_view::npos);
+    bool clean = asKey.empty() || (asKey.front() != '\\' && asKey.back() != '\\' &&
+                                   asKey.find("\\\\") == std::string_view::npos);
     if (clean) return std::string(asKey);
     std::string result;
     result.reserve(asKey.size());
@@ -130,9 +129,8 @@ bool FileExists(const std::string& asFile) {
 }
 
 void HiveFileInto(RegistryHive axHive, std::string& asFile) {
-    const char* variable =
-        std::getenv(axHive == RegistryHive::LocalMachine ? "NXBASE_MACHINE_REGISTRY"
-                                                         : "NXBASE_USER_REGISTRY");
+    const char* variable = std::getenv(
+        axHive == RegistryHive::LocalMachine ? "NXBASE_MACHINE_REGISTRY" : "NXBASE_USER_REGISTRY");
     if (variable && *variable) {
         asFile.assign(variable);
     } else {
@@ -212,8 +210,8 @@ class Connection {
         message += "the file is corrupt or not a registry database (" +
                    std::string(sqlite3_errstr(alResult)) + ")";
     } else {
-        const char* detail = axConnection.Db() ? sqlite3_errmsg(axConnection.Db())
-                                               : sqlite3_errstr(alResult);
+        const char* detail =
+            axConnection.Db() ? sqlite3_errmsg(axConnection.Db()) : sqlite3_errstr(alResult);
         message += asWhat + ": " + detail;
     }
     throw RegistryError(alResult, message);
@@ -467,7 +465,8 @@ RegistryValue ValueFromRow(sqlite3_stmt* pStatement, int alTypeColumn, std::stri
     value.name = std::move(asName);
     if (sqlite3_column_int(pStatement, alTypeColumn) == static_cast<int>(RegistryType::Dword)) {
         value.type = RegistryType::Dword;
-        value.dword = static_cast<std::uint32_t>(sqlite3_column_int64(pStatement, alTypeColumn + 1));
+        value.dword =
+            static_cast<std::uint32_t>(sqlite3_column_int64(pStatement, alTypeColumn + 1));
     } else {
         value.type = RegistryType::String;
         value.text = ColumnText(pStatement, alTypeColumn + 1);

@@ -88,7 +88,8 @@ std::string Describe(const nxbase::RegistryValue& axValue) {
 }
 
 void PrintKey(const Key& axKey) {
-    for (const nxbase::RegistryValue& value : nxbase::RegistryStore::Values(axKey.hive, axKey.path)) {
+    for (const nxbase::RegistryValue& value :
+         nxbase::RegistryStore::Values(axKey.hive, axKey.path)) {
         std::cout << "  " << (value.name.empty() ? "@" : value.name) << "  " << Describe(value)
                   << "\n";
     }
@@ -225,7 +226,8 @@ int LogOptions(const std::vector<std::string>& asArguments) {
 }
 
 int Files() {
-    std::cout << "HKEY_CURRENT_USER  " << nxbase::RegistryHiveFile(nxbase::RegistryHive::CurrentUser)
+    std::cout << "HKEY_CURRENT_USER  "
+              << nxbase::RegistryHiveFile(nxbase::RegistryHive::CurrentUser)
               << "\nHKEY_LOCAL_MACHINE "
               << nxbase::RegistryHiveFile(nxbase::RegistryHive::LocalMachine) << "\n";
     return kOk;
