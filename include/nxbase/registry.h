@@ -1,7 +1,8 @@
 // Registry access: string values below key paths in two hives, the machine's
 // (HKEY_LOCAL_MACHINE) and the user's (HKEY_CURRENT_USER), kept in one SQLite
 // database per hive. Any thread and any number of processes may read and
-// write at once; each write is one transaction.
+// write at once; each write is one transaction. The root path is set once at
+// start, before other threads use the registry.
 //
 // Hive files: HKEY_CURRENT_USER is $NXBASE_USER_REGISTRY, else
 // $XDG_CONFIG_HOME/K-Lume/registry.sqlite (~/.config when XDG_CONFIG_HOME is
