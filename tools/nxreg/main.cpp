@@ -42,7 +42,17 @@ constexpr const char* kHelp =
     "$XDG_CONFIG_HOME/K-Lume/registry.sqlite; HKEY_LOCAL_MACHINE is\n"
     "$NXBASE_MACHINE_REGISTRY, else /etc/k-lume/registry.sqlite.\n"
     "\n"
-    "Exit status: 0 done, 1 value or key not found, 2 bad usage, 3 failure.\n";
+    "Exit status: 0 done, 1 value or key not found, 2 bad usage, 3 failure.\n"
+    "\n"
+    "Examples:\n"
+    "  sudo nxreg set 'HKLM\\Software\\K-Lume\\LumaServer' Executable /opt/k-lume/bin/LumaServer\n"
+    "  sudo nxreg set 'HKLM\\Software\\K-Lume\\LumaServer' Path /opt/k-lume/bin\n"
+    "  sudo nxreg set 'HKLM\\Software\\K-Lume\\LumaServer' Version 3.2\n"
+    "  sudo nxreg set 'HKLM\\Software\\K-Lume\\ChromaLink\\Applications' ColorLab "
+    "/opt/k-lume/bin/ColorLab\n"
+    "  nxreg set 'HKCU\\Software\\K-Lume\\ColorLab\\Log' Startup 1\n"
+    "  nxreg log-options 'Software\\K-Lume\\ColorLab'\n"
+    "  nxreg export HKLM\\Software\\K-Lume k-lume.reg\n";
 
 class UsageError : public std::runtime_error {
   public:
