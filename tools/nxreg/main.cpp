@@ -52,7 +52,7 @@ constexpr const char* kHelp =
     "/opt/k-lume/bin/ColorLab\n"
     "  nxreg set 'HKCU\\Software\\K-Lume\\ColorLab\\Log' Startup 1\n"
     "  nxreg log-options 'Software\\K-Lume\\ColorLab'\n"
-    "  nxreg export HKLM\\Software\\K-Lume k-lume.reg\n";
+    "  nxreg export 'HKLM\\Software\\K-Lume' k-lume.reg\n";
 
 class UsageError : public std::runtime_error {
   public:
