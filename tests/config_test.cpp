@@ -108,7 +108,8 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
               "# second group\n"
               "[Alpha]\n"
               "b = 2\n"
-              "a = 1\n");
+              "a = 1\n\n"
+              "; end of file\n");
     Config config(path);
     config.SetGroup("Alpha");
     ASSERT_TRUE(config.WriteKey("c", "3"));
@@ -125,7 +126,8 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
         "[Alpha]\n"
         "b = 2\n"
         "a = 1\n"
-        "c = %\n";
+        "c = %\n\n"
+        "; end of file\n";
     auto withC = [&](const char* c) {
         std::string text = expected;
         return text.replace(text.find('%'), 1, c);
@@ -141,6 +143,23 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
     EXPECT_EQ(config.GetGroupName(0), "Zeta");
     EXPECT_EQ(config.GetGroupName(1), "Alpha");
     EXPECT_EQ(config.GetGroupName(2), "");
+}
+
+TEST(IniFile, AFileOfCommentsOnlyKeepsThemAboveTheFirstGroup) {
+    TempDir dir;
+    const std::string path = dir.File("comments.ini");
+    WriteFile(path, "; written by hand\n\n# nothing set yet\n");
+    Config config(path);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("k", "v"));
+    EXPECT_EQ(ReadFile(path), "; written by hand\n\n# nothing set yet\n\n[G]\nk = v\n");
+    ASSERT_TRUE(config.WriteKey("k", "w"));
+    const std::string once = ReadFile(path);
+    ASSERT_TRUE(config.WriteKey("k", "v"));
+    ASSERT_TRUE(config.WriteKey("k", "w"));
+    EXPECT_EQ(ReadFile(path), once);
+    EXPECT_NE(once.find("; written by hand"), std::string::npos);
+    EXPECT_NE(once.find("# nothing set yet"), std::string::npos);
 }
 
 TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {

@@ -169,25 +169,62 @@ bool IsWellFormed(const char* begin, const char* end) {
     return equals != end && equals != begin;
 }
 
+// Comment lines SimpleIni would drop, kept aside to be written back: those
+// after the last group or key line (`after`), or every comment of a file
+// without any group or key (`before`).
+struct LooseComments {
+    std::string before;
+    std::string after;
+};
+
+bool IsEntry(const std::string& line) {
+    std::size_t first = line.find_first_not_of(" \t");
+    return first != std::string::npos && line[first] != ';' && line[first] != '#';
+}
+
 // Hands SimpleIni the well-formed lines only, so that a malformed line is
 // skipped on its own and never changes how the lines after it read (SimpleIni
 // would file the keys after an unclosed "[" under a garbage group).
-void Parse(Ini& ini, const std::string& text) {
+LooseComments Parse(Ini& ini, const std::string& text) {
     ini.Reset();
-    std::string clean;
-    clean.reserve(text.size());
+    std::vector<std::string> lines;
     const char* p = text.data();
     const char* const end = p + text.size();
     while (p < end) {
         const char* eol = p;
         while (eol < end && *eol != '\n' && *eol != '\r') ++eol;
-        if (IsWellFormed(p, eol)) {
-            clean.append(p, eol);
-            clean += '\n';
-        }
+        if (IsWellFormed(p, eol)) lines.emplace_back(p, eol);
         p = eol < end ? eol + 1 : end;
     }
+    std::size_t lastEntry = lines.size();
+    for (std::size_t i = lines.size(); i-- > 0;) {
+        if (IsEntry(lines[i])) {
+            lastEntry = i;
+            break;
+        }
+    }
+    LooseComments loose;
+    std::string clean;
+    clean.reserve(text.size());
+    if (lastEntry == lines.size()) {
+        for (const std::string& line : lines) {
+            if (!loose.before.empty() || line.find_first_not_of(" \t") != std::string::npos) {
+                loose.before += line + "\n";
+            }
+        }
+    } else {
+        for (std::size_t i = 0; i < lines.size(); ++i) {
+            std::string& target = i <= lastEntry ? clean : loose.after;
+            if (i > lastEntry && target.empty() && !IsEntry(lines[i]) &&
+                lines[i].find_first_not_of(" \t") == std::string::npos) {
+                continue;  // blank lines between the last key and a comment
+            }
+            target += lines[i];
+            target += '\n';
+        }
+    }
     ini.LoadData(clean.data(), clean.size());
+    return loose;
 }
 
 bool HasLineBreakOrNul(const std::string& s) {
@@ -286,7 +323,7 @@ struct Config::Impl {
         std::string error;
         if (!ReadWhole(target, text, oldId, error)) return Fail(error);
         std::unique_ptr<Ini> fresh(new Ini(false, false, false));
-        Parse(*fresh, text);
+        const LooseComments loose = Parse(*fresh, text);
         if (!change(*fresh)) {
             ini = std::move(fresh);
             id = oldId;
@@ -297,6 +334,8 @@ struct Config::Impl {
 
         std::string out;
         if (fresh->Save(out) != SI_OK) return Fail("cannot format the file");
+        if (!loose.before.empty()) out = loose.before + (out.empty() ? "" : "\n") + out;
+        if (!loose.after.empty()) out += (out.empty() ? "" : "\n") + loose.after;
 
         // One temporary name per file: only the holder of the lock writes it,
         // and a leftover from a killed writer is simply overwritten.
