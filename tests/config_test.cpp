@@ -162,6 +162,29 @@ TEST(IniFile, AFileOfCommentsOnlyKeepsThemAboveTheFirstGroup) {
     EXPECT_NE(once.find("# nothing set yet"), std::string::npos);
 }
 
+TEST(IniFile, AByteOrderMarkIsASignatureOnlyAtTheStartOfTheFile) {
+    TempDir dir;
+    const std::string path = dir.File("bom.ini");
+    const std::string bom = "\xEF\xBB\xBF";
+    WriteFile(path, bom + "[G]\nk = v\n");
+    Config config(path);
+    EXPECT_EQ(Keys(config, "G"), (std::vector<std::string>{"k=v"}));
+    ASSERT_TRUE(config.WriteKey("l", "w"));
+    EXPECT_EQ(ReadFile(path), bom + "[G]\nk = v\nl = w\n");
+
+    // A key that begins with the mark's bytes keeps them, first in the file
+    // or not.
+    WriteFile(path, "\n" + bom + "key = 1\n");
+    Config top(path);
+    top.SetGroup("");
+    EXPECT_EQ(top.ReadKey(bom + "key"), "1");
+    ASSERT_TRUE(top.WriteKey("other", "2"));
+    Config reread(path);
+    reread.SetGroup("");
+    EXPECT_EQ(reread.ReadKey(bom + "key"), "1");
+    EXPECT_EQ(reread.ReadKey("key", "absent"), "absent");
+}
+
 TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {
     TempDir dir;
     const std::string path = dir.File("bad.ini");

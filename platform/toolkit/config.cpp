@@ -175,7 +175,14 @@ bool IsWellFormed(const char* begin, const char* end) {
 struct LooseComments {
     std::string before;
     std::string after;
+    bool signature = false;  // the file began with a UTF-8 byte-order mark
 };
+
+// A UTF-8 byte-order mark: a signature at the start of a file, ordinary bytes
+// anywhere else (even at the start of a key name).
+const char kBom[] = "\xEF\xBB\xBF";
+
+bool StartsWithBom(const std::string& text) { return text.compare(0, 3, kBom) == 0; }
 
 bool IsEntry(const std::string& line) {
     std::size_t first = line.find_first_not_of(" \t");
@@ -188,8 +195,10 @@ bool IsEntry(const std::string& line) {
 LooseComments Parse(Ini& ini, const std::string& text) {
     ini.Reset();
     std::vector<std::string> lines;
-    const char* p = text.data();
-    const char* const end = p + text.size();
+    LooseComments loose;
+    loose.signature = StartsWithBom(text);
+    const char* p = text.data() + (loose.signature ? 3 : 0);
+    const char* const end = text.data() + text.size();
     while (p < end) {
         const char* eol = p;
         while (eol < end && *eol != '\n' && *eol != '\r') ++eol;
@@ -203,7 +212,6 @@ LooseComments Parse(Ini& ini, const std::string& text) {
             break;
         }
     }
-    LooseComments loose;
     std::string clean;
     clean.reserve(text.size());
     if (lastEntry == lines.size()) {
@@ -223,6 +231,9 @@ LooseComments Parse(Ini& ini, const std::string& text) {
             target += '\n';
         }
     }
+    // SimpleIni takes a mark at the start of its data as the signature: keep
+    // a key that merely begins with those bytes from starting the data.
+    if (StartsWithBom(clean)) clean.insert(0, "\n");
     ini.LoadData(clean.data(), clean.size());
     return loose;
 }
@@ -336,6 +347,8 @@ struct Config::Impl {
         if (fresh->Save(out) != SI_OK) return Fail("cannot format the file");
         if (!loose.before.empty()) out = loose.before + (out.empty() ? "" : "\n") + out;
         if (!loose.after.empty()) out += (out.empty() ? "" : "\n") + loose.after;
+        if (StartsWithBom(out)) out.insert(0, "\n");
+        if (loose.signature) out.insert(0, kBom);
 
         // One temporary name per file: only the holder of the lock writes it,
         // and a leftover from a killed writer is simply overwritten.
