@@ -1,5 +1,6 @@
 // The application's name, directories, configuration files and settings.
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <filesystem>
 #include <memory>
@@ -125,7 +126,7 @@ TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults
     EXPECT_EQ(UserConfig::Instance()->GetPath(), String(dir.path().string() + "/K-Lume/Color_Check.INI"));
     UserConfig::CreateUserConfig("Color:Check", "", String(defaults));
     EXPECT_EQ(UserConfig::Instance()->ReadKey("Settings", "DirectLightPart"), "0.75");
-    EXPECT_FALSE(std::filesystem::exists(path + ".seed." + std::to_string(::getpid())));
+    EXPECT_FALSE(std::filesystem::exists(path + ".copy." + std::to_string(::getpid())));
 
     AppConfig::CreateAppConfig(String(dir.path().string()), "app");
     EXPECT_EQ(AppConfig::Instance()->GetPath(), String(dir.File("app.ini")));
