@@ -160,6 +160,11 @@ TEST(IniFile, AFileOfCommentsOnlyKeepsThemAboveTheFirstGroup) {
     EXPECT_EQ(ReadFile(path), once);
     EXPECT_NE(once.find("; written by hand"), std::string::npos);
     EXPECT_NE(once.find("# nothing set yet"), std::string::npos);
+
+    // A file from Windows: CRLF lines, a comment after the last key.
+    WriteFile(path, "[G]\r\nk = v\r\n; last\r\n; words\r\n");
+    ASSERT_TRUE(config.WriteKey("l", "w"));
+    EXPECT_EQ(ReadFile(path), "[G]\nk = v\nl = w\n\n; last\n; words\n");
 }
 
 TEST(IniFile, AByteOrderMarkIsASignatureOnlyAtTheStartOfTheFile) {

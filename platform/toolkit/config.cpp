@@ -203,6 +203,8 @@ LooseComments Parse(Ini& ini, const std::string& text) {
         const char* eol = p;
         while (eol < end && *eol != '\n' && *eol != '\r') ++eol;
         if (IsWellFormed(p, eol)) lines.emplace_back(p, eol);
+        // "\r\n", "\n" and a lone "\r" each end one line.
+        if (eol + 1 < end && eol[0] == '\r' && eol[1] == '\n') ++eol;
         p = eol < end ? eol + 1 : end;
     }
     std::size_t lastEntry = lines.size();
