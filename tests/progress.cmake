@@ -1,2 +1,3 @@
-# Tests: progress.
+# Tests: progress, and the screen-colour families (toolkit bitmap, colour converter).
 nxbase_add_test(progress_test progress_test.cpp)
+nxbase_add_test(bitmap_test bitmap_test.cpp)
