@@ -1,0 +1,109 @@
+#include "nxbase/iccprofile.h"
+
+#include <gtest/gtest.h>
+#include <lcms2.h>
+
+#include <map>
+
+#include "test_util.h"
+
+namespace {
+
+// Replaces the engine's configuration for one test and rebuilds the engine.
+class IccTest : public ::testing::Test {
+  protected:
+    void Configure(const std::string& enable, const std::string& path) {
+        settings_ = {{ICCEngine::kEnableKey, enable}, {ICCEngine::kPathKey, path}};
+        previous_ = nxbase::SetICCSettingsReader(
+            [this](const std::string& key, const std::string& def) {
+                auto it = settings_.find(key);
+                return it == settings_.end() ? def : it->second;
+            });
+        ICCEngine::CreateICCEngine();
+    }
+    void TearDown() override {
+        nxbase::SetICCSettingsReader(previous_);
+        ICCEngine::CreateICCEngine();
+    }
+    // A profile LittleCMS makes itself, written to the test directory.
+    std::string WriteProfile(const std::string& name, cmsHPROFILE profile) {
+        std::string path = dir_.File(name);
+        EXPECT_TRUE(cmsSaveProfileToFile(profile, path.c_str()));
+        cmsCloseProfile(profile);
+        return path;
+    }
+
+    nxtest::TempDir dir_;
+    std::map<std::string, std::string> settings_;
+    nxbase::SettingsReader previous_;
+};
+
+TEST_F(IccTest, SwitchedOffByDefaultAndNeverLoadsTheProfile) {
+    nxbase::SetICCSettingsReader(nullptr);
+    ICCEngine* engine = ICCEngine::CreateICCEngine();
+    EXPECT_FALSE(ICCProfile::ProfileEnabled());
+    EXPECT_FALSE(ICCProfile::ProfileValid());
+    EXPECT_EQ(engine->GetIdentifier(), "ICCEngine");
+    EXPECT_EQ(std::string(engine->GetVersion().str()),
+              std::to_string(LCMS_VERSION / 1000) + "." + std::to_string(LCMS_VERSION % 1000 / 10));
+
+    Configure("0", WriteProfile("srgb.icc", cmsCreate_sRGBProfile()));
+    EXPECT_FALSE(ICCProfile::ProfileValid());  // present, but "0" keeps it unread
+    ICCProfile::EnableProfile(true);           // switching on at run time loads it
+    EXPECT_TRUE(ICCProfile::ProfileValid());
+}
+
+TEST_F(IccTest, LoadsAnRgbProfileAndConvertsLabToDisplayRgb) {
+    Configure("1", WriteProfile("srgb.icc", cmsCreate_sRGBProfile()));
+    ICCEngine* engine = ICCEngine::Instance();
+    ASSERT_TRUE(engine->IsActive()) << engine->GetProblem();
+    EXPECT_EQ(std::string(ICCProfile::GetProfileName().str()), "sRGB built-in");
+
+    // Relative colorimetric: the PCS white is the display's white, black its black.
+    constexpr double kWhiteTolerance = 1e-3;  // LittleCMS float pipeline rounding
+    double white[3] = {100, 0, 0}, black[3] = {0, 0, 0}, rgb[3];
+    ASSERT_TRUE(engine->LabToRGB(white, rgb));
+    for (double v : rgb) EXPECT_NEAR(v, 1.0, kWhiteTolerance);
+    ASSERT_TRUE(engine->LabToRGB(black, rgb));
+    for (double v : rgb) EXPECT_NEAR(v, 0.0, kWhiteTolerance);
+    // Far outside the gamut the result is clipped to the device range.
+    double outside[3] = {50, 200, -200};
+    ASSERT_TRUE(engine->LabToRGB(outside, rgb));
+    for (double v : rgb) {
+        EXPECT_GE(v, 0.0);
+        EXPECT_LE(v, 1.0);
+    }
+}
+
+TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
+    std::string grey = WriteProfile("grey.icc", [] {
+        cmsToneCurve* gamma = cmsBuildGamma(nullptr, 2.2);
+        cmsHPROFILE p = cmsCreateGrayProfile(cmsD50_xyY(), gamma);
+        cmsFreeToneCurve(gamma);
+        return p;
+    }());
+    std::string lab = WriteProfile("lab.icc", cmsCreateLab4Profile(nullptr));
+    std::string junk = dir_.File("junk.icc");
+    nxtest::WriteFile(junk, std::string(128, 'x') + "acsp" + std::string(300, '\0'));
+
+    const std::pair<std::string, std::string> cases[] = {
+        {"", "no profile configured"},
+        {dir_.File("missing.icc"), "cannot read"},
+        {junk, "cannot read"},
+        {grey, "is not an RGB profile"},
+        {lab, "is not an RGB profile"},
+    };
+    for (const auto& [path, problem] : cases) {
+        EXPECT_NO_THROW(Configure("1", path));
+        ICCEngine* engine = ICCEngine::Instance();
+        EXPECT_TRUE(ICCProfile::ProfileEnabled());
+        EXPECT_FALSE(ICCProfile::ProfileValid()) << path;
+        EXPECT_NE(engine->GetProblem().find(problem), std::string::npos)
+            << path << ": " << engine->GetProblem();
+        double in[3] = {50, 0, 0}, out[3] = {-1, -1, -1};
+        EXPECT_FALSE(engine->LabToRGB(in, out));
+        EXPECT_EQ(out[0], -1);
+    }
+}
+
+}  // namespace
