@@ -10,7 +10,7 @@
 #include "toolkit/string.h"
 
 class NXBASE_EXPORT Check {
-public:
+  public:
     // "Module: <m>   Date: <d>   Time: <t>   Line: <l>".
     static String CommonErrStr(const char* module, const char* date, const char* time, int line);
     // Reports "Internal ERROR!\n\nPOINTER -> NULL\n..." and throws 1 when `p` is null.

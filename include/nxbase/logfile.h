@@ -8,6 +8,7 @@
 #define NXBASE_LOGFILE_H_
 
 #include <atomic>
+#include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <list>
 #include <map>
@@ -16,13 +17,11 @@
 #include <shared_mutex>
 #include <string>
 
-#include <boost/shared_ptr.hpp>
-
 #include "nxbase/export.h"
 #include "toolkit/string.h"
 
 class NXBASE_EXPORT LogInterface {
-public:
+  public:
     virtual ~LogInterface() = default;
     virtual bool IsLogOptionEnabled(const String& key) const = 0;
     virtual void WriteLog(const String& text, const String& key) = 0;
@@ -36,7 +35,7 @@ namespace nxbase {
 // one that reads the application's option file and the registry; without it
 // the log uses the temporary directory and the NXBASE_LOG_OPTIONS variable.
 class NXBASE_EXPORT LogOptionProvider {
-public:
+  public:
     virtual ~LogOptionProvider() = default;
     // The option "Path" of the application's option file, "" when unset.
     virtual std::string LogPath() = 0;
@@ -52,7 +51,7 @@ NXBASE_EXPORT std::shared_ptr<LogOptionProvider> SetLogOptionProvider(
 }  // namespace nxbase
 
 class NXBASE_EXPORT LogFile : public LogInterface {
-public:
+  public:
     // Lines after which a limited log starts afresh.
     static constexpr std::uint32_t kLineLimit = 50000;
 
@@ -89,10 +88,8 @@ public:
 
     const std::string& GetFileName() const { return fileName; }
 
-private:
-    struct PreparedLine;
-    void AnnounceKey(const std::string& key);
-    void WriteLine(const String& text, bool appendRequested);
+  private:
+    bool CheckKey(const String& key);
     void NotifyListeners(const String& text, const String& key);
     void ApplyOptions(const std::map<std::string, std::string>& options);
 
@@ -102,11 +99,14 @@ private:
     std::uint32_t loggedLines = 0;
     bool unlimited = false;
     std::atomic<bool> withThreadId{false};
-    std::set<std::string> availableKeys;
-    std::set<std::string> enabledKeys;
+    // Available (announced) and enabled keys in one table, so that a line
+    // costs one look-up.
+    std::map<std::string, std::uint8_t, std::less<>> keyStates;
     std::list<boost::shared_ptr<LogInterface>> listeners;
-    // Guards the two key sets; file writes use the named lock "LogWrite",
-    // listeners the named lock "LogListeners".
+    // The restart note, written at the head of the fresh file.
+    std::string restartNote;
+    // Guards keyStates; file writes use the named lock "LogWrite", listeners
+    // the named lock "LogListeners".
     mutable std::shared_mutex keysMutex;
     std::atomic<bool> hasListeners{false};
 };
@@ -115,7 +115,7 @@ private:
 // key, indenting the lines between by two blanks. The indentation depth is
 // process-wide, shared by all threads.
 class NXBASE_EXPORT AutoLog {
-public:
+  public:
     AutoLog(const String& text, const String& key);
     AutoLog(LogInterface* log, const String& text, const String& key);
     ~AutoLog();
@@ -129,7 +129,7 @@ public:
     static String GetIndentString();
     static std::uint32_t GetAutoLogCounter();
 
-private:
+  private:
     void StartBlock(const String& text, const String& key);
     void WriteLog(const String& text);
 

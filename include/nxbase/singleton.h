@@ -13,7 +13,7 @@
 #include "nxbase/export.h"
 
 class NXBASE_EXPORT NxSingleton {
-public:
+  public:
     // Stores the identifier and logs "Creating singleton <id>" under "Startup".
     // Does not register the object: the creating function inserts it.
     explicit NxSingleton(const std::string& identifier);
@@ -37,7 +37,7 @@ public:
     // Number of registered singletons (for diagnostics and tests).
     static std::size_t RegisteredCount();
 
-private:
+  private:
     std::string identifier;
     static std::deque<NxSingleton*> mListOfSingletons;
 };

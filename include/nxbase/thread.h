@@ -14,7 +14,7 @@
 #include "nxbase/export.h"
 
 class NXBASE_EXPORT CriticalSection {
-public:
+  public:
     // Finds or creates the mutex named `name` and enters it (recursively).
     explicit CriticalSection(const char* name);
     // Leaves the mutex. Leaving "CleanCriticalSections" destroys every named
@@ -26,15 +26,19 @@ public:
     // Number of named mutexes alive (for diagnostics and tests).
     static std::size_t NamedLockCount();
 
-private:
+  private:
     std::string amName;
     std::shared_ptr<std::recursive_mutex> pMutex;
 };
 
-enum ThreadPriorityTYPE { NORMAL_PRIORITY = 0, BELOW_NORMAL_PRIORITY = 1, ABOVE_NORMAL_PRIORITY = 2 };
+enum ThreadPriorityTYPE {
+    NORMAL_PRIORITY = 0,
+    BELOW_NORMAL_PRIORITY = 1,
+    ABOVE_NORMAL_PRIORITY = 2
+};
 
 class NXBASE_EXPORT Thread {
-public:
+  public:
     Thread(const std::string& id, ThreadPriorityTYPE priority);
     // Stops and joins a thread still running.
     virtual ~Thread();
@@ -61,14 +65,14 @@ public:
 
     static std::vector<std::string> GetRunningThreads();
 
-protected:
+  protected:
     virtual unsigned int Run() = 0;
     virtual void StopThread();
     virtual void RequestChildrenStop() {}
     virtual void KillChildThreads() {}
     bool IsStopRequested() const { return stopRequested.load(); }
 
-private:
+  private:
     static void ThreadRoutine(Thread* self);
     void ApplyPriority();
 

@@ -4,13 +4,20 @@
 #include <charconv>
 #include <ostream>
 
-String::String(const char* text) : text_(text ? text : "") { Clip(); }
+String::String(const char* text) : text_(text ? text : "") {
+    Clip();
+}
 
-String::String(const char* text, xub_StrLen length) : text_(text ? std::string(text, length) : "") {}
+String::String(const char* text, xub_StrLen length)
+    : text_(text ? std::string(text, length) : "") {}
 
-String::String(const std::string& text) : text_(text) { Clip(); }
+String::String(const std::string& text) : text_(text) {
+    Clip();
+}
 
-String::String(std::string_view text) : text_(text) { Clip(); }
+String::String(std::string_view text) : text_(text) {
+    Clip();
+}
 
 String::String(char c) : text_(1, c) {}
 
@@ -132,7 +139,8 @@ String String::GetToken(xub_StrLen index, char separator) const {
         start = next + 1;
     }
     std::size_t end = text_.find(separator, start);
-    return String(std::string_view(text_).substr(start, end == std::string::npos ? end : end - start));
+    return String(
+        std::string_view(text_).substr(start, end == std::string::npos ? end : end - start));
 }
 
 bool String::IsNumeric() const {
@@ -168,8 +176,14 @@ String operator+(const String& a, const String& b) {
     return result.Append(b);
 }
 
-String operator+(const String& a, const char* b) { return a + String(b); }
+String operator+(const String& a, const char* b) {
+    return a + String(b);
+}
 
-String operator+(const char* a, const String& b) { return String(a) + b; }
+String operator+(const char* a, const String& b) {
+    return String(a) + b;
+}
 
-std::ostream& operator<<(std::ostream& out, const String& text) { return out << text.str(); }
+std::ostream& operator<<(std::ostream& out, const String& text) {
+    return out << text.str();
+}

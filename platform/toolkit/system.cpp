@@ -36,7 +36,9 @@ std::string ExecutableFileName() {
     return std::string(buffer.data(), static_cast<std::size_t>(n));
 }
 
-std::uint32_t CurrentThreadId() { return static_cast<std::uint32_t>(syscall(SYS_gettid)); }
+std::uint32_t CurrentThreadId() {
+    return static_cast<std::uint32_t>(syscall(SYS_gettid));
+}
 
 std::string NormalizePath(const std::string& path) {
     std::string result(path);

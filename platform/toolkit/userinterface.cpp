@@ -33,9 +33,13 @@ std::shared_ptr<UserInterface> UserInterface::Install(std::shared_ptr<UserInterf
     return handler;
 }
 
-void StderrUserInterface::ErrorBox(const std::string& text) { WriteBox("error", text); }
+void StderrUserInterface::ErrorBox(const std::string& text) {
+    WriteBox("error", text);
+}
 
-void StderrUserInterface::InfoBox(const std::string& text) { WriteBox("info", text); }
+void StderrUserInterface::InfoBox(const std::string& text) {
+    WriteBox("info", text);
+}
 
 bool StderrUserInterface::QueryBox(const std::string& text, bool defaultAnswer) {
     WriteBox(defaultAnswer ? "question, answered yes" : "question, answered no", text);
@@ -47,9 +51,13 @@ void RecordingUserInterface::Record(BoxKind kind, const std::string& text) {
     boxes_.push_back(Box{kind, text});
 }
 
-void RecordingUserInterface::ErrorBox(const std::string& text) { Record(BoxKind::kError, text); }
+void RecordingUserInterface::ErrorBox(const std::string& text) {
+    Record(BoxKind::kError, text);
+}
 
-void RecordingUserInterface::InfoBox(const std::string& text) { Record(BoxKind::kInfo, text); }
+void RecordingUserInterface::InfoBox(const std::string& text) {
+    Record(BoxKind::kInfo, text);
+}
 
 bool RecordingUserInterface::QueryBox(const std::string& text, bool /*defaultAnswer*/) {
     Record(BoxKind::kQuery, text);

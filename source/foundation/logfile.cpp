@@ -1,1 +1,411 @@
-// (in progress)
+#include "nxbase/logfile.h"
+
+#include <fcntl.h>
+#include <pthread.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <boost/stacktrace.hpp>
+#include <cerrno>
+#include <charconv>
+#include <cstdlib>
+#include <ctime>
+#include <mutex>
+#include <sstream>
+
+#include "nxbase/thread.h"
+#include "toolkit/system.h"
+
+namespace {
+
+constexpr const char* kLogWrite = "LogWrite";
+constexpr const char* kLogListeners = "LogListeners";
+constexpr const char* kUnlimited = "Unlimited";
+constexpr const char* kPath = "Path";
+constexpr const char* kThreadId = "ThreadId";
+
+// Bits of a key's state: announced once in "# - Available key: ", enabled.
+constexpr std::uint8_t kAvailable = 1;
+constexpr std::uint8_t kEnabled = 2;
+
+// ---- operating-system seam: one whole line per write() on O_APPEND ----
+
+// Appends `bytes` to `path` (truncating first when asked); false when the
+// file cannot be opened. A single write() keeps lines whole across threads
+// and processes; the loop only finishes the rare short write.
+bool AppendToFile(const std::string& path, const std::string& bytes, bool truncate) {
+    int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | (truncate ? O_TRUNC : 0);
+    int fd;
+    do {
+        fd = ::open(path.c_str(), flags, 0644);
+    } while (fd < 0 && errno == EINTR);
+    if (fd < 0) return false;
+    const char* data = bytes.data();
+    std::size_t left = bytes.size();
+    while (left > 0) {
+        ssize_t n = ::write(fd, data, left);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        data += n;
+        left -= static_cast<std::size_t>(n);
+    }
+    ::close(fd);
+    return true;
+}
+
+bool IsDirectory(const std::string& path) {
+    struct stat info {};
+    return ::stat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+// Bytes of stack between the caller's frame and the end of its thread's stack.
+long AvailableStackBytes() {
+    pthread_attr_t attr;
+    if (pthread_getattr_np(pthread_self(), &attr) != 0) return -1;
+    void* base = nullptr;
+    std::size_t size = 0;
+    pthread_attr_getstack(&attr, &base, &size);
+    pthread_attr_destroy(&attr);
+    char here = 0;
+    return static_cast<long>(reinterpret_cast<std::uintptr_t>(&here) -
+                             reinterpret_cast<std::uintptr_t>(base));
+}
+
+// ---- time stamp "05.03.2009 - 07:04:09", formatted once per second per thread ----
+
+void Put2(char* at, int value) {
+    at[0] = static_cast<char>('0' + value / 10 % 10);
+    at[1] = static_cast<char>('0' + value % 10);
+}
+
+const std::string& TimeStamp() {
+    thread_local std::time_t cachedSecond = -1;
+    thread_local std::string cached;
+    std::time_t now = std::time(nullptr);
+    if (now != cachedSecond) {
+        std::tm local{};
+        localtime_r(&now, &local);
+        char text[] = "dd.mm.yyyy - hh:mm:ss";
+        Put2(text, local.tm_mday);
+        Put2(text + 3, local.tm_mon + 1);
+        int year = local.tm_year + 1900;
+        Put2(text + 6, year / 100);
+        Put2(text + 8, year % 100);
+        Put2(text + 13, local.tm_hour);
+        Put2(text + 16, local.tm_min);
+        Put2(text + 19, local.tm_sec);
+        cached.assign(text, sizeof text - 1);
+        cachedSecond = now;
+    }
+    return cached;
+}
+
+// ---- where options come from ----
+
+std::map<std::string, std::string> OptionsFromEnvironment() {
+    std::map<std::string, std::string> options;
+    const char* list = std::getenv("NXBASE_LOG_OPTIONS");
+    if (list == nullptr) return options;
+    std::string text(list);
+    std::size_t start = 0;
+    while (start <= text.size()) {
+        std::size_t end = text.find_first_of(",; ", start);
+        if (end == std::string::npos) end = text.size();
+        if (end > start) options[text.substr(start, end - start)] = "1";
+        start = end + 1;
+    }
+    return options;
+}
+
+class DefaultLogOptionProvider : public nxbase::LogOptionProvider {
+  public:
+    std::string LogPath() override { return std::string(); }
+    std::map<std::string, std::string> LogOptions() override { return {}; }
+};
+
+std::mutex& ProviderMutex() {
+    static std::mutex mutex;
+    return mutex;
+}
+
+std::shared_ptr<nxbase::LogOptionProvider>& ProviderSlot() {
+    static auto* provider = new std::shared_ptr<nxbase::LogOptionProvider>(
+        std::make_shared<DefaultLogOptionProvider>());
+    return *provider;
+}
+
+std::shared_ptr<nxbase::LogOptionProvider> CurrentProvider() {
+    std::lock_guard<std::mutex> lock(ProviderMutex());
+    return ProviderSlot();
+}
+
+// The executable's base name: after the last "/", before the first ".".
+std::string ExecutableBaseName() {
+    std::string path = toolkit::ExecutableFileName();
+    std::string base = path.substr(path.find_last_of('/') + 1);
+    return base.substr(0, base.find('.'));
+}
+
+// The log path: "Path" names the file, or the directory when it is one (or
+// ends in "/"); without it, <temp>/<name or executable>.log.
+std::string ResolveLogPath(const std::string& name, const std::string& pathOption) {
+    std::string fileName = (name.empty() ? ExecutableBaseName() : name) + ".log";
+    if (pathOption.empty()) return toolkit::TempDirectory() + "/" + fileName;
+    std::string path = toolkit::NormalizePath(pathOption);
+    if (path.back() == '/') return path + fileName;
+    if (IsDirectory(path)) return path + "/" + fileName;
+    return path;
+}
+
+bool IsTrue(const std::string& value) {
+    return value == "1" || value == "true";
+}
+
+// The process log, never destroyed: singletons log in their destructors
+// during static destruction.
+std::mutex& InstanceMutex() {
+    static auto* mutex = new std::mutex();
+    return *mutex;
+}
+
+boost::shared_ptr<LogFile>& InstanceSlot() {
+    static auto* instance = new boost::shared_ptr<LogFile>();
+    return *instance;
+}
+
+}  // namespace
+
+namespace nxbase {
+
+std::shared_ptr<LogOptionProvider> SetLogOptionProvider(
+    std::shared_ptr<LogOptionProvider> provider) {
+    if (!provider) provider = std::make_shared<DefaultLogOptionProvider>();
+    std::lock_guard<std::mutex> lock(ProviderMutex());
+    std::swap(ProviderSlot(), provider);
+    return provider;
+}
+
+}  // namespace nxbase
+
+// ---- LogFile ----
+
+LogFile::LogFile(const std::string& name) {
+    std::shared_ptr<nxbase::LogOptionProvider> provider = CurrentProvider();
+    std::string pathOption;
+    std::map<std::string, std::string> options;
+    try {
+        const char* envPath = std::getenv("NXBASE_LOG_PATH");
+        pathOption = (envPath && *envPath) ? envPath : provider->LogPath();
+        options = provider->LogOptions();
+    } catch (const std::exception& e) {
+        std::fprintf(stderr, "Error creating LogFile instance: %s\n", e.what());
+    }
+    fileName = ResolveLogPath(name, pathOption);
+    WriteLog(String("Starting log"), String());
+    if (loggedLines == 0) std::fprintf(stderr, "Error writing LogFile: %s\n", fileName.c_str());
+    for (const auto& [key, value] : OptionsFromEnvironment()) options[key] = value;
+    ApplyOptions(options);
+}
+
+LogFile::~LogFile() = default;
+
+void LogFile::ApplyOptions(const std::map<std::string, std::string>& options) {
+    for (const auto& [key, value] : options) {
+        if (IsTrue(value)) SetLogOption(key, true);
+    }
+}
+
+void LogFile::CreateLogFile(const std::string& name) {
+    std::lock_guard<std::mutex> lock(InstanceMutex());
+    if (!InstanceSlot()) InstanceSlot().reset(new LogFile(name));
+}
+
+boost::shared_ptr<LogFile> LogFile::Instance() {
+    std::lock_guard<std::mutex> lock(InstanceMutex());
+    if (!InstanceSlot()) InstanceSlot().reset(new LogFile(std::string()));
+    return InstanceSlot();
+}
+
+void LogFile::WriteToLog(const String& text, const String& key) {
+    Instance()->WriteLog(text, key);
+}
+
+bool LogFile::IsLogOptionEnabled(const String& key) const {
+    std::shared_lock<std::shared_mutex> lock(keysMutex);
+    auto at = keyStates.find(key.str());
+    return at != keyStates.end() && (at->second & kEnabled) != 0;
+}
+
+void LogFile::SetLogOption(const std::string& key, bool enable) {
+    {
+        std::unique_lock<std::shared_mutex> lock(keysMutex);
+        std::uint8_t& state = keyStates[key];
+        state = enable ? (state | kEnabled) : (state & ~kEnabled);
+    }
+    if (key == kUnlimited) {
+        CriticalSection section(kLogWrite);
+        unlimited = enable;
+    }
+    if (key == kThreadId) withThreadId = enable;
+}
+
+std::set<std::string> LogFile::GetAvailableLogOptions() const {
+    std::set<std::string> keys;
+    std::shared_lock<std::shared_mutex> lock(keysMutex);
+    for (const auto& [key, state] : keyStates) {
+        if (state & kAvailable) keys.insert(key);
+    }
+    return keys;
+}
+
+// Returns whether lines under `key` are written; announces a new key once.
+bool LogFile::CheckKey(const String& key) {
+    const std::string& name = key.str();
+    {
+        std::shared_lock<std::shared_mutex> lock(keysMutex);
+        auto at = keyStates.find(name);
+        if (at != keyStates.end() && (at->second & kAvailable)) {
+            return name.empty() || (at->second & kEnabled);
+        }
+    }
+    bool announce = false;
+    bool enabled;
+    {
+        std::unique_lock<std::shared_mutex> lock(keysMutex);
+        std::uint8_t& state = keyStates[name];
+        announce = !(state & kAvailable) && !name.empty();
+        state |= kAvailable;
+        enabled = name.empty() || (state & kEnabled);
+    }
+    if (announce) WriteLog(String("# - Available key: ") + key, String("Keys"));
+    return enabled;
+}
+
+void LogFile::WriteLog(const String& text, const String& key) {
+    if (!CheckKey(key)) return;
+    bool appendRequested = text == "APPEND";
+
+    std::string line;
+    line.reserve(64 + text.Len());
+    line += TimeStamp();
+    line += '\t';
+    line.append(2u * AutoLog::GetIndent(), ' ');
+    if (withThreadId) {
+        char id[16];
+        auto end = std::to_chars(id, id + sizeof id, toolkit::CurrentThreadId()).ptr;
+        line += "ThreadId: ";
+        line.append(id, end);
+        line += '\t';
+    }
+    line += text.str();
+    line += '\n';
+
+    {
+        CriticalSection section(kLogWrite);
+        bool truncate = firstWrite && !appendRequested;
+        firstWrite = false;
+        if (!unlimited && loggedLines > kLineLimit) {
+            restartNote = "Log restarted (LogedLines: " + std::to_string(loggedLines) + "\n";
+            loggedLines = 0;
+            firstWrite = true;
+        } else if (truncate && !restartNote.empty()) {
+            // The fresh file after a restart begins with the note.
+            line.insert(0, restartNote);
+            restartNote.clear();
+        }
+        if (AppendToFile(fileName, line, truncate)) ++loggedLines;
+    }
+    if (hasListeners) NotifyListeners(text, key);
+}
+
+void LogFile::NotifyListeners(const String& text, const String& key) {
+    CriticalSection section(kLogListeners);
+    for (const auto& listener : listeners) listener->WriteLog(text, key);
+}
+
+void LogFile::AddLogListener(boost::shared_ptr<LogInterface> listener) {
+    CriticalSection section(kLogListeners);
+    listeners.push_back(std::move(listener));
+    hasListeners = true;
+}
+
+void LogFile::RemoveLogListener(boost::shared_ptr<LogInterface> listener) {
+    CriticalSection section(kLogListeners);
+    listeners.remove(listener);
+    hasListeners = !listeners.empty();
+}
+
+void LogFile::RemoveListeners() {
+    CriticalSection section(kLogListeners);
+    listeners.clear();
+    hasListeners = false;
+}
+
+void LogFile::WriteStackTrace() {
+    if (!IsLogOptionEnabled(String("StackTrace"))) return;
+    std::ostringstream trace;
+    trace << boost::stacktrace::stacktrace();
+    WriteLog(String("\nStackTrace:\n") + String(trace.str()), String("StackTrace"));
+}
+
+void LogFile::LogAvailableStack(const String& text) {
+    if (!IsLogOptionEnabled(String("AvailableStack"))) return;
+    WriteLog(String("AvailableStack: ") + text + " " +
+                 String::CreateFromInt(AvailableStackBytes()) + " bytes",
+             String("AvailableStack"));
+}
+
+void LogFile::UpdateInfo(const String& name, const String& value) {
+    WriteLog(name + ": " + value, String("Info"));
+}
+
+// ---- AutoLog ----
+
+std::atomic<unsigned short> AutoLog::smIndent{0};
+std::atomic<std::uint32_t> AutoLog::smAutoLogCounter{0};
+
+AutoLog::AutoLog(const String& text, const String& key) {
+    amOwnedLog = LogFile::Instance();
+    pLog = amOwnedLog.get();
+    StartBlock(text, key);
+}
+
+AutoLog::AutoLog(LogInterface* log, const String& text, const String& key) : pLog(log) {
+    StartBlock(text, key);
+}
+
+void AutoLog::StartBlock(const String& text, const String& key) {
+    amText = text;
+    amKey = key;
+    if (pLog == nullptr || !pLog->IsLogOptionEnabled(key)) return;
+    active = true;
+    ++smAutoLogCounter;
+    pLog->WriteLog(String("|->") + text, key);
+    ++smIndent;
+}
+
+AutoLog::~AutoLog() {
+    if (!active) return;
+    --smIndent;
+    pLog->WriteLog(String("|<-") + amText, amKey);
+}
+
+void AutoLog::Log(const String& text) {
+    WriteLog(text);
+}
+
+void AutoLog::WriteLog(const String& text) {
+    if (active && pLog != nullptr) pLog->WriteLog(text, amKey);
+}
+
+unsigned short AutoLog::GetIndent() {
+    return smIndent.load();
+}
+
+String AutoLog::GetIndentString() {
+    return String(std::string(2u * smIndent.load(), ' '));
+}
+
+std::uint32_t AutoLog::GetAutoLogCounter() {
+    return smAutoLogCounter.load();
+}

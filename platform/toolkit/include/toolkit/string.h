@@ -19,7 +19,7 @@ constexpr xub_StrLen STRING_NOTFOUND = 0xFFFF;
 constexpr xub_StrLen STRING_LEN = 0xFFFF;
 
 class NXBASE_EXPORT String {
-public:
+  public:
     // The longest text a String holds; one less than STRING_NOTFOUND so that
     // no valid position equals it.
     static constexpr std::size_t kMaxLen = 0xFFFE;
@@ -89,7 +89,7 @@ public:
     friend bool operator==(const String& a, const char* b) { return a.text_ == b; }
     friend bool operator!=(const String& a, const char* b) { return a.text_ != b; }
 
-private:
+  private:
     void Clip();
 
     std::string text_;

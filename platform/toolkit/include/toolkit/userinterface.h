@@ -13,7 +13,7 @@
 #include "nxbase/export.h"
 
 class NXBASE_EXPORT UserInterface {
-public:
+  public:
     enum class BoxKind { kError, kInfo, kQuery };
 
     virtual ~UserInterface() = default;
@@ -33,7 +33,7 @@ public:
 
 // Writes every box to stderr and answers with the default.
 class NXBASE_EXPORT StderrUserInterface : public UserInterface {
-public:
+  public:
     void ErrorBox(const std::string& text) override;
     void InfoBox(const std::string& text) override;
     bool QueryBox(const std::string& text, bool defaultAnswer) override;
@@ -42,7 +42,7 @@ public:
 // Records every box and answers queries with a preset answer; for tests.
 // Any thread may call it.
 class NXBASE_EXPORT RecordingUserInterface : public UserInterface {
-public:
+  public:
     struct Box {
         BoxKind kind;
         std::string text;
@@ -57,7 +57,7 @@ public:
     std::vector<Box> Boxes() const;
     void Clear();
 
-private:
+  private:
     void Record(BoxKind kind, const std::string& text);
 
     mutable std::mutex mutex_;
@@ -67,14 +67,14 @@ private:
 
 // Installs a handler for the lifetime of a scope, then puts the previous back.
 class NXBASE_EXPORT ScopedUserInterface {
-public:
+  public:
     explicit ScopedUserInterface(std::shared_ptr<UserInterface> handler)
         : previous_(UserInterface::Install(std::move(handler))) {}
     ~ScopedUserInterface() { UserInterface::Install(previous_); }
     ScopedUserInterface(const ScopedUserInterface&) = delete;
     ScopedUserInterface& operator=(const ScopedUserInterface&) = delete;
 
-private:
+  private:
     std::shared_ptr<UserInterface> previous_;
 };
 

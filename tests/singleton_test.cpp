@@ -1,0 +1,119 @@
+#include "nxbase/singleton.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+namespace {
+
+std::vector<std::string> destroyed;
+
+// A service built the way every library service is: static instance pointer,
+// create-or-replace, strict Instance(), destructor nulling the pointer.
+class Service : public NxSingleton {
+  public:
+    explicit Service(const std::string& name) : NxSingleton(name), name_(name) {}
+    ~Service() override {
+        destroyed.push_back(name_);
+        if (smInstance == this) smInstance = nullptr;
+    }
+    static Service* Create(const std::string& name) {
+        return nxbase::CreateOrReplaceSingleton(smInstance, name);
+    }
+    static Service* Instance() {
+        return nxbase::StrictSingletonInstance(smInstance,
+                                               "Please create the Service-Singleton first !");
+    }
+    static Service* smInstance;
+
+  private:
+    std::string name_;
+};
+Service* Service::smInstance = nullptr;
+
+// A second base ahead of NxSingleton, so that the registered pointer differs
+// from the object's address.
+struct Padding {
+    virtual ~Padding() = default;
+    char bytes[24] = {};
+};
+class OffsetService : public Padding, public NxSingleton {
+  public:
+    OffsetService() : NxSingleton("OffsetService") {}
+    ~OffsetService() override { destroyed.push_back("OffsetService"); }
+};
+
+class Plain : public NxSingleton {
+  public:
+    explicit Plain(const std::string& name) : NxSingleton(name) {}
+    ~Plain() override { destroyed.push_back(GetIdentifier()); }
+};
+
+class NxSingletonTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        NxSingleton::DeleteAllSingleton();
+        destroyed.clear();
+    }
+    void TearDown() override { NxSingleton::DeleteAllSingleton(); }
+};
+
+TEST_F(NxSingletonTest, TeardownDestroysNewestFirstAndEmptyTeardownDoesNothing) {
+    NxSingleton::DeleteAllSingleton();
+    EXPECT_TRUE(destroyed.empty());
+    NxSingleton::Insert(new Plain("A"));
+    NxSingleton::Insert(new OffsetService());
+    NxSingleton::Insert(new Plain("C"));
+    NxSingleton::DeleteAllSingleton();
+    EXPECT_EQ(destroyed, (std::vector<std::string>{"C", "OffsetService", "A"}));
+    EXPECT_EQ(NxSingleton::RegisteredCount(), 0u);
+}
+
+TEST_F(NxSingletonTest, CreatingTwiceReplacesAfterDestroyingTheFirst) {
+    Service* first = Service::Create("first");
+    EXPECT_EQ(Service::Instance(), first);
+    Service* second = Service::Create("second");
+    EXPECT_EQ(destroyed, std::vector<std::string>{"first"});
+    EXPECT_EQ(Service::Instance(), second);
+    EXPECT_EQ(NxSingleton::RegisteredCount(), 1u);
+    NxSingleton::DeleteAllSingleton();
+    EXPECT_THROW(Service::Instance(), std::logic_error);
+    try {
+        Service::Instance();
+    } catch (const std::logic_error& e) {
+        EXPECT_STREQ(e.what(), "Please create the Service-Singleton first !");
+    }
+}
+
+TEST_F(NxSingletonTest, ReplaceKeepsPositionOrAppendsAtTheBack) {
+    auto* a = new Plain("A");
+    auto* b = new Plain("B");
+    NxSingleton::Insert(a);
+    NxSingleton::Insert(b);  // registry: B, A
+    auto* late = new Plain("late");
+    NxSingleton::Replace(reinterpret_cast<NxSingleton*>(0x10), late);  // unknown: back
+    auto* b2 = new Plain("B2");
+    NxSingleton::Replace(b, b2);  // in place of B, at the front
+    delete b;
+    NxSingleton::Remove(reinterpret_cast<NxSingleton*>(0x20));  // unknown: ignored
+    destroyed.clear();
+    NxSingleton::DeleteAllSingleton();
+    EXPECT_EQ(destroyed, (std::vector<std::string>{"B2", "A", "late"}));
+}
+
+TEST_F(NxSingletonTest, LazyInstanceCreatesRegistersAndLoadsOnce) {
+    int loads = 0;
+    auto load = [&loads](Plain&) { ++loads; };
+    struct Lazy : Plain {
+        Lazy() : Plain("Lazy") {}
+    };
+    Lazy* lazyInstance = nullptr;
+    Lazy* first = nxbase::LazySingletonInstance(lazyInstance, load);
+    Lazy* again = nxbase::LazySingletonInstance(lazyInstance, load);
+    EXPECT_EQ(first, again);
+    EXPECT_EQ(loads, 1);
+    EXPECT_EQ(NxSingleton::RegisteredCount(), 1u);
+}
+
+}  // namespace

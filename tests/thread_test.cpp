@@ -1,0 +1,106 @@
+#include "nxbase/thread.h"
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include <chrono>
+#include <future>
+#include <stdexcept>
+
+#include "nxbase/logfile.h"
+#include "test_util.h"
+#include "toolkit/system.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+TEST(CriticalSection, NestsOnOneThreadAndExcludesOtherThreads) {
+    std::atomic<bool> otherEntered{false};
+    std::thread other;
+    {
+        CriticalSection outer("A");
+        CriticalSection inner("A");  // recursive: must not deadlock
+        other = std::thread([&] {
+            CriticalSection section("A");
+            otherEntered = true;
+        });
+        std::this_thread::sleep_for(50ms);
+        EXPECT_FALSE(otherEntered.load());
+        CriticalSection unrelated("B");  // another name does not block
+    }
+    other.join();
+    EXPECT_TRUE(otherEntered.load());
+}
+
+TEST(CriticalSection, CountedIncrementsStayExactUnderContention) {
+    long counter = 0;
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t) {
+        threads.emplace_back([&counter] {
+            for (int i = 0; i < 20000; ++i) {
+                CriticalSection section("Counter");
+                ++counter;
+            }
+        });
+    }
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(counter, 80000);
+}
+
+TEST(CriticalSection, CleanCriticalSectionsDropsEveryNamedLock) {
+    { CriticalSection a("X1"); }
+    EXPECT_GT(CriticalSection::NamedLockCount(), 0u);
+    { CriticalSection clean("CleanCriticalSections"); }
+    EXPECT_EQ(CriticalSection::NamedLockCount(), 0u);
+    CriticalSection again("X1");  // usable afterwards
+}
+
+class Worker : public Thread {
+  public:
+    using Thread::Thread;
+    std::promise<int> niceOfBody;
+    bool throwInBody = false;
+
+  protected:
+    unsigned int Run() override {
+        niceOfBody.set_value(getpriority(PRIO_PROCESS, toolkit::CurrentThreadId()));
+        if (throwInBody) throw std::runtime_error("boom");
+        while (!IsStopRequested()) std::this_thread::sleep_for(1ms);
+        return 7;
+    }
+};
+
+TEST(Thread, RunsUntilStopRequestedAndReportsStates) {
+    Worker worker("worker-1", BELOW_NORMAL_PRIORITY);
+    EXPECT_TRUE(worker.IsFinished());
+    worker.SetPriority(ABOVE_NORMAL_PRIORITY);  // before start: no effect
+    EXPECT_EQ(worker.GetPriority(), BELOW_NORMAL_PRIORITY);
+    auto nice = worker.niceOfBody.get_future();
+    worker.StartThread();
+    EXPECT_TRUE(worker.IsRunning());
+    auto running = Thread::GetRunningThreads();
+    EXPECT_NE(std::find(running.begin(), running.end(), "worker-1"), running.end());
+    // The body ran at the priority given to the constructor: one step below normal.
+    EXPECT_EQ(nice.get(), getpriority(PRIO_PROCESS, 0) + 1);
+    worker.RequestStop();
+    worker.KillThread();
+    EXPECT_TRUE(worker.IsFinished());
+    EXPECT_EQ(worker.GetExitCode(), 7u);
+    running = Thread::GetRunningThreads();
+    EXPECT_EQ(std::find(running.begin(), running.end(), "worker-1"), running.end());
+    worker.KillThread();  // on a finished thread: only unregisters again
+}
+
+TEST(Thread, ExceptionInBodyIsLoggedAndTheThreadEnds) {
+    Worker worker("thrower", NORMAL_PRIORITY);
+    worker.throwInBody = true;
+    worker.StartThread();
+    worker.niceOfBody.get_future().wait();
+    worker.KillThread();
+    EXPECT_TRUE(worker.IsFinished());
+    std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
+    EXPECT_NE(log.find("!!! Thread Exception: boom"), std::string::npos);
+}
+
+}  // namespace
