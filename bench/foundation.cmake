@@ -1,1 +1,2 @@
 # Benchmarks: foundation.
+nxbase_add_bench(logfile_bench logfile_bench.cpp)

@@ -1,1 +1,5 @@
-# Tests: packaging.
+# Tests: the installed package, used by a consumer through find_package and pkg-config.
+add_test(NAME InstalledPackage.BuildsAndRunsAConsumer
+         COMMAND ${CMAKE_CURRENT_SOURCE_DIR}/packaging/check_install.sh
+                 ${PROJECT_BINARY_DIR} ${PROJECT_SOURCE_DIR} "${CMAKE_CXX_FLAGS}")
+set_tests_properties(InstalledPackage.BuildsAndRunsAConsumer PROPERTIES LABELS packaging TIMEOUT 300)
