@@ -49,7 +49,8 @@ public:
 
     // CIE 1976 L*a*b* (CIE 15:2004, formulas as in LABVector) of alCount
     // spectra relative to the white point of the weights; pLab[3i..3i+2] =
-    // L, a, b. pSpectra and pLab must not overlap.
+    // L, a, b. Always CIE 1976: the process-wide DIN99 setting of LABVector
+    // does not apply here. pSpectra and pLab must not overlap.
     void ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const;
 
     // White point Xn, Yn (= 100), Zn of the weights.

@@ -11,6 +11,8 @@
 #include <cstdint>
 #include <cstring>
 
+#include "nxbase/cmetry.h"
+
 // The vector helpers below are file-local and inlined; the ABI note GCC gives
 // for 32-byte vector arguments without AVX does not apply to them.
 #if defined(__GNUC__) && !defined(__clang__)
@@ -187,6 +189,27 @@ void RunCbrt(const float* in, std::size_t count, float* out) {
 
 }  // namespace
 
+namespace {
+
+BatchWeights WeightsOf(const CMetryFilter& axFilter) {
+    BatchWeights w;
+    for (unsigned short c = 0; c < BatchWeights::kChannels; ++c) {
+        std::memcpy(w.weights[c], axFilter.GetWeights(c), sizeof w.weights[c]);
+        w.sums[c] = axFilter.GetWeightSum(c);
+    }
+    return w;
+}
+
+}  // namespace
+
+ColorBatch::ColorBatch() : amWeights(WeightsOf(*CMetry::Instance()->GetLXYZFilter())) {}
+
+ColorBatch::ColorBatch(const CMetryFilter& axFilter) : amWeights(WeightsOf(axFilter)) {}
+
+ColorBatch::ColorBatch(const MeasuringCondition& axCondition)
+    : amWeights(WeightsOf(CMetryFilter(Lichtart(axCondition.GetIllum()),
+                                       Observer(axCondition.GetObserver())))) {}
+
 ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {}
 
 void ColorBatch::ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const {
@@ -199,6 +222,16 @@ void ColorBatch::ToLab(const float* pSpectra, std::size_t alCount, float* pLab) 
 
 float ColorBatch::WhitePoint(int alChannel) const {
     return 100.0f * amWeights.sums[alChannel] / amWeights.sums[1];
+}
+
+void SpectraToXYZ(const MeasuringCondition& axCondition, const float* pSpectra, std::size_t alCount,
+                  float* pXYZ) {
+    ColorBatch(axCondition).ToXYZ(pSpectra, alCount, pXYZ);
+}
+
+void SpectraToLab(const MeasuringCondition& axCondition, const float* pSpectra, std::size_t alCount,
+                  float* pLab) {
+    ColorBatch(axCondition).ToLab(pSpectra, alCount, pLab);
 }
 
 namespace detail {
