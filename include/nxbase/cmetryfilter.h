@@ -148,8 +148,8 @@ public:
     // The sum of the weights, recomputed first when not valid.
     float FilterSumme();
     float FilterSumme() const;
-    // The dot product of the weights with the first 36 elements of `values`.
-    // REQUIRES: values.size() >= 36.
+    // The dot product of the weights with the first 36 elements of `values`;
+    // throws std::logic_error("Illegal spectrum size") when there are fewer.
     float operator*(const std::vector<float>& values) const;
     // The dot product with 36 contiguous floats, summed in ascending order.
     float Dot(const float* values) const;
@@ -203,7 +203,8 @@ public:
     boost::shared_ptr<const klume::cmetry::CMetryFilter> GetProviderFilter() const { return amFilter; }
 
 private:
-    void Build(const std::string& illuminant, const std::string& observer);
+    void Build(boost::shared_ptr<klume::cmetry::IIlluminant> illuminant,
+               boost::shared_ptr<klume::cmetry::IObserver> observer);
 
     boost::shared_ptr<const klume::cmetry::CMetryFilter> amFilter;
     boost::shared_ptr<Filter> amFilters[3];

@@ -8,6 +8,7 @@
 
 #include "csvtable.h"
 #include "embedded.h"
+#include "nxbase/logfile.h"
 #include "objects.h"
 
 namespace klume {
@@ -252,8 +253,13 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::string& name) {
-    boost::shared_ptr<IDensityStandard> standard = Find(name);
-    return standard ? standard : GetDefault();
+    std::string error;
+    boost::shared_ptr<IDensityStandard> standard = Find(name, &error);
+    if (standard) return standard;
+    LogFile::WriteToLog(String("Density standard \"" + name + "\" not available (" + error +
+                               "); using \"" + kDefaultDensityStandard + "\""),
+                        String());
+    return GetDefault();
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::GetDefault() {
