@@ -1,0 +1,78 @@
+// Repositories of the colorimetry data provider: illuminants, observers and
+// density standards by name. The built-in tables are embedded in the library;
+// further illuminants and density standards are read from the data directory
+// $NXBASE_DATA_DIR on first request and kept for the life of the process.
+// Every function may be called from any thread.
+//
+// Installed files (CSV, one header row, "," between fields, "." decimals):
+//   $NXBASE_DATA_DIR/illuminants/<name>.csv   columns wavelength,value
+//   $NXBASE_DATA_DIR/density/<file>_log10.csv columns wavelength,<ch>[,<ch>...]
+// where <file> is the standard's name in lower case with blanks turned into
+// "_" ("Status I" -> status_i_log10.csv, "DIN NB" -> din_nb_log10.csv) and the
+// values are ISO 5-3 log10 spectral products (peak 5.000). Built-in names are
+// never looked up on disk.
+#ifndef KLUME_CMETRY_REPOSITORY_H_
+#define KLUME_CMETRY_REPOSITORY_H_
+
+#include <string>
+#include <vector>
+
+#include <boost/shared_ptr.hpp>
+
+#include "klume/cmetry/data.h"
+#include "nxbase/export.h"
+
+namespace klume {
+namespace cmetry {
+
+class NXBASE_EXPORT IlluminantRepository {
+public:
+    // The illuminant of that name: built in, or installed in the data
+    // directory. An unknown name, or a file that does not parse, yields
+    // GetDefault(); Find tells the two cases apart.
+    static boost::shared_ptr<IIlluminant> Get(const std::string& name);
+    // CIE illuminant D50.
+    static boost::shared_ptr<IIlluminant> GetDefault();
+    // The illuminant of that name, or an empty pointer with a message naming
+    // the file, line and offending text stored in *error (when given).
+    static boost::shared_ptr<IIlluminant> Find(const std::string& name,
+                                               std::string* error = nullptr);
+    static bool Exists(const std::string& name);
+    // Names of the built-in illuminants.
+    static std::vector<std::string> GetNames();
+};
+
+class NXBASE_EXPORT ObserverRepository {
+public:
+    // "2" (CIE 1931 2 degree) or "10" (CIE 1964 10 degree); an empty pointer
+    // for any other name.
+    static boost::shared_ptr<IObserver> Get(const std::string& name);
+    // The 2 degree observer.
+    static boost::shared_ptr<IObserver> GetDefault();
+    static std::vector<std::string> GetNames();
+};
+
+class NXBASE_EXPORT DensityStandardRepository {
+public:
+    // The standard of that name. Built in: "Status A", "Status T", "Status M",
+    // "Status E" (ISO 5-3). "Status I", "DIN", "DIN NB", "SPI" and any other
+    // name only when a table is installed. A missing standard yields
+    // GetDefault().
+    static boost::shared_ptr<IDensityStandard> Get(const std::string& name);
+    // "Status E".
+    static boost::shared_ptr<IDensityStandard> GetDefault();
+    // True when Get(name) delivers that very standard (built in, or an
+    // installed table that parses).
+    static bool Exists(const std::string& name);
+    // As Get, but an empty pointer and a message in *error for a missing or
+    // unreadable standard.
+    static boost::shared_ptr<IDensityStandard> Find(const std::string& name,
+                                                    std::string* error = nullptr);
+    // Names of the built-in standards.
+    static std::vector<std::string> GetNames();
+};
+
+}  // namespace cmetry
+}  // namespace klume
+
+#endif  // KLUME_CMETRY_REPOSITORY_H_

@@ -1,0 +1,278 @@
+#include "klume/cmetry/repository.h"
+
+#include <cctype>
+#include <cstdlib>
+#include <map>
+#include <mutex>
+#include <utility>
+
+#include "csvtable.h"
+#include "embedded.h"
+#include "nxbase/logfile.h"
+#include "objects.h"
+
+namespace klume {
+namespace cmetry {
+
+namespace {
+
+constexpr const char* kDefaultIlluminant = "D50";
+constexpr const char* kDefaultObserver = "2";
+constexpr const char* kDefaultDensityStandard = "Status E";
+constexpr const char* kDataDirVariable = "NXBASE_DATA_DIR";
+// Longest name looked up as a file.
+constexpr std::size_t kMaxFileNameLength = 64;
+
+std::string IlluminantDescription(const std::string& name) {
+    if (name == "A" || name == "D65") return "CIE standard illuminant " + name;
+    if (name == "E") return "CIE equal-energy illuminant E";
+    if (name.compare(0, 2, "FL") == 0) return "CIE illuminant F" + name.substr(2);
+    return "CIE illuminant " + name;
+}
+
+struct BuiltIns {
+    std::map<std::string, boost::shared_ptr<IIlluminant>> illuminants;
+    std::map<std::string, boost::shared_ptr<IObserver>> observers;
+    std::map<std::string, boost::shared_ptr<IDensityStandard>> standards;
+    std::vector<std::string> illuminantNames;
+    std::vector<std::string> observerNames;
+    std::vector<std::string> standardNames;
+};
+
+std::vector<std::string> SplitHeader(const char* header) {
+    std::vector<std::string> names;
+    std::string current;
+    for (const char* p = header; *p != '\0'; ++p) {
+        if (*p == ',') {
+            names.push_back(current);
+            current.clear();
+        } else {
+            current += *p;
+        }
+    }
+    names.push_back(current);
+    return names;
+}
+
+// Made once, on first use; read-only afterwards.
+const BuiltIns& GetBuiltIns() {
+    static const BuiltIns builtIns = [] {
+        BuiltIns b;
+        for (int i = 0; i < embedded::kObserversCount; ++i) {
+            const embedded::EmbeddedTable& t = embedded::kObservers[i];
+            const int field = std::atoi(t.key);
+            const std::string description =
+                field == 2 ? "CIE 1931 2 degree standard colorimetric observer"
+                           : "CIE 1964 10 degree supplementary standard colorimetric observer";
+            b.observers[t.key] = detail::MakeObserver(t, description, field);
+            b.observerNames.push_back(t.key);
+        }
+        for (int i = 0; i < embedded::kIlluminantsCount; ++i) {
+            const embedded::EmbeddedTable& t = embedded::kIlluminants[i];
+            std::vector<double> wavelengths;
+            std::vector<double> powers;
+            for (int row = 0; row < t.rows; ++row) {
+                wavelengths.push_back(t.values[row * t.columns]);
+                powers.push_back(t.values[row * t.columns + 1]);
+            }
+            b.illuminants[t.key] = MakeIlluminant(t.key, IlluminantDescription(t.key),
+                                                  std::move(wavelengths), std::move(powers));
+            b.illuminantNames.push_back(t.key);
+        }
+        for (int i = 0; i < embedded::kDensityStandardsCount; ++i) {
+            const embedded::EmbeddedTable& t = embedded::kDensityStandards[i];
+            std::vector<std::string> columns = SplitHeader(t.header);
+            columns.erase(columns.begin());
+            std::vector<double> wavelengths;
+            std::vector<std::vector<double>> products(columns.size());
+            for (int row = 0; row < t.rows; ++row) {
+                wavelengths.push_back(t.values[row * t.columns]);
+                for (std::size_t c = 0; c < columns.size(); ++c) {
+                    products[c].push_back(t.values[row * t.columns + 1 + static_cast<int>(c)]);
+                }
+            }
+            std::string error;
+            b.standards[t.key] =
+                detail::MakeDensityStandard(t.key, columns, wavelengths, products, error);
+            b.standardNames.push_back(t.key);
+        }
+        return b;
+    }();
+    return builtIns;
+}
+
+// Installed tables, by path; parsed once per process.
+struct InstalledCache {
+    std::mutex mutex;
+    std::map<std::string, boost::shared_ptr<IIlluminant>> illuminants;
+    std::map<std::string, boost::shared_ptr<IDensityStandard>> standards;
+};
+
+InstalledCache& GetInstalled() {
+    static InstalledCache cache;
+    return cache;
+}
+
+bool SetError(std::string* error, std::string text) {
+    if (error != nullptr) *error = std::move(text);
+    return false;
+}
+
+// The data directory, or "" when none is set.
+std::string DataDirectory() {
+    const char* dir = std::getenv(kDataDirVariable);
+    return dir == nullptr ? std::string() : std::string(dir);
+}
+
+// Names that may become file names: letters, digits, blank, "_", "-", ".",
+// not starting with "." and not too long.
+bool IsSafeFileName(const std::string& name) {
+    if (name.empty() || name.size() > kMaxFileNameLength || name[0] == '.') return false;
+    for (char c : name) {
+        const unsigned char u = static_cast<unsigned char>(c);
+        if (!(std::isalnum(u) || c == ' ' || c == '_' || c == '-' || c == '.')) return false;
+    }
+    return true;
+}
+
+std::string DensityFileStem(const std::string& name) {
+    std::string stem;
+    for (char c : name) {
+        const unsigned char u = static_cast<unsigned char>(c);
+        stem += c == ' ' ? '_' : static_cast<char>(std::tolower(u));
+    }
+    return stem;
+}
+
+bool LoadTable(const std::string& path, std::size_t minColumns, detail::CsvTable& table,
+               std::string* error) {
+    std::string text;
+    std::string message;
+    if (!detail::ReadTableFile(path, text, message) ||
+        !detail::ParseCsvTable(text, path, minColumns, table, message)) {
+        return SetError(error, message);
+    }
+    return true;
+}
+
+}  // namespace
+
+boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& name,
+                                                          std::string* error) {
+    const BuiltIns& b = GetBuiltIns();
+    const auto builtIn = b.illuminants.find(name);
+    if (builtIn != b.illuminants.end()) return builtIn->second;
+    if (!IsSafeFileName(name)) {
+        SetError(error, "unknown illuminant \"" + name + "\"");
+        return {};
+    }
+    const std::string dir = DataDirectory();
+    if (dir.empty()) {
+        SetError(error, "unknown illuminant \"" + name + "\" (" + kDataDirVariable + " not set)");
+        return {};
+    }
+    const std::string path = dir + "/illuminants/" + name + ".csv";
+    InstalledCache& cache = GetInstalled();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    const auto cached = cache.illuminants.find(path);
+    if (cached != cache.illuminants.end()) return cached->second;
+    detail::CsvTable table;
+    if (!LoadTable(path, 2, table, error)) return {};
+    if (table.columns.size() != 2) {
+        SetError(error, path + ": expected the columns wavelength,value");
+        return {};
+    }
+    boost::shared_ptr<IIlluminant> illuminant =
+        MakeIlluminant(name, "Illuminant " + name + " (" + path + ")",
+                       std::move(table.wavelengths), std::move(table.values[0]), error);
+    if (illuminant) cache.illuminants[path] = illuminant;
+    return illuminant;
+}
+
+boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
+    boost::shared_ptr<IIlluminant> illuminant = Find(name);
+    return illuminant ? illuminant : GetDefault();
+}
+
+boost::shared_ptr<IIlluminant> IlluminantRepository::GetDefault() {
+    return GetBuiltIns().illuminants.at(kDefaultIlluminant);
+}
+
+bool IlluminantRepository::Exists(const std::string& name) {
+    return static_cast<bool>(Find(name));
+}
+
+std::vector<std::string> IlluminantRepository::GetNames() {
+    return GetBuiltIns().illuminantNames;
+}
+
+boost::shared_ptr<IObserver> ObserverRepository::Get(const std::string& name) {
+    const BuiltIns& b = GetBuiltIns();
+    const auto it = b.observers.find(name);
+    return it == b.observers.end() ? boost::shared_ptr<IObserver>() : it->second;
+}
+
+boost::shared_ptr<IObserver> ObserverRepository::GetDefault() {
+    return GetBuiltIns().observers.at(kDefaultObserver);
+}
+
+std::vector<std::string> ObserverRepository::GetNames() { return GetBuiltIns().observerNames; }
+
+boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::string& name,
+                                                                    std::string* error) {
+    const BuiltIns& b = GetBuiltIns();
+    const auto builtIn = b.standards.find(name);
+    if (builtIn != b.standards.end()) return builtIn->second;
+    if (!IsSafeFileName(name)) {
+        SetError(error, "unknown density standard \"" + name + "\"");
+        return {};
+    }
+    const std::string dir = DataDirectory();
+    if (dir.empty()) {
+        SetError(error, "density standard \"" + name + "\" is not installed (" +
+                            kDataDirVariable + " not set)");
+        return {};
+    }
+    const std::string path = dir + "/density/" + DensityFileStem(name) + "_log10.csv";
+    InstalledCache& cache = GetInstalled();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    const auto cached = cache.standards.find(path);
+    if (cached != cache.standards.end()) return cached->second;
+    detail::CsvTable table;
+    if (!LoadTable(path, 2, table, error)) return {};
+    std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
+    std::string message;
+    boost::shared_ptr<IDensityStandard> standard =
+        detail::MakeDensityStandard(name, channels, table.wavelengths, table.values, message);
+    if (!standard) {
+        SetError(error, path + ": " + message);
+        return {};
+    }
+    cache.standards[path] = standard;
+    return standard;
+}
+
+boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::string& name) {
+    std::string error;
+    boost::shared_ptr<IDensityStandard> standard = Find(name, &error);
+    if (standard) return standard;
+    LogFile::WriteToLog(String("Density standard \"" + name + "\" not available (" + error +
+                               "); using \"" + kDefaultDensityStandard + "\""),
+                        String());
+    return GetDefault();
+}
+
+boost::shared_ptr<IDensityStandard> DensityStandardRepository::GetDefault() {
+    return GetBuiltIns().standards.at(kDefaultDensityStandard);
+}
+
+bool DensityStandardRepository::Exists(const std::string& name) {
+    return static_cast<bool>(Find(name));
+}
+
+std::vector<std::string> DensityStandardRepository::GetNames() {
+    return GetBuiltIns().standardNames;
+}
+
+}  // namespace cmetry
+}  // namespace klume
