@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <mutex>
+#include <optional>
 
 #include "nxbase/cmetry.h"
 #include "nxbase/iccprofile.h"
@@ -190,7 +191,11 @@ void RGBVector::ReflectanceSpectrumToRGB(const ReflectanceSpectrum& axSpectrum,
 }
 
 void RGBVector::FromLab(const LABVector& axLab) {
-    LABVector lab = axLab.GetCIELab();
+    // GetCIELab() copies the vector with its condition; under CIELAB it would
+    // return the vector unchanged, so the copy is skipped.
+    std::optional<LABVector> converted;
+    if (LABVector::GetColorSpaceType() != LAB_CIE1976) converted = axLab.GetCIELab();
+    const LABVector& lab = converted ? *converted : axLab;
     if (ProfiledLabToRGB(lab)) return;
     LabToSrgb(lab.getV(), amV, D65White());
     if (LogEnabled()) Log(String("Lab -> RGB: ") + String(lab) + " -> " + String(*this));
