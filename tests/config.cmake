@@ -1,1 +1,2 @@
 # Tests: config.
+nxbase_add_test(config_test config_test.cpp LABELS config)
