@@ -7,9 +7,10 @@
 // floats per spectrum at float 3*i. The batch computes what XYZVector and
 // LABVector (CIE 1976, type 0) compute from a ReflectanceSpectrum with the same
 // filter: the weighted sums are formed in the same order with the same single
-// precision operations, so XYZ agree bit for bit; the Lab cube root is a
-// vectorised approximation agreeing with the objects' pow(t, 0.33333334) to a
-// few units in the last place (1e-5 of the vector's length at worst).
+// precision operations, so XYZ agree bit for bit, and Lab differs only by the
+// cube root, a vectorised approximation agreeing with the objects'
+// pow(t, 0.33333334) to a unit or two in the last place (within 1e-5 of the
+// vector's length).
 #ifndef NXBASE_COLORBATCH_H_
 #define NXBASE_COLORBATCH_H_
 
@@ -21,6 +22,18 @@ class CMetryFilter;
 class MeasuringCondition;
 
 namespace nxbase {
+
+namespace detail {
+// The weights as the kernels read them: per channel five 8-float chunks
+// covering samples 0..31 and 28..35 (the fifth chunk's first four weights
+// zero), and the normalising factors.
+struct BatchTables {
+    static constexpr int kChunks = 5;
+    alignas(32) float chunks[3][kChunks][8] = {};
+    float sumY = 0.0f;   // XYZ = S / sumY * 100
+    float sums[3] = {};  // Lab: t = XYZ * sumY / sums[c] / 100
+};
+}  // namespace detail
 
 // The X, Y, Z weight tables of one illuminant and observer on the 36-point
 // grid, with the sums the filters report for them.
@@ -59,6 +72,7 @@ public:
 
 private:
     BatchWeights amWeights;
+    detail::BatchTables amTables;
 };
 
 // One-call forms for the weights of a measuring condition's illuminant and

@@ -55,8 +55,9 @@ public:
 
 protected:
     explicit ColorVector(const MeasuringCondition& axCondition);
-    // Raw weighted sums S_i = sum of W_i * R over the 36 samples, in
-    // ascending wavelength order; the condition is the filter's illuminant and
+    // Raw weighted sums S_i = sum of W_i * R over the 36 samples, formed in
+    // eight pairwise-added lanes (the order of the batch path, so that both
+    // agree bit for bit); the condition is the filter's illuminant and
     // observer with the spectrum's physical conditions.
     ColorVector(const CMetryFilter& axFilter, const ReflectanceSpectrum& axSpectrum);
 

@@ -1,17 +1,20 @@
 // ColorBatch: spectra to XYZ and CIELAB, eight spectra per step.
 //
-// A block of eight spectra is transposed so that each wavelength's eight
-// samples lie side by side; every lane then sums its spectrum in wavelength
-// order exactly as the one-at-a-time path does, with the same single-precision
-// operations, and the compiler turns the lane loops into SIMD code. The code
+// Each spectrum is multiplied chunk by chunk with the weight tables (laid out
+// in 8-float chunks), and the partial sums of eight spectra are reduced across
+// lanes together, so that every step works on full 8-float vectors and no
+// spectrum is transposed. The colour vectors sum one spectrum in the same
+// order (detail::LaneSums) and the file is compiled without floating-point
+// contraction, so XYZ agree bit for bit and Lab up to the cube root. The code
 // is target-independent (GCC/Clang vector extensions); on x86-64 GCC also
-// builds an AVX2 clone of the kernel that is picked at load time.
+// builds an x86-64-v3 (AVX2) clone of the kernels that is picked at load time.
 #include "nxbase/colorbatch.h"
 
 #include <cstdint>
 #include <cstring>
 
 #include "nxbase/cmetry.h"
+#include "tristimulus.h"
 
 // The vector helpers below are file-local and inlined; the ABI note GCC gives
 // for 32-byte vector arguments without AVX does not apply to them.
@@ -24,20 +27,21 @@ namespace {
 
 constexpr int kSamples = BatchWeights::kSamples;
 constexpr int kLanes = 8;
+using PaddedWeights = detail::BatchTables;
+static_assert(detail::BatchTables::kChunks * kLanes - 4 == kSamples, "five chunks, the last overlapping");
 
 typedef float V8 __attribute__((vector_size(kLanes * sizeof(float))));
 typedef std::int32_t I8 __attribute__((vector_size(kLanes * sizeof(std::int32_t))));
 
-// CIE 15:2004 CIELAB constants, in single precision as LABVector uses them.
-constexpr float kLabEpsilon = 0.008856f;  // t at or below: linear branch
-constexpr float kLabKappa = 7.787f;
-constexpr float kLabOffset = 16.0f / 116.0f;
+using detail::kLabEpsilon;
+using detail::kLabKappa;
+using detail::kLabOffset;
 
 // The kernels' helpers are forced inline so that each clone gets its own copy.
 #define NXBASE_BATCH_INLINE inline __attribute__((always_inline))
 
 #if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__) && !defined(NXBASE_BATCH_NO_CLONES)
-#define NXBASE_BATCH_CLONES __attribute__((target_clones("avx2", "default")))
+#define NXBASE_BATCH_CLONES __attribute__((target_clones("arch=x86-64-v3", "default")))
 #else
 #define NXBASE_BATCH_CLONES
 #endif
@@ -87,44 +91,73 @@ NXBASE_BATCH_INLINE V8 LabF(V8 t) {
     return out;
 }
 
-// Weighted sums of eight spectra (src holds 8 x 36 floats), in wavelength
-// order per lane.
-NXBASE_BATCH_INLINE void SumBlock(const BatchWeights& w, const float* src, V8 sums[3]) {
-    alignas(32) float t[kSamples][kLanes];
+#if defined(__clang__)
+#define NXBASE_SHUFFLE(a, b, ...) __builtin_shufflevector(a, b, __VA_ARGS__)
+#else
+#define NXBASE_SHUFFLE(a, b, ...) __builtin_shuffle(a, b, I8{__VA_ARGS__})
+#endif
+
+// Lane s of the result is the sum of the eight lanes of p[s]: a pairwise
+// tree of shuffles and adds (14 shuffles, 7 adds for 64 numbers).
+NXBASE_BATCH_INLINE V8 SumLanes(const float (*p)[kLanes]) {
+    V8 q[4];
+    for (int i = 0; i < 4; ++i) {
+        const V8 a = Load(p[2 * i]);
+        const V8 b = Load(p[2 * i + 1]);
+        q[i] = NXBASE_SHUFFLE(a, b, 0, 8, 2, 10, 4, 12, 6, 14) +
+               NXBASE_SHUFFLE(a, b, 1, 9, 3, 11, 5, 13, 7, 15);
+    }
+    V8 h[2];
+    for (int i = 0; i < 2; ++i) {
+        const V8 a = q[2 * i];
+        const V8 b = q[2 * i + 1];
+        h[i] = NXBASE_SHUFFLE(a, b, 0, 1, 8, 9, 4, 5, 12, 13) +
+               NXBASE_SHUFFLE(a, b, 2, 3, 10, 11, 6, 7, 14, 15);
+    }
+    return NXBASE_SHUFFLE(h[0], h[1], 0, 1, 2, 3, 8, 9, 10, 11) +
+           NXBASE_SHUFFLE(h[0], h[1], 4, 5, 6, 7, 12, 13, 14, 15);
+}
+
+// Weighted sums of eight spectra (src holds 8 x 36 floats). Each spectrum is
+// read as five 8-float chunks (the last at offset 28, overlapping the fourth,
+// whose first four weights are zero in the padded table) and multiplied with
+// the weights laid out the same way; the eight partial sums per channel are
+// then reduced across lanes for all eight spectra at once. The order of the
+// operations is the one detail::LaneSums spells out for a single spectrum.
+NXBASE_BATCH_INLINE void SumBlock(const PaddedWeights& w, const float* src, V8 sums[3]) {
+    alignas(32) float part[3][kLanes][kLanes];
     for (int s = 0; s < kLanes; ++s) {
-        for (int k = 0; k < kSamples; ++k) t[k][s] = src[s * kSamples + k];
+        const float* r = src + s * kSamples;
+        const V8 r0 = Load(r);
+        const V8 r1 = Load(r + 8);
+        const V8 r2 = Load(r + 16);
+        const V8 r3 = Load(r + 24);
+        const V8 r4 = Load(r + 28);
+        for (int c = 0; c < 3; ++c) {
+            const V8 acc = (r0 * Load(w.chunks[c][0]) + r1 * Load(w.chunks[c][1])) +
+                           (r2 * Load(w.chunks[c][2]) + r3 * Load(w.chunks[c][3])) +
+                           r4 * Load(w.chunks[c][4]);
+            Store(part[c][s], acc);
+        }
     }
-    V8 x = Splat(0.0f);
-    V8 y = Splat(0.0f);
-    V8 z = Splat(0.0f);
-    for (int k = 0; k < kSamples; ++k) {
-        const V8 r = Load(t[k]);
-        x += Splat(w.weights[0][k]) * r;
-        y += Splat(w.weights[1][k]) * r;
-        z += Splat(w.weights[2][k]) * r;
-    }
-    sums[0] = x;
-    sums[1] = y;
-    sums[2] = z;
+    for (int c = 0; c < 3; ++c) sums[c] = SumLanes(part[c]);
 }
 
 // XYZ of a block: 100 * S / sum_1, as XYZVector.
-NXBASE_BATCH_INLINE void XyzBlock(const BatchWeights& w, const float* src, V8 xyz[3]) {
+NXBASE_BATCH_INLINE void XyzBlock(const PaddedWeights& w, const float* src, V8 xyz[3]) {
     SumBlock(w, src, xyz);
-    const V8 sumY = Splat(w.sums[1]);
+    const V8 sumY = Splat(w.sumY);
     for (int c = 0; c < 3; ++c) xyz[c] = xyz[c] / sumY * Splat(100.0f);
 }
 
-// Lab of a block, as LABVector from XYZ with the same weights.
-NXBASE_BATCH_INLINE void LabBlock(const BatchWeights& w, const float* src, V8 lab[3]) {
+// Lab of a block, as LABVector from XYZ with the same weights and the same
+// operations: t = X * sum_1 / sum_c / 100.
+NXBASE_BATCH_INLINE void LabBlock(const PaddedWeights& w, const float* src, V8 lab[3]) {
     V8 xyz[3];
     XyzBlock(w, src, xyz);
-    const V8 sumY = Splat(w.sums[1]);
+    const V8 sumY = Splat(w.sumY);
     V8 f[3];
-    for (int c = 0; c < 3; ++c) {
-        const V8 t = xyz[c] * sumY / Splat(w.sums[c]) / Splat(100.0f);
-        f[c] = LabF(t);
-    }
+    for (int c = 0; c < 3; ++c) f[c] = LabF(xyz[c] * sumY / Splat(w.sums[c]) / Splat(100.0f));
     lab[0] = Splat(116.0f) * f[1] - Splat(16.0f);
     lab[1] = Splat(500.0f) * (f[0] - f[1]);
     lab[2] = Splat(200.0f) * (f[1] - f[2]);
@@ -139,7 +172,7 @@ NXBASE_BATCH_INLINE void Interleave(const V8 v[3], float* out, int lanes) {
 }
 
 template <bool kLab>
-NXBASE_BATCH_INLINE void RunBlocks(const BatchWeights& w, const float* src, std::size_t count, float* out) {
+NXBASE_BATCH_INLINE void RunBlocks(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
     V8 v[3];
     std::size_t i = 0;
     for (; i + kLanes <= count; i += kLanes) {
@@ -165,12 +198,12 @@ NXBASE_BATCH_INLINE void RunBlocks(const BatchWeights& w, const float* src, std:
 }
 
 NXBASE_BATCH_CLONES
-void RunXyz(const BatchWeights& w, const float* src, std::size_t count, float* out) {
+void RunXyz(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
     RunBlocks<false>(w, src, count, out);
 }
 
 NXBASE_BATCH_CLONES
-void RunLab(const BatchWeights& w, const float* src, std::size_t count, float* out) {
+void RunLab(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
     RunBlocks<true>(w, src, count, out);
 }
 
@@ -202,22 +235,32 @@ BatchWeights WeightsOf(const CMetryFilter& axFilter) {
 
 }  // namespace
 
-ColorBatch::ColorBatch() : amWeights(WeightsOf(*CMetry::Instance()->GetLXYZFilter())) {}
+ColorBatch::ColorBatch() : ColorBatch(WeightsOf(*CMetry::Instance()->GetLXYZFilter())) {}
 
-ColorBatch::ColorBatch(const CMetryFilter& axFilter) : amWeights(WeightsOf(axFilter)) {}
+ColorBatch::ColorBatch(const CMetryFilter& axFilter) : ColorBatch(WeightsOf(axFilter)) {}
 
 ColorBatch::ColorBatch(const MeasuringCondition& axCondition)
-    : amWeights(WeightsOf(CMetryFilter(Lichtart(axCondition.GetIllum()),
-                                       Observer(axCondition.GetObserver())))) {}
+    : ColorBatch(WeightsOf(CMetryFilter(Lichtart(axCondition.GetIllum()),
+                                        Observer(axCondition.GetObserver())))) {}
 
-ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {}
+ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {
+    for (int c = 0; c < BatchWeights::kChannels; ++c) {
+        float* chunks = &amTables.chunks[c][0][0];
+        std::memcpy(chunks, amWeights.weights[c], sizeof(float) * 32);
+        // The fifth chunk reads samples 28..35; 28..31 are summed in the fourth.
+        for (int k = 0; k < 4; ++k) chunks[32 + k] = 0.0f;
+        std::memcpy(chunks + 36, amWeights.weights[c] + 32, sizeof(float) * 4);
+        amTables.sums[c] = amWeights.sums[c];
+    }
+    amTables.sumY = amWeights.sums[1];
+}
 
 void ColorBatch::ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const {
-    RunXyz(amWeights, pSpectra, alCount, pXYZ);
+    RunXyz(amTables, pSpectra, alCount, pXYZ);
 }
 
 void ColorBatch::ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const {
-    RunLab(amWeights, pSpectra, alCount, pLab);
+    RunLab(amTables, pSpectra, alCount, pLab);
 }
 
 float ColorBatch::WhitePoint(int alChannel) const {

@@ -8,13 +8,15 @@
 #include <optional>
 #include <string>
 
+#include "tristimulus.h"
+
 namespace {
 
-// CIE 15:2004 CIELAB constants, single precision.
-constexpr float kLabExponent = 0.33333334f;
-constexpr float kLabEpsilon = 0.008856f;            // f(t): t at or below is linear
-constexpr float kLabKappa = 7.787f;
-constexpr float kLabOffset = 0.13793103448275862f;  // 16/116
+// CIE 15:2004 CIELAB constants, single precision (shared with the batch).
+using nxbase::detail::kLabEpsilon;
+using nxbase::detail::kLabExponent;
+using nxbase::detail::kLabKappa;
+using nxbase::detail::kLabOffset;
 constexpr float kLabInverseEpsilon = 0.206893034423f;  // f at or below is linear
 
 // LCh hue: degrees per radian, and the neutral threshold for a and b.
@@ -214,7 +216,8 @@ ColorVector::ColorVector(const MeasuringCondition& axCondition) : amCondition(ax
 
 ColorVector::ColorVector(const CMetryFilter& axFilter, const ReflectanceSpectrum& axSpectrum)
     : amCondition(ConditionFor(axFilter, axSpectrum.GetPhysicalConditions())) {
-    axFilter.Tristimulus(axSpectrum.GetData(), amV);
+    const float* weights[3] = {axFilter.GetWeights(0), axFilter.GetWeights(1), axFilter.GetWeights(2)};
+    nxbase::detail::LaneSums(weights, axSpectrum.GetData(), amV);
 }
 
 float ColorVector::Length() const { return std::sqrt(amV[0] * amV[0] + amV[1] * amV[1] + amV[2] * amV[2]); }
