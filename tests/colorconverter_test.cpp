@@ -6,9 +6,9 @@
 #include <cmath>
 #include <fstream>
 #include <map>
-#include <regex>
 
 #include "nxbase/iccprofile.h"
+#include "nxbase/text.h"
 #include "test_util.h"
 
 namespace {
@@ -236,30 +236,24 @@ TEST(ColorConverter, ColourNamesFollowHueSectorsAndLightnessClasses) {
 }
 
 // The shipped text files hold the group "FarbTexte" with one name per colour
-// number, in the order of the built-in list.
+// number; loaded, they name the colours (German in Windows-1252).
 TEST(ColorConverter, ShippedTextFilesNameEveryColourNumber) {
-    const std::regex group(R"([[:space:]|[:digit:]]*\{(.*)\}[[:space:]]*)");
-    const std::regex text(R"([[:space:]|[:digit:]]*\[(.*)\][[:space:]]*)");
-    for (const char* file : {"NxBase1.lng", "NxBase49.lng"}) {
-        std::ifstream in(std::string(NXBASE_SOURCE_DIR) + "/data/lng/" + file);
-        ASSERT_TRUE(in) << file;
-        std::vector<std::string> names;
-        std::string current, line;
-        while (std::getline(in, line)) {
-            std::smatch m;
-            if (std::regex_match(line, m, group)) {
-                current = m[1];
-            } else if (current == "FarbTexte" && std::regex_match(line, m, text)) {
-                names.push_back(m[1]);
-            }
-        }
-        EXPECT_EQ(names.size(), static_cast<std::size_t>(FARBE_ANZAHL)) << file;
-        if (std::string(file) == "NxBase1.lng" && names.size() == FARBE_ANZAHL) {
-            EXPECT_EQ(names[FARBE_SCHWARZ], "black");
-            EXPECT_EQ(names[8], "brown");
-            EXPECT_EQ(names[FARBE_ANZAHL - 1], "light magenta");
-        }
+    const std::string dir = std::string(NXBASE_SOURCE_DIR) + "/data/lng/";
+    const LABVector white = Lab(96, 0, 2), brown = Lab(37.5f, 14.4f, 14.9f);
+    Text::FreeResources();
+    ASSERT_TRUE(Text::LoadText(String(dir + "NxBase49.lng")));
+    EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
+    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(white).str()), "Wei\xDF");
+    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(brown).str()), "Braun");
+    Text::FreeResources();
+    ASSERT_TRUE(Text::LoadText(String(dir + "NxBase1.lng")));
+    EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
+    for (int n = 0; n < FARBE_ANZAHL; ++n) {
+        String shipped = Text::GetText(String("FarbTexte"), n);
+        EXPECT_FALSE(shipped.Len() == 0) << n;
     }
+    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(brown).str()), "brown");
+    Text::FreeResources();
 }
 
 }  // namespace

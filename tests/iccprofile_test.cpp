@@ -1,5 +1,7 @@
 #include "nxbase/iccprofile.h"
 
+#include "nxbase/appconfig.h"
+
 #include <gtest/gtest.h>
 #include <lcms2.h>
 
@@ -104,6 +106,23 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         EXPECT_FALSE(engine->LabToRGB(in, out));
         EXPECT_EQ(out[0], -1);
     }
+}
+
+TEST_F(IccTest, ReadsBothKeysFromTheUserConfiguration) {
+    std::string profile = WriteProfile("display.icc", cmsCreate_sRGBProfile());
+    nxbase::SetICCSettingsReader(nullptr);
+    UserConfig* config = UserConfig::CreateUserConfig(String("IccTest"), String(dir_.path().string()),
+                                                      String());
+    config->WriteKey(String("Settings"), String("ICCProfile"), String("1"));
+    config->WriteKey(String("Settings"), String("ICCProfilePath"), String(profile));
+    ICCEngine::CreateICCEngine();
+    EXPECT_TRUE(ICCProfile::ProfileEnabled());
+    EXPECT_TRUE(ICCProfile::ProfileValid()) << ICCEngine::Instance()->GetProblem();
+    config->WriteKey(String("Settings"), String("ICCProfile"), String("0"));
+    ICCEngine::CreateICCEngine();
+    EXPECT_FALSE(ICCProfile::ProfileEnabled());
+    NxSingleton::Remove(config);
+    delete config;
 }
 
 }  // namespace

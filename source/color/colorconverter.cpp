@@ -9,6 +9,7 @@
 #include "nxbase/iccprofile.h"
 #include "nxbase/linalg.h"
 #include "nxbase/logfile.h"
+#include "nxbase/text.h"
 
 namespace {
 
@@ -123,10 +124,13 @@ const char* const kBuiltinNames[FARBE_ANZAHL] = {
     "dark blue",      "blue",           "light blue",  "dark violet",    "violet",
     "lilac",          "dark magenta",   "magenta",     "light magenta"};
 
-// The text of a colour number. The library's text store is not part of this
-// build yet, so this answers from the built-in English list.
+// The text of a colour number from the loaded text files, or the built-in
+// English name while no file holding it is loaded.
 String ColourName(int number) {
     if (number < 0 || number >= FARBE_ANZAHL) return String();
+    static const String group("FarbTexte");
+    if (Text::GetEntryCount(group) > static_cast<unsigned long>(number))
+        return Text::GetText(group, static_cast<unsigned long>(number));
     return String(kBuiltinNames[number]);
 }
 

@@ -6,6 +6,7 @@
 #include <charconv>
 #include <mutex>
 
+#include "nxbase/appconfig.h"
 #include "nxbase/logfile.h"
 #include "toolkit/system.h"
 
@@ -23,16 +24,19 @@ nxbase::SettingsReader& InstalledReader() {
     return reader;
 }
 
-// The user configuration's group "Settings". The user configuration service
-// is not part of this build yet, so without an installed reader every key
-// reads as its default and the engine stays off.
+// The key of the user configuration's group "Settings" (or of an installed
+// reader); the default while no user configuration exists.
 std::string ReadUserSetting(const std::string& key, const std::string& def) {
     nxbase::SettingsReader reader;
     {
         std::lock_guard<std::mutex> lock(ReaderMutex());
         reader = InstalledReader();
     }
-    return reader ? reader(key, def) : def;
+    if (reader) return reader(key, def);
+    if (!UserConfig::IsInitialized()) return def;
+    return UserConfig::Instance()
+        ->ReadKey(String(ICCEngine::kGroup), String(key), String(def))
+        .str();
 }
 
 // "ICCProfile" is on when it reads as a non-zero number.
