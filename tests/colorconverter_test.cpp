@@ -5,7 +5,9 @@
 
 #include <cmath>
 #include <fstream>
+#include <atomic>
 #include <map>
+#include <thread>
 
 #include "nxbase/iccprofile.h"
 #include "nxbase/text.h"
@@ -142,6 +144,25 @@ TEST(RGBVector, IccPathAgreesWithTheFormulasForLittleCmsOwnSrgbProfile) {
                 << "Lab #" << n << " channel " << i;
         }
     }
+    // Threads share the one cached transform: every thread gets the results
+    // of the single-threaded run, bit for bit.
+    std::vector<RGBVector> single;
+    for (const auto& l : labs) single.emplace_back(Lab(l[0], l[1], l[2]));
+    std::atomic<int> mismatches{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t) {
+        threads.emplace_back([&] {
+            for (int round = 0; round < 500; ++round) {
+                for (std::size_t n = 0; n < single.size(); ++n) {
+                    RGBVector again(Lab(labs[n][0], labs[n][1], labs[n][2]));
+                    for (int i = 0; i < 3; ++i) mismatches += again[i] != single[n][i];
+                }
+            }
+        });
+    }
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(mismatches.load(), 0);
+
     // Spectra go through the profile too, and stay close to the EBU path.
     ICCProfile::EnableProfile(false);
     RGBVector viaTables(Flat(0.5f));

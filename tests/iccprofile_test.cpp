@@ -11,6 +11,23 @@
 
 namespace {
 
+// A LUT profile of the given class and colour space whose only table (`tag`)
+// is a flat two-point CLUT from `in` to `out` channels.
+cmsHPROFILE LutProfile(cmsProfileClassSignature deviceClass, cmsColorSpaceSignature space,
+                       cmsTagSignature tag, int in, int out) {
+    cmsHPROFILE profile = cmsCreateProfilePlaceholder(nullptr);
+    cmsSetProfileVersion(profile, 2.1);  // lut16Type takes a bare CLUT
+    cmsSetDeviceClass(profile, deviceClass);
+    cmsSetColorSpace(profile, space);
+    cmsSetPCS(profile, cmsSigLabData);
+    cmsPipeline* pipeline = cmsPipelineAlloc(nullptr, in, out);
+    cmsPipelineInsertStage(pipeline, cmsAT_END,
+                           cmsStageAllocCLut16bit(nullptr, 2, in, out, nullptr));
+    cmsWriteTag(profile, tag, pipeline);
+    cmsPipelineFree(pipeline);
+    return profile;
+}
+
 // Replaces the engine's configuration for one test and rebuilds the engine.
 class IccTest : public ::testing::Test {
   protected:
@@ -85,6 +102,10 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         return p;
     }());
     std::string lab = WriteProfile("lab.icc", cmsCreateLab4Profile(nullptr));
+    std::string cmyk = WriteProfile(
+        "cmyk.icc", LutProfile(cmsSigOutputClass, cmsSigCmykData, cmsSigBToA0Tag, 3, 4));
+    std::string inputOnly = WriteProfile(
+        "scanner.icc", LutProfile(cmsSigInputClass, cmsSigRgbData, cmsSigAToB0Tag, 3, 3));
     std::string junk = dir_.File("junk.icc");
     nxtest::WriteFile(junk, std::string(128, 'x') + "acsp" + std::string(300, '\0'));
 
@@ -94,6 +115,8 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         {junk, "cannot read"},
         {grey, "is not an RGB profile"},
         {lab, "is not an RGB profile"},
+        {cmyk, "is not an RGB profile"},
+        {inputOnly, "cannot be used as an output profile"},
     };
     for (const auto& [path, problem] : cases) {
         EXPECT_NO_THROW(Configure("1", path));

@@ -27,9 +27,11 @@ class NXBASE_EXPORT ICCEngine : public NxSingleton {
     static constexpr const char* kEnableKey = "ICCProfile";
     static constexpr const char* kPathKey = "ICCProfilePath";
 
-    // The engine, created from the configuration on first use.
+    // The engine, created from the configuration on first use (by whichever
+    // thread comes first).
     static ICCEngine* Instance();
-    // Creates the engine afresh from the configuration (replacing a live one).
+    // Creates the engine afresh from the configuration (replacing a live one;
+    // no conversion may be running meanwhile).
     static ICCEngine* CreateICCEngine();
 
     ~ICCEngine() override;
@@ -79,6 +81,8 @@ class NXBASE_EXPORT ICCEngine : public NxSingleton {
     void* amTransform = nullptr;  // cmsHTRANSFORM, shared by all threads (no 1-pixel cache)
 
     static ICCEngine* smInstance;
+    // The loaded engine, for the lock-free fast path of Instance().
+    static std::atomic<ICCEngine*> smPublished;
 };
 
 // The static switch and status of the ICC engine.

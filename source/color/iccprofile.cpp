@@ -63,6 +63,12 @@ std::string VersionText() {
 }  // namespace
 
 ICCEngine* ICCEngine::smInstance = nullptr;
+std::atomic<ICCEngine*> ICCEngine::smPublished{nullptr};
+
+namespace {
+// Serialises the first creation when several threads convert at once.
+std::mutex gCreateMutex;
+}  // namespace
 
 ICCEngine::ICCEngine() : NxSingleton("ICCEngine") {}
 
@@ -70,15 +76,24 @@ ICCEngine::~ICCEngine() {
     if (amTransform != nullptr) cmsDeleteTransform(static_cast<cmsHTRANSFORM>(amTransform));
     if (amContext != nullptr) cmsDeleteContext(static_cast<cmsContext>(amContext));
     if (smInstance == this) smInstance = nullptr;
+    ICCEngine* self = this;
+    smPublished.compare_exchange_strong(self, nullptr);
 }
 
 ICCEngine* ICCEngine::Instance() {
-    return nxbase::LazySingletonInstance(smInstance, [](ICCEngine& engine) { engine.Load(); });
+    if (ICCEngine* engine = smPublished.load(std::memory_order_acquire)) return engine;
+    std::lock_guard<std::mutex> lock(gCreateMutex);
+    ICCEngine* engine =
+        nxbase::LazySingletonInstance(smInstance, [](ICCEngine& created) { created.Load(); });
+    smPublished.store(engine, std::memory_order_release);
+    return engine;
 }
 
 ICCEngine* ICCEngine::CreateICCEngine() {
+    std::lock_guard<std::mutex> lock(gCreateMutex);
     ICCEngine* engine = nxbase::CreateOrReplaceSingleton(smInstance);
     engine->Load();
+    smPublished.store(engine, std::memory_order_release);
     return engine;
 }
 
