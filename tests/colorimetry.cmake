@@ -1,1 +1,5 @@
-# Tests: colorimetry.
+# Tests: colorimetry (the CIE data provider, spectra, filters, measuring
+# conditions, the colorimetry facade).
+nxbase_add_test(cmetry_provider_test cmetry_provider_test.cpp LABELS colorimetry)
+nxbase_add_test(spectrum_test spectrum_test.cpp LABELS colorimetry)
+nxbase_add_test(colorimetry_test colorimetry_test.cpp LABELS colorimetry)

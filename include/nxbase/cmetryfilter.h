@@ -131,8 +131,10 @@ public:
 };
 
 // One weight table on the spectrum grid (36 floats, 380..730 nm) with a cached
-// sum. The sum is recomputed on demand when a weight changed through the
-// non-const access; a Filter shared between threads must not be changed.
+// sum. Taking the non-const float pointer invalidates the cached sum (the
+// caller may write through it) and the non-const FilterSumme() caches it
+// again; a Filter shared between threads must therefore be read through const
+// access only (the const forms never write).
 class NXBASE_EXPORT Filter {
 public:
     static constexpr int kSize = klume::cmetry::kSampleCount;
@@ -192,8 +194,16 @@ public:
     const float* GetWeights(unsigned short channel) const {
         return amFilters[channel]->GetWeights();
     }
-    // The sum of the weights of a channel (Y: 100 up to float rounding).
-    float GetWeightSum(unsigned short channel) const { return amFilters[channel]->FilterSumme(); }
+    // The provider's weights as one contiguous, 32-byte aligned float[3][36]
+    // block (X row, Y row, Z row) shared by every filter of the pair, for
+    // vectorised and batch sums. It shows the weights as computed: changes
+    // made through a Filter's non-const pointer do not reach it.
+    const float* GetWeightTable() const { return amFilter->GetFloatWeights(0); }
+    // The sum of the weights of a channel (Y: 100 up to float rounding). Reads
+    // only, so any number of threads may ask at once.
+    float GetWeightSum(unsigned short channel) const {
+        return static_cast<const Filter&>(*amFilters[channel]).FilterSumme();
+    }
     // Raw weighted sums S_i = sum over the 36 samples of W_i * R, in single
     // precision in ascending wavelength order; no allocation, no lock.
     void Tristimulus(const float* values, float sums[3]) const;

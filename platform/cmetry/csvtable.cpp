@@ -71,6 +71,8 @@ bool ParseCsvTable(std::string_view text, const std::string& source, std::size_t
     }
     std::size_t lineNumber = 0;
     std::size_t position = 0;
+    // Spreadsheet programs often save CSV with a UTF-8 byte-order mark.
+    if (text.substr(0, 3) == "\xEF\xBB\xBF") position = 3;
     bool haveHeader = false;
     while (position < text.size()) {
         std::size_t end = text.find('\n', position);

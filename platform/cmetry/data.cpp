@@ -101,6 +101,10 @@ bool SetError(std::string* error, const std::string& text) {
 
 // Log10 products above this are not spectral products (peak 5.000).
 constexpr double kMaxLogProduct = 10.0;
+// A channel whose largest linear product on the grid is below this (log10
+// product -1, six decades under the peak) has no response there; ArgyllCMS's
+// "no response" placeholder -10 lies far below.
+constexpr double kMinPeakProduct = 1e-6;
 
 }  // namespace
 
@@ -165,9 +169,9 @@ boost::shared_ptr<IDensityStandard> MakeDensityStandard(
         }
     }
     for (std::size_t c = 0; c < products.size(); ++c) {
-        double sum = 0.0;
-        for (double v : products[c]) sum += v;
-        if (!(sum > 0.0)) {
+        double peak = 0.0;
+        for (double v : products[c]) peak = std::max(peak, v);
+        if (!(peak >= kMinPeakProduct)) {
             error = name + ": channel " + channelNames[c] + " has no response on 380..730 nm";
             return {};
         }

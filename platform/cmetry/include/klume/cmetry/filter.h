@@ -54,7 +54,8 @@ public:
     // Weights of channel 0 (X), 1 (Y) or 2 (Z): 36 doubles, 380..730 nm.
     // REQUIRES: 0 <= channel <= 2.
     const SampleTable& GetWeights(int channel) const { return amWeights.channel[channel]; }
-    // The same weights rounded to single precision, contiguous float[36].
+    // The same weights rounded to single precision, contiguous float[36]; the
+    // three channels follow each other in one float[3][36] block.
     const float* GetFloatWeights(int channel) const { return amFloatWeights[channel]; }
 
     boost::shared_ptr<IObserver> GetObserver() const { return amObserver; }

@@ -1,0 +1,404 @@
+// Illuminant and observer classes, filters, measuring conditions, densities
+// and the colorimetry facade, with the ColorChecker as a numeric check.
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cmath>
+#include <filesystem>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "colorimetry_test_util.h"
+#include "nxbase/cmetry.h"
+
+namespace {
+
+// XYZ from float weights and a float sum of 36 products against the double
+// reference: float rounding of weights and sums explains about 1e-6 relative,
+// some 1e-5 on the scale Y = 100 (measured worst 2.6e-5).
+constexpr double kXyzTolerance = 1e-4;
+// Densities are summed in double from float weights and reflectances.
+constexpr float kDensityTolerance = 1e-5f;
+
+ReflectanceSpectrum Flat(float value) { return ReflectanceSpectrum(value, PhysicalConditions()); }
+
+// Resets the facade to its state at creation when a test ends.
+class CMetryFacade : public ::testing::Test {
+protected:
+    void TearDown() override {
+        CMetry& cmetry = *CMetry::Instance();
+        cmetry.SetMeasuringConditions(MeasuringCondition());
+        cmetry.EnterWhite(Flat(0.0f));
+    }
+};
+
+}  // namespace
+
+TEST(IllumClass, TypesSelectTheirTableNameAndOthersTheDefault) {
+    const std::pair<int, const char*> table[] = {
+        {0, "A"},      {1, "C"},      {2, "D65"},    {3, "D50"},    {24, "FL1"},
+        {28, "FL5"},   {32, "FL9"},   {33, "FL10"},  {34, "FL11"},  {35, "FL12"},
+        {40, "D55"},   {41, "D75"},   {50, "E"},
+    };
+    for (const auto& entry : table) {
+        const IllumClass illuminant(static_cast<IllumType>(entry.first), 0);
+        EXPECT_EQ(illuminant.GetName(), entry.second);
+        EXPECT_EQ(illuminant.GetIllumType(), entry.first);
+    }
+    for (int type : {4, 23, 36, 39, 42, 49, 51, -1}) {
+        EXPECT_EQ(IllumClass(static_cast<IllumType>(type), 0).GetName(), "D50") << type;
+    }
+    EXPECT_EQ(IllumClass().GetName(), "D50");
+    EXPECT_EQ(IllumClass(std::string("unknown")).GetName(), "D50");
+
+    // A caller-owned illuminant is copied, so the class outlives it.
+    std::unique_ptr<IllumClass> kept;
+    {
+        const auto d65 = klume::cmetry::IlluminantRepository::Get("D65");
+        const auto own = klume::cmetry::MakeIlluminant("Mine", "test", d65->GetWavelengths(),
+                                                       d65->GetPowers());
+        kept.reset(new IllumClass(*own));
+        EXPECT_EQ(IllumClass(*d65).GetIlluminant(), d65);
+    }
+    EXPECT_EQ(kept->GetName(), "Mine");
+    EXPECT_EQ(kept->GetIllumType(), ILLUM_UNKNOWN);
+}
+
+TEST(ObserverClass, NamesTypesAndTheDegreeString) {
+    EXPECT_EQ(ObserverClass(OBSERVER_2DEG).GetName(), "2");
+    EXPECT_EQ(ObserverClass(OBSERVER_10DEG).GetObserver()->GetFieldSize(), 10);
+    EXPECT_EQ(ObserverClass(String("10")).GetObserverType(), OBSERVER_10DEG);
+    EXPECT_EQ(ObserverClass(String("2\xB0")).GetObserverType(), OBSERVER_2DEG);
+    EXPECT_EQ(ObserverClass(String("10deg")).GetObserverType(), OBSERVER_10DEG);
+    const ObserverClass unknown(String("7"));
+    EXPECT_EQ(unknown.GetObserverType(), OBSERVER_UNKNOWN);
+    EXPECT_EQ(unknown.GetObserver()->GetName(), "2");
+    EXPECT_EQ(static_cast<ObserverType>(ObserverClass(static_cast<ObserverType>(5))),
+              OBSERVER_UNKNOWN);
+
+    const String saved = ObserverClass::GetDegreeString();
+    EXPECT_EQ(static_cast<String>(ObserverClass(OBSERVER_10DEG)), String("10\xB0"));
+    ObserverClass::SetDegreeString(String(" deg"));
+    EXPECT_EQ(static_cast<String>(ObserverClass(OBSERVER_2DEG)), String("2 deg"));
+    ObserverClass::SetDegreeString(saved);
+}
+
+TEST(Filter, SumsDotProductsAndDefinition) {
+    Filter empty;
+    EXPECT_FALSE(empty.isDefined());
+    EXPECT_EQ(empty.FilterSumme(), 0.0f);
+
+    float weights[Filter::kSize];
+    for (int i = 0; i < Filter::kSize; ++i) weights[i] = static_cast<float>(i);
+    Filter ramp(weights);
+    EXPECT_TRUE(ramp.isDefined());
+    EXPECT_EQ(ramp.FilterSumme(), 630.0f);  // 0 + 1 + ... + 35
+    EXPECT_EQ(ramp * std::vector<float>(36, 2.0f), 1260.0f);
+    EXPECT_THROW(ramp * std::vector<float>(35, 2.0f), std::logic_error);
+
+    static_cast<float*>(ramp)[0] = 100.0f;  // writing through the pointer
+    EXPECT_EQ(ramp.FilterSumme(), 730.0f);  // invalidates the cached sum
+
+    const Filter squares = ramp.FilterXFilter(ramp);
+    EXPECT_EQ(squares.GetWeights()[3], 9.0f);
+    EXPECT_TRUE(squares.isDefined());
+    ramp.Init(0.5f);
+    EXPECT_EQ(ramp.FilterSumme(), 18.0f);
+    ramp.Define(0);
+    EXPECT_FALSE(ramp.isDefined());
+}
+
+TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
+    const CMetryFilter defaults;
+    EXPECT_EQ(defaults.GetIllum().GetName(), "D65");
+    EXPECT_EQ(defaults.GetObserver().GetName(), "2");
+    const auto provider = klume::cmetry::CMetryFilter::Find("D65", "2");
+    for (unsigned short c = 0; c < 3; ++c) {
+        for (int i = 0; i < Filter::kSize; ++i) {
+            EXPECT_EQ(defaults[c].GetWeights()[i], static_cast<float>(provider->GetWeights(c)[i]));
+            EXPECT_EQ(defaults.GetWeightTable()[c * Filter::kSize + i], defaults[c].GetWeights()[i]);
+        }
+    }
+    EXPECT_NEAR(defaults.GetWeightSum(1), 100.0f, 1e-4f);
+
+    const CMetryFilter a10(Lichtart(IllumClass(ILLUM_A, 0)), Observer(OBSERVER_10DEG));
+    EXPECT_EQ(a10.GetIllum().GetName(), "A");
+    EXPECT_EQ(a10.GetObserver().GetObserverType(), OBSERVER_10DEG);
+    EXPECT_EQ(a10.GetProviderFilter(), klume::cmetry::CMetryFilter::Find("A", "10"));
+}
+
+TEST(CMetryFilter, ColorCheckerTristimulusValuesMatchTheReference) {
+    const auto samples =
+        nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
+    const auto reference = nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
+    ASSERT_EQ(samples.size(), 24u);
+    ASSERT_EQ(reference.size(), 24u);
+    const CMetryFilter filter(Lichtart(IllumClass(ILLUM_D50, 0)), Observer(OBSERVER_2DEG));
+    const float ySum = filter.GetWeightSum(1);
+    double worst = 0.0;
+    for (std::size_t p = 0; p < samples.size(); ++p) {
+        SCOPED_TRACE(samples[p][1]);
+        std::vector<float> values;
+        for (int i = 0; i < Spectrum::kSize; ++i) {
+            values.push_back(static_cast<float>(nxtest::ToDouble(samples[p][2 + i])));
+        }
+        const ReflectanceSpectrum spectrum(values, PhysicalConditions());
+        float sums[3];
+        filter.Tristimulus(spectrum.GetData(), sums);
+        for (int c = 0; c < 3; ++c) {
+            const double xyz = 100.0 * sums[c] / ySum;
+            const double expected = nxtest::ToDouble(reference[p][2 + c]);
+            EXPECT_NEAR(xyz, expected, kXyzTolerance) << "channel " << c;
+            worst = std::max(worst, std::fabs(xyz - expected));
+            // The vector dot product of a filter gives the same raw sum.
+            EXPECT_EQ(filter[static_cast<unsigned short>(c)] * values, sums[c]);
+        }
+    }
+    ::testing::Test::RecordProperty("worst_xyz_error", nxtest::Scientific(worst));
+}
+
+TEST(CMetryFilter, ConcurrentFirstUseFromSeveralThreadsGivesOneTable) {
+    constexpr int kThreads = 6;
+    std::vector<boost::shared_ptr<const klume::cmetry::CMetryFilter>> seen(kThreads);
+    std::atomic<int> ready{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < kThreads; ++t) {
+        threads.emplace_back([&, t] {
+            ++ready;
+            while (ready.load() < kThreads) std::this_thread::yield();
+            const CMetryFilter filter(Lichtart(IllumClass(ILLUM_FL3, 0)),
+                                      Observer(OBSERVER_10DEG));
+            seen[t] = filter.GetProviderFilter();
+        });
+    }
+    for (std::thread& thread : threads) thread.join();
+    for (const auto& filter : seen) EXPECT_EQ(filter, seen[0]);
+}
+
+TEST(ActualFilterClass, NamesGeometriesAndDisplayNames) {
+    EXPECT_EQ(ActualFilterClass().GetType(), 0x1FFFFFFF);
+    const std::pair<const char*, ActualFilterClass::Geometry> names[] = {
+        {"No", ActualFilterClass::GEOMETRY_45_0},     {"Pol", ActualFilterClass::GEOMETRY_45_0},
+        {"D65", ActualFilterClass::GEOMETRY_45_0},    {"UV", ActualFilterClass::GEOMETRY_45_0},
+        {"UVCut", ActualFilterClass::GEOMETRY_45_0},  {"Custom", ActualFilterClass::GEOMETRY_45_0},
+        {"Repro", ActualFilterClass::GEOMETRY_45_0},  {"D8t", ActualFilterClass::GEOMETRY_D8T},
+        {"D8e", ActualFilterClass::GEOMETRY_D8E},     {"D8i", ActualFilterClass::GEOMETRY_D8I},
+    };
+    for (const auto& entry : names) {
+        const ActualFilterClass filter{String(entry.first)};
+        EXPECT_EQ(static_cast<String>(filter), String(entry.first));
+        EXPECT_EQ(filter.GetGeometry(), entry.second) << entry.first;
+    }
+    EXPECT_EQ(ActualFilterClass(String("Cust")).GetType(), FILTER_CUSTOM);
+    EXPECT_EQ(ActualFilterClass(String("uvcut")).GetType(), FILTER_UVCUT);
+    EXPECT_EQ(ActualFilterClass(String("Sepia")).GetType(), FILTER_DEFAULT);
+    EXPECT_EQ(ActualFilterClass().GetGeometry(), ActualFilterClass::GEOMETRY_UNDEFINED);
+
+    EXPECT_EQ(ActualFilterClass::GetDisplayName(FILTER_POL), String("Pol"));
+    ActualFilterClass::SetDisplayFilterName(FILTER_POL, String("Polfilter"));
+    EXPECT_EQ(ActualFilterClass(FILTER_POL).GetDisplayName(), String("Polfilter"));
+    EXPECT_EQ(static_cast<String>(ActualFilterClass(FILTER_POL)), String("Pol"));
+
+    const PhysicalConditions physical(FILTER_D8I, WBaseClass(String("paper")),
+                                      PhysicalConditions::SURFACE_WET);
+    EXPECT_EQ(static_cast<String>(physical), String("D8i,Paper,2"));
+}
+
+TEST(DStdClass, TypesSelectStandardsAndMissingOnesFallBackToStatusE) {
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv log("NXBASE_LOG_PATH", dir.File("log"));
+    nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
+    EXPECT_EQ(DStdClass(DSTD_STATUS_A).GetName(), "Status A");
+    EXPECT_EQ(DStdClass(DSTD_STATUS_T).GetDStdType(), DSTD_STATUS_T);
+    EXPECT_EQ(DStdClass(DSTD_STATUS_M).GetName(), "Status M");
+    EXPECT_EQ(DStdClass(static_cast<DStdType>(7)).GetName(), "Status E");
+    EXPECT_EQ(DStdClass(static_cast<DStdType>(5)).GetName(), "Status E");
+    EXPECT_EQ(DStdClass().GetDStdType(), DSTD_STATUS_E);
+    // Without an installed table there is no DIN NB curve to use.
+    EXPECT_EQ(DStdClass(DSTD_DIN_NB).GetName(), "Status E");
+
+    std::filesystem::create_directories(dir.path() / "density");
+    nxtest::WriteFile(dir.File("density/din_nb_log10.csv"),
+                      "wavelength,red,green,blue\n600,5,4,3\n610,4,5,3\n620,3,4,5\n");
+    const DStdClass installed(DSTD_DIN_NB);
+    EXPECT_EQ(installed.GetName(), "DIN NB");
+    EXPECT_EQ(installed.GetDStdType(), DSTD_DIN_NB);
+}
+
+TEST(DichteFilter, DensitiesOfWhiteAndGreyReflectors) {
+    for (DStdType type : {DSTD_STATUS_A, DSTD_STATUS_T, DSTD_STATUS_M, DSTD_STATUS_E}) {
+        const DichteFilter filter{DStdClass(type)};
+        ASSERT_EQ(filter.GetChannelCount(), 3);
+        for (unsigned short c = 0; c < 3; ++c) {
+            float density = -1.0f;
+            ASSERT_TRUE(filter.GetDensity(Flat(1.0f), c, density));
+            EXPECT_NEAR(density, 0.0f, kDensityTolerance);
+            ASSERT_TRUE(filter.GetDensity(Flat(0.1f), c, density));
+            EXPECT_NEAR(density, 1.0f, kDensityTolerance);
+            ASSERT_TRUE(filter.GetDensity(Flat(0.01f), c, density));
+            EXPECT_NEAR(density, 2.0f, kDensityTolerance);
+        }
+        float untouched = 7.0f;
+        EXPECT_FALSE(filter.GetDensity(Flat(0.0f), 0, untouched));
+        EXPECT_FALSE(filter.GetDensity(Flat(0.5f), 3, untouched));
+        EXPECT_EQ(untouched, 7.0f);
+    }
+    // A cyan ink absorbs red: high red-filter density, low blue-filter one.
+    std::vector<float> cyan(36, 0.8f);
+    for (int i = (580 - 380) / 10; i < 36; ++i) cyan[i] = 0.05f;
+    const DichteFilter statusT{DStdClass(DSTD_STATUS_T)};
+    float red = 0.0f;
+    float blue = 0.0f;
+    ASSERT_TRUE(statusT.GetDensity(Spectrum(cyan), 0, red));
+    ASSERT_TRUE(statusT.GetDensity(Spectrum(cyan), 2, blue));
+    EXPECT_GT(red, 1.2f);
+    EXPECT_LT(blue, 0.15f);
+}
+
+TEST(MeasuringCondition, StringShowsIlluminantAndObserverOrQuestionMarks) {
+    const String saved = ObserverClass::GetDegreeString();
+    ObserverClass::SetDegreeString(String("deg"));
+    const MeasuringCondition d65(IllumClass(ILLUM_D65, 0), ObserverClass(OBSERVER_10DEG),
+                                 PhysicalConditions());
+    EXPECT_EQ(d65.GetMeasuringConditionString(), "D65,10deg");
+    EXPECT_EQ(static_cast<String>(d65), String("D65,10deg,Status E,Default,Absolute,0"));
+
+    const auto d50 = klume::cmetry::IlluminantRepository::Get("D50");
+    const auto custom = klume::cmetry::MakeIlluminant("Lamp", "test", d50->GetWavelengths(),
+                                                      d50->GetPowers());
+    const MeasuringCondition unknown(IllumClass(custom), ObserverClass(String("7")),
+                                     PhysicalConditions());
+    EXPECT_EQ(unknown.GetMeasuringConditionString(), "?,?");
+    ObserverClass::SetDegreeString(saved);
+
+    MeasuringCondition copy(d65);
+    EXPECT_EQ(copy, d65);
+    copy = MeasuringCondition(DStdClass(DSTD_STATUS_A), PhysicalConditions());
+    EXPECT_NE(copy, d65);
+    EXPECT_EQ(copy.GetIllum().GetName(), "D50");
+    EXPECT_EQ(copy.GetDStd().GetName(), "Status A");
+}
+
+TEST_F(CMetryFacade, StartsWithD50AndTheTwoDegreeObserver) {
+    const boost::shared_ptr<CMetry> cmetry = CMetry::Instance();
+    EXPECT_EQ(cmetry, CMetry::Instance());
+    EXPECT_EQ(cmetry->GetIllum().GetName(), "D50");
+    EXPECT_EQ(cmetry->GetObserver().GetObserverType(), OBSERVER_2DEG);
+    EXPECT_EQ(cmetry->GetLXYZFilter()->GetIllum().GetName(), "D50");
+    EXPECT_EQ(cmetry->GetDensityStandard()->GetName(), "Status E");
+    EXPECT_FALSE(cmetry->IsPaperSpectrumDefined());
+}
+
+TEST_F(CMetryFacade, SetCMetryRebuildsTheSumFilterButNotTheRgbFilter) {
+    CMetry& cmetry = *CMetry::Instance();
+    const boost::shared_ptr<CMetryFilter> before = cmetry.GetLXYZFilter();
+    cmetry.SetCMetry(IllumClass(ILLUM_FL11, 0), ObserverClass(OBSERVER_10DEG));
+    EXPECT_EQ(cmetry.GetLXYZFilter()->GetIllum().GetName(), "FL11");
+    EXPECT_EQ(before->GetIllum().GetName(), "D50");  // a held filter stays alive
+
+    const CMetryFilter e10(Lichtart(IllumClass(ILLUM_E, 0)), Observer(OBSERVER_10DEG));
+    for (int i = 0; i < Filter::kSize; ++i) {
+        EXPECT_EQ(cmetry.GetSumFilter().GetWeights()[i],
+                  e10.GetWeights(0)[i] + e10.GetWeights(1)[i] + e10.GetWeights(2)[i]);
+    }
+    EXPECT_TRUE(cmetry.GetSumFilter().isDefined());
+
+    const CMetryFilter& rgb = CMetry::GetRGBFilter();
+    EXPECT_EQ(&rgb, &CMetry::GetRGBFilter());
+    EXPECT_EQ(rgb.GetIllum().GetName(), "D65");
+    EXPECT_EQ(rgb.GetObserver().GetObserverType(), OBSERVER_2DEG);
+
+    const MeasuringCondition condition(IllumClass(ILLUM_A, 0), ObserverClass(OBSERVER_2DEG),
+                                       DStdClass(DSTD_STATUS_T),
+                                       PhysicalConditions(FILTER_UVCUT));
+    cmetry.SetMeasuringConditions(condition);
+    EXPECT_EQ(cmetry.GetMeasuringConditions(), condition);
+    EXPECT_EQ(cmetry.GetDichteFilter().GetDStd().GetName(), "Status T");
+    EXPECT_EQ(cmetry.GetPhysicalConditions().GetActualFilter(), ActualFilterClass(FILTER_UVCUT));
+}
+
+TEST_F(CMetryFacade, EnterWhiteDefinesOrResetsThePaper) {
+    CMetry& cmetry = *CMetry::Instance();
+    cmetry.EnterWhite(Flat(0.9f));
+    EXPECT_TRUE(cmetry.IsPaperSpectrumDefined());
+    EXPECT_EQ(cmetry.GetPaperSpectrum()[0], 0.9f);
+    float density = 0.0f;
+    ASSERT_TRUE(cmetry.GetDensity(Flat(0.09f), 1, density, true));
+    EXPECT_NEAR(density, 1.0f, kDensityTolerance);
+
+    std::vector<float> canceling(36, 0.0f);
+    canceling[0] = 1.0f;
+    canceling[1] = -1.0f;
+    cmetry.EnterWhite(ReflectanceSpectrum(canceling, PhysicalConditions()));
+    EXPECT_FALSE(cmetry.IsPaperSpectrumDefined());  // sums to exactly 0.0
+    ASSERT_TRUE(cmetry.GetDensity(Flat(0.09f), 1, density, true));
+    EXPECT_NEAR(density, -std::log10(0.09f), kDensityTolerance);
+}
+
+TEST_F(CMetryFacade, MaxDensityPrefersTheSampleNearest560Nanometres) {
+    CMetry& cmetry = *CMetry::Instance();
+    float density = 0.0f;
+    EXPECT_EQ(cmetry.GetMaxDensity(Flat(0.1f), density, false), 560);
+    EXPECT_EQ(density, -std::log10(0.1f));
+
+    ReflectanceSpectrum spectrum = Flat(0.5f);
+    spectrum[(480 - 380) / 10] = 0.2f;  // 8 samples below 560 nm
+    spectrum[(640 - 380) / 10] = 0.2f;  // 8 samples above: the later wins
+    EXPECT_EQ(cmetry.GetMaxDensity(spectrum, density, false), 640);
+    spectrum[(540 - 380) / 10] = 0.2f;  // nearer than both
+    EXPECT_EQ(cmetry.GetMaxDensity(spectrum, density, false), 540);
+    spectrum[(390 - 380) / 10] = 0.001f;  // outside 410..700 nm
+    spectrum[(710 - 380) / 10] = 0.001f;
+    EXPECT_EQ(cmetry.GetMaxDensity(spectrum, density, false), 540);
+
+    EXPECT_EQ(cmetry.GetMaxDensity(Flat(0.0f), density, false), 380);
+    EXPECT_EQ(density, -4.0f);
+
+    // Relative to a paper that is half as bright at 600 nm only.
+    ReflectanceSpectrum paper = Flat(1.0f);
+    paper[(600 - 380) / 10] = 0.25f;
+    cmetry.EnterWhite(paper);
+    const ReflectanceSpectrum sample = Flat(0.25f);
+    EXPECT_EQ(cmetry.GetMaxDensity(sample, density, false), 560);
+    EXPECT_NE(cmetry.GetMaxDensity(sample, density, true), 600);
+    EXPECT_EQ(density, -std::log10(0.25f));
+}
+
+TEST(CMetry, ToEqualStrengthMatchesKubelkaMunkSums) {
+    ReflectanceSpectrum white = Flat(1.0f);
+    CMetry::ToEqualStrength(white, Flat(0.5f));
+    EXPECT_EQ(white, Flat(1.0f));  // K/S 0 stays 0 whatever the ratio
+
+    // A sample twice as strong as the reference comes back to the reference.
+    const auto ks = [](float r) { return (1.0f - r) * (1.0f - r) / (2.0f * r); };
+    const float reference = 0.4f;
+    const float k = 2.0f * ks(reference);
+    const float strong = k + 1.0f - std::sqrt(k * (k + 2.0f));
+    ReflectanceSpectrum sample = Flat(strong);
+    const ReflectanceSpectrum ref = Flat(reference);
+    CMetry::ToEqualStrength(sample, ref);
+    for (int i = 0; i < Spectrum::kSize; ++i) EXPECT_NEAR(sample[i], reference, 1e-5f);
+    EXPECT_EQ(ref, Flat(reference));  // the reference is not changed
+}
+
+TEST_F(CMetryFacade, InstalledIlluminantWorksThroughTheFacade) {
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
+    std::filesystem::create_directories(dir.path() / "illuminants");
+    // A flat light: the same weights as illuminant E.
+    nxtest::WriteFile(dir.File("illuminants/Flat.csv"), "wavelength,value\n300,7\n900,7\n");
+    const IllumClass flat(std::string("Flat"));
+    EXPECT_EQ(flat.GetName(), "Flat");
+    EXPECT_EQ(flat.GetIllumType(), ILLUM_UNKNOWN);
+
+    CMetry& cmetry = *CMetry::Instance();
+    cmetry.SetCMetry(flat, ObserverClass(OBSERVER_2DEG));
+    EXPECT_EQ(cmetry.GetMeasuringConditions().GetMeasuringConditionString().substr(0, 2), "?,");
+    const CMetryFilter e2(Lichtart(IllumClass(ILLUM_E, 0)), Observer(OBSERVER_2DEG));
+    for (unsigned short c = 0; c < 3; ++c) {
+        for (int i = 0; i < Filter::kSize; ++i) {
+            EXPECT_FLOAT_EQ(cmetry.GetLXYZFilter()->GetWeights(c)[i], e2.GetWeights(c)[i]);
+        }
+    }
+}

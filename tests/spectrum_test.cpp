@@ -1,0 +1,160 @@
+// Spectra: value semantics, the size check, maximum and deviation rules, and
+// the copy-versus-assignment asymmetry of reflectance spectra.
+#include <gtest/gtest.h>
+
+#include <limits>
+#include <stdexcept>
+#include <vector>
+
+#include "nxbase/spectrum.h"
+
+namespace {
+
+class Note : public IAdditionalSpectrumInfo {
+public:
+    Note(InfoType type, int value) : amType(type), amValue(value) {}
+    InfoType GetType() const override { return amType; }
+    int Value() const { return amValue; }
+
+private:
+    InfoType amType;
+    int amValue;
+};
+
+const auto kFirstKey = static_cast<IAdditionalSpectrumInfo::InfoType>(1);
+const auto kSecondKey = static_cast<IAdditionalSpectrumInfo::InfoType>(7);
+
+std::vector<float> Ramp() {
+    std::vector<float> values;
+    for (int i = 0; i < Spectrum::kSize; ++i) values.push_back(0.01f * static_cast<float>(i));
+    return values;
+}
+
+}  // namespace
+
+TEST(Spectrum, SetValuesRejectsAnyOtherSizeAndKeepsTheOldValues) {
+    Spectrum spectrum(Ramp());
+    for (std::size_t size : {0u, 35u, 37u, 360u}) {
+        try {
+            spectrum.SetValues(std::vector<float>(size, 9.0f));
+            ADD_FAILURE() << "no exception for size " << size;
+        } catch (const std::logic_error& e) {
+            EXPECT_STREQ(e.what(), "Illegal spectrum size");
+        }
+        EXPECT_EQ(spectrum.GetValues(), Ramp());
+    }
+    spectrum.SetValues(std::vector<float>(36, 0.5f));
+    EXPECT_EQ(spectrum, Spectrum(0.5f));
+    // The vector constructors do not check; a short vector leaves zeros.
+    EXPECT_EQ(Spectrum(std::vector<double>{0.25, 0.5})[1], 0.5f);
+    EXPECT_EQ(Spectrum(std::vector<double>{0.25, 0.5})[35], 0.0f);
+}
+
+TEST(Spectrum, MaximumTakesTheFirstPositiveMaximumAndDefaultsTo380) {
+    int wavelength = -1;
+    EXPECT_EQ(Spectrum::CreateBlackSpectrum().Maximum(wavelength), 0.0f);
+    EXPECT_EQ(wavelength, 380);
+    EXPECT_EQ(Spectrum(-0.5f).Maximum(wavelength), 0.0f);
+    EXPECT_EQ(wavelength, 380);
+
+    Spectrum peaks(0.1f);
+    peaks[(500 - 380) / 10] = 0.9f;
+    peaks[(600 - 380) / 10] = 0.9f;
+    EXPECT_EQ(peaks.Maximum(wavelength), 0.9f);
+    EXPECT_EQ(wavelength, 500);
+    peaks[35] = 1.5f;
+    EXPECT_EQ(peaks.Maximum(wavelength), 1.5f);
+    EXPECT_EQ(wavelength, 730);
+}
+
+TEST(Spectrum, SpectralDeviationCoversOnly400To700Nanometres) {
+    const Spectrum a(0.5f);
+    Spectrum b(a);
+    b[0] = 0.9f;
+    b[1] = 0.9f;
+    b[33] = 0.9f;
+    b[35] = 0.0f;
+    EXPECT_EQ(a.GetSpectralDeviation(b), 0.0);
+    b[2] = 0.75f;   // 400 nm
+    b[32] = 0.25f;  // 700 nm
+    EXPECT_DOUBLE_EQ(a.GetSpectralDeviation(b), 0.5);
+    EXPECT_DOUBLE_EQ(b.GetSpectralDeviation(a), 0.5);
+}
+
+TEST(Spectrum, ArithmeticIsElementWiseAndFollowsIeeeRules) {
+    const Spectrum ramp(Ramp());
+    const Spectrum two(2.0f);
+    const float v = ramp[10];
+    EXPECT_EQ((ramp + two)[10], v + 2.0f);
+    EXPECT_EQ((ramp - two)[10], v - 2.0f);
+    EXPECT_EQ((ramp * 3.0)[10], v * 3.0f);
+    EXPECT_EQ((3.0 * ramp)[10], v * 3.0f);
+    EXPECT_EQ((ramp / 4.0)[10], v / 4.0f);
+    Spectrum product(ramp);
+    product *= two;
+    product /= Spectrum(4.0f);
+    EXPECT_EQ(product[10], v * 2.0f / 4.0f);
+    Spectrum zero(ramp);
+    zero /= 0.0f;
+    EXPECT_EQ(zero[1], std::numeric_limits<float>::infinity());
+    EXPECT_NE(zero[0], zero[0]);  // 0 / 0 is NaN
+    EXPECT_FLOAT_EQ(Spectrum::CreateWhiteSpectrum().Summe(), 36.0f);
+    EXPECT_NE(ramp, ramp + Spectrum(1e-7f));
+}
+
+TEST(ReflectanceSpectrum, CopySharesTheInformationButAssignmentKeepsTheReceivers) {
+    ReflectanceSpectrum source(Ramp(), PhysicalConditions(ActualFilterClass(FILTER_POL)));
+    const boost::shared_ptr<IAdditionalSpectrumInfo> sourceNote(new Note(kSecondKey, 1));
+    source.SetAdditionalInfo(sourceNote);
+
+    const ReflectanceSpectrum copy(source);
+    ASSERT_EQ(copy.GetAdditionalInfo().size(), 1u);
+    EXPECT_EQ(copy.GetAdditionalInfo(kSecondKey), sourceNote);  // shared, not cloned
+
+    ReflectanceSpectrum target(0.3f, PhysicalConditions());
+    const boost::shared_ptr<IAdditionalSpectrumInfo> targetNote(new Note(kFirstKey, 2));
+    target.SetAdditionalInfo(targetNote);
+    target = source;
+    EXPECT_EQ(target.GetValues(), Ramp());
+    EXPECT_EQ(target.GetPhysicalConditions(), source.GetPhysicalConditions());
+    ASSERT_EQ(target.GetAdditionalInfo().size(), 1u);
+    EXPECT_EQ(target.GetAdditionalInfo(kFirstKey), targetNote);
+    EXPECT_FALSE(target.GetAdditionalInfo(kSecondKey));
+    EXPECT_EQ(target, source);  // information takes no part in equality
+
+    target = *&target;  // self-assignment changes nothing
+    EXPECT_EQ(target.GetAdditionalInfo(kFirstKey), targetNote);
+
+    // Free operators copy the left operand, information included.
+    const ReflectanceSpectrum sum = source + Spectrum(1.0f);
+    EXPECT_EQ(sum.GetAdditionalInfo(kSecondKey), sourceNote);
+    EXPECT_EQ(sum.GetPhysicalConditions().GetActualFilter(), ActualFilterClass(FILTER_POL));
+    EXPECT_EQ(sum[10], 0.1f + 1.0f);
+}
+
+TEST(ReflectanceSpectrum, InformationIsKeyedByTypeAndOrderedByKey) {
+    ReflectanceSpectrum spectrum;
+    EXPECT_EQ(spectrum.GetPhysicalConditions().GetActualFilter().GetType(), 0x1FFFFFFF);
+    spectrum.SetAdditionalInfo(boost::shared_ptr<IAdditionalSpectrumInfo>(new Note(kSecondKey, 1)));
+    spectrum.SetAdditionalInfo(boost::shared_ptr<IAdditionalSpectrumInfo>(new Note(kFirstKey, 2)));
+    spectrum.SetAdditionalInfo(boost::shared_ptr<IAdditionalSpectrumInfo>(new Note(kSecondKey, 3)));
+    spectrum.SetAdditionalInfo(boost::shared_ptr<IAdditionalSpectrumInfo>());
+    const auto all = spectrum.GetAdditionalInfo();
+    ASSERT_EQ(all.size(), 2u);
+    EXPECT_EQ(all[0]->GetType(), kFirstKey);
+    EXPECT_EQ(static_cast<const Note&>(*all[1]).Value(), 3);  // replaced
+}
+
+TEST(ReflectanceSpectrum, EqualityNeedsEqualValuesAndPhysicalConditions) {
+    const ReflectanceSpectrum dry(
+        0.5f, PhysicalConditions(FILTER_NO, WBASE_ABSOLUTE, PhysicalConditions::SURFACE_DRY));
+    ReflectanceSpectrum wet(dry);
+    EXPECT_EQ(dry, wet);
+    wet.SetSurfaceType(PhysicalConditions::SURFACE_WET);
+    EXPECT_NE(dry, wet);
+    ReflectanceSpectrum filtered(dry);
+    filtered.SetPhysicalFilter(ActualFilterClass(FILTER_UVCUT));
+    EXPECT_NE(dry, filtered);
+    EXPECT_EQ(filtered.GetPhysicalConditions().GetSurfaceType(),
+              PhysicalConditions::SURFACE_DRY);
+}

@@ -1,0 +1,179 @@
+// nxcolor's quantities and output layouts.
+#include "report.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cmath>
+
+namespace nxcolor {
+namespace {
+
+// The process-wide Lab type set for one computation and restored after it.
+class ScopedLabType {
+public:
+    explicit ScopedLabType(LabColorSpaceType type) : amPrevious(LABVector::GetColorSpaceType()) {
+        LABVector::SetColorSpaceType(type);
+    }
+    ~ScopedLabType() { LABVector::SetColorSpaceType(amPrevious); }
+    ScopedLabType(const ScopedLabType&) = delete;
+    ScopedLabType& operator=(const ScopedLabType&) = delete;
+
+private:
+    LabColorSpaceType amPrevious;
+};
+
+void CopyThree(const ColorVector& v, float* pOut) {
+    for (int i = 0; i < 3; ++i) pOut[i] = v[i];
+}
+
+std::vector<Quantity> MakeQuantities() {
+    std::vector<Quantity> q;
+    q.push_back({"xyz", {{"X"}, {"Y"}, {"Z"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
+                     CopyThree(XYZVector(filter, s), out);
+                 }});
+    q.push_back({"xyy", {{"x"}, {"y"}, {"Y"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
+                     CopyThree(xyYVector(XYZVector(filter, s)), out);
+                 }});
+    q.push_back({"lab", {{"L*"}, {"a*"}, {"b*"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType cie(LAB_CIE1976);
+                     CopyThree(LABVector(s, mc), out);
+                 }});
+    q.push_back({"lch", {{"C*"}, {"h"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType cie(LAB_CIE1976);
+                     const LChVector lch{LABVector(s, mc)};
+                     out[0] = lch[1];
+                     out[1] = lch[2];
+                 }});
+    q.push_back({"din99", {{"L99"}, {"a99"}, {"b99"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType din(LAB_DIN99);
+                     CopyThree(LABVector(s, mc), out);
+                 }});
+    return q;
+}
+
+bool NeedsQuotes(const std::string& text) {
+    return text.find_first_of(",\"\n\r") != std::string::npos;
+}
+
+std::string CsvField(const std::string& text) {
+    if (!NeedsQuotes(text)) return text;
+    std::string out = "\"";
+    for (char c : text) {
+        if (c == '"') out += '"';
+        out += c;
+    }
+    return out + "\"";
+}
+
+void WriteCsv(const Report& report, std::ostream& out) {
+    out << "id";
+    for (const Column& c : report.columns) out << ',' << CsvField(c.name);
+    out << '\n';
+    for (const ReportRow& row : report.rows) {
+        out << CsvField(row.id);
+        for (std::size_t i = 0; i < row.values.size(); ++i) {
+            out << ',' << FormatNumber(row.values[i], report.columns[i].precision);
+        }
+        out << '\n';
+    }
+}
+
+void WriteTable(const Report& report, std::ostream& out) {
+    out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
+        << report.illuminant << ", observer " << report.observer << "\xC2\xB0\n";
+    std::size_t idWidth = 2;
+    for (const ReportRow& row : report.rows) idWidth = std::max(idWidth, row.id.size());
+    // Each column as wide as its widest entry.
+    std::vector<std::size_t> widths;
+    std::vector<std::vector<std::string>> cells(report.rows.size());
+    for (std::size_t c = 0; c < report.columns.size(); ++c) {
+        std::size_t width = report.columns[c].name.size();
+        for (std::size_t r = 0; r < report.rows.size(); ++r) {
+            cells[r].push_back(FormatNumber(report.rows[r].values[c], report.columns[c].precision));
+            width = std::max(width, cells[r].back().size());
+        }
+        widths.push_back(width);
+    }
+    auto pad = [&out](const std::string& text, std::size_t width, bool left) {
+        if (left) out << text;
+        for (std::size_t i = text.size(); i < width; ++i) out << ' ';
+        if (!left) out << text;
+    };
+    pad("id", idWidth, true);
+    for (std::size_t c = 0; c < report.columns.size(); ++c) {
+        out << "  ";
+        pad(report.columns[c].name, widths[c], false);
+    }
+    out << '\n';
+    for (std::size_t r = 0; r < report.rows.size(); ++r) {
+        pad(report.rows[r].id, idWidth, true);
+        for (std::size_t c = 0; c < cells[r].size(); ++c) {
+            out << "  ";
+            pad(cells[r][c], widths[c], false);
+        }
+        out << '\n';
+    }
+}
+
+}  // namespace
+
+const std::vector<Quantity>& Quantities() {
+    static const std::vector<Quantity> quantities = MakeQuantities();
+    return quantities;
+}
+
+Report Evaluate(const SpectraTable& table, const std::string& source,
+                const MeasuringCondition& condition, const std::vector<std::string>& quantities,
+                int precision) {
+    Report report;
+    report.source = source;
+    report.illuminant = condition.GetIllum().GetName();
+    report.observer = condition.GetObserver().GetName().str();
+    std::vector<const Quantity*> chosen;
+    for (const Quantity& q : Quantities()) {
+        if (std::find(quantities.begin(), quantities.end(), q.key) == quantities.end()) continue;
+        chosen.push_back(&q);
+        for (Column c : q.columns) {
+            c.precision = precision;
+            report.columns.push_back(c);
+        }
+    }
+    for (const SpectrumRow& in : table.rows) {
+        ReportRow row;
+        row.id = in.id;
+        row.spectrum = in.values;
+        const ReflectanceSpectrum spectrum(in.values.data(), PhysicalConditions());
+        for (const Quantity* q : chosen) {
+            float values[8] = {};
+            q->compute(spectrum, condition, values);
+            row.values.insert(row.values.end(), values, values + q->columns.size());
+        }
+        report.rows.push_back(std::move(row));
+    }
+    return report;
+}
+
+const std::map<std::string, Writer>& Writers() {
+    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}};
+    return writers;
+}
+
+std::string FormatNumber(float value, int precision) {
+    char buffer[64];
+    double v = value;
+    if (v == 0.0) v = 0.0;  // no "-0.0000"
+    const auto result = std::to_chars(buffer, buffer + sizeof buffer, v, std::chars_format::fixed, precision);
+    std::string text(buffer, result.ptr);
+    // A tiny negative value rounds to "-0.00": print it unsigned.
+    if (text.front() == '-' && text.find_first_not_of("-0.") == std::string::npos) text.erase(0, 1);
+    return text;
+}
+
+}  // namespace nxcolor

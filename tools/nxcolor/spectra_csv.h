@@ -1,0 +1,60 @@
+// Reading reflectance spectra from CSV text for nxcolor: rows of optional id
+// fields followed by 36 reflectance factors, 380..730 nm in 10 nm steps.
+//
+// Format: fields separated by ","; double quotes around a field are removed
+// ("" inside stands for one quote); blank lines and lines starting with "#"
+// are skipped; CR LF line ends and a UTF-8 byte order mark are accepted.
+// Numbers are read with "." as decimal separator whatever the locale. An
+// optional header is the first line whose last field is not a number; its
+// spectral columns are the fields that carry a wavelength ("r380", "380",
+// "nm380", "SPEC_380", "SPECTRAL_NM380") and must be exactly 380..730 nm in
+// 10 nm steps. Without a header the last 36 fields of each row are the values
+// and the fields before them the id.
+#ifndef NXCOLOR_SPECTRA_CSV_H_
+#define NXCOLOR_SPECTRA_CSV_H_
+
+#include <array>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace nxcolor {
+
+constexpr int kSpectrumSize = 36;
+constexpr int kFirstWavelength = 380;
+constexpr int kWavelengthStep = 10;
+// Longest line accepted; longer lines are reported and skipped.
+constexpr std::size_t kMaxLineLength = 64 * 1024;
+// Most id fields a row may have before its values.
+constexpr std::size_t kMaxIdFields = 16;
+
+struct SpectrumRow {
+    std::string id;                         // id fields joined by " "; the row number if none
+    std::array<float, kSpectrumSize> values{};
+    int line = 0;                           // 1-based line in the source
+};
+
+struct SpectraTable {
+    std::vector<SpectrumRow> rows;
+    // One message per rejected row or header, "<source>:<line>: <what>".
+    std::vector<std::string> errors;
+    // A header defines a grid other than 380..730/10 nm: nothing was read.
+    bool badGrid = false;
+};
+
+// Parses `text`; `source` names it in the messages. Each bad row is reported
+// and skipped; the others are kept. `scale` divides every value (100 for
+// percentages). Never throws on any input.
+SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, float scale = 1.0f);
+
+// Reads and parses a file ("-" is standard input). False, with the reason in
+// *error, when the file cannot be read.
+bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, std::string* error);
+
+// The ColorChecker chart built into nxcolor (BabelColor average, 24 patches).
+std::string_view EmbeddedChart();
+const char* EmbeddedChartName();
+
+}  // namespace nxcolor
+
+#endif  // NXCOLOR_SPECTRA_CSV_H_
