@@ -23,6 +23,7 @@ constexpr int kTitleHeight = 56;
 constexpr int kSwatchHeight = 88;
 constexpr int kPlotHeight = 56;
 constexpr int kMaxColumns = 6;
+constexpr std::size_t kMaxIdChars = 26;  // of the bold 13 px id font in a cell
 
 std::string Num(double value, int precision) {
     char buffer[64];
@@ -68,6 +69,21 @@ std::string CurveColour(const ScreenColor& c) {
     return luma > 200.0 ? "#555555" : Hex(c);
 }
 
+// Dark text on light colours, light text on dark ones.
+const char* TextOn(const ScreenColor& c) {
+    double luma = 0.2126 * c.red + 0.7152 * c.green + 0.0722 * c.blue;
+    return luma > 140.0 ? "#222222" : "#f4f4f4";
+}
+
+// Ids longer than a cell is wide end in "...". Cuts before a UTF-8
+// continuation byte never happen: the cut moves back to a character start.
+std::string Shortened(const std::string& id) {
+    if (id.size() <= kMaxIdChars) return id;
+    std::size_t cut = kMaxIdChars - 3;
+    while (cut > 0 && (static_cast<unsigned char>(id[cut]) & 0xC0) == 0x80) --cut;
+    return id.substr(0, cut) + "...";
+}
+
 class ScopedLab {
   public:
     ScopedLab() : previous_(LABVector::GetColorSpaceType()) {
@@ -91,10 +107,12 @@ void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition
     out << "<g transform=\"translate(" << x << "," << y << ")\">\n";
     out << "  <rect width=\"" << w << "\" height=\"" << kSwatchHeight << "\" rx=\"6\" fill=\""
         << Hex(colour) << "\" stroke=\"#888\" stroke-width=\"1\"/>\n";
-    out << "  <text x=\"0\" y=\"" << kSwatchHeight + 16 << "\" class=\"id\">" << Escape(row.id)
-        << "</text>\n";
-    out << "  <text x=\"" << w << "\" y=\"" << kSwatchHeight + 16
-        << "\" class=\"hex\" text-anchor=\"end\">" << Hex(colour) << "</text>\n";
+    // The hex code sits in the swatch's corner, in a colour that reads on it.
+    out << "  <text x=\"" << w - 6 << "\" y=\"" << kSwatchHeight - 7
+        << "\" class=\"hex\" text-anchor=\"end\" fill=\"" << TextOn(colour) << "\">"
+        << Hex(colour) << "</text>\n";
+    out << "  <text x=\"0\" y=\"" << kSwatchHeight + 16 << "\" class=\"id\">"
+        << Escape(Shortened(row.id)) << "</text>\n";
     out << "  <text x=\"0\" y=\"" << kSwatchHeight + 31 << "\" class=\"lab\">L* " << Num(lab[0], 2)
         << "  a* " << Num(lab[1], 2) << "  b* " << Num(lab[2], 2) << "</text>\n";
     // Reflectance 0..1 over 380..730 nm; values above 1 (fluorescence) are
@@ -161,11 +179,12 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
         << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\""
         << height << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
         << "<style>\n"
-        << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; fill: #222; }\n"
+        << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; }\n"
+        << "  .title, .sub, .id, .lab { fill: #222; }\n"
         << "  .title { font-size: 18px; font-weight: bold; }\n"
         << "  .sub { font-size: 12px; fill: #555; }\n"
         << "  .id { font-size: 13px; font-weight: bold; }\n"
-        << "  .hex { font-size: 11px; fill: #666; font-family: 'DejaVu Sans Mono', monospace; }\n"
+        << "  .hex { font-size: 11px; font-family: 'DejaVu Sans Mono', monospace; }\n"
         << "  .lab { font-size: 11px; fill: #444; }\n"
         << "  .plot { fill: #fff; stroke: #ccc; stroke-width: 1; }\n"
         << "  .grid { stroke: #e4e4e4; stroke-width: 1; }\n"
