@@ -135,6 +135,9 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
     ASSERT_TRUE(config.WriteKey("C", "4"));
     EXPECT_EQ(ReadFile(path), withC("4"));
     EXPECT_EQ(Keys(config, "Alpha"), (std::vector<std::string>{"b=2", "a=1", "c=4"}));
+    std::vector<std::string> bulk;
+    for (const auto& [key, value] : config.ReadGroup()) bulk.push_back(key.str() + "=" + value.str());
+    EXPECT_EQ(bulk, Keys(config, "Alpha"));
     EXPECT_EQ(config.GetGroupName(0), "Zeta");
     EXPECT_EQ(config.GetGroupName(1), "Alpha");
     EXPECT_EQ(config.GetGroupName(2), "");
@@ -160,6 +163,23 @@ TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {
     Config reread(path);
     EXPECT_EQ(Keys(reread, "Good"), (std::vector<std::string>{"Key=Value", "Other=spaced value"}));
     EXPECT_EQ(Keys(reread, "Second"), (std::vector<std::string>{"x=1", "y=2"}));
+}
+
+TEST(IniFile, ALinkedFileStaysALinkAndKeepsItsPermissions) {
+    TempDir dir;
+    const std::string real = dir.File("real.ini");
+    const std::string link = dir.File("link.ini");
+    WriteFile(real, "[G]\nOld = 1\n");
+    ::chmod(real.c_str(), 0640);
+    std::filesystem::create_symlink(real, link);
+    Config config(link);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("New", "2"));
+    EXPECT_TRUE(std::filesystem::is_symlink(link));
+    EXPECT_EQ(ReadFile(real), "[G]\nOld = 1\nNew = 2\n");
+    struct stat st {};
+    ASSERT_EQ(::stat(real.c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 0777, 0640u);
 }
 
 TEST(IniFile, RefusesNamesAndValuesThatWouldCorruptTheFile) {

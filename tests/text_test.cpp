@@ -175,6 +175,17 @@ TEST_F(TextTest, MissingFileAndMissingTextsAnswerEmptyWithALogLine) {
     EXPECT_EQ(Text::ConvertText("unchanged").str(), "unchanged");
 }
 
+TEST_F(TextTest, LoadingLogsTheFileAndWithLanguage2EveryLine) {
+    LogFile::Instance()->SetLogOption("Language2", true);
+    std::string path = Write("logged.lng", "{G}\r\n[t]\n");
+    ASSERT_TRUE(Text::LoadText(String(path)));
+    LogFile::Instance()->SetLogOption("Language2", false);
+    EXPECT_TRUE(log->Contains("Language|Loading text: \"" + path + "\""));
+    EXPECT_TRUE(log->Contains("Language|Parse text file: \"" + path + "\""));
+    EXPECT_TRUE(log->Contains("Language2| Read line: {G}"));
+    EXPECT_TRUE(log->Contains("Language2| Read line: [t]"));
+}
+
 TEST_F(TextTest, LanguageFileFallsBackToLanguageOne) {
     Write("Texte1.lng", "{G}\n[english]\n");
     std::string base = dir.File("Texte");

@@ -17,6 +17,8 @@
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "nxbase/singleton.h"
@@ -122,6 +124,9 @@ class NXBASE_EXPORT KLConfig {
     std::uint16_t GetKeyCount(const String& asGroup);
     // The key name at `index` in file order, "" past the end.
     String GetKeyName(const String& asGroup, std::uint16_t alIndex);
+    // Every key of the group with its value, in file order (one look at the
+    // file instead of one per key).
+    std::vector<std::pair<String, String>> GetEntries(const String& asGroup);
     // Removes the group with all its keys.
     bool EmptyGroup(const String& asGroup);
 

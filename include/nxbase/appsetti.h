@@ -19,7 +19,7 @@ class NXBASE_EXPORT NxSetting : public NxSingleton {
 
     // Reads the four keys from the user configuration; does nothing unless
     // UserConfig::IsInitialized(). A "DirectLightPart" that is not a number
-    // reads as 0.5; the display is EYE exactly when the text is "Eye".
+    // (or not finite) reads as 0.5; the display is EYE exactly when the text is "Eye".
     void LoadProperties();
     // Writes the four keys to the user configuration (the direct-light part
     // with 2 decimals); does nothing unless UserConfig::IsInitialized().

@@ -12,6 +12,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <iostream>
 #include <list>
@@ -264,7 +265,17 @@ struct Config::Impl {
     template <class Change>
     bool Modify(Change change) {
         lastError.clear();
-        Fd lock(::open((path + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0666));
+        // A symbolic link (a shared or managed file) stays a link: the file it
+        // names is the one replaced.
+        std::string target = path;
+        struct stat link {};
+        if (::lstat(path.c_str(), &link) == 0 && S_ISLNK(link.st_mode)) {
+            if (char* real = ::realpath(path.c_str(), nullptr)) {
+                target = real;
+                std::free(real);
+            }
+        }
+        Fd lock(::open((target + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0666));
         if (lock.get() < 0) return Fail(ErrnoText("cannot open the lock file"));
         while (::flock(lock.get(), LOCK_EX) != 0) {
             if (errno != EINTR) return Fail(ErrnoText("cannot lock"));
@@ -273,7 +284,7 @@ struct Config::Impl {
         std::string text;
         FileId oldId;
         std::string error;
-        if (!ReadWhole(path, text, oldId, error)) return Fail(error);
+        if (!ReadWhole(target, text, oldId, error)) return Fail(error);
         std::unique_ptr<Ini> fresh(new Ini(false, false, false));
         Parse(*fresh, text);
         if (!change(*fresh)) {
@@ -289,14 +300,14 @@ struct Config::Impl {
 
         // One temporary name per file: only the holder of the lock writes it,
         // and a leftover from a killed writer is simply overwritten.
-        const std::string temp = path + ".tmp";
+        const std::string temp = target + ".tmp";
         Fd file(::open(temp.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
         if (file.get() < 0) return Fail(ErrnoText("cannot create the temporary file"));
         bool ok = true;
         std::string reason;
         if (oldId.exists) {
             struct stat st {};
-            if (::stat(path.c_str(), &st) == 0) (void)::fchmod(file.get(), st.st_mode & 07777);
+            if (::stat(target.c_str(), &st) == 0) (void)::fchmod(file.get(), st.st_mode & 07777);
         }
         if (!WriteAll(file.get(), out)) {
             ok = false;
@@ -314,7 +325,7 @@ struct Config::Impl {
             ok = false;
             reason = ErrnoText("cannot close the temporary file");
         }
-        if (ok && ::rename(temp.c_str(), path.c_str()) != 0) {
+        if (ok && ::rename(temp.c_str(), target.c_str()) != 0) {
             ok = false;
             reason = ErrnoText("cannot replace the file");
         }
@@ -395,6 +406,17 @@ String Config::ReadKey(std::uint16_t index) {
     if (index >= order.size()) return String();
     const char* value = pImpl->ini->GetValue(pImpl->group.GetBuffer(), order[index].c_str(), "");
     return String(value);
+}
+
+std::vector<std::pair<String, String>> Config::ReadGroup() {
+    const auto& order = pImpl->KeyOrder();
+    std::vector<std::pair<String, String>> entries;
+    entries.reserve(order.size());
+    for (const std::string& key : order) {
+        const char* value = pImpl->ini->GetValue(pImpl->group.GetBuffer(), key.c_str(), "");
+        entries.emplace_back(String(key), String(value));
+    }
+    return entries;
 }
 
 std::uint16_t Config::GetGroupCount() {

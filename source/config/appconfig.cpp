@@ -181,6 +181,11 @@ String KLConfig::GetKeyName(const String& asGroup, std::uint16_t alIndex) {
     return pConfig->GetKeyName(alIndex);
 }
 
+std::vector<std::pair<String, String>> KLConfig::GetEntries(const String& asGroup) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->ReadGroup();
+}
+
 bool KLConfig::EmptyGroup(const String& asGroup) { return pConfig->DeleteGroup(asGroup); }
 
 // ---------------------------------------------------------------- AppConfig

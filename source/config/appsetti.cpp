@@ -1,6 +1,7 @@
 #include "nxbase/appsetti.h"
 
 #include <charconv>
+#include <cmath>
 #include <string>
 #include <system_error>
 
@@ -15,7 +16,7 @@ const char* const kDirectLightPart = "DirectLightPart";
 const char* const kDisplay = "MeasurementDisplay";
 constexpr double kDefaultDirectLightPart = 0.5;
 
-// A decimal number without locale; `fallback` when the text is not one.
+// A finite decimal number without locale; `fallback` when the text is not one.
 double ParseDouble(const std::string& text, double fallback) {
     std::size_t begin = text.find_first_not_of(" \t");
     if (begin == std::string::npos) return fallback;
@@ -24,7 +25,7 @@ double ParseDouble(const std::string& text, double fallback) {
     if (*first == '+') ++first;
     double value = 0.0;
     auto [end, error] = std::from_chars(first, last, value);
-    if (error != std::errc() || end == first) return fallback;
+    if (error != std::errc() || end == first || !std::isfinite(value)) return fallback;
     return value;
 }
 

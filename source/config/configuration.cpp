@@ -106,11 +106,7 @@ std::map<String, String> CascadedConfig::GetEntries(const String& group) {
     };
     KLConfig* sources[] = {AppConfig::Instance(), UserConfig::Instance()};
     for (KLConfig* source : sources) {
-        std::uint16_t count = source->GetKeyCount(group);
-        for (std::uint16_t i = 0; i < count; ++i) {
-            String name = source->GetKeyName(group, i);
-            put(name, source->ReadKey(group, name, String()));
-        }
+        for (const auto& [name, value] : source->GetEntries(group)) put(name, value);
     }
     return entries;
 }

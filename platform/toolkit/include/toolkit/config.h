@@ -11,7 +11,9 @@
 //   re-reads the file, applies the one change and replaces the file
 //   atomically (temporary file in the same directory, fsync, rename), so a
 //   crash leaves the old or the new file and two processes writing different
-//   keys never lose each other's changes.
+//   keys never lose each other's changes. A path that is a symbolic link
+//   stays one: the file it points to is replaced. The permissions of the old
+//   file carry over to the new one.
 // - A malformed line (no "=", an empty key name, an unclosed "[") is skipped
 //   and dropped by the next write; a missing file reads as empty.
 // - A write that fails leaves the old file whole, reports one line through
@@ -23,6 +25,8 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "toolkit/string.h"
@@ -64,6 +68,10 @@ class NXBASE_EXPORT Config {
     String GetKeyName(std::uint16_t index);
     // The value of the key at `index` in file order, "" past the end.
     String ReadKey(std::uint16_t index);
+
+    // Every key of the selected group with its value, in file order: the
+    // same as GetKeyName and ReadKey by index, with one look at the file.
+    std::vector<std::pair<String, String>> ReadGroup();
 
     // Groups of the file, in file order.
     std::uint16_t GetGroupCount();
