@@ -159,11 +159,13 @@ class NXBASE_EXPORT CurrentWaitVisualizer {
 namespace nxbase {
 
 // A progress bar for command-line tools, e.g.
-//   "reading  [##########..........]  50%  12.3 k/s  left 0:04"
-// redrawn in place with "\r". It draws only when its file descriptor is a
-// terminal (or when forced, for tests), no more often than the minimal
-// progress step (default 0.005) and every 100 ms allow, and ends the line at 1.
-// With a total count set, the rate is in items per second, else in percent.
+//   "nxcolor  [#########.........]  50%  12.5 k spectra/s  left 0:02"
+// redrawn in place with "\r" to the terminal's width. It draws only when its
+// file descriptor is a terminal (or when forced, for tests), when the value
+// moved by at least the minimal progress step (default 0.005) and at most
+// once per minimal interval (default 100 ms); 1.0 is always drawn and ends
+// the line. With a total count set, the rate is in items per second, else in
+// percent per second; the time left assumes the rate so far.
 class NXBASE_EXPORT TerminalProgressListener : public ProgressListener {
   public:
     enum class DrawMode { kWhenTerminal, kAlways, kNever };
