@@ -168,8 +168,13 @@ bool ICCEngine::LabToRGB(const double lab[3], double rgb[3]) const {
 
 bool ICCEngine::LabToRGB(const double* lab, double* rgb, std::size_t count) const {
     if (amTransform == nullptr) return false;
-    cmsDoTransform(static_cast<cmsHTRANSFORM>(amTransform), lab, rgb,
-                   static_cast<cmsUInt32Number>(count));
+    // LittleCMS counts pixels in 32 bits.
+    constexpr std::size_t kChunk = 1u << 30;
+    for (std::size_t done = 0; done < count; done += kChunk) {
+        std::size_t n = std::min(kChunk, count - done);
+        cmsDoTransform(static_cast<cmsHTRANSFORM>(amTransform), lab + 3 * done, rgb + 3 * done,
+                       static_cast<cmsUInt32Number>(n));
+    }
     for (std::size_t i = 0; i < 3 * count; ++i) rgb[i] = std::clamp(rgb[i], 0.0, 1.0);
     return true;
 }
