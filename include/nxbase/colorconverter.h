@@ -24,11 +24,13 @@ class NXBASE_EXPORT RGBVector : public ColorVector {
     RGBVector() = default;
     RGBVector(float axR, float axG, float axB, const MeasuringCondition& axCondition);
     // Through the ICC engine when active (Lab under the current CMetry
-    // condition), else EBU primaries on XYZ of the RGB filter (D65, 2 degree)
-    // and the display gamma tables.
+    // condition, which the result then carries), else EBU primaries on XYZ of
+    // the RGB filter (D65, 2 degree) and the display gamma tables; the result
+    // carries illuminant D65 and the 2 degree observer.
     explicit RGBVector(const ReflectanceSpectrum& axSpectrum);
     // The same with axFilter in place of the RGB filter (also for the Lab
-    // handed to the ICC engine).
+    // handed to the ICC engine); the result carries the filter's illuminant
+    // and observer and the spectrum's physical conditions.
     RGBVector(const ReflectanceSpectrum& axSpectrum, const CMetryFilter& axFilter);
     // Through the ICC engine when active, else sRGB (IEC 61966-2-1) with the
     // Lab value taken relative to the D65 white; not clamped.

@@ -68,6 +68,15 @@ const WhitePoint& D65White() {
     return white;
 }
 
+// The condition of screen colours from spectra: the RGB filter's illuminant
+// (D65) and observer (2 degree). Built once: a default condition costs more
+// to make than the whole conversion.
+const MeasuringCondition& RgbCondition() {
+    static const MeasuringCondition condition(IllumClass(ILLUM_D65, 65),
+                                              ObserverClass(OBSERVER_2DEG), PhysicalConditions());
+    return condition;
+}
+
 // CIE 15:2004 inverse of f, matching the colour vectors' own constants.
 inline float InverseF(float f) {
     return f > 0.206893034423f ? f * f * f : (f - 16.0f / 116.0f) / 7.787f;
@@ -84,9 +93,11 @@ inline void LabToSrgb(const float* lab, float* rgb, const WhitePoint& white) {
     float fx = lab[1] / 500.0f + fy;
     float fz = fy - lab[2] / 200.0f;
     float xyz[3] = {white.x * InverseF(fx), InverseF(fy), white.z * InverseF(fz)};
-    float linear[3];
-    LinAlg::MxV(linear, kSrgbMatrix, xyz, 3, 3);
-    for (int i = 0; i < 3; ++i) rgb[i] = Compand(linear[i]);
+    // Row by row, as LinAlg::MxV sums, written out so that it inlines.
+    for (int i = 0; i < 3; ++i) {
+        const float* row = kSrgbMatrix + 3 * i;
+        rgb[i] = Compand(row[0] * xyz[0] + row[1] * xyz[1] + row[2] * xyz[2]);
+    }
 }
 
 String Components(const float* v) {
@@ -153,11 +164,13 @@ constexpr float kLightAbove = 15.0f;
 RGBVector::RGBVector(float axR, float axG, float axB, const MeasuringCondition& axCondition)
     : ColorVector(axR, axG, axB, axCondition) {}
 
-RGBVector::RGBVector(const ReflectanceSpectrum& axSpectrum) {
+RGBVector::RGBVector(const ReflectanceSpectrum& axSpectrum) : ColorVector(RgbCondition()) {
     ReflectanceSpectrumToRGB(axSpectrum, CMetry::GetRGBFilter(), true);
 }
 
-RGBVector::RGBVector(const ReflectanceSpectrum& axSpectrum, const CMetryFilter& axFilter) {
+RGBVector::RGBVector(const ReflectanceSpectrum& axSpectrum, const CMetryFilter& axFilter)
+    : ColorVector(MeasuringCondition(axFilter.GetIllum(), axFilter.GetObserver(),
+                                     axSpectrum.GetPhysicalConditions())) {
     ReflectanceSpectrumToRGB(axSpectrum, axFilter, false);
 }
 
