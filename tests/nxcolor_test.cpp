@@ -55,16 +55,18 @@ TEST(NxcolorCsv, ReportsBadRowsWithTheirLineAndKeepsTheOthers) {
                              "2,short," + Values(0.5f, 30) + "\n" +
                              "3,text,0.1,abc," + Values(0.5f, 34) + "\n" +
                              "4,nan," + Values(0.5f, 35) + ",nan\n" +
-                             "5,\"quoted, name\"," + Values(0.25f) + "\r\n";
+                             "5,\"quoted, name\"," + Values(0.25f) + "\r\n" +
+                             "6,huge,1e300," + Values(0.5f, 35) + "\n";
     const nxcolor::SpectraTable table = ParseSpectraCsv(text, "bad.csv");
     ASSERT_EQ(table.rows.size(), 2u);
     EXPECT_EQ(table.rows[0].id, "1 good");
     EXPECT_EQ(table.rows[1].id, "5 quoted, name");
     EXPECT_EQ(table.rows[1].values[35], 0.25f) << "CR of CR LF removed";
-    ASSERT_EQ(table.errors.size(), 3u);
+    ASSERT_EQ(table.errors.size(), 4u);
     EXPECT_EQ(table.errors[0], "bad.csv:3: 32 fields, expected 38");
     EXPECT_EQ(table.errors[1], "bad.csv:4: field 4 (390 nm): \"abc\" is not a number");
     EXPECT_EQ(table.errors[2], "bad.csv:5: field 38 (730 nm): \"nan\" is not a number");
+    EXPECT_EQ(table.errors[3], "bad.csv:7: field 3 (380 nm): \"1e300\" is out of range");
     EXPECT_FALSE(table.badGrid);
 }
 

@@ -180,7 +180,14 @@ private:
                                 Shown(field) + "\" is not a number");
                 return;
             }
-            row.values[k] = static_cast<float>(value / amScale);
+            const float scaled = static_cast<float>(value / amScale);
+            if (!std::isfinite(scaled)) {
+                Error(line, "field " + std::to_string(ids + k + 1) + " (" +
+                                std::to_string(kFirstWavelength + kWavelengthStep * k) + " nm): \"" +
+                                Shown(field) + "\" is out of range");
+                return;
+            }
+            row.values[k] = scaled;
         }
         pTable->rows.push_back(std::move(row));
     }
