@@ -105,6 +105,28 @@ TEST(ColorBatch, HandlesEveryTailLengthAndWritesNothingBeyond) {
     }
 }
 
+TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
+    const std::vector<float> base = TestSpectra();
+    std::vector<float> spectra;
+    while (spectra.size() < 36u * 70001u) spectra.insert(spectra.end(), base.begin(), base.end());
+    spectra.resize(36u * 70001u);  // not a multiple of eight or of the thread count
+    const std::size_t count = spectra.size() / 36;
+    const ColorBatch batch;
+    std::vector<float> serial(3 * count);
+    batch.ToLab(spectra.data(), count, serial.data());
+    for (unsigned threads : {0u, 1u, 2u, 3u, 7u}) {
+        std::vector<float> parallel(3 * count + 1, -1.0f);
+        batch.ToLabParallel(spectra.data(), count, parallel.data(), threads);
+        EXPECT_TRUE(std::equal(serial.begin(), serial.end(), parallel.begin())) << threads;
+        EXPECT_EQ(parallel.back(), -1.0f);
+    }
+    std::vector<float> xyz(3 * count);
+    std::vector<float> xyzParallel(3 * count);
+    batch.ToXYZ(spectra.data(), count, xyz.data());
+    batch.ToXYZParallel(spectra.data(), count, xyzParallel.data(), 2);
+    EXPECT_EQ(xyz, xyzParallel);
+}
+
 TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {
     const std::vector<float> spectra = TestSpectra();
     const ColorBatch batch;
