@@ -185,6 +185,14 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     ASSERT_EQ(RunNxcolor("--illuminant D65 --observer 10 --format csv --din99", &out, &err), 0) << err;
     EXPECT_EQ(out.substr(0, out.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 25);
+    // Densities of a flat 10% reflector are 1 in every channel.
+    nxtest::TempDir dir;
+    const std::string grey = dir.File("grey.csv");
+    std::ofstream(grey) << "grey," << Values(0.1f) << "\n";
+    ASSERT_EQ(RunNxcolor(grey + " --density 'Status T' -p 3 -f csv", &out, &err), 0) << err;
+    EXPECT_NE(out.find(",D_RED,D_GREEN,D_BLUE\ngrey,"), std::string::npos) << out;
+    EXPECT_NE(out.find(",1.000,1.000,1.000\n"), std::string::npos) << out;
+    EXPECT_EQ(RunNxcolor("--density 'Status Q'", &out, &err), 2);
     ASSERT_EQ(RunNxcolor("--help", &out, &err), 0);
     EXPECT_NE(out.find("Usage: nxcolor"), std::string::npos);
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);

@@ -1,6 +1,6 @@
-// nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, DIN99) under
-// a chosen illuminant and observer, from a CSV file or the built-in
-// ColorChecker chart.
+// nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, xyY, DIN99,
+// densities) under a chosen illuminant, observer and density standard, from a
+// CSV file or the built-in ColorChecker chart.
 #include <charconv>
 #include <cstdio>
 #include <iostream>
@@ -24,7 +24,7 @@ constexpr int kMaxPrecision = 9;
 const char kUsage[] =
     "Usage: nxcolor [options] [FILE]\n"
     "Prints the colour values of reflectance spectra: XYZ, CIELAB and LCh, and\n"
-    "optionally xyY and DIN99, under one illuminant and observer.\n"
+    "optionally xyY, DIN99 and densities, under one illuminant and observer.\n"
     "\n"
     "FILE is CSV: optional id columns, then 36 reflectance factors (0..1) for\n"
     "380..730 nm in 10 nm steps, one spectrum per line; a header line is\n"
@@ -38,6 +38,10 @@ const char kUsage[] =
     "  -o, --observer 2|10     CIE 1931 2 degree (default) or CIE 1964 10 degree\n"
     "      --xyy               also print chromaticity x, y\n"
     "      --din99             also print DIN99 L99, a99, b99 (DIN 6176)\n"
+    "  -d, --density NAME      also print densities D_RED, D_GREEN, D_BLUE of an\n"
+    "                          ISO 5-3 standard: \"Status A\", \"Status E\",\n"
+    "                          \"Status M\", \"Status T\", or one installed in\n"
+    "                          $NXBASE_DATA_DIR/density\n"
     "  -f, --format table|csv  output layout (default table)\n"
     "  -p, --precision N       decimals, 0..9 (default 4)\n"
     "      --percent           the values are percentages (0..100)\n"
@@ -55,6 +59,7 @@ struct Options {
     std::string illuminant = "D50";
     std::string observer = "2";
     std::string format = "table";
+    std::string density;  // empty: no density columns
     int precision = 4;
     float scale = 1.0f;
     bool xyy = false;
@@ -101,6 +106,8 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             if (!take(&options->illuminant)) return arg + " needs a name";
         } else if (arg == "-o" || arg == "--observer") {
             if (!take(&options->observer)) return arg + " needs 2 or 10";
+        } else if (arg == "-d" || arg == "--density") {
+            if (!take(&options->density)) return arg + " needs a standard's name";
         } else if (arg == "-f" || arg == "--format") {
             if (!take(&options->format)) return arg + " needs table or csv";
         } else if (arg == "-p" || arg == "--precision") {
@@ -154,6 +161,10 @@ int main(int argc, char** argv) {
     if (observer.GetObserverType() == OBSERVER_UNKNOWN) {
         return UsageError("unknown observer \"" + options.observer + "\"; use 2 or 10");
     }
+    if (!options.density.empty() &&
+        !klume::cmetry::DensityStandardRepository::Exists(options.density)) {
+        return UsageError("unknown or uninstalled density standard \"" + options.density + "\"");
+    }
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
         return UsageError("unknown format \"" + options.format + "\"; use table or csv");
@@ -179,10 +190,13 @@ int main(int argc, char** argv) {
         return kExitUsage;
     }
 
-    const MeasuringCondition condition(IllumClass(options.illuminant), observer, PhysicalConditions());
+    const MeasuringCondition condition(
+        IllumClass(options.illuminant), observer,
+        options.density.empty() ? DStdClass() : DStdClass(options.density), PhysicalConditions());
     std::vector<std::string> quantities = {"xyz", "lab", "lch"};
     if (options.xyy) quantities.push_back("xyy");
     if (options.din99) quantities.push_back("din99");
+    if (!options.density.empty()) quantities.push_back("density");
     const nxcolor::Report report =
         nxcolor::Evaluate(table, source, condition, quantities, options.precision);
     writer->second(report, std::cout);

@@ -55,6 +55,22 @@ std::vector<Quantity> MakeQuantities() {
                      ScopedLabType din(LAB_DIN99);
                      CopyThree(LABVector(s, mc), out);
                  }});
+    // ISO 5-3 status densities of the condition's density standard (red,
+    // green, blue filter: cyan, magenta, yellow density); NaN where the
+    // weighted reflectance is not positive.
+    q.push_back({"density", {{"D_RED"}, {"D_GREEN"}, {"D_BLUE"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     thread_local std::string name;
+                     thread_local DichteFilter filter;
+                     if (name != mc.GetDStd().GetName()) {
+                         filter = DichteFilter(mc.GetDStd());
+                         name = mc.GetDStd().GetName();
+                     }
+                     for (unsigned short c = 0; c < 3; ++c) {
+                         out[c] = std::nanf("");
+                         filter.GetDensity(s, c, out[c]);
+                     }
+                 }});
     return q;
 }
 
@@ -87,7 +103,11 @@ void WriteCsv(const Report& report, std::ostream& out) {
 
 void WriteTable(const Report& report, std::ostream& out) {
     out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
-        << report.illuminant << ", observer " << report.observer << "\xC2\xB0\n";
+        << report.illuminant << ", observer " << report.observer << "\xC2\xB0";
+    const bool densities = std::any_of(report.columns.begin(), report.columns.end(),
+                                       [](const Column& c) { return c.name == "D_RED"; });
+    if (densities) out << ", density " << report.densityStandard;
+    out << '\n';
     std::size_t idWidth = 2;
     for (const ReportRow& row : report.rows) idWidth = std::max(idWidth, row.id.size());
     // Each column as wide as its widest entry.
@@ -136,6 +156,7 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
     report.source = source;
     report.illuminant = condition.GetIllum().GetName();
     report.observer = condition.GetObserver().GetName().str();
+    report.densityStandard = condition.GetDStd().GetName();
     std::vector<const Quantity*> chosen;
     for (const Quantity& q : Quantities()) {
         if (std::find(quantities.begin(), quantities.end(), q.key) == quantities.end()) continue;

@@ -26,7 +26,7 @@ struct Column {
 // One quantity: its columns and how to compute them from a spectrum under a
 // measuring condition (pOut receives one float per column).
 struct Quantity {
-    std::string key;  // as the options name it: "xyz", "lab", "lch", "din99"
+    std::string key;  // "xyz", "xyy", "lab", "lch", "din99", "density"
     std::vector<Column> columns;
     std::function<void(const ReflectanceSpectrum&, const MeasuringCondition&, float* pOut)> compute;
 };
@@ -44,6 +44,7 @@ struct Report {
     std::string source;       // file name or the built-in chart's name
     std::string illuminant;   // "D65"
     std::string observer;     // "10"
+    std::string densityStandard;  // "Status T" (used by the density columns)
     std::vector<Column> columns;
     std::vector<ReportRow> rows;
 };
