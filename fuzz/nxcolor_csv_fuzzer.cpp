@@ -10,7 +10,7 @@
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const std::string_view text(reinterpret_cast<const char*>(data), size);
     const nxcolor::SpectraTable table = nxcolor::ParseSpectraCsv(text, "fuzz.csv");
-    if (table.badGrid && !table.rows.empty()) __builtin_trap();
+    if (table.unusable && !table.rows.empty()) __builtin_trap();
     for (const nxcolor::SpectrumRow& row : table.rows) {
         if (row.id.empty() || row.line < 1) __builtin_trap();
         for (float v : row.values) {

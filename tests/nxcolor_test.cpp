@@ -67,7 +67,7 @@ TEST(NxcolorCsv, ReportsBadRowsWithTheirLineAndKeepsTheOthers) {
     EXPECT_EQ(table.errors[1], "bad.csv:4: field 4 (390 nm): \"abc\" is not a number");
     EXPECT_EQ(table.errors[2], "bad.csv:5: field 38 (730 nm): \"nan\" is not a number");
     EXPECT_EQ(table.errors[3], "bad.csv:7: field 3 (380 nm): \"1e300\" is out of range");
-    EXPECT_FALSE(table.badGrid);
+    EXPECT_FALSE(table.unusable);
 }
 
 TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
@@ -75,7 +75,7 @@ TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
                                std::string("id,SPEC_380,SPEC_385")}) {
         const nxcolor::SpectraTable table =
             ParseSpectraCsv("# comment\n" + header + "\n1,x," + Values(0.5f) + "\n", "grid.csv");
-        EXPECT_TRUE(table.badGrid) << header;
+        EXPECT_TRUE(table.unusable) << header;
         EXPECT_TRUE(table.rows.empty());
         ASSERT_EQ(table.errors.size(), 1u);
         EXPECT_EQ(table.errors[0].rfind("grid.csv:2: spectral columns", 0), 0u) << table.errors[0];
@@ -84,7 +84,7 @@ TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
     std::string cgats = "SAMPLE_ID";
     for (int nm = 380; nm <= 730; nm += 10) cgats += ",SPECTRAL_NM" + std::to_string(nm);
     const auto table = ParseSpectraCsv("\xEF\xBB\xBF" + cgats + "\nA1," + Values(0.5f) + "\n", "s");
-    EXPECT_FALSE(table.badGrid);
+    EXPECT_FALSE(table.unusable);
     ASSERT_EQ(table.rows.size(), 1u);
     EXPECT_EQ(table.rows[0].id, "A1");
 }
@@ -115,6 +115,48 @@ TEST(NxcolorCsv, SurvivesArbitraryBytes) {
     }
     const auto longLine = ParseSpectraCsv(std::string(nxcolor::kMaxLineLength + 1, '1'), "long");
     ASSERT_EQ(longLine.errors.size(), 1u);
+}
+
+// A CGATS.17 file as measurement software writes it, with `sets` data lines.
+std::string Cgats(const std::vector<std::string>& sets, int first = 380, int last = 730) {
+    std::string text = "CGATS.17\nORIGINATOR \"test\"\nNUMBER_OF_FIELDS " +
+                       std::to_string(2 + (last - first) / 10 + 1) +
+                       "\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
+    for (int nm = first; nm <= last; nm += 10) text += " SPECTRAL_NM" + std::to_string(nm);
+    text += "\nEND_DATA_FORMAT\nNUMBER_OF_SETS " + std::to_string(sets.size()) + "\nBEGIN_DATA\n";
+    for (const std::string& set : sets) text += set + "\n";
+    return text + "END_DATA\n";
+}
+
+std::string SpaceValues(float v, int count = 36) {
+    std::string text = Values(v, count);
+    std::replace(text.begin(), text.end(), ',', ' ');
+    return text;
+}
+
+TEST(NxcolorCgats, ReadsSpectralFieldsThroughLittleCms) {
+    const std::string text = Cgats({"A1 \"paper white\" " + SpaceValues(0.9f),
+                                    "A2 \"bad\" 0.5 abc " + SpaceValues(0.5f, 34),
+                                    "A3 \"grey\" " + SpaceValues(0.2f)});
+    ASSERT_TRUE(nxcolor::LooksLikeCgats(text));
+    const nxcolor::SpectraTable table = nxcolor::ParseSpectra(text, "m.cgats");
+    ASSERT_EQ(table.rows.size(), 2u);
+    EXPECT_EQ(table.rows[0].id, "A1 paper white");
+    EXPECT_EQ(table.rows[0].values[35], 0.9f);
+    EXPECT_EQ(table.rows[1].id, "A3 grey");
+    EXPECT_EQ(table.rows[1].line, 11);
+    ASSERT_EQ(table.errors.size(), 1u);
+    EXPECT_EQ(table.errors[0], "m.cgats:10: SPECTRAL_NM390: \"abc\" is not a number");
+
+    const auto grid = nxcolor::ParseSpectra(Cgats({"A1 x " + SpaceValues(0.5f, 41)}, 380, 780), "g");
+    EXPECT_TRUE(grid.unusable);
+    ASSERT_EQ(grid.errors.size(), 1u);
+    EXPECT_EQ(grid.errors[0].rfind("g: spectral fields 380..780 nm (41 fields)", 0), 0u) << grid.errors[0];
+
+    const auto broken = nxcolor::ParseSpectra("CGATS.17\nBEGIN_DATA_FORMAT\nKEYWORD\n", "b");
+    EXPECT_TRUE(broken.unusable);
+    ASSERT_EQ(broken.errors.size(), 1u);
+    EXPECT_EQ(broken.errors[0].rfind("b:", 0), 0u) << broken.errors[0];
 }
 
 TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {

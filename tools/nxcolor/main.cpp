@@ -1,6 +1,6 @@
 // nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, xyY, DIN99,
 // densities) under a chosen illuminant, observer and density standard, from a
-// CSV file or the built-in ColorChecker chart.
+// CSV or CGATS file or the built-in ColorChecker chart.
 #include <charconv>
 #include <cstdio>
 #include <iostream>
@@ -29,8 +29,10 @@ const char kUsage[] =
     "FILE is CSV: optional id columns, then 36 reflectance factors (0..1) for\n"
     "380..730 nm in 10 nm steps, one spectrum per line; a header line is\n"
     "optional and, when present, must name exactly those wavelengths (r380,\n"
-    "380, nm380, SPEC_380, ...). \"-\" reads standard input. Without FILE the\n"
-    "built-in ColorChecker chart (BabelColor average, 24 patches) is used.\n"
+    "380, nm380, SPEC_380, ...). A CGATS file (BEGIN_DATA_FORMAT with\n"
+    "SPECTRAL_NM380..SPECTRAL_NM730 fields, SAMPLE_ID, SAMPLE_NAME) is read too.\n"
+    "\"-\" reads standard input. Without FILE the built-in ColorChecker chart\n"
+    "(BabelColor average, 24 patches) is used.\n"
     "\n"
     "Options:\n"
     "  -i, --illuminant NAME   A, C, D50 (default), D55, D65, D75, E, FL1..FL12,\n"
@@ -184,7 +186,7 @@ int main(int argc, char** argv) {
         }
     }
     for (const std::string& error : table.errors) std::cerr << "nxcolor: " << error << '\n';
-    if (table.badGrid) return kExitUsage;
+    if (table.unusable) return kExitUsage;
     if (table.rows.empty()) {
         std::cerr << "nxcolor: " << source << ": no spectra\n";
         return kExitUsage;

@@ -4,11 +4,6 @@
 #include <cctype>
 #include <charconv>
 #include <cmath>
-#include <filesystem>
-#include <fstream>
-#include <iostream>
-#include <iterator>
-#include <sstream>
 
 namespace nxcolor {
 namespace {
@@ -49,7 +44,10 @@ std::vector<std::string> SplitFields(std::string_view line) {
     return fields;
 }
 
-// A finite decimal number, "." as separator, an optional leading "+".
+}  // namespace
+
+namespace detail {
+
 bool ParseNumber(std::string_view text, double* value) {
     text = Trim(text);
     if (!text.empty() && text.front() == '+') text.remove_prefix(1);
@@ -58,7 +56,6 @@ bool ParseNumber(std::string_view text, double* value) {
     return result.ec == std::errc() && result.ptr == text.data() + text.size() && std::isfinite(*value);
 }
 
-// The wavelength a header field names: its first run of digits, or -1.
 int WavelengthOf(std::string_view field) {
     std::size_t i = 0;
     while (i < field.size() && !std::isdigit(static_cast<unsigned char>(field[i]))) ++i;
@@ -69,8 +66,6 @@ int WavelengthOf(std::string_view field) {
     return nm;
 }
 
-// Printable form of a field for messages: at most 40 characters, control
-// bytes as "?".
 std::string Shown(std::string_view field) {
     std::string out;
     for (char c : field.substr(0, 40)) {
@@ -79,6 +74,14 @@ std::string Shown(std::string_view field) {
     if (field.size() > 40) out += "...";
     return out;
 }
+
+}  // namespace detail
+
+namespace {
+
+using detail::ParseNumber;
+using detail::Shown;
+using detail::WavelengthOf;
 
 // A header ends in a field that is not a number, and either names a
 // wavelength there or has mostly text fields; a data row with one bad value
@@ -113,7 +116,7 @@ public:
                 return;
             }
         }
-        if (pTable->badGrid) return;
+        if (pTable->unusable) return;
         Row(fields, number);
     }
 
@@ -142,7 +145,7 @@ private:
                         std::to_string(count) + " columns)";
             }
             Error(line, what + "; nxcolor needs 36 columns, 380..730 nm in 10 nm steps");
-            pTable->badGrid = true;
+            pTable->unusable = true;
             return;
         }
         amIdFields = static_cast<int>(first);
@@ -213,31 +216,6 @@ SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, f
         text.remove_prefix(end + 1);
     }
     return table;
-}
-
-bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, std::string* error) {
-    std::string text;
-    if (path == "-") {
-        text.assign(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
-    } else {
-        std::error_code ignored;
-        if (std::filesystem::is_directory(path, ignored)) {
-            *error = path + ": is a directory";
-            return false;
-        }
-        std::ifstream in(path, std::ios::binary);
-        if (!in) {
-            *error = path + ": cannot open the file";
-            return false;
-        }
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-        if (in.bad()) {
-            *error = path + ": read error";
-            return false;
-        }
-    }
-    *table = ParseSpectraCsv(text, path == "-" ? "<stdin>" : path, scale);
-    return true;
 }
 
 }  // namespace nxcolor
