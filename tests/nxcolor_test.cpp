@@ -176,6 +176,15 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     std::ostringstream aligned;
     nxcolor::Writers().at("table")(report, aligned);
     EXPECT_EQ(aligned.str().rfind("# chart: 24 spectra, illuminant D50, observer 2", 0), 0u);
+    // CGATS output parses with LittleCMS: the reader gets past the syntax and
+    // finds the data format (colour fields, no spectral ones).
+    std::ostringstream cgats;
+    nxcolor::Writers().at("cgats")(report, cgats);
+    EXPECT_NE(cgats.str().find("SAMPLE_ID XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
+              std::string::npos);
+    const auto back = nxcolor::ParseSpectra(cgats.str(), "out.cgats");
+    ASSERT_EQ(back.errors.size(), 1u);
+    EXPECT_EQ(back.errors[0].rfind("out.cgats: spectral fields missing", 0), 0u) << back.errors[0];
     EXPECT_EQ(nxcolor::FormatNumber(-0.00001f, 2), "0.00");
     EXPECT_EQ(nxcolor::FormatNumber(-1.5f, 1), "-1.5");
 }

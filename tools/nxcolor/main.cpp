@@ -44,7 +44,8 @@ const char kUsage[] =
     "                          ISO 5-3 standard: \"Status A\", \"Status E\",\n"
     "                          \"Status M\", \"Status T\", or one installed in\n"
     "                          $NXBASE_DATA_DIR/density\n"
-    "  -f, --format table|csv  output layout (default table)\n"
+    "  -f, --format table|csv|cgats\n"
+    "                          output layout (default table)\n"
     "  -p, --precision N       decimals, 0..9 (default 4)\n"
     "      --percent           the values are percentages (0..100)\n"
     "      --list-illuminants  print the built-in illuminant names and exit\n"
@@ -111,7 +112,7 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
         } else if (arg == "-d" || arg == "--density") {
             if (!take(&options->density)) return arg + " needs a standard's name";
         } else if (arg == "-f" || arg == "--format") {
-            if (!take(&options->format)) return arg + " needs table or csv";
+            if (!take(&options->format)) return arg + " needs table, csv or cgats";
         } else if (arg == "-p" || arg == "--precision") {
             std::string text;
             if (!take(&text)) return arg + " needs a number";
@@ -169,7 +170,7 @@ int main(int argc, char** argv) {
     }
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
-        return UsageError("unknown format \"" + options.format + "\"; use table or csv");
+        return UsageError("unknown format \"" + options.format + "\"; use table, csv or cgats");
     }
 
     nxcolor::SpectraTable table;

@@ -28,29 +28,29 @@ void CopyThree(const ColorVector& v, float* pOut) {
 
 std::vector<Quantity> MakeQuantities() {
     std::vector<Quantity> q;
-    q.push_back({"xyz", {{"X"}, {"Y"}, {"Z"}},
+    q.push_back({"xyz", {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(XYZVector(filter, s), out);
                  }});
-    q.push_back({"xyy", {{"x"}, {"y"}, {"Y"}},
+    q.push_back({"xyy", {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(xyYVector(XYZVector(filter, s)), out);
                  }});
-    q.push_back({"lab", {{"L*"}, {"a*"}, {"b*"}},
+    q.push_back({"lab", {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      CopyThree(LABVector(s, mc), out);
                  }});
-    q.push_back({"lch", {{"C*"}, {"h"}},
+    q.push_back({"lch", {{"C*", "LAB_C"}, {"h", "LAB_H"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      const LChVector lch{LABVector(s, mc)};
                      out[0] = lch[1];
                      out[1] = lch[2];
                  }});
-    q.push_back({"din99", {{"L99"}, {"a99"}, {"b99"}},
+    q.push_back({"din99", {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType din(LAB_DIN99);
                      CopyThree(LABVector(s, mc), out);
@@ -58,7 +58,7 @@ std::vector<Quantity> MakeQuantities() {
     // ISO 5-3 status densities of the condition's density standard (red,
     // green, blue filter: cyan, magenta, yellow density); NaN where the
     // weighted reflectance is not positive.
-    q.push_back({"density", {{"D_RED"}, {"D_GREEN"}, {"D_BLUE"}},
+    q.push_back({"density", {{"D_RED", "D_RED"}, {"D_GREEN", "D_GREEN"}, {"D_BLUE", "D_BLUE"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      thread_local std::string name;
                      thread_local DichteFilter filter;
@@ -99,6 +99,35 @@ void WriteCsv(const Report& report, std::ostream& out) {
         }
         out << '\n';
     }
+}
+
+// A CGATS string: double quotes, an inner quote written as a single quote.
+std::string CgatsString(const std::string& text) {
+    std::string out = "\"";
+    for (char c : text) out += (c == '"' || c == '\n' || c == '\r') ? '\'' : c;
+    return out + "\"";
+}
+
+void WriteCgats(const Report& report, std::ostream& out) {
+    out << "CGATS.17\n"
+        << "ORIGINATOR \"nxcolor\"\n"
+        << "DESCRIPTOR " << CgatsString(report.source) << "\n"
+        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
+        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer) << "\n"
+        << "NUMBER_OF_FIELDS " << report.columns.size() + 1 << "\n"
+        << "BEGIN_DATA_FORMAT\nSAMPLE_ID";
+    for (const Column& c : report.columns) out << ' ' << c.cgats;
+    out << "\nEND_DATA_FORMAT\n"
+        << "NUMBER_OF_SETS " << report.rows.size() << "\n"
+        << "BEGIN_DATA\n";
+    for (const ReportRow& row : report.rows) {
+        out << CgatsString(row.id);
+        for (std::size_t i = 0; i < row.values.size(); ++i) {
+            out << ' ' << FormatNumber(row.values[i], report.columns[i].precision);
+        }
+        out << '\n';
+    }
+    out << "END_DATA\n";
 }
 
 void WriteTable(const Report& report, std::ostream& out) {
@@ -182,7 +211,7 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
 }
 
 const std::map<std::string, Writer>& Writers() {
-    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}};
+    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}};
     return writers;
 }
 

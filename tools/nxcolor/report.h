@@ -20,6 +20,7 @@ namespace nxcolor {
 
 struct Column {
     std::string name;   // "X", "L*", ...
+    std::string cgats;  // the CGATS field name: "XYZ_X", "LAB_L", ...
     int precision = 4;  // decimals
 };
 
@@ -55,7 +56,8 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
                 int precision);
 
 using Writer = std::function<void(const Report&, std::ostream&)>;
-// Layouts by name: "table" (aligned columns, a "#" title line) and "csv".
+// Layouts by name: "table" (aligned columns, a "#" title line), "csv" and
+// "cgats" (CGATS.17 text with the standard field names).
 const std::map<std::string, Writer>& Writers();
 
 // A number with `precision` decimals and "." as separator, whatever the locale.
