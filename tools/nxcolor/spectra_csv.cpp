@@ -57,13 +57,24 @@ bool ParseNumber(std::string_view text, double* value) {
 }
 
 int WavelengthOf(std::string_view field) {
-    std::size_t i = 0;
-    while (i < field.size() && !std::isdigit(static_cast<unsigned char>(field[i]))) ++i;
-    if (i == field.size()) return -1;
-    int nm = 0;
-    const auto result = std::from_chars(field.data() + i, field.data() + field.size(), nm);
-    if (result.ec != std::errc()) return -1;
-    return nm;
+    // Known prefixes, longest first; compared without ASCII case.
+    static const char* const kPrefixes[] = {"SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
+    auto upper = [](char c) { return static_cast<char>(std::toupper(static_cast<unsigned char>(c))); };
+    for (const char* prefix : kPrefixes) {
+        const std::string_view p(prefix);
+        if (field.size() <= p.size()) continue;
+        bool match = true;
+        for (std::size_t i = 0; i < p.size() && match; ++i) match = upper(field[i]) == p[i];
+        if (!match) continue;
+        std::string_view rest = field.substr(p.size());
+        if (rest.size() > 2 && upper(rest[rest.size() - 2]) == 'N' && upper(rest.back()) == 'M') {
+            rest.remove_suffix(2);  // "380nm"
+        }
+        int nm = 0;
+        const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), nm);
+        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0) return nm;
+    }
+    return -1;
 }
 
 std::string Shown(std::string_view field) {

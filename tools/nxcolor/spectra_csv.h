@@ -7,8 +7,8 @@
 // are skipped; CR LF line ends and a UTF-8 byte order mark are accepted.
 // Numbers are read with "." as decimal separator whatever the locale. An
 // optional header is the first line whose last field is not a number; its
-// spectral columns are the fields that carry a wavelength ("r380", "380",
-// "nm380", "SPEC_380", "SPECTRAL_NM380") and must be exactly 380..730 nm in
+// spectral columns are the trailing fields that name a wavelength ("r380",
+// "380", "nm380", "SPEC_380", "SPECTRAL_NM380") and must be exactly 380..730 nm in
 // 10 nm steps. Without a header the last 36 fields of each row are the values
 // and the fields before them the id.
 #ifndef NXCOLOR_SPECTRA_CSV_H_
@@ -51,7 +51,7 @@ SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, f
 
 // CGATS (CGATS.17 / IT8.7 text as measurement software writes it), read with
 // LittleCMS's parser: the spectral fields of the data format ("SPECTRAL_NM380",
-// "SPEC_380", "nm380", "R380", any name whose digits are the wavelength) must
+// "SPEC_380", "nm380", "R380"; see detail::WavelengthOf) must
 // be exactly 380..730 nm in 10 nm steps, in any order; the id is SAMPLE_ID,
 // SAMPLE_NAME or the set number. A value that is not a number is reported with
 // the line of its set (sets counted one per line after BEGIN_DATA) and the set
@@ -69,7 +69,9 @@ bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, 
 namespace detail {
 // A finite decimal number ("." separator, optional leading "+"), whole field.
 bool ParseNumber(std::string_view text, double* value);
-// The wavelength a column name carries (its first run of digits), or -1.
+// The wavelength a spectral column name gives: digits after one of the
+// prefixes SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or none (any case),
+// optionally followed by "nm" ("r380", "SPECTRAL_NM380", "380nm"); else -1.
 int WavelengthOf(std::string_view field);
 // A field as shown in messages: at most 40 bytes, control bytes as "?".
 std::string Shown(std::string_view field);
