@@ -16,6 +16,9 @@ namespace cm = klume::cmetry;
 
 namespace {
 
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
+
 // The weights are computed in double from the same 1 nm data as the
 // reference; only the order of summation differs.
 constexpr double kWeightRelativeTolerance = 1e-9;
@@ -74,7 +77,7 @@ protected:
 
     nxtest::TempDir dir;
     nxtest::ScopedEnv dataDir{"NXBASE_DATA_DIR", dir.path().string()};
-    nxtest::ScopedEnv logPath{"NXBASE_LOG_PATH", dir.File("log")};
+    nxtest::LogCapture log;
 };
 
 }  // namespace
@@ -126,8 +129,8 @@ TEST(CMetryProvider, RepositoriesKnowTheirNamesAndFallBackToTheDefaults) {
 
 TEST(CMetryProvider, StatusDensitiesAreBuiltInAndTheNarrowBandOnesAreNot) {
     nxtest::TempDir dir;
-    nxtest::ScopedEnv logPath("NXBASE_LOG_PATH", dir.File("log"));
     nxtest::ScopedEnv noData("NXBASE_DATA_DIR", dir.File("nothing-here"));
+    nxtest::LogCapture log;
     for (const char* name : {"Status A", "Status T", "Status M", "Status E"}) {
         SCOPED_TRACE(name);
         ASSERT_TRUE(cm::DensityStandardRepository::Exists(name));
@@ -147,8 +150,8 @@ TEST(CMetryProvider, StatusDensitiesAreBuiltInAndTheNarrowBandOnesAreNot) {
         EXPECT_EQ(cm::DensityStandardRepository::Get(name)->GetName(), "Status E");
     }
     EXPECT_EQ(cm::DensityStandardRepository::GetDefault()->GetName(), "Status E");
-    const std::string log = nxtest::ReadFile(dir.File("log"));
-    EXPECT_NE(log.find("Density standard \"DIN NB\" not available"), std::string::npos) << log;
+    EXPECT_NE(log.Text().find("Density standard \"DIN NB\" not available"), std::string::npos)
+        << log.Text();
 }
 
 TEST_F(CMetryProviderInDataDir, InstalledIlluminantGoesThroughTheSameWeightPath) {
@@ -185,6 +188,8 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
         {"Binary", std::string("\0\xff\x01,\n", 5), "line 1"},
         {"Infinite", "wavelength,value\n380,1\n390,1e999\n", "line 3: not a number"},
         {"Columns", "wavelength,value,more\n380,1,2\n390,1,2\n", "expected the columns"},
+        {"Negative", "wavelength,value\n380,1\n390,-1\n", "negative power at 390"},
+        {"Dark", "wavelength,value\n300,5\n310,0\n900,0\n", "no power between 360 and 780"},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);
@@ -196,6 +201,10 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
         EXPECT_EQ(cm::IlluminantRepository::Get(c.name)->GetName(), "D50");
         EXPECT_FALSE(cm::CMetryFilter::Find(c.name, "2"));
     }
+    EXPECT_NE(log.Text().find("Illuminant \"Text\" not available (" + Illuminant("Text") +
+                              ": line 3"),
+              std::string::npos)
+        << log.Text();
     // A byte-order mark and CRLF line ends are accepted.
     nxtest::WriteFile(Illuminant("Bom"), "\xEF\xBB\xBFwavelength,value\r\n380,1\r\n780,1\r\n");
     std::string error;

@@ -14,6 +14,9 @@
 
 namespace {
 
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
+
 // XYZ from float weights and a float sum of 36 products against the double
 // reference: float rounding of weights and sums explains about 1e-6 relative,
 // some 1e-5 on the scale Y = 100 (measured worst 2.6e-5).
@@ -207,7 +210,6 @@ TEST(ActualFilterClass, NamesGeometriesAndDisplayNames) {
 
 TEST(DStdClass, TypesSelectStandardsAndMissingOnesFallBackToStatusE) {
     nxtest::TempDir dir;
-    nxtest::ScopedEnv log("NXBASE_LOG_PATH", dir.File("log"));
     nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
     EXPECT_EQ(DStdClass(DSTD_STATUS_A).GetName(), "Status A");
     EXPECT_EQ(DStdClass(DSTD_STATUS_T).GetDStdType(), DSTD_STATUS_T);
@@ -401,4 +403,33 @@ TEST_F(CMetryFacade, InstalledIlluminantWorksThroughTheFacade) {
             EXPECT_FLOAT_EQ(cmetry.GetLXYZFilter()->GetWeights(c)[i], e2.GetWeights(c)[i]);
         }
     }
+}
+
+namespace {
+
+// An application's own light source that gives no light at all.
+class DarkLamp : public klume::cmetry::IIlluminant {
+public:
+    const std::string& GetName() const override { return amName; }
+    const std::string& GetDescription() const override { return amName; }
+    const std::vector<double>& GetWavelengths() const override { return amWavelengths; }
+    const std::vector<double>& GetPowers() const override { return amPowers; }
+
+private:
+    std::string amName = "Dark";
+    std::vector<double> amWavelengths{300.0, 900.0};
+    std::vector<double> amPowers{0.0, 0.0};
+};
+
+}  // namespace
+
+TEST(CMetryFilter, AnIlluminantWithoutLightFallsBackToTheDefaultWithALogLine) {
+    nxtest::LogCapture log;
+    const boost::shared_ptr<klume::cmetry::IIlluminant> dark(new DarkLamp);
+    EXPECT_FALSE(klume::cmetry::CMetryFilter::Find(dark, klume::cmetry::ObserverRepository::Get("2")));
+    const CMetryFilter filter{Lichtart(IllumClass(dark)), Observer(OBSERVER_2DEG)};
+    EXPECT_EQ(filter.GetIllum().GetName(), "D50");
+    EXPECT_NEAR(filter.GetWeightSum(1), 100.0f, 1e-4f);
+    EXPECT_NE(log.Text().find("Illuminant \"Dark\" has no weights"), std::string::npos)
+        << log.Text();
 }

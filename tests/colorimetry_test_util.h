@@ -5,10 +5,16 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <memory>
+#include <mutex>
 #include <sstream>
 #include <string>
 #include <vector>
 
+#include <boost/make_shared.hpp>
+#include <gtest/gtest.h>
+
+#include "nxbase/logfile.h"
 #include "test_util.h"
 
 namespace nxtest {
@@ -38,6 +44,55 @@ inline std::string Scientific(double value) {
 }
 
 inline double ToDouble(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
+
+// Sends the process log into a temporary directory for the whole test
+// program (the log is a process singleton and keeps its first path).
+class LogDirEnvironment : public ::testing::Environment {
+public:
+    void SetUp() override {
+        dir.reset(new TempDir());
+        logPath.reset(new ScopedEnv("NXBASE_LOG_PATH", dir->File("log")));
+    }
+    void TearDown() override {
+        logPath.reset();
+        dir.reset();
+    }
+
+private:
+    std::unique_ptr<TempDir> dir;
+    std::unique_ptr<ScopedEnv> logPath;
+};
+
+// Collects the log lines written while it exists.
+class LogCapture {
+public:
+    LogCapture() : amListener(boost::make_shared<Listener>()) {
+        LogFile::Instance()->AddLogListener(amListener);
+    }
+    ~LogCapture() { LogFile::Instance()->RemoveLogListener(amListener); }
+    LogCapture(const LogCapture&) = delete;
+    LogCapture& operator=(const LogCapture&) = delete;
+
+    // Every captured line, one per "\n".
+    std::string Text() const {
+        std::lock_guard<std::mutex> lock(amListener->mutex);
+        return amListener->text;
+    }
+
+private:
+    struct Listener : LogInterface {
+        bool IsLogOptionEnabled(const String&) const override { return true; }
+        void WriteLog(const String& line, const String&) override {
+            std::lock_guard<std::mutex> lock(mutex);
+            text += line.str() + "\n";
+        }
+        void WriteStackTrace() override {}
+        void UpdateInfo(const String&, const String&) override {}
+        mutable std::mutex mutex;
+        std::string text;
+    };
+    boost::shared_ptr<Listener> amListener;
+};
 
 }  // namespace nxtest
 

@@ -99,6 +99,11 @@ bool SetError(std::string* error, const std::string& text) {
     return false;
 }
 
+// The range over which weights are computed (ASTM E308 practice range); an
+// illuminant must have power somewhere in it.
+constexpr int kPowerRangeStart = 360;
+constexpr int kPowerRangeEnd = 780;
+
 // Log10 products above this are not spectral products (peak 5.000).
 constexpr double kMaxLogProduct = 10.0;
 // A channel whose largest linear product on the grid is below this (log10
@@ -126,9 +131,22 @@ boost::shared_ptr<IIlluminant> MakeIlluminant(const std::string& name,
             SetError(error, name + ": wavelengths must ascend strictly and values be finite");
             return {};
         }
+        if (powers[i] < 0.0) {
+            SetError(error, name + ": negative power at " + std::to_string(wavelengths[i]) + " nm");
+            return {};
+        }
     }
-    return boost::shared_ptr<IIlluminant>(new TableIlluminant(
+    boost::shared_ptr<IIlluminant> illuminant(new TableIlluminant(
         name, description, std::move(wavelengths), std::move(powers)));
+    bool lit = false;
+    for (int nm = kPowerRangeStart; nm <= kPowerRangeEnd && !lit; ++nm) {
+        lit = illuminant->GetPower(nm) > 0.0;
+    }
+    if (!lit) {
+        SetError(error, name + ": no power between 360 and 780 nm");
+        return {};
+    }
+    return illuminant;
 }
 
 namespace detail {

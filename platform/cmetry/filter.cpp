@@ -1,5 +1,6 @@
 #include "klume/cmetry/filter.h"
 
+#include <cmath>
 #include <map>
 #include <mutex>
 #include <utility>
@@ -161,7 +162,15 @@ boost::shared_ptr<const CMetryFilter> CMetryFilter::Find(boost::shared_ptr<IIllu
     const bool shared = IlluminantRepository::Find(illuminant->GetName()) == illuminant &&
                         ObserverRepository::Get(observer->GetName()) == observer;
     if (shared) return Cached(illuminant, observer);
-    return boost::shared_ptr<const CMetryFilter>(new CMetryFilter(illuminant, observer));
+    // Objects made elsewhere were not checked by the repository: a light without
+    // power in 360..780 nm has no weights.
+    boost::shared_ptr<const CMetryFilter> filter(new CMetryFilter(illuminant, observer));
+    for (int c = 0; c < 3; ++c) {
+        for (double w : filter->GetWeights(c)) {
+            if (!std::isfinite(w)) return {};
+        }
+    }
+    return filter;
 }
 
 }  // namespace cmetry

@@ -1,5 +1,6 @@
 #include "klume/cmetry/repository.h"
 
+#include <atomic>
 #include <cctype>
 #include <cstdlib>
 #include <map>
@@ -8,7 +9,6 @@
 
 #include "csvtable.h"
 #include "embedded.h"
-#include "nxbase/logfile.h"
 #include "objects.h"
 
 namespace klume {
@@ -52,6 +52,14 @@ std::vector<std::string> SplitHeader(const char* header) {
     }
     names.push_back(current);
     return names;
+}
+
+// Constant-initialised, so it is in place before any static constructor runs.
+std::atomic<MessageHandler> gMessageHandler{nullptr};
+
+void Report(const std::string& message) {
+    const MessageHandler handler = gMessageHandler.load();
+    if (handler != nullptr) handler(message);
 }
 
 // Made once, on first use; read-only afterwards.
@@ -157,6 +165,10 @@ bool LoadTable(const std::string& path, std::size_t minColumns, detail::CsvTable
 
 }  // namespace
 
+MessageHandler SetMessageHandler(MessageHandler handler) {
+    return gMessageHandler.exchange(handler);
+}
+
 boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& name,
                                                           std::string* error) {
     const BuiltIns& b = GetBuiltIns();
@@ -182,16 +194,25 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
         SetError(error, path + ": expected the columns wavelength,value");
         return {};
     }
+    std::string message;
     boost::shared_ptr<IIlluminant> illuminant =
         MakeIlluminant(name, "Illuminant " + name + " (" + path + ")",
-                       std::move(table.wavelengths), std::move(table.values[0]), error);
-    if (illuminant) cache.illuminants[path] = illuminant;
+                       std::move(table.wavelengths), std::move(table.values[0]), &message);
+    if (!illuminant) {
+        SetError(error, path + ": " + message);
+        return {};
+    }
+    cache.illuminants[path] = illuminant;
     return illuminant;
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
-    boost::shared_ptr<IIlluminant> illuminant = Find(name);
-    return illuminant ? illuminant : GetDefault();
+    std::string error;
+    boost::shared_ptr<IIlluminant> illuminant = Find(name, &error);
+    if (illuminant) return illuminant;
+    Report("Illuminant \"" + name + "\" not available (" + error + "); using \"" +
+           kDefaultIlluminant + "\"");
+    return GetDefault();
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::GetDefault() {
@@ -256,9 +277,8 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::st
     std::string error;
     boost::shared_ptr<IDensityStandard> standard = Find(name, &error);
     if (standard) return standard;
-    LogFile::WriteToLog(String("Density standard \"" + name + "\" not available (" + error +
-                               "); using \"" + kDefaultDensityStandard + "\""),
-                        String());
+    Report("Density standard \"" + name + "\" not available (" + error + "); using \"" +
+           kDefaultDensityStandard + "\"");
     return GetDefault();
 }
 

@@ -5,6 +5,8 @@
 #include <mutex>
 #include <stdexcept>
 
+#include "nxbase/logfile.h"
+
 namespace {
 
 using klume::cmetry::IIlluminant;
@@ -24,6 +26,13 @@ constexpr IllumName kIllumNames[] = {
     {ILLUM_FL9, "FL9"},   {ILLUM_FL10, "FL10"}, {ILLUM_FL11, "FL11"}, {ILLUM_FL12, "FL12"},
     {ILLUM_D55, "D55"},   {ILLUM_D75, "D75"},   {ILLUM_E, "E"},
 };
+
+// The data provider's diagnostics go to the process log, always written.
+void LogProviderMessage(const std::string& message) { LogFile::WriteToLog(String(message), String()); }
+
+// Installed when the library is loaded, before any colour work.
+const bool kProviderLogInstalled =
+    (klume::cmetry::SetMessageHandler(&LogProviderMessage), true);
 
 constexpr const char* kObserver2 = "2";
 constexpr const char* kObserver10 = "10";
@@ -232,7 +241,14 @@ void CMetryFilter::Build(boost::shared_ptr<IIlluminant> illuminant,
                          boost::shared_ptr<IObserver> observer) {
     if (!observer) observer = ObserverRepository::GetDefault();
     if (!illuminant) illuminant = IlluminantRepository::GetDefault();
-    amFilter = klume::cmetry::CMetryFilter::Find(std::move(illuminant), std::move(observer));
+    amFilter = klume::cmetry::CMetryFilter::Find(illuminant, observer);
+    if (!amFilter) {
+        LogFile::WriteToLog(String("Illuminant \"" + illuminant->GetName() +
+                                   "\" has no weights; using \"" +
+                                   IlluminantRepository::GetDefault()->GetName() + "\""),
+                            String());
+        amFilter = klume::cmetry::CMetryFilter::Find(IlluminantRepository::GetDefault(), observer);
+    }
     for (unsigned short c = 0; c < 3; ++c) {
         amFilters[c].reset(new Filter(amFilter->GetFloatWeights(c)));
     }

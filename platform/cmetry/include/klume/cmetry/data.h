@@ -82,8 +82,9 @@ public:
 
 // An illuminant from a table (as IIlluminant defines it). Empty pointer, with
 // the reason in *error, when the name is empty, the sizes differ, there are
-// fewer than two points, the wavelengths are not strictly ascending or a
-// value is not finite.
+// fewer than two points, the wavelengths are not strictly ascending, a value
+// is not finite or negative, or the light has no power anywhere in the
+// 360..780 nm range the weights are computed over.
 NXBASE_EXPORT boost::shared_ptr<IIlluminant> MakeIlluminant(const std::string& name,
                                                            const std::string& description,
                                                            std::vector<double> wavelengths,

@@ -41,7 +41,8 @@ public:
                                                       const std::string& observer);
 
     // The filter of these objects: shared when both are the repositories' own,
-    // computed afresh for any other illuminant. Empty pointer for a null one.
+    // computed afresh for any other illuminant. Empty pointer for a null one
+    // and for an illuminant without power in 360..780 nm.
     static boost::shared_ptr<const CMetryFilter> Find(boost::shared_ptr<IIlluminant> illuminant,
                                                       boost::shared_ptr<IObserver> observer);
 

@@ -25,11 +25,19 @@
 namespace klume {
 namespace cmetry {
 
+// Receives the provider's diagnostic lines (a table that is missing or does
+// not parse, a fallback to a default). The host application installs one at
+// load time; without one the lines are dropped. Any thread may call the
+// handler, so it must be thread-safe.
+using MessageHandler = void (*)(const std::string& message);
+// Installs `handler` (null: drop the lines) and returns the previous one.
+NXBASE_EXPORT MessageHandler SetMessageHandler(MessageHandler handler);
+
 class NXBASE_EXPORT IlluminantRepository {
 public:
     // The illuminant of that name: built in, or installed in the data
-    // directory. An unknown name, or a file that does not parse, yields
-    // GetDefault(); Find tells the two cases apart.
+    // directory. An unknown name, or a file that does not parse, is logged
+    // (with the file, line and reason) and yields GetDefault().
     static boost::shared_ptr<IIlluminant> Get(const std::string& name);
     // CIE illuminant D50.
     static boost::shared_ptr<IIlluminant> GetDefault();
@@ -56,8 +64,8 @@ class NXBASE_EXPORT DensityStandardRepository {
 public:
     // The standard of that name. Built in: "Status A", "Status T", "Status M",
     // "Status E" (ISO 5-3). "Status I", "DIN", "DIN NB", "SPI" and any other
-    // name only when a table is installed. A missing standard yields
-    // GetDefault().
+    // name only when a table is installed. A missing standard is logged and
+    // yields GetDefault().
     static boost::shared_ptr<IDensityStandard> Get(const std::string& name);
     // "Status E".
     static boost::shared_ptr<IDensityStandard> GetDefault();
