@@ -60,6 +60,7 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
     std::vector<float> lab(3 * count);
     batch.ToXYZ(spectra.data(), count, xyz.data());
     batch.ToLab(spectra.data(), count, lab.data());
+    double worst = 0.0;
     for (std::size_t s = 0; s < count; ++s) {
         const ReflectanceSpectrum spectrum(&spectra[36 * s], PhysicalConditions());
         const LABVector object(spectrum, condition);
@@ -67,8 +68,12 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
         const double scale = Scale(object.getV());
         for (int i = 0; i < 3; ++i) {
             ASSERT_NEAR(b[i], object[i], kBatchRelative * scale) << "spectrum " << s << " Lab " << i;
+            worst = std::max(worst, std::fabs(b[i] - object[i]) / scale);
         }
     }
+    ::testing::Test::RecordProperty("worst_lab_relative_" + condition.GetIllum().GetName() + "_" +
+                                        condition.GetObserver().GetName().str(),
+                                    std::to_string(worst * 1e6) + "e-6");
     const CMetryFilter filter(Lichtart(condition.GetIllum()), Observer(condition.GetObserver()));
     for (std::size_t s = 0; s < count; ++s) {
         const XYZVector object(filter, ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));
