@@ -32,7 +32,7 @@ constexpr std::size_t kMaxIdFields = 16;
 struct SpectrumRow {
     std::string id;                         // id fields joined by " "; the row number if none
     std::array<float, kSpectrumSize> values{};
-    int line = 0;                           // 1-based line in the source
+    int line = 0;                           // 1-based line in the source; 0 unknown
 };
 
 struct SpectraTable {
