@@ -1,1 +1,2 @@
-# Benchmarks: text.
+# Benchmarks: text files.
+nxbase_add_bench(text_bench text_bench.cpp)

@@ -1,1 +1,2 @@
-# Fuzz targets: memblock.
+# Fuzz targets: memory block readers.
+nxbase_add_fuzzer(memblock_fuzz memblock_fuzz.cpp)

@@ -1,1 +1,2 @@
-# Fuzz targets: text.
+# Fuzz targets: text files.
+nxbase_add_fuzzer(text_fuzz text_fuzz.cpp)

@@ -5,6 +5,8 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 preset="${1:-default}"
 scripts/deps.sh
-cmake --preset "$preset"
+# Tests and tools on explicitly: scripts/demo.sh configures the same build
+# directory without them.
+cmake --preset "$preset" -DNXBASE_BUILD_TESTS=ON -DNXBASE_BUILD_TOOLS=ON
 cmake --build --preset "$preset" -j "$(nproc)"
 ctest --preset "$preset"

@@ -1,1 +1,2 @@
 # Tests: asciifile.
+nxbase_add_test(asciifile_test asciifile_test.cpp)

@@ -1,1 +1,425 @@
-// (in progress)
+#include "nxbase/mymemblo.h"
+
+#include <algorithm>
+#include <cstring>
+#include <functional>
+#include <istream>
+#include <limits>
+#include <new>
+#include <string>
+
+#include "nxbase/check.h"
+
+namespace {
+
+constexpr std::int32_t kMaxCapacity = std::numeric_limits<std::int32_t>::max();
+constexpr int kWordBits = 64;
+
+// Array new that reports failure through the pointer check instead of
+// throwing std::bad_alloc.
+char* AllocateBytes(std::int32_t alCount) {
+    char* p = new (std::nothrow) char[static_cast<std::size_t>(std::max<std::int32_t>(alCount, 0))];
+    Check::POINTER(p, "mymemblo", __DATE__, __TIME__, __LINE__);
+    return p;
+}
+
+std::int32_t ClampCapacity(long alCapacity) {
+    if (alCapacity < 0) return 0;
+    if (alCapacity > kMaxCapacity) return kMaxCapacity;
+    return static_cast<std::int32_t>(alCapacity);
+}
+
+// Little-endian encoding of the low `N` bytes of an unsigned value.
+template <int N>
+void Encode(std::uint32_t axValue, unsigned char* p) {
+    for (int i = 0; i < N; ++i) p[i] = static_cast<unsigned char>(axValue >> (8 * i));
+}
+
+template <int N>
+std::uint32_t Decode(const unsigned char* p) {
+    std::uint32_t value = 0;
+    for (int i = 0; i < N; ++i) value |= static_cast<std::uint32_t>(p[i]) << (8 * i);
+    return value;
+}
+
+int WordCount(int alCount) {
+    return (alCount + kWordBits - 1) / kWordBits;
+}
+
+}  // namespace
+
+// ---------------------------------------------------------------- FlagSet
+
+FlagSet::FlagSet(int alCount, int axInitial) {
+    Resize(alCount);
+    if (axInitial != 0) SetAll();
+}
+
+void FlagSet::Resize(int alCount) {
+    amCount = std::max(alCount, 0);
+    amWords.resize(static_cast<std::size_t>(WordCount(amCount)), 0);
+    ClearUnusedBits();
+}
+
+void FlagSet::ClearUnusedBits() {
+    int used = amCount % kWordBits;
+    if (used != 0 && !amWords.empty()) amWords.back() &= (std::uint64_t{1} << used) - 1;
+}
+
+unsigned char FlagSet::GetFlag(int alIndex) const {
+    if (alIndex < 0 || alIndex >= amCount) return 0;
+    return static_cast<unsigned char>((amWords[alIndex / kWordBits] >> (alIndex % kWordBits)) & 1u);
+}
+
+void FlagSet::SetFlag(int alIndex) {
+    if (alIndex < 0 || alIndex >= amCount) return;
+    amWords[alIndex / kWordBits] |= std::uint64_t{1} << (alIndex % kWordBits);
+}
+
+void FlagSet::ClearFlag(int alIndex) {
+    if (alIndex < 0 || alIndex >= amCount) return;
+    amWords[alIndex / kWordBits] &= ~(std::uint64_t{1} << (alIndex % kWordBits));
+}
+
+void FlagSet::SetAll() {
+    std::fill(amWords.begin(), amWords.end(), ~std::uint64_t{0});
+    ClearUnusedBits();
+}
+
+void FlagSet::ClearAll() {
+    std::fill(amWords.begin(), amWords.end(), 0);
+}
+
+bool FlagSet::IsEmpty() const {
+    return std::all_of(amWords.begin(), amWords.end(), [](std::uint64_t w) { return w == 0; });
+}
+
+int FlagSet::CountSet() const {
+    int count = 0;
+    for (std::uint64_t w : amWords) count += __builtin_popcountll(w);
+    return count;
+}
+
+FlagSet& FlagSet::operator|=(const FlagSet& axOther) {
+    if (axOther.amCount > amCount) Resize(axOther.amCount);
+    for (std::size_t i = 0; i < axOther.amWords.size(); ++i) amWords[i] |= axOther.amWords[i];
+    return *this;
+}
+
+FlagSet& FlagSet::operator&=(const FlagSet& axOther) {
+    if (axOther.amCount > amCount) Resize(axOther.amCount);
+    for (std::size_t i = 0; i < amWords.size(); ++i)
+        amWords[i] &= i < axOther.amWords.size() ? axOther.amWords[i] : 0;
+    return *this;
+}
+
+FlagSet& FlagSet::operator-=(const FlagSet& axOther) {
+    if (axOther.amCount > amCount) Resize(axOther.amCount);
+    for (std::size_t i = 0; i < axOther.amWords.size(); ++i) amWords[i] &= ~axOther.amWords[i];
+    return *this;
+}
+
+FlagSet& FlagSet::operator^=(const FlagSet& axOther) {
+    if (axOther.amCount > amCount) Resize(axOther.amCount);
+    for (std::size_t i = 0; i < axOther.amWords.size(); ++i) amWords[i] ^= axOther.amWords[i];
+    return *this;
+}
+
+FlagSet FlagSet::operator~() const {
+    FlagSet result(*this);
+    for (std::uint64_t& w : result.amWords) w = ~w;
+    result.ClearUnusedBits();
+    return result;
+}
+
+FlagSet operator|(FlagSet a, const FlagSet& b) {
+    return a |= b;
+}
+FlagSet operator&(FlagSet a, const FlagSet& b) {
+    return a &= b;
+}
+FlagSet operator-(FlagSet a, const FlagSet& b) {
+    return a -= b;
+}
+FlagSet operator^(FlagSet a, const FlagSet& b) {
+    return a ^= b;
+}
+
+// ---------------------------------------------------------- MyMemoryBlock
+
+MyMemoryBlock::MyMemoryBlock() : MyMemoryBlock(kDefaultCapacity) {}
+
+MyMemoryBlock::MyMemoryBlock(long alCapacity) {
+    capacity = ClampCapacity(alCapacity);
+    data = AllocateBytes(capacity);
+    getPointer = putPointer = rememberedRead = rememberedWrite = data;
+}
+
+MyMemoryBlock::MyMemoryBlock(const MyMemoryBlock& axOther) : MyMemoryBlock(axOther.capacity) {
+    Put(axOther.data, axOther.length);
+}
+
+MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
+    if (this == &axOther) return *this;
+    // Allocate before freeing, so that a failed allocation leaves this block intact.
+    char* fresh = AllocateBytes(axOther.capacity);
+    delete[] data;
+    data = fresh;
+    capacity = axOther.capacity;
+    length = 0;
+    readPastEnd = false;
+    getPointer = putPointer = rememberedRead = rememberedWrite = data;
+    Put(axOther.data, axOther.length);
+    return *this;
+}
+
+MyMemoryBlock::~MyMemoryBlock() {
+    delete[] data;
+}
+
+void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
+    char* fresh = AllocateBytes(alCapacity);
+    if (length > 0) std::memcpy(fresh, data, static_cast<std::size_t>(length));
+    getPointer = fresh + (getPointer - data);
+    putPointer = fresh + (putPointer - data);
+    rememberedRead = fresh + (rememberedRead - data);
+    rememberedWrite = fresh + (rememberedWrite - data);
+    delete[] data;
+    data = fresh;
+    capacity = alCapacity;
+}
+
+void MyMemoryBlock::CheckSize(long alCount) {
+    long needed = static_cast<long>(length) + alCount;
+    if (capacity >= needed) return;
+    if (needed > kMaxCapacity) needed = kMaxCapacity;
+    long grown = std::max<long>(capacity, 1);
+    while (grown < needed) grown *= 2;
+    Reallocate(ClampCapacity(grown));
+}
+
+long MyMemoryBlock::Put(const void* p, long alCount) {
+    if (alCount <= 0) return 0;
+    const char* source = static_cast<const char*>(p);
+    if (!std::less<const char*>()(source, data) &&
+        std::less<const char*>()(source, data + capacity)) {
+        // Copying from inside this block: keep the source valid across growth.
+        long offset = static_cast<long>(source - data);
+        CheckSize(alCount);
+        source = data + offset;
+    } else {
+        CheckSize(alCount);
+    }
+    long copied = std::min<long>(alCount, static_cast<long>(capacity) - length);
+    if (copied <= 0) return 0;
+    std::memmove(putPointer, source, static_cast<std::size_t>(copied));
+    putPointer += copied;
+    length += static_cast<std::int32_t>(copied);
+    return copied;
+}
+
+long MyMemoryBlock::Get(void* p, long alCount) {
+    if (alCount <= 0) return 0;
+    long copied = std::min<long>(alCount, Remaining());
+    if (copied < alCount) readPastEnd = true;
+    if (copied > 0) {
+        std::memcpy(p, getPointer, static_cast<std::size_t>(copied));
+        getPointer += copied;
+    }
+    return copied;
+}
+
+void MyMemoryBlock::Minimize() {
+    if (capacity != length) Reallocate(length);
+}
+
+void MyMemoryBlock::RestoreWritePointer() {
+    putPointer = rememberedWrite;
+    length = static_cast<std::int32_t>(putPointer - data);
+    if (getPointer > putPointer) getPointer = putPointer;
+    if (rememberedRead > putPointer) rememberedRead = putPointer;
+}
+
+template <int N>
+void MyMemoryBlock::PutBytes(const unsigned char* p) {
+    // Fast path for the scalar writers: when the room is there, a fixed-size
+    // copy without the growth check.
+    if (capacity - length >= N) {
+        std::memcpy(putPointer, p, N);
+        putPointer += N;
+        length += N;
+        return;
+    }
+    Put(p, N);
+}
+
+template <int N>
+void MyMemoryBlock::GetBytes(unsigned char* p) {
+    if (Remaining() >= N) {
+        std::memcpy(p, getPointer, N);
+        getPointer += N;
+        return;
+    }
+    Get(p, N);
+}
+
+// ------------------------------------------------------------- writers
+
+MyMemoryBlock& MyMemoryBlock::operator<<(char axValue) {
+    unsigned char byte = static_cast<unsigned char>(axValue);
+    PutBytes<1>(&byte);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(unsigned char axValue) {
+    PutBytes<1>(&axValue);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(short axValue) {
+    return *this << static_cast<unsigned short>(axValue);
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(unsigned short axValue) {
+    unsigned char bytes[2];
+    Encode<2>(axValue, bytes);
+    PutBytes<2>(bytes);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(int axValue) {
+    unsigned char bytes[4];
+    Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
+    PutBytes<4>(bytes);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(long axValue) {
+    // The low 32 bits, as a 32-bit long would carry them.
+    return *this << static_cast<int>(static_cast<std::uint32_t>(axValue));
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(const String& asValue) {
+    // GetBuffer() carries the terminating zero.
+    Put(asValue.GetBuffer(), static_cast<long>(asValue.Len()) + 1);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(const char* asValue) {
+    if (asValue != nullptr) Put(asValue, static_cast<long>(std::strlen(asValue)));
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(const FlagSet& axValue) {
+    int count = axValue.Count();
+    *this << count;
+    CheckSize(count);
+    for (int i = 0; i < count; ++i) {
+        unsigned char byte = axValue.GetFlag(i);
+        PutBytes<1>(&byte);
+    }
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator<<(std::iostream& axStream) {
+    std::streambuf* buffer = axStream.rdbuf();
+    std::string bytes;
+    if (buffer != nullptr) {
+        std::streampos current = buffer->pubseekoff(0, std::ios_base::cur, std::ios_base::in);
+        std::streampos end = buffer->pubseekoff(0, std::ios_base::end, std::ios_base::in);
+        if (current != std::streampos(-1) && end != std::streampos(-1) &&
+            buffer->pubseekpos(0, std::ios_base::in) != std::streampos(-1)) {
+            bytes.resize(static_cast<std::size_t>(std::min<std::streamoff>(end, kMaxCapacity)));
+            bytes.resize(static_cast<std::size_t>(
+                buffer->sgetn(bytes.data(), static_cast<std::streamsize>(bytes.size()))));
+            buffer->pubseekpos(current, std::ios_base::in);
+        } else {
+            // Not seekable: take what is left to read.
+            char chunk[4096];
+            for (std::streamsize got; (got = buffer->sgetn(chunk, sizeof chunk)) > 0;)
+                bytes.append(chunk, static_cast<std::size_t>(got));
+        }
+    }
+    *this << static_cast<int>(bytes.size());
+    Put(bytes.data(), static_cast<long>(bytes.size()));
+    return *this;
+}
+
+// ------------------------------------------------------------- readers
+// A short read leaves the bytes it could not fill as they were, so each
+// scalar reader starts from the target's own little-endian image.
+
+MyMemoryBlock& MyMemoryBlock::operator>>(char& axValue) {
+    unsigned char byte = static_cast<unsigned char>(axValue);
+    GetBytes<1>(&byte);
+    axValue = static_cast<char>(byte);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(unsigned char& axValue) {
+    GetBytes<1>(&axValue);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(short& axValue) {
+    unsigned short value = static_cast<unsigned short>(axValue);
+    *this >> value;
+    axValue = static_cast<short>(value);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(unsigned short& axValue) {
+    unsigned char bytes[2];
+    Encode<2>(axValue, bytes);
+    GetBytes<2>(bytes);
+    axValue = static_cast<unsigned short>(Decode<2>(bytes));
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(long& axValue) {
+    unsigned char bytes[4];
+    Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
+    GetBytes<4>(bytes);
+    axValue = static_cast<long>(static_cast<std::int32_t>(Decode<4>(bytes)));
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(int& axValue) {
+    long value = axValue;
+    *this >> value;
+    axValue = static_cast<int>(value);
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(String& asValue) {
+    std::size_t available = static_cast<std::size_t>(Remaining());
+    const char* zero = static_cast<const char*>(std::memchr(getPointer, 0, available));
+    std::size_t textLength =
+        zero != nullptr ? static_cast<std::size_t>(zero - getPointer) : available;
+    asValue = String(std::string_view(getPointer, textLength));
+    if (zero != nullptr) {
+        getPointer += textLength + 1;
+    } else {
+        getPointer = putPointer;
+        readPastEnd = true;
+    }
+    return *this;
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(FlagSet& axValue) {
+    long count = 0;
+    long before = Remaining();
+    *this >> count;
+    if (before < 4 || count < 0 || count > Remaining()) {
+        getPointer = putPointer;
+        readPastEnd = true;
+        return *this;
+    }
+    FlagSet flags(static_cast<int>(count));
+    for (int i = 0; i < count; ++i) {
+        if (getPointer[i] != 0) flags.SetFlag(i);
+    }
+    getPointer += count;
+    axValue = std::move(flags);
+    return *this;
+}

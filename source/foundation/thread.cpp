@@ -1,8 +1,10 @@
 #include "nxbase/thread.h"
 
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <exception>
 #include <map>
 
@@ -45,16 +47,15 @@ class NamedLockRegistry {
 
 constexpr const char* kCleanCriticalSections = "CleanCriticalSections";
 
-// Nice values for the three priorities: normal, one step below, one step above.
+// Nice values for the three priorities, relative to the process's own nice
+// value (a program started under `nice` keeps its threads below normal):
+// normal, one step below, one step above, within the range Linux allows.
 int NiceValue(ThreadPriorityTYPE priority) {
-    switch (priority) {
-        case BELOW_NORMAL_PRIORITY:
-            return 1;
-        case ABOVE_NORMAL_PRIORITY:
-            return -1;
-        default:
-            return 0;
-    }
+    errno = 0;
+    int base = getpriority(PRIO_PROCESS, static_cast<id_t>(getpid()));
+    if (base == -1 && errno != 0) base = 0;
+    int step = priority == BELOW_NORMAL_PRIORITY ? 1 : priority == ABOVE_NORMAL_PRIORITY ? -1 : 0;
+    return std::clamp(base + step, -20, 19);
 }
 
 bool IsValidPriority(int priority) {

@@ -1,5 +1,6 @@
 // nxdemo: the foundation at work. Several threads write keyed lines inside
-// nested AutoLog blocks into one log, then the log is printed.
+// nested AutoLog blocks into one log, a measurement record travels through a
+// memory block and back, then the log is printed.
 #include <cstdio>
 #include <iostream>
 #include <string>
@@ -7,6 +8,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "nxbase/mymemblo.h"
 #include "nxbase/singleton.h"
 #include "nxbase/thread.h"
 #include "toolkit/system.h"
@@ -37,6 +39,29 @@ private:
     int number_;
 };
 
+// Packs a record the way messages carry it, copies the block (the copy reads
+// from its start) and logs what comes out of the copy.
+void RoundTripRecord() {
+    AutoLog block("memory block", "Measure");
+    FlagSet channels(4);
+    channels.SetFlag(0);
+    channels.SetFlag(2);
+    MyMemoryBlock out;
+    out << String("patch A1") << 36 << static_cast<short>(-12) << channels;
+    out.Minimize();
+    MyMemoryBlock copy(out);
+    String id;
+    int samples = 0;
+    short offset = 0;
+    FlagSet readChannels;
+    copy >> id >> samples >> offset >> readChannels;
+    block.Log(String("wrote ") + String::CreateFromInt(out.Len()) + " bytes, read back \"" + id +
+              "\", " + String::CreateFromInt(samples) + " samples, offset " +
+              String::CreateFromInt(offset) + ", " + String::CreateFromInt(readChannels.CountSet()) +
+              " of " + String::CreateFromInt(readChannels.Count()) + " channels" +
+              (copy.ReadPastEnd() || readChannels != channels ? " (MISMATCH)" : ""));
+}
+
 }  // namespace
 
 int main() {
@@ -56,6 +81,7 @@ int main() {
             workers.back()->StartThread();
         }
         for (auto& worker : workers) worker->KillThread();
+        RoundTripRecord();
         AutoLog summary("summary", "Measure");
         summary.Log("key \"Quiet\" is announced but not written");
     }

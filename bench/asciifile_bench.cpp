@@ -1,0 +1,167 @@
+// Reading a 50 MB ASCII data file of measurement records, against the floor
+// of reading the same file into memory in the same process. Writing the
+// file is measured too, for reference.
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <benchmark/benchmark.h>
+
+#include <cmath>
+#include <cstdio>
+#include <filesystem>
+#include <sstream>
+#include <vector>
+
+#include "nxbase/asciifile.h"
+#include "test_util.h"
+
+namespace {
+
+constexpr std::size_t kTargetBytes = 50u << 20;
+constexpr int kSpectrumPoints = 36;
+constexpr int kDensityChannels = 4;
+constexpr int kDecimals = 5;
+
+// One measured patch, as a spectrophotometer application stores it.
+struct Record {
+    String name;
+    int date[6];
+    double spectrum[kSpectrumPoints];
+    double lab[3];
+    short density[kDensityChannels];
+    int counts[kSpectrumPoints];
+    bool valid;
+};
+
+Record MakeRecord(int index) {
+    Record r;
+    char name[64];
+    std::snprintf(name, sizeof name, "Patch %05d row %c col %d", index, 'A' + index % 26,
+                  index % 40);
+    r.name = name;
+    int date[6] = {1 + index % 28, 1 + index % 12, 2026, index % 24, index % 60, (index * 7) % 60};
+    std::copy(date, date + 6, r.date);
+    for (int i = 0; i < kSpectrumPoints; ++i) {
+        double nm = 380.0 + 10.0 * i;
+        r.spectrum[i] = 0.05 + 0.85 / (1.0 + std::exp(-(nm - 500.0 - index % 150) / 25.0));
+        r.counts[i] = 1000 + (index * 37 + i * 1013) % 60000;
+    }
+    r.lab[0] = 20.0 + index % 80 + 0.123;
+    r.lab[1] = -40.0 + index % 80 + 0.456;
+    r.lab[2] = -30.0 + index % 70 + 0.789;
+    for (int i = 0; i < kDensityChannels; ++i) {
+        r.density[i] = static_cast<short>((index * 13 + i * 311) % 2500);
+    }
+    r.valid = index % 17 != 0;
+    return r;
+}
+
+void WriteRecord(ASCIIFile& file, const Record& r) {
+    file.PutTitel("Measurement");
+    file.PutString("Name", r.name);
+    file.PutDate("Date", r.date[0], r.date[1], r.date[2], r.date[3], r.date[4], r.date[5]);
+    file.PutBOOL("Valid", r.valid);
+    file.PutString("Device", String("LumaSpec 3000, SN 104-2231"));
+    file.PutInt("Points", kSpectrumPoints);
+    file.PutRealArray("Spectrum", r.spectrum, kSpectrumPoints, kDecimals);
+    file.PutRealArray("Lab", r.lab, 3, kDecimals);
+    file.PutShortArray("Density", r.density, kDensityChannels);
+    file.PutIntArray("Counts", r.counts, kSpectrumPoints);
+}
+
+// Reads one record; false at the end of the file or on a mismatch.
+bool ReadRecord(ASCIIFile& file, Record& r) {
+    int points = 0;
+    return file.GetTitel("Measurement") && file.GetString("Name", r.name) &&
+           file.GetDate("Date", r.date[0], r.date[1], r.date[2], r.date[3], r.date[4],
+                        r.date[5]) &&
+           file.GetBOOL("Valid", r.valid) && file.GetString("Device", r.name) &&
+           file.GetInt("Points", points) &&
+           file.GetRealArray("Spectrum", r.spectrum, kSpectrumPoints) &&
+           file.GetRealArray("Lab", r.lab, 3) &&
+           file.GetShortArray("Density", r.density, kDensityChannels) &&
+           file.GetIntArray("Counts", r.counts, kSpectrumPoints);
+}
+
+// The data file, written once per process.
+struct DataFile {
+    nxtest::TempDir dir;
+    std::string path = dir.File("measurements.dat");
+    std::size_t bytes = 0;
+    int records = 0;
+
+    DataFile() {
+        std::vector<Record> patterns;
+        for (int i = 0; i < 1000; ++i) patterns.push_back(MakeRecord(i));
+        std::stringstream batch;
+        {
+            ASCIIFileImpl sizer(&batch, false);
+            for (const Record& r : patterns) WriteRecord(sizer, r);
+        }
+        std::size_t batchBytes = batch.str().size();
+        {
+            auto file = ASCIIFile::Get(String(path), false);
+            for (std::size_t written = 0; written < kTargetBytes; written += batchBytes) {
+                for (const Record& r : patterns) WriteRecord(*file, r);
+                records += 1000;
+            }
+        }
+        bytes = std::filesystem::file_size(path);
+    }
+};
+
+DataFile& TheFile() {
+    static DataFile file;
+    return file;
+}
+
+void BM_PlainReadIntoMemory(benchmark::State& state) {
+    DataFile& data = TheFile();
+    std::vector<char> buffer(data.bytes);
+    for (auto _ : state) {
+        int fd = ::open(data.path.c_str(), O_RDONLY | O_CLOEXEC);
+        std::size_t have = 0;
+        while (have < buffer.size()) {
+            ssize_t n = ::read(fd, buffer.data() + have, buffer.size() - have);
+            if (n <= 0) break;
+            have += static_cast<std::size_t>(n);
+        }
+        ::close(fd);
+        benchmark::DoNotOptimize(buffer.data());
+        if (have != data.bytes) state.SkipWithError("short read");
+    }
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * data.bytes));
+}
+BENCHMARK(BM_PlainReadIntoMemory)->Unit(benchmark::kMillisecond);
+
+void BM_ReadMeasurementRecords(benchmark::State& state) {
+    DataFile& data = TheFile();
+    Record record;
+    for (auto _ : state) {
+        auto file = ASCIIFile::Get(String(data.path), true);
+        int count = 0;
+        while (ReadRecord(*file, record)) ++count;
+        if (count != data.records) state.SkipWithError("records lost");
+        benchmark::DoNotOptimize(record.spectrum[0]);
+    }
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * data.bytes));
+    state.counters["records"] = data.records;
+}
+BENCHMARK(BM_ReadMeasurementRecords)->Unit(benchmark::kMillisecond);
+
+void BM_WriteMeasurementRecords(benchmark::State& state) {
+    DataFile& data = TheFile();
+    std::vector<Record> patterns;
+    for (int i = 0; i < 1000; ++i) patterns.push_back(MakeRecord(i));
+    std::string path = data.dir.File("written.dat");
+    for (auto _ : state) {
+        auto file = ASCIIFile::Get(String(path), false);
+        for (int i = 0; i < data.records; ++i) WriteRecord(*file, patterns[i % 1000]);
+    }
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * data.bytes));
+}
+BENCHMARK(BM_WriteMeasurementRecords)->Unit(benchmark::kMillisecond);
+
+}  // namespace
+
+BENCHMARK_MAIN();

@@ -1,0 +1,168 @@
+// Registry point reads and autocommit writes against their floor: a raw
+// SQLite loop (WAL, synchronous=NORMAL, one prepared statement, a plain
+// key/value table) in the same program on the same disk.
+#include <benchmark/benchmark.h>
+#include <sqlite3.h>
+
+#include <string>
+
+#include "nxbase/registry.h"
+#include "test_util.h"
+
+namespace {
+
+using nxbase::RegistryHive;
+using nxbase::RegistryStore;
+using nxbase::RegistryValue;
+
+constexpr int kValues = 1000;  // distinct values read or written in turn
+const std::string kKey = "Software\\K-Lume\\Bench\\Settings";
+
+std::string Name(int i) {
+    return "Value" + std::to_string(i);
+}
+
+// ---- the raw SQLite floor ----
+
+class RawSqlite {
+  public:
+    explicit RawSqlite(const std::string& path) {
+        sqlite3_open_v2(path.c_str(), &db,
+                        SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
+        sqlite3_exec(db,
+                     "PRAGMA journal_mode = WAL; PRAGMA synchronous = NORMAL;"
+                     "CREATE TABLE kv(k TEXT PRIMARY KEY, v TEXT) WITHOUT ROWID;",
+                     nullptr, nullptr, nullptr);
+        sqlite3_prepare_v2(db, "SELECT v FROM kv WHERE k = ?1", -1, &select, nullptr);
+        sqlite3_prepare_v2(
+            db, "INSERT INTO kv(k, v) VALUES(?1, ?2) ON CONFLICT(k) DO UPDATE SET v = excluded.v",
+            -1, &upsert, nullptr);
+    }
+    ~RawSqlite() {
+        sqlite3_finalize(select);
+        sqlite3_finalize(upsert);
+        sqlite3_close_v2(db);
+    }
+    void Write(const std::string& key, const std::string& value) {
+        sqlite3_bind_text(upsert, 1, key.data(), static_cast<int>(key.size()), SQLITE_STATIC);
+        sqlite3_bind_text(upsert, 2, value.data(), static_cast<int>(value.size()), SQLITE_STATIC);
+        if (sqlite3_step(upsert) != SQLITE_DONE) std::abort();
+        sqlite3_reset(upsert);
+    }
+    std::string Read(const std::string& key) {
+        sqlite3_bind_text(select, 1, key.data(), static_cast<int>(key.size()), SQLITE_STATIC);
+        std::string value;
+        if (sqlite3_step(select) == SQLITE_ROW) {
+            value = reinterpret_cast<const char*>(sqlite3_column_text(select, 0));
+        }
+        sqlite3_reset(select);
+        return value;
+    }
+
+  private:
+    sqlite3* db = nullptr;
+    sqlite3_stmt* select = nullptr;
+    sqlite3_stmt* upsert = nullptr;
+};
+
+void BM_RawSqlitePointRead(benchmark::State& state) {
+    nxtest::TempDir dir;
+    RawSqlite raw(dir.File("raw.sqlite"));
+    std::vector<std::string> names;
+    for (int i = 0; i < kValues; ++i) {
+        names.push_back(kKey + "\\" + Name(i));
+        raw.Write(names.back(), "some setting text");
+    }
+    int i = 0;
+    for (auto _ : state) {
+        benchmark::DoNotOptimize(raw.Read(names[i]));
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RawSqlitePointRead);
+
+void BM_RawSqliteAutocommitWrite(benchmark::State& state) {
+    nxtest::TempDir dir;
+    RawSqlite raw(dir.File("raw.sqlite"));
+    std::vector<std::string> names;
+    for (int i = 0; i < kValues; ++i) names.push_back(kKey + "\\" + Name(i));
+    int i = 0;
+    for (auto _ : state) {
+        raw.Write(names[i], "some setting text");
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RawSqliteAutocommitWrite);
+
+// ---- the registry ----
+
+class RegistryFixture {
+  public:
+    RegistryFixture() {
+        for (int i = 0; i < kValues; ++i) {
+            names.push_back(Name(i));
+            RegistryStore::Write(RegistryHive::CurrentUser, kKey,
+                                 RegistryValue::Text(names.back(), "some setting text"));
+        }
+    }
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv user{"NXBASE_USER_REGISTRY", dir.File("user.sqlite")};
+    nxtest::ScopedEnv machine{"NXBASE_MACHINE_REGISTRY", dir.File("machine.sqlite")};
+    std::vector<std::string> names;
+};
+
+void BM_RegistryStorePointRead(benchmark::State& state) {
+    RegistryFixture fixture;
+    int i = 0;
+    for (auto _ : state) {
+        benchmark::DoNotOptimize(
+            RegistryStore::Read(RegistryHive::CurrentUser, kKey, fixture.names[i]));
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RegistryStorePointRead);
+
+void BM_RegistryHandlerGetValue(benchmark::State& state) {
+    RegistryFixture fixture;
+    RegistryHandler::SetRootPath("Software\\K-Lume\\Bench");
+    int i = 0;
+    for (auto _ : state) {
+        benchmark::DoNotOptimize(
+            RegistryHandler::GetValue(HKEY_CURRENT_USER, "Settings", fixture.names[i]));
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RegistryHandlerGetValue);
+
+void BM_RegistryAutocommitWrite(benchmark::State& state) {
+    RegistryFixture fixture;
+    int i = 0;
+    for (auto _ : state) {
+        RegistryStore::Write(RegistryHive::CurrentUser, kKey,
+                             RegistryValue::Text(fixture.names[i], "some setting text"));
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RegistryAutocommitWrite);
+
+void BM_RegistryHandlerAddEntry(benchmark::State& state) {
+    RegistryFixture fixture;
+    RegistryHandler::SetRootPath("Software\\K-Lume\\Bench");
+    int i = 0;
+    for (auto _ : state) {
+        RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Settings", fixture.names[i],
+                                          "some setting text");
+        i = (i + 1) % kValues;
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_RegistryHandlerAddEntry);
+
+}  // namespace
+
+BENCHMARK_MAIN();

@@ -1,0 +1,54 @@
+// NxSetting holds the user's colour-evaluation settings (identifier
+// "NxSetting"), kept in the user configuration, group "Settings":
+// "MetamerieTL1", "MetamerieTL2" (illuminant names of the metamerism test),
+// "DirectLightPart" (decimal, default "0.5") and "MeasurementDisplay" ("Eye"
+// or "Instrument"). Created on first use on the main thread; not locked.
+#ifndef NXBASE_APPSETTI_H_
+#define NXBASE_APPSETTI_H_
+
+#include "nxbase/export.h"
+#include "nxbase/singleton.h"
+#include "toolkit/string.h"
+
+class NXBASE_EXPORT NxSetting : public NxSingleton {
+  public:
+    enum MeasurementDisplay { INSTRUMENT = 0, EYE = 1 };
+
+    // Creates, registers and loads the settings on the first call; never fails.
+    static NxSetting* Instance();
+
+    // Reads the four keys from the user configuration; does nothing unless
+    // UserConfig::IsInitialized(). A "DirectLightPart" that is not a number
+    // (or not finite) reads as 0.5; the display is EYE exactly when the text is "Eye".
+    void LoadProperties();
+    // Writes the four keys to the user configuration (the direct-light part
+    // with 2 decimals); does nothing unless UserConfig::IsInitialized().
+    void SaveProperties();
+
+    // The illuminant names of the metamerism test ("" selects the provider's
+    // default illuminant).
+    void GetIllumNames(String& asFirst, String& asSecond) const;
+    const String& GetIllumName1() const { return amIllum1; }
+    const String& GetIllumName2() const { return amIllum2; }
+    void SetIllumNames(const String& asFirst, const String& asSecond);
+
+    MeasurementDisplay GetMeasurementDisplay() const { return amDisplay; }
+    void SetMeasurementDisplay(MeasurementDisplay axDisplay) { amDisplay = axDisplay; }
+    double GetDirectLightPart() const { return amDirectLightPart; }
+    void SetDirectLightPart(double axPart) { amDirectLightPart = axPart; }
+
+    ~NxSetting() override;
+
+  private:
+    NxSetting();
+    template <class T, class Load>
+    friend T* nxbase::LazySingletonInstance(T*&, Load);
+
+    String amIllum1;
+    String amIllum2;
+    MeasurementDisplay amDisplay = INSTRUMENT;
+    double amDirectLightPart = 0.5;
+    static NxSetting* smInstance;
+};
+
+#endif  // NXBASE_APPSETTI_H_

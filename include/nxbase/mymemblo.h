@@ -1,0 +1,177 @@
+// MyMemoryBlock is a growable byte buffer with one write and one read
+// position whose stream operators define the byte format of message payloads;
+// FlagSet is a numbered set of flags that travels in such blocks. Both are
+// values: one object must not be used by two threads at once.
+//
+// Byte format (little-endian on every host, no padding, no type tags):
+//   char, unsigned char    1 byte
+//   short, unsigned short  2 bytes
+//   int, long              4 bytes (a long is written as its low 32 bits)
+//   String                 the characters, then one zero byte
+//   const char*            the characters only, without a zero byte
+//   FlagSet                the count as 4-byte int, then one byte per flag
+//                          (1 set, 0 clear)
+//   std::iostream          the byte count as 4-byte int, then the bytes
+//
+// Error model: allocation failure is reported by Check::POINTER (which throws
+// the int 1). Readers never read outside the written data and never throw: a
+// read that finds fewer bytes than it needs stops at the end of the data,
+// leaves what it could not fill unchanged and sets ReadPastEnd().
+#ifndef NXBASE_MYMEMBLO_H_
+#define NXBASE_MYMEMBLO_H_
+
+#include <cstdint>
+#include <iosfwd>
+#include <vector>
+
+#include "nxbase/export.h"
+#include "toolkit/string.h"
+
+// A set of flags numbered 0 to Count()-1, all clear unless set.
+class NXBASE_EXPORT FlagSet {
+  public:
+    // `alCount` flags (a negative count gives an empty set); all of them set
+    // when `axInitial` is non-zero, else all clear.
+    explicit FlagSet(int alCount = 0, int axInitial = 0);
+
+    int Count() const { return amCount; }
+    // 1 when flag `alIndex` is set, 0 when it is clear or out of range.
+    unsigned char GetFlag(int alIndex) const;
+    // Sets or clears one flag; an index out of range changes nothing.
+    void SetFlag(int alIndex);
+    void ClearFlag(int alIndex);
+    void SetAll();
+    void ClearAll();
+    bool IsEmpty() const;  // no flag set
+    int CountSet() const;
+
+    // Set operators. Operands of different counts act as if the shorter one
+    // were extended with clear flags; the result has the larger count.
+    FlagSet& operator|=(const FlagSet& axOther);
+    FlagSet& operator&=(const FlagSet& axOther);
+    FlagSet& operator-=(const FlagSet& axOther);  // difference: clears the other's flags
+    FlagSet& operator^=(const FlagSet& axOther);
+    // Complement within the same count.
+    FlagSet operator~() const;
+
+    // Equal when the counts and every flag agree.
+    friend bool operator==(const FlagSet& a, const FlagSet& b) {
+        return a.amCount == b.amCount && a.amWords == b.amWords;
+    }
+    friend bool operator!=(const FlagSet& a, const FlagSet& b) { return !(a == b); }
+
+  private:
+    void Resize(int alCount);
+    void ClearUnusedBits();
+
+    int amCount = 0;
+    std::vector<std::uint64_t> amWords;
+};
+
+NXBASE_EXPORT FlagSet operator|(FlagSet a, const FlagSet& b);
+NXBASE_EXPORT FlagSet operator&(FlagSet a, const FlagSet& b);
+NXBASE_EXPORT FlagSet operator-(FlagSet a, const FlagSet& b);
+NXBASE_EXPORT FlagSet operator^(FlagSet a, const FlagSet& b);
+
+class NXBASE_EXPORT MyMemoryBlock {
+  public:
+    static constexpr long kDefaultCapacity = 1024;
+
+    // An empty block of 1024 bytes, or of `alCapacity` bytes (negative counts
+    // as 0). All positions at the start.
+    MyMemoryBlock();
+    explicit MyMemoryBlock(long alCapacity);
+    // The copy has the source's capacity and its written bytes; its read and
+    // remembered positions are at the start, whatever the source's were.
+    MyMemoryBlock(const MyMemoryBlock& axOther);
+    MyMemoryBlock& operator=(const MyMemoryBlock& axOther);
+    ~MyMemoryBlock();
+
+    // Appends `alCount` bytes from `p` at the write position, growing the
+    // block by doubling; returns the number of bytes written (fewer only when
+    // the block would pass 2^31-1 bytes). A count <= 0 writes nothing.
+    long Put(const void* p, long alCount);
+    // Copies up to `alCount` bytes from the read position into `p` and
+    // advances it; returns the number copied. Stops at the end of the written
+    // data and leaves the rest of `p` unchanged (sets ReadPastEnd()).
+    long Get(void* p, long alCount);
+
+    long Len() const { return length; }
+    long Capacity() const { return capacity; }
+    // Bytes between the read and the write position.
+    long Remaining() const { return static_cast<long>(putPointer - getPointer); }
+    char* GetDatenZeiger() { return data; }
+    const char* GetDatenZeiger() const { return data; }
+    char* GetGetPointer() { return getPointer; }
+    char* GetPutPointer() { return putPointer; }
+
+    // Shrinks the storage to exactly Len() bytes, keeping content and positions.
+    void Minimize();
+
+    // Saves the read or write position; Restore puts it back. Restoring the
+    // write position also cuts the written data there (and pulls the read
+    // position back if it lay beyond), so that writing resumes at that point.
+    void RememberReadPointer() { rememberedRead = getPointer; }
+    void RestoreReadPointer() { getPointer = rememberedRead; }
+    void RememberWritePointer() { rememberedWrite = putPointer; }
+    void RestoreWritePointer();
+
+    // True once any read found fewer bytes than it needed; cleared by
+    // ClearReadError().
+    bool ReadPastEnd() const { return readPastEnd; }
+    void ClearReadError() { readPastEnd = false; }
+
+    MyMemoryBlock& operator<<(char axValue);
+    MyMemoryBlock& operator<<(unsigned char axValue);
+    MyMemoryBlock& operator<<(short axValue);
+    MyMemoryBlock& operator<<(unsigned short axValue);
+    MyMemoryBlock& operator<<(int axValue);
+    MyMemoryBlock& operator<<(long axValue);
+    MyMemoryBlock& operator<<(const String& asValue);
+    // The characters without a terminating zero: read them back with Get and
+    // a known length, not with the String reader.
+    MyMemoryBlock& operator<<(const char* asValue);
+    MyMemoryBlock& operator<<(const FlagSet& axValue);
+    // The stream's whole content (from its start, whatever its positions);
+    // the stream's read position is left where it was.
+    MyMemoryBlock& operator<<(std::iostream& axStream);
+
+    MyMemoryBlock& operator>>(char& axValue);
+    MyMemoryBlock& operator>>(unsigned char& axValue);
+    MyMemoryBlock& operator>>(short& axValue);
+    MyMemoryBlock& operator>>(unsigned short& axValue);
+    MyMemoryBlock& operator>>(int& axValue);
+    MyMemoryBlock& operator>>(long& axValue);  // sign-extended from 4 bytes
+    // The characters up to the next zero byte; the read position moves past
+    // it. Without a zero byte before the end of the data the rest of the data
+    // is taken and ReadPastEnd() is set. A text longer than String::kMaxLen
+    // is cut, but the whole of it is consumed.
+    MyMemoryBlock& operator>>(String& asValue);
+    // Replaces the target with an all-clear set of the count read, then sets
+    // the flags whose byte is not zero. A count that is negative or larger
+    // than the bytes left cannot come from a well-formed block: the target is
+    // left unchanged, the rest of the data is consumed and ReadPastEnd() set.
+    MyMemoryBlock& operator>>(FlagSet& axValue);
+
+  private:
+    // Makes room for `alCount` more bytes, doubling the capacity.
+    void CheckSize(long alCount);
+    // Moves the content into a new array of `alCapacity` bytes (>= length).
+    void Reallocate(std::int32_t alCapacity);
+    // Fixed-size helpers for the scalar operators (defined in the .cpp only).
+    template <int N>
+    void PutBytes(const unsigned char* p);
+    template <int N>
+    void GetBytes(unsigned char* p);
+
+    char* data = nullptr;
+    char* getPointer = nullptr;
+    char* putPointer = nullptr;
+    char* rememberedRead = nullptr;
+    char* rememberedWrite = nullptr;
+    std::int32_t length = 0;
+    std::int32_t capacity = 0;
+    bool readPastEnd = false;
+};
+
+#endif  // NXBASE_MYMEMBLO_H_

@@ -1,0 +1,50 @@
+// DirEntry is the toolkit's path value: a file or directory name that may or
+// may not exist. Windows applications' "\" separators are taken as "/". A
+// DirEntry is a value; distinct objects may be used on distinct threads.
+#ifndef TOOLKIT_DIRENTRY_H_
+#define TOOLKIT_DIRENTRY_H_
+
+#include <filesystem>
+#include <string>
+
+#include "nxbase/export.h"
+#include "toolkit/string.h"
+
+class NXBASE_EXPORT DirEntry {
+  public:
+    DirEntry() = default;
+    explicit DirEntry(const String& path);
+    explicit DirEntry(const std::string& path);
+    explicit DirEntry(const char* path);
+    explicit DirEntry(const std::filesystem::path& path);
+
+    // The whole path as given (normalised separators, no trailing "/").
+    String GetFull() const;
+    // The last name ("app" of "/opt/k/bin/app"); "" for "/".
+    String GetName() const;
+    // The name without its last extension ("app" of "app.ini").
+    String GetBase() const;
+    // The last extension without the dot ("ini"), "" when none.
+    String GetExtension() const;
+    // The entry without its last name: "/opt/k/bin" of "/opt/k/bin/app", "/"
+    // of "/opt", "" of a bare name.
+    DirEntry GetPath() const;
+
+    // Appends `child` as a further name ("LNG" to "/opt/k" gives "/opt/k/LNG").
+    DirEntry& operator+=(const DirEntry& child);
+    friend DirEntry operator+(DirEntry parent, const DirEntry& child) { return parent += child; }
+
+    bool Exists() const;
+    bool IsDirectory() const;
+    // Creates this directory (one level); true if it exists afterwards.
+    bool MakeDir() const;
+
+    const std::filesystem::path& path() const { return amPath; }
+    bool operator==(const DirEntry& other) const { return amPath == other.amPath; }
+    bool operator!=(const DirEntry& other) const { return !(*this == other); }
+
+  private:
+    std::filesystem::path amPath;
+};
+
+#endif  // TOOLKIT_DIRENTRY_H_

@@ -1,0 +1,335 @@
+#include "nxbase/appconfig.h"
+
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+#include "nxbase/check.h"
+#include "nxbase/files.h"
+#include "nxbase/logfile.h"
+#include "toolkit/config.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+bool EndsWithIgnoreCase(const String& text, const char* suffix) {
+    String tail(suffix);
+    if (text.Len() < tail.Len()) return false;
+    return text.Copy(text.Len() - tail.Len()).EqualsIgnoreCaseAscii(tail);
+}
+
+String JoinPath(const String& directory, const String& name) {
+    if (directory.IsEmpty()) return name;
+    String path = directory;
+    if (path.GetChar(path.Len() - 1) != '/' && path.GetChar(path.Len() - 1) != '\\') path += '/';
+    return path + name;
+}
+
+// The user's home directory: $HOME, else the password database.
+std::string HomeDirectory() {
+    const char* home = std::getenv("HOME");
+    if (home != nullptr && *home != '\0') return home;
+    std::vector<char> buffer(16384);
+    struct passwd entry {};
+    struct passwd* found = nullptr;
+    if (::getpwuid_r(::getuid(), &entry, buffer.data(), buffer.size(), &found) == 0 &&
+        found != nullptr && found->pw_dir != nullptr) {
+        return found->pw_dir;
+    }
+    return std::string();
+}
+
+// Copies `from` to `to` unless `to` exists, never replacing a file another
+// process made meanwhile: the copy is linked into place.
+void SeedFile(const std::string& from, const std::string& to) {
+    std::error_code ec;
+    if (from.empty() || fs::exists(to, ec) || !fs::is_regular_file(from, ec)) return;
+    std::string temp = to + ".seed." + std::to_string(::getpid());
+    if (!fs::copy_file(from, temp, fs::copy_options::overwrite_existing, ec)) return;
+    (void)::link(temp.c_str(), to.c_str());
+    ::unlink(temp.c_str());
+}
+
+}  // namespace
+
+// ------------------------------------------------------------------ AppName
+
+AppName* AppName::smInstance = nullptr;
+
+AppName::AppName(const String& asTitel, const String& asShortName, const String& asFullName,
+                 const ApplicationVersion& axVersion)
+    : NxSingleton("AppName"),
+      amTitel(asTitel),
+      amShortName(asShortName),
+      amFullName(asFullName),
+      amVersion(axVersion) {}
+
+AppName::~AppName() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+AppName* AppName::CreateAppName(const String& asTitel, const String& asShortName,
+                                const String& asFullName, const ApplicationVersion& axVersion) {
+    return nxbase::CreateOrReplaceSingleton(smInstance, asTitel, asShortName, asFullName,
+                                            axVersion);
+}
+
+AppName* AppName::Instance() {
+    return nxbase::StrictSingletonInstance(smInstance,
+                                           "Please create the AppName-Singleton first !");
+}
+
+bool AppName::IsInitialized() { return smInstance != nullptr; }
+
+String AppName::GetVersionString() const { return amVersion.GetVersionString(2); }
+
+// ------------------------------------------------------------------- AppDir
+
+AppDir* AppDir::smInstance = nullptr;
+
+AppDir::AppDir(const String& asPath) : NxSingleton("AppDir"), amEntry(asPath) {}
+
+AppDir::~AppDir() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+AppDir* AppDir::CreateAppDir(const String& asPath) {
+    LogFile::WriteToLog(String("Create AppDir: ") + asPath, String("Language"));
+    return nxbase::CreateOrReplaceSingleton(smInstance, asPath);
+}
+
+AppDir* AppDir::Instance() {
+    return nxbase::StrictSingletonInstance(smInstance,
+                                           "Please create the AppDir-Singleton first !");
+}
+
+bool AppDir::IsInitialized() { return smInstance != nullptr; }
+
+void AppDir::SetAppDir(AppDir* pAppDir) {
+    if (smInstance == pAppDir) return;
+    if (smInstance != nullptr) {
+        AppDir* previous = smInstance;
+        NxSingleton::Remove(previous);
+        delete previous;
+    }
+    smInstance = pAppDir;
+    if (pAppDir != nullptr) NxSingleton::Insert(pAppDir);
+}
+
+DirEntry AppDir::BinDirEntry() const { return amEntry.GetPath(); }
+
+DirEntry AppDir::RootDirEntry() const { return BinDirEntry().GetPath(); }
+
+DirEntry AppDir::LngDirEntry() const { return RootDirEntry() + DirEntry("LNG"); }
+
+DirEntry AppDir::HlpDirEntry() const { return RootDirEntry() + DirEntry("DOC"); }
+
+DirEntry AppDir::TargetDisk() const {
+    std::error_code ec;
+    fs::path at = fs::absolute(BinDirEntry().path(), ec);
+    if (ec) return DirEntry("/");
+    at = at.lexically_normal();
+    struct stat st {};
+    // The nearest existing ancestor...
+    while (::stat(at.c_str(), &st) != 0) {
+        if (at == at.root_path() || at.empty()) return DirEntry("/");
+        at = at.parent_path();
+    }
+    // ...then up while the parent is on the same device.
+    while (at != at.root_path()) {
+        fs::path parent = at.parent_path();
+        struct stat up {};
+        if (::stat(parent.c_str(), &up) != 0 || up.st_dev != st.st_dev) break;
+        at = parent;
+    }
+    return DirEntry(at);
+}
+
+// ----------------------------------------------------------------- KLConfig
+
+KLConfig::KLConfig(const String& asPath) : amPath(asPath), pConfig(new Config(asPath)) {}
+
+KLConfig::~KLConfig() = default;
+
+String KLConfig::ReadKey(const String& asGroup, const String& asKey) {
+    return ReadKey(asGroup, asKey, String());
+}
+
+String KLConfig::ReadKey(const String& asGroup, const String& asKey, const String& asDefault) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->ReadKey(asKey, asDefault);
+}
+
+bool KLConfig::WriteKey(const String& asGroup, const String& asKey, const String& asValue) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->WriteKey(asKey, asValue);
+}
+
+std::uint16_t KLConfig::GetKeyCount(const String& asGroup) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->GetKeyCount();
+}
+
+String KLConfig::GetKeyName(const String& asGroup, std::uint16_t alIndex) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->GetKeyName(alIndex);
+}
+
+std::vector<std::pair<String, String>> KLConfig::GetEntries(const String& asGroup) {
+    pConfig->SetGroup(asGroup);
+    return pConfig->ReadGroup();
+}
+
+bool KLConfig::EmptyGroup(const String& asGroup) { return pConfig->DeleteGroup(asGroup); }
+
+// ---------------------------------------------------------------- AppConfig
+
+AppConfig* AppConfig::smInstance = nullptr;
+
+AppConfig::AppConfig(const String& asPath) : KLConfig(asPath), NxSingleton("AppConfig") {}
+
+AppConfig::~AppConfig() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+AppConfig* AppConfig::CreateAppConfig(const String& asDirectory, const String& asFileName) {
+    String path = JoinPath(asDirectory, asFileName);
+    if (DirEntry(asFileName).GetExtension().IsEmpty()) path += ".ini";
+    LogFile::WriteToLog(String("App config file: \"") + path + "\"", String("Startup"));
+    return nxbase::CreateOrReplaceSingleton(smInstance, path);
+}
+
+AppConfig* AppConfig::Instance() {
+    return nxbase::StrictSingletonInstance(smInstance, "No AppConfig instance");
+}
+
+bool AppConfig::IsInitialized() { return smInstance != nullptr; }
+
+void AppConfig::SetAppConfig(AppConfig* pAppConfig) {
+    if (smInstance == pAppConfig) return;
+    if (smInstance != nullptr) {
+        AppConfig* previous = smInstance;
+        NxSingleton::Remove(previous);
+        delete previous;
+    }
+    smInstance = pAppConfig;
+    if (pAppConfig != nullptr) NxSingleton::Insert(pAppConfig);
+}
+
+// --------------------------------------------------------------- UserConfig
+
+UserConfig* UserConfig::smInstance = nullptr;
+
+UserConfig::UserConfig(const String& asPath) : KLConfig(asPath), NxSingleton("UserConfig") {}
+
+UserConfig::~UserConfig() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+String UserConfig::GetConfigDirectoryPath() {
+    std::string base;
+    const char* xdg = std::getenv("XDG_CONFIG_HOME");
+    // Relative values are invalid by the XDG base directory rules.
+    if (xdg != nullptr && xdg[0] == '/') {
+        base = xdg;
+    } else {
+        std::string home = HomeDirectory();
+        if (home.empty()) return String();
+        base = home + "/.config";
+    }
+    while (base.size() > 1 && base.back() == '/') base.pop_back();
+    std::string dir = base + "/K-Lume";
+    std::error_code ec;
+    if (!fs::is_directory(dir, ec)) fs::create_directories(dir, ec);
+    return String(dir);
+}
+
+UserConfig* UserConfig::CreateUserConfig(const String& asAppName, const String& asDirectory,
+                                         const String& asDefaultsPath) {
+    String directory = asDirectory.IsEmpty() ? GetConfigDirectoryPath() : asDirectory;
+    String name = MakeValidFileName(asAppName);
+    if (!EndsWithIgnoreCase(name, ".ini")) name += ".ini";
+    String path = JoinPath(directory, name);
+    LogFile::WriteToLog(String("User config file: \"") + path + "\"", String("Startup"));
+    SeedFile(asDefaultsPath.str(), path.str());
+    return nxbase::CreateOrReplaceSingleton(smInstance, path);
+}
+
+UserConfig* UserConfig::Instance() {
+    return nxbase::StrictSingletonInstance(smInstance, "No UserConfig instance");
+}
+
+bool UserConfig::IsInitialized() { return smInstance != nullptr; }
+
+// -------------------------------------------------------------- LocalConfig
+
+String LocalConfig::GetLocalConfigPath() {
+    String name = MakeValidFileName(AppName::Instance()->GetShortName()) + ".ini";
+    return JoinPath(UserConfig::GetConfigDirectoryPath(), name);
+}
+
+LocalConfig::LocalConfig() : KLConfig(GetLocalConfigPath()) {}
+
+// ------------------------------------------------------------- VELTRAConfig
+
+VELTRAConfig* VELTRAConfig::smInstance = nullptr;
+
+VELTRAConfig::VELTRAConfig(const String& asPath)
+    : NxSingleton("VELTRAConfig"), amPath(asPath), pConfig(new Config(asPath)) {}
+
+VELTRAConfig::~VELTRAConfig() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+VELTRAConfig* VELTRAConfig::CreateVELTRAConfig(const String& asPath) {
+    return nxbase::CreateOrReplaceSingleton(smInstance, asPath);
+}
+
+VELTRAConfig* VELTRAConfig::Instance() {
+    return nxbase::StrictSingletonInstance(smInstance,
+                                           "Please create the VELTRAConfig-Singleton first !");
+}
+
+bool VELTRAConfig::IsInitialized() { return smInstance != nullptr; }
+
+String VELTRAConfig::GetGroupName(VELTRAiniGroup axGroup) {
+    switch (axGroup) {
+        case VELTRA_LPM_SERVER: return String("LPM-Server");
+        case VELTRA_GRADUS: return String("Gradus");
+        case VELTRA_CHROMALINK_APPLICATIONS: return String("ChromaLink Applications");
+        case VELTRA_COMPATIBILITY: return String("Compatibility");
+        case VELTRA_32BIT_APPLICATIONS: return String("32-Bit Applications");
+        case VELTRA_COLOR_LIBRARIES: return String("Color Libraries");
+        case VELTRA_LICENSES: return String("Licenses");
+    }
+    Check::AssertFailed("\"Unknown VELTRAConfig group name\" == 0", __FILE__, __LINE__);
+    return String();
+}
+
+String VELTRAConfig::ReadVELTRAKey(VELTRAiniGroup axGroup, const String& asKey) {
+    return ReadVELTRAKey(axGroup, asKey, String());
+}
+
+String VELTRAConfig::ReadVELTRAKey(VELTRAiniGroup axGroup, const String& asKey,
+                                   const String& asDefault) {
+    pConfig->SetGroup(GetGroupName(axGroup));
+    return pConfig->ReadKey(asKey, asDefault);
+}
+
+bool VELTRAConfig::WriteVELTRAKey(VELTRAiniGroup axGroup, const String& asKey,
+                                  const String& asValue) {
+    pConfig->SetGroup(GetGroupName(axGroup));
+    return pConfig->WriteKey(asKey, asValue);
+}
+
+String VELTRAConfig::ReadChromaLinkApplication(int alIndex) {
+    pConfig->SetGroup(GetGroupName(VELTRA_CHROMALINK_APPLICATIONS));
+    if (alIndex < 0 || alIndex >= static_cast<int>(pConfig->GetKeyCount())) return String();
+    return pConfig->GetKeyName(static_cast<std::uint16_t>(alIndex));
+}

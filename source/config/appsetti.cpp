@@ -1,0 +1,87 @@
+#include "nxbase/appsetti.h"
+
+#include <charconv>
+#include <cmath>
+#include <string>
+#include <system_error>
+
+#include "nxbase/appconfig.h"
+
+namespace {
+
+const char* const kGroup = "Settings";
+const char* const kIllum1 = "MetamerieTL1";
+const char* const kIllum2 = "MetamerieTL2";
+const char* const kDirectLightPart = "DirectLightPart";
+const char* const kDisplay = "MeasurementDisplay";
+constexpr double kDefaultDirectLightPart = 0.5;
+
+// A finite decimal number without locale; `fallback` when the text is not one.
+double ParseDouble(const std::string& text, double fallback) {
+    std::size_t begin = text.find_first_not_of(" \t");
+    if (begin == std::string::npos) return fallback;
+    const char* first = text.data() + begin;
+    const char* last = text.data() + text.size();
+    if (*first == '+') ++first;
+    double value = 0.0;
+    auto [end, error] = std::from_chars(first, last, value);
+    if (error != std::errc() || end == first || !std::isfinite(value)) return fallback;
+    return value;
+}
+
+std::string FormatFixed2(double value) {
+    char buffer[64];
+    auto [end, error] = std::to_chars(buffer, buffer + sizeof buffer, value,
+                                      std::chars_format::fixed, 2);
+    if (error != std::errc()) return "0.50";
+    return std::string(buffer, end);
+}
+
+String DisplayText(NxSetting::MeasurementDisplay display) {
+    return String(display == NxSetting::EYE ? "Eye" : "Instrument");
+}
+
+}  // namespace
+
+NxSetting* NxSetting::smInstance = nullptr;
+
+NxSetting::NxSetting() : NxSingleton("NxSetting") {}
+
+NxSetting::~NxSetting() {
+    if (smInstance == this) smInstance = nullptr;
+}
+
+NxSetting* NxSetting::Instance() {
+    return nxbase::LazySingletonInstance(smInstance, [](NxSetting& s) { s.LoadProperties(); });
+}
+
+void NxSetting::LoadProperties() {
+    if (!UserConfig::IsInitialized()) return;
+    UserConfig* user = UserConfig::Instance();
+    amIllum1 = user->ReadKey(kGroup, kIllum1, String());
+    amIllum2 = user->ReadKey(kGroup, kIllum2, String());
+    amDirectLightPart =
+        ParseDouble(user->ReadKey(kGroup, kDirectLightPart, String("0.5")).str(),
+                    kDefaultDirectLightPart);
+    String display = user->ReadKey(kGroup, kDisplay, DisplayText(amDisplay));
+    amDisplay = display == "Eye" ? EYE : INSTRUMENT;
+}
+
+void NxSetting::SaveProperties() {
+    if (!UserConfig::IsInitialized()) return;
+    UserConfig* user = UserConfig::Instance();
+    user->WriteKey(kGroup, kIllum1, amIllum1);
+    user->WriteKey(kGroup, kIllum2, amIllum2);
+    user->WriteKey(kGroup, kDirectLightPart, String(FormatFixed2(amDirectLightPart)));
+    user->WriteKey(kGroup, kDisplay, DisplayText(amDisplay));
+}
+
+void NxSetting::GetIllumNames(String& asFirst, String& asSecond) const {
+    asFirst = amIllum1;
+    asSecond = amIllum2;
+}
+
+void NxSetting::SetIllumNames(const String& asFirst, const String& asSecond) {
+    amIllum1 = asFirst;
+    amIllum2 = asSecond;
+}

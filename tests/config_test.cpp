@@ -1,0 +1,466 @@
+// INI files (toolkit Config), the configuration stores and their cascade.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <boost/make_shared.hpp>
+
+#include "nxbase/appconfig.h"
+#include "nxbase/configuration.h"
+#include "nxbase/logfile.h"
+#include "test_util.h"
+#include "toolkit/config.h"
+
+namespace {
+
+using nxtest::ReadFile;
+using nxtest::TempDir;
+using nxtest::WriteFile;
+
+// Collects the lines that failed INI writes report to the log.
+class LogRecorder : public LogInterface {
+  public:
+    bool IsLogOptionEnabled(const String&) const override { return true; }
+    void WriteLog(const String& text, const String&) override { lines.push_back(text.str()); }
+    void WriteStackTrace() override {}
+    void UpdateInfo(const String&, const String&) override {}
+    std::vector<std::string> lines;
+};
+
+// Waits for a forked child and answers its exit code, -1 when it did not exit.
+int WaitExit(pid_t pid) {
+    int status = 0;
+    if (::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
+    return WEXITSTATUS(status);
+}
+
+// Keys of a group as "name=value" in file order.
+std::vector<std::string> Keys(Config& config, const char* group) {
+    config.SetGroup(group);
+    std::vector<std::string> keys;
+    for (std::uint16_t i = 0; i < config.GetKeyCount(); ++i) {
+        keys.push_back(config.GetKeyName(i).str() + "=" + config.ReadKey(i).str());
+    }
+    return keys;
+}
+
+bool HavePython() { return std::system("python3 -c 'import configparser' >/dev/null 2>&1") == 0; }
+
+std::string RunCapture(const std::string& command) {
+    std::string out;
+    FILE* pipe = ::popen(command.c_str(), "r");
+    if (pipe == nullptr) return out;
+    char buffer[4096];
+    std::size_t n;
+    while ((n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0) out.append(buffer, n);
+    ::pclose(pipe);
+    return out;
+}
+
+TEST(IniFile, AMissingFileReadsAsEmptyAndIsNotCreatedByReading) {
+    TempDir dir;
+    Config config(dir.File("absent.ini"));
+    config.SetGroup("Group");
+    EXPECT_EQ(config.ReadKey("Key", "fallback"), "fallback");
+    EXPECT_EQ(config.GetKeyCount(), 0);
+    EXPECT_EQ(config.GetKeyName(0), "");
+    EXPECT_EQ(config.GetGroupCount(), 0);
+    EXPECT_FALSE(std::filesystem::exists(dir.File("absent.ini")));
+}
+
+TEST(IniFile, NamesCompareWithoutCaseAndKeepTheCaseFirstWritten) {
+    TempDir dir;
+    Config config(dir.File("case.ini"));
+    config.SetGroup("Colour Settings");
+    ASSERT_TRUE(config.WriteKey("WhitePoint", "D50"));
+    config.SetGroup("COLOUR SETTINGS");
+    EXPECT_EQ(config.ReadKey("whitepoint"), "D50");
+    ASSERT_TRUE(config.WriteKey("WHITEPOINT", "D65"));
+    EXPECT_EQ(config.GetKeyCount(), 1);
+    EXPECT_EQ(config.GetKeyName(0), "WhitePoint");
+    EXPECT_EQ(config.GetGroupName(0), "Colour Settings");
+    EXPECT_EQ(ReadFile(dir.File("case.ini")), "[Colour Settings]\nWhitePoint = D65\n");
+    EXPECT_TRUE(config.DeleteGroup("colour settings"));
+    EXPECT_FALSE(config.HasGroup("Colour Settings"));
+}
+
+TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
+    TempDir dir;
+    const std::string path = dir.File("order.ini");
+    WriteFile(path,
+              "; K-Lume settings\n\n"
+              "[Zeta]\n"
+              "; the measuring device\n"
+              "Device = i1Pro\n"
+              "Aperture = 4.5\n\n"
+              "# second group\n"
+              "[Alpha]\n"
+              "b = 2\n"
+              "a = 1\n");
+    Config config(path);
+    config.SetGroup("Alpha");
+    ASSERT_TRUE(config.WriteKey("c", "3"));
+    config.SetGroup("Zeta");
+    ASSERT_TRUE(config.WriteKey("Device", "i1Pro3"));
+    ASSERT_TRUE(config.DeleteKey("Aperture"));
+    // SimpleIni sets comments apart by a blank line; the layout is then stable.
+    const std::string expected =
+        "; K-Lume settings\n\n\n"
+        "[Zeta]\n\n"
+        "; the measuring device\n"
+        "Device = i1Pro3\n\n\n"
+        "# second group\n"
+        "[Alpha]\n"
+        "b = 2\n"
+        "a = 1\n"
+        "c = %\n";
+    auto withC = [&](const char* c) {
+        std::string text = expected;
+        return text.replace(text.find('%'), 1, c);
+    };
+    EXPECT_EQ(ReadFile(path), withC("3"));
+    config.SetGroup("alpha");
+    ASSERT_TRUE(config.WriteKey("C", "4"));
+    EXPECT_EQ(ReadFile(path), withC("4"));
+    EXPECT_EQ(Keys(config, "Alpha"), (std::vector<std::string>{"b=2", "a=1", "c=4"}));
+    std::vector<std::string> bulk;
+    for (const auto& [key, value] : config.ReadGroup()) bulk.push_back(key.str() + "=" + value.str());
+    EXPECT_EQ(bulk, Keys(config, "Alpha"));
+    EXPECT_EQ(config.GetGroupName(0), "Zeta");
+    EXPECT_EQ(config.GetGroupName(1), "Alpha");
+    EXPECT_EQ(config.GetGroupName(2), "");
+}
+
+TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {
+    TempDir dir;
+    const std::string path = dir.File("bad.ini");
+    WriteFile(path,
+              "[Good]\n"
+              "no equals sign here\n"
+              "= value without a key\n"
+              "Key = Value\r\n"
+              "[Unclosed\n"
+              "Other=  spaced value  \n"
+              "[Second]\n"
+              "x=1\n");
+    Config config(path);
+    EXPECT_EQ(Keys(config, "Good"), (std::vector<std::string>{"Key=Value", "Other=spaced value"}));
+    EXPECT_EQ(Keys(config, "Second"), (std::vector<std::string>{"x=1"}));
+    config.SetGroup("Second");
+    ASSERT_TRUE(config.WriteKey("y", "2"));
+    Config reread(path);
+    EXPECT_EQ(Keys(reread, "Good"), (std::vector<std::string>{"Key=Value", "Other=spaced value"}));
+    EXPECT_EQ(Keys(reread, "Second"), (std::vector<std::string>{"x=1", "y=2"}));
+}
+
+TEST(IniFile, ALinkedFileStaysALinkAndKeepsItsPermissions) {
+    TempDir dir;
+    const std::string real = dir.File("real.ini");
+    const std::string link = dir.File("link.ini");
+    WriteFile(real, "[G]\nOld = 1\n");
+    ::chmod(real.c_str(), 0640);
+    std::filesystem::create_symlink(real, link);
+    Config config(link);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("New", "2"));
+    EXPECT_TRUE(std::filesystem::is_symlink(link));
+    EXPECT_EQ(ReadFile(real), "[G]\nOld = 1\nNew = 2\n");
+    struct stat st {};
+    ASSERT_EQ(::stat(real.c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 0777, 0640u);
+}
+
+TEST(IniFile, RefusesNamesAndValuesThatWouldCorruptTheFile) {
+    TempDir dir;
+    const std::string path = dir.File("refuse.ini");
+    Config config(path);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("Key", "old"));
+    const std::string before = ReadFile(path);
+    Config::ErrorSink previous = Config::SetErrorSink([](const std::string&) {});
+    EXPECT_FALSE(config.WriteKey("a=b", "x"));
+    EXPECT_FALSE(config.WriteKey("", "x"));
+    EXPECT_FALSE(config.WriteKey("[Injected]", "x"));
+    EXPECT_FALSE(config.WriteKey("Key", "two\nlines"));
+    config.SetGroup("Bad]Group");
+    EXPECT_FALSE(config.WriteKey("Key", "x"));
+    Config::SetErrorSink(previous);
+    EXPECT_EQ(ReadFile(path), before);
+}
+
+TEST(IniFile, AnotherObjectSeesAWriteAtItsNextRead) {
+    TempDir dir;
+    const std::string path = dir.File("shared.ini");
+    Config reader(path);
+    Config writer(path);
+    reader.SetGroup("G");
+    writer.SetGroup("G");
+    EXPECT_EQ(reader.ReadKey("K", "none"), "none");
+    ASSERT_TRUE(writer.WriteKey("K", "first"));
+    EXPECT_EQ(reader.ReadKey("K", "none"), "first");
+    ASSERT_TRUE(writer.WriteKey("K", "second"));
+    EXPECT_EQ(reader.ReadKey("K", "none"), "second");
+    // The reader's own write keeps the writer's other key.
+    ASSERT_TRUE(writer.WriteKey("W", "w"));
+    ASSERT_TRUE(reader.WriteKey("R", "r"));
+    EXPECT_EQ(Keys(writer, "G"), (std::vector<std::string>{"K=second", "W=w", "R=r"}));
+}
+
+TEST(IniFile, TwoProcessesWritingAThousandKeysEachLoseNone) {
+    constexpr int kKeysPerProcess = 1000;
+    // Two thousand fsyncs take half a minute on a virtual disk; the race is
+    // the same on a memory file system.
+    std::optional<nxtest::ScopedEnv> inMemory;
+    if (::access("/dev/shm", W_OK) == 0) inMemory.emplace("TMPDIR", "/dev/shm");
+    TempDir dir;
+    const std::string path = dir.File("race.ini");
+    std::vector<pid_t> children;
+    for (int p = 0; p < 2; ++p) {
+        pid_t pid = ::fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            Config config(path);
+            config.SetGroup(p == 0 ? "Shared" : "shared");
+            bool ok = true;
+            for (int i = 0; i < kKeysPerProcess; ++i) {
+                std::string key = "P" + std::to_string(p) + "_" + std::to_string(i);
+                ok = config.WriteKey(key, std::to_string(i)) && ok;
+            }
+            ::_exit(ok ? 0 : 1);
+        }
+        children.push_back(pid);
+    }
+    for (pid_t pid : children) EXPECT_EQ(WaitExit(pid), 0);
+    Config config(path);
+    config.SetGroup("Shared");
+    ASSERT_EQ(config.GetKeyCount(), 2 * kKeysPerProcess);
+    for (int p = 0; p < 2; ++p) {
+        for (int i = 0; i < kKeysPerProcess; ++i) {
+            std::string key = "P" + std::to_string(p) + "_" + std::to_string(i);
+            ASSERT_EQ(config.ReadKey(key, "lost").str(), std::to_string(i)) << key;
+        }
+    }
+}
+
+TEST(IniFile, AWriterKilledMidLoopLeavesTheOldOrTheNewFile) {
+    TempDir dir;
+    const std::string path = dir.File("killed.ini");
+    WriteFile(path, "[Loop]\nCounter = start\n");
+    for (int round = 0; round < 5; ++round) {
+        pid_t pid = ::fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            Config config(path);
+            config.SetGroup("Loop");
+            // Each write also grows a long value, so writes take a while.
+            for (int i = 0;; ++i) {
+                config.WriteKey("Counter", std::to_string(i));
+                config.WriteKey("K" + std::to_string(i % 300), std::string(200, 'a' + i % 26));
+            }
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(30 + 17 * round));
+        ::kill(pid, SIGKILL);
+        int status = 0;
+        ::waitpid(pid, &status, 0);
+
+        // A complete file: every line a group header or a full key line, and
+        // the whole file as this writer would have saved it.
+        const std::string text = ReadFile(path);
+        ASSERT_FALSE(text.empty());
+        ASSERT_EQ(text.back(), '\n');
+        Config config(path);
+        config.SetGroup("Loop");
+        const std::string counter = config.ReadKey("Counter", "").str();
+        ASSERT_FALSE(counter.empty()) << "round " << round;
+        for (std::uint16_t i = 0; i < config.GetKeyCount(); ++i) {
+            String name = config.GetKeyName(i);
+            if (name == "Counter") continue;
+            EXPECT_EQ(config.ReadKey(i).Len(), 200) << name;
+        }
+        std::string saved;
+        for (std::uint16_t i = 0; i < config.GetKeyCount(); ++i) {
+            saved += config.GetKeyName(i).str() + " = " + config.ReadKey(i).str() + "\n";
+        }
+        EXPECT_EQ(text, "[Loop]\n" + saved);
+    }
+}
+
+TEST(IniFile, AFailedWriteKeepsTheOldFileAndReportsALine) {
+    TempDir dir;
+    const std::string path = dir.File("keep.ini");
+    {
+        Config config(path);
+        config.SetGroup("G");
+        ASSERT_TRUE(config.WriteKey("Key", "old"));
+    }
+    const std::string before = ReadFile(path);
+
+    // A file-size limit makes the temporary file's write fail halfway.
+    pid_t pid = ::fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        ::signal(SIGXFSZ, SIG_IGN);
+        struct rlimit limit {64, 64};
+        ::setrlimit(RLIMIT_FSIZE, &limit);
+        std::vector<std::string> reported;
+        Config::SetErrorSink([&](const std::string& line) { reported.push_back(line); });
+        Config config(path);
+        config.SetGroup("G");
+        bool wrote = config.WriteKey("Key", std::string(500, 'x'));
+        bool cleaned = !std::filesystem::exists(path + ".tmp");
+        bool logged = reported.size() == 1 &&
+                      reported[0].find("Cannot write configuration file \"" + path + "\"") == 0;
+        ::_exit(!wrote && cleaned && logged ? 0 : 1);
+    }
+    EXPECT_EQ(WaitExit(pid), 0);
+    EXPECT_EQ(ReadFile(path), before);
+}
+
+// The store and its log line, with a directory the writer may not change.
+TEST(IniConfigStore, AnUnwritableDirectoryKeepsTheOldFileAndLogsTheFailure) {
+    TempDir dir;
+    const std::string path = dir.File("locked.ini");
+    IniConfig store(path);
+    store.WriteKey("G", "Key", "old");
+    const std::string before = ReadFile(path);
+    ::chmod(dir.path().c_str(), 0755);
+    ::chmod((path + ".lock").c_str(), 0666);
+
+    pid_t pid = ::fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        // Root writes anywhere: drop to an unprivileged user first.
+        if (::geteuid() == 0 && (::setgid(65534) != 0 || ::setuid(65534) != 0)) ::_exit(2);
+        if (::geteuid() != 0) ::chmod(dir.path().c_str(), 0555);
+        auto recorder = boost::make_shared<LogRecorder>();
+        LogFile::Instance()->AddLogListener(recorder);
+        IniConfig child(path);
+        child.WriteKey("G", "Key", "new");
+        bool logged = false;
+        for (const auto& line : recorder->lines) {
+            if (line.find("Cannot write configuration file \"" + path + "\"") == 0) logged = true;
+        }
+        bool unchanged = child.ReadKey("G", "Key", "") == "old";
+        ::_exit(logged && unchanged ? 0 : 1);
+    }
+    EXPECT_EQ(WaitExit(pid), 0);
+    ::chmod(dir.path().c_str(), 0700);
+    EXPECT_EQ(ReadFile(path), before);
+}
+
+TEST(IniFile, PythonConfigparserReadsOurFilesAndWeReadItsFiles) {
+    if (!HavePython()) GTEST_SKIP() << "python3 with configparser is not installed";
+    TempDir dir;
+    const std::string ours = dir.File("ours.ini");
+    {
+        Config config(ours);
+        config.SetGroup("LPM-Server");
+        config.WriteKey("Path", "/opt/k-lume/bin/lumaserver");
+        config.WriteKey("Version", "2.10");
+        config.SetGroup("Colour Libraries");
+        config.WriteKey("Library 1", "Pantone % \xE9t\xE9");
+        config.WriteKey("Empty", "");
+    }
+    const std::string dump =
+        "import configparser,sys\n"
+        "c=configparser.ConfigParser(interpolation=None)\n"
+        "c.optionxform=str\n"
+        "c.read(sys.argv[1],encoding='latin-1')\n"
+        "for s in c.sections():\n"
+        "  for k,v in c.items(s): print(s+'|'+k+'|'+v)\n";
+    WriteFile(dir.File("dump.py"), dump);
+    std::string out = RunCapture("PYTHONIOENCODING=utf-8 python3 " + dir.File("dump.py") + " " + ours);
+    EXPECT_EQ(out,
+              "LPM-Server|Path|/opt/k-lume/bin/lumaserver\n"
+              "LPM-Server|Version|2.10\n"
+              "Colour Libraries|Library 1|Pantone % \xC3\xA9t\xC3\xA9\n"
+              "Colour Libraries|Empty|\n");
+
+    const std::string theirs = dir.File("theirs.ini");
+    const std::string write =
+        "import configparser,sys\n"
+        "c=configparser.ConfigParser(interpolation=None)\n"
+        "c.optionxform=str\n"
+        "c['Gradus']={'Steps':'12','Mode':'Linear'}\n"
+        "c['Licenses']={'Key One':'A-B-C'}\n"
+        "c.write(open(sys.argv[1],'w'))\n";
+    WriteFile(dir.File("write.py"), write);
+    ASSERT_EQ(std::system(("python3 " + dir.File("write.py") + " " + theirs).c_str()), 0);
+    Config config(theirs);
+    EXPECT_EQ(Keys(config, "gradus"), (std::vector<std::string>{"Steps=12", "Mode=Linear"}));
+    EXPECT_EQ(Keys(config, "Licenses"), (std::vector<std::string>{"Key One=A-B-C"}));
+}
+
+TEST(MemoryConfigStore, NamesAreCaseSensitiveAndReadingCreatesNothing) {
+    MemoryConfig store;
+    EXPECT_EQ(store.ReadKey("Group", "Key", "default"), "default");
+    EXPECT_EQ(store.GetGroupCount(), 0u);
+    store.WriteKey("Group", "Key", "v");
+    store.WriteKey("group", "key", "w");
+    EXPECT_EQ(store.ReadKey("Group", "Key", ""), "v");
+    EXPECT_EQ(store.ReadKey("group", "key", ""), "w");
+    EXPECT_EQ(store.ReadKey("Group", "key", "none"), "none");
+    store.DeleteGroup("Group");
+    EXPECT_EQ(store.ReadKey("Group", "Key", "gone"), "gone");
+    EXPECT_EQ(store.ReadKey("group", "key", ""), "w");
+}
+
+class CascadeTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        AppConfig::CreateAppConfig(String(dir.path().string()), "app.ini");
+        UserConfig::CreateUserConfig("Cascade Test", String(dir.path().string()), "");
+    }
+    void TearDown() override { NxSingleton::DeleteAllSingleton(); }
+    TempDir dir;
+};
+
+TEST_F(CascadeTest, TheUserValueWinsOverTheApplicationValueOverTheDefault) {
+    AppConfig::Instance()->WriteKey("Display", "Both", "app");
+    UserConfig::Instance()->WriteKey("Display", "BOTH", "user");
+    AppConfig::Instance()->WriteKey("Display", "AppOnly", "app");
+    UserConfig::Instance()->WriteKey("Display", "UserOnly", "user");
+
+    EXPECT_EQ(CascadedConfig::ReadKey("Display", "both", "default"), "user");
+    EXPECT_EQ(CascadedConfig::ReadKey("Display", "AppOnly", "default"), "app");
+    EXPECT_EQ(CascadedConfig::ReadKey("Display", "UserOnly", "default"), "user");
+    EXPECT_EQ(CascadedConfig::ReadKey("Display", "Neither", "default"), "default");
+    EXPECT_EQ(CascadedConfig::ReadKey("Other", "Both", ""), "");
+
+    // One entry per name, the user's spelling and value, ordered by key.
+    std::map<String, String> entries = CascadedConfig::GetEntries("display");
+    std::vector<std::string> listed;
+    for (const auto& [key, value] : entries) listed.push_back(key.str() + "=" + value.str());
+    EXPECT_EQ(listed, (std::vector<std::string>{"AppOnly=app", "BOTH=user", "UserOnly=user"}));
+}
+
+TEST_F(CascadeTest, TheFactoryHandsOutIndependentStoresOnTheSingletonsFiles) {
+    boost::shared_ptr<Configuration> app = ConfigurationFactory::CreateAppConfig();
+    boost::shared_ptr<Configuration> user = ConfigurationFactory::CreateUserConfig();
+    ASSERT_NE(app, ConfigurationFactory::CreateAppConfig());
+    app->WriteKey("G", "K", "from app store");
+    user->WriteKey("G", "K", "from user store");
+    EXPECT_EQ(AppConfig::Instance()->ReadKey("G", "K"), "from app store");
+    EXPECT_EQ(CascadedConfig::ReadKey("G", "K", ""), "from user store");
+    user->DeleteGroup("g");
+    EXPECT_EQ(CascadedConfig::ReadKey("G", "K", ""), "from app store");
+
+    NxSingleton::DeleteAllSingleton();
+    EXPECT_THROW(ConfigurationFactory::CreateAppConfig(), std::logic_error);
+    EXPECT_THROW(ConfigurationFactory::CreateUserConfig(), std::logic_error);
+    EXPECT_THROW(CascadedConfig::ReadKey("G", "K", ""), std::logic_error);
+}
+
+}  // namespace

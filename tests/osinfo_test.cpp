@@ -1,0 +1,57 @@
+#include "nxbase/osinfo.h"
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <thread>
+
+#include "test_util.h"
+
+namespace {
+
+class OSInfoTest : public ::testing::Test {
+  protected:
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv logPath{"NXBASE_LOG_PATH", dir.path().string()};
+    nxtest::ScopedEnv logOptions{"NXBASE_LOG_OPTIONS", "Info"};
+};
+
+TEST_F(OSInfoTest, AnswersWhatTheSystemReports) {
+    // Linux 2.6 is long gone; anything newer than 99 would be a parse error.
+    EXPECT_GE(OSInfo::GetOSMajorVersion(), 3u);
+    EXPECT_LE(OSInfo::GetOSMajorVersion(), 99u);
+    EXPECT_FALSE(OSInfo::IsWindowsNT());
+
+    char host[256] = {};
+    ASSERT_EQ(::gethostname(host, sizeof host - 1), 0);
+    EXPECT_EQ(OSInfo::GetMachineName(), std::string(host).substr(0, 64));
+
+    EXPECT_FALSE(OSInfo::GetUserName().empty());
+    EXPECT_LE(OSInfo::GetUserName().size(), 255u);
+
+    EXPECT_GE(OSInfo::GetCoreCount(), 1u);
+    if (std::thread::hardware_concurrency() != 0) {
+        EXPECT_EQ(OSInfo::GetCoreCount(), std::thread::hardware_concurrency());
+    }
+}
+
+TEST_F(OSInfoTest, ARemoteSessionCountsAsTerminalServer) {
+    {
+        nxtest::ScopedEnv connection("SSH_CONNECTION", "");
+        nxtest::ScopedEnv client("SSH_CLIENT", "");
+        nxtest::ScopedEnv tty("SSH_TTY", "");
+        EXPECT_FALSE(OSInfo::IsTerminalServer());
+        nxtest::ScopedEnv remote("SSH_CONNECTION", "10.0.0.1 52000 10.0.0.2 22");
+        EXPECT_TRUE(OSInfo::IsTerminalServer());
+    }
+    OSInfo::GetMachineName();
+    std::string log;
+    for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
+        log += nxtest::ReadFile(entry.path().string());
+    }
+    EXPECT_NE(log.find("TerminalServer: 0"), std::string::npos) << log;
+    EXPECT_NE(log.find("TerminalServer: 1"), std::string::npos) << log;
+    EXPECT_NE(log.find("Computername length: "), std::string::npos) << log;
+}
+
+}  // namespace

@@ -1,0 +1,376 @@
+#include "nxbase/registry.h"
+
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <thread>
+
+#include "nxbase/logfile.h"
+#include "test_util.h"
+
+namespace {
+
+using nxbase::RegistryHive;
+using nxbase::RegistryStore;
+using nxbase::RegistryValue;
+
+constexpr const char* kRoot = "Software\\K-Lume\\RegistryTest";
+
+class RegistryTest : public ::testing::Test {
+  protected:
+    void SetUp() override { RegistryHandler::SetRootPath(kRoot); }
+    void TearDown() override { RegistryHandler::SetRootPath(""); }
+
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv user{"NXBASE_USER_REGISTRY", dir.File("user/registry.sqlite")};
+    nxtest::ScopedEnv machine{"NXBASE_MACHINE_REGISTRY", dir.File("machine/registry.sqlite")};
+};
+
+TEST_F(RegistryTest, UserValueWinsOverMachineValueWhichWinsOverDefault) {
+    EXPECT_EQ(RegistryHandler::GetValue("Server", "Port", "default"), "default");
+    EXPECT_EQ(RegistryHandler::GetValue("Server", "Port"), "");
+
+    ASSERT_TRUE(RegistryHandler::AddRegistryEntry(HKEY_LOCAL_MACHINE, "Server", "Port", "4000"));
+    EXPECT_EQ(RegistryHandler::GetValue("Server", "Port", "default"), "4000");
+
+    RegistryEntry entry = RegistryEntry::CreateUserRegistryEntry("Server", "Port");
+    EXPECT_EQ(entry.GetSubKey(), std::string(kRoot) + "\\Server");
+    ASSERT_TRUE(RegistryHandler::AddRegistryEntry(entry, "5000"));
+    EXPECT_EQ(RegistryHandler::GetValue("Server", "Port", "default"), "5000");
+    EXPECT_EQ(RegistryHandler::GetValue(HKEY_LOCAL_MACHINE, "Server", "Port"), "4000");
+    EXPECT_EQ(RegistryHandler::GetGlobalValue(HKEY_LOCAL_MACHINE, std::string(kRoot) + "\\Server",
+                                              "Port"),
+              "4000");
+
+    // The machine entry sits in the machine's file only.
+    RegistryEntry app = RegistryEntry::CreateAppRegistryEntry("Server", "Port");
+    EXPECT_EQ(app.GetHKey(), HKEY_LOCAL_MACHINE);
+    EXPECT_EQ(RegistryHandler::GetRegistryEntry(app), "4000");
+    EXPECT_TRUE(std::filesystem::exists(dir.File("machine/registry.sqlite")));
+}
+
+TEST_F(RegistryTest, KeyPathsAndValueNamesIgnoreCaseAndKeepTheirCase) {
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Colour\\Display", "GammaValue", "2.2");
+    EXPECT_EQ(RegistryHandler::GetValue(HKEY_CURRENT_USER, "COLOUR\\display", "gammavalue"), "2.2");
+    EXPECT_EQ(RegistryHandler::GetValue(HKEY_CURRENT_USER, "\\colour\\\\Display\\", "GAMMAVALUE"),
+              "2.2");
+
+    // Writing under another case replaces the value and keeps the first name.
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "colour\\DISPLAY", "GAMMAVALUE", "1.8");
+    std::map<std::string, std::string> values =
+        RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Colour\\Display");
+    EXPECT_EQ(values, (std::map<std::string, std::string>{{"GammaValue", "1.8"}}));
+    EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "colour\\display"), 1u);
+
+    EXPECT_EQ(RegistryStore::SubKeys(RegistryHive::CurrentUser, "SOFTWARE\\k-lume\\registrytest"),
+              (std::vector<std::string>{"Colour"}));
+    EXPECT_EQ(
+        RegistryStore::Tree(RegistryHive::CurrentUser, "software\\k-lume\\REGISTRYTEST\\colour"),
+        (std::vector<std::string>{std::string(kRoot) + "\\Colour",
+                                  std::string(kRoot) + "\\Colour\\Display"}));
+
+    // A sibling whose name extends the key's is not below it.
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Colour2", "x", "1");
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Colour-B", "x", "1");
+    EXPECT_EQ(
+        RegistryStore::Tree(RegistryHive::CurrentUser, std::string(kRoot) + "\\Colour").size(), 2u);
+    EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "Missing"), 0u);
+    EXPECT_TRUE(RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Missing").empty());
+}
+
+TEST_F(RegistryTest, DeletesOnlyInsideTheMakersBranches) {
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Group\\Sub", "a", "1");
+    RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Group", "b", "2");
+    NxWriteRegistryKeyString("HKEY_CURRENT_USER\\Software\\Other\\Group", "c", "3");
+    NxWriteRegistryKeyString("HKEY_CURRENT_USER\\software\\veltramond\\Old", "d", "4");
+
+    EXPECT_FALSE(RegistryHandler::DeleteGroup(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "")));
+    EXPECT_FALSE(RegistryHandler::DeleteKey(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\Other\\Group", "c")));
+    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\Other\\Group", "c"), "3");
+
+    EXPECT_TRUE(RegistryHandler::DeleteKey(
+        RegistryEntry(HKEY_CURRENT_USER, "Software\\VeltraMond\\Old", "D")));
+    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\software\\veltramond\\Old", "d"), "");
+
+    EXPECT_TRUE(RegistryHandler::DeleteGroup(HKEY_CURRENT_USER, "group"));
+    EXPECT_FALSE(
+        RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group"));
+    EXPECT_FALSE(
+        RegistryStore::KeyExists(RegistryHive::CurrentUser, std::string(kRoot) + "\\Group\\Sub"));
+    EXPECT_FALSE(RegistryHandler::DeleteGroup(HKEY_CURRENT_USER, "group"));
+    EXPECT_THROW(RegistryStore::DeleteKey(RegistryHive::CurrentUser, "\\"), std::invalid_argument);
+}
+
+TEST_F(RegistryTest, ReadingADwordAsAStringRaisesTheKeyTypeError) {
+    RegistryStore::Write(RegistryHive::CurrentUser, std::string(kRoot) + "\\Numbers",
+                         RegistryValue::Dword("Count", 10));
+    const std::string path = "HKEY_CURRENT_USER\\" + std::string(kRoot) + "\\Numbers";
+    EXPECT_THROW(NxReadRegistryKeyString(path, "Count"), nxbase::RegistryKeyTypeError);
+    EXPECT_THROW(NxReadRegistryKeysString(path), nxbase::RegistryKeyTypeError);
+    EXPECT_THROW(RegistryHandler::GetValue("Numbers", "Count"), nxbase::RegistryKeyTypeError);
+    EXPECT_THROW(RegistryHandler::GetKeys(HKEY_CURRENT_USER, "Numbers"),
+                 nxbase::RegistryKeyTypeError);
+    EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "Numbers"), 1u);
+    EXPECT_EQ(
+        RegistryStore::Read(RegistryHive::CurrentUser, std::string(kRoot) + "\\Numbers", "count")
+            ->dword,
+        10u);
+
+    // A string written over it changes its type.
+    NxWriteRegistryKeyString(path, "Count", "eleven");
+    EXPECT_EQ(NxReadRegistryKeyString(path, "COUNT"), "eleven");
+}
+
+TEST_F(RegistryTest, EntriesNeedTheRootPath) {
+    RegistryHandler::SetRootPath("");
+    try {
+        RegistryEntry::CreateUserRegistryEntry("Log", "Startup");
+        FAIL() << "no exception";
+    } catch (const std::logic_error& error) {
+        EXPECT_STREQ(error.what(), "Registry root path not set");
+    }
+    EXPECT_THROW(RegistryEntry::CreateAppRegistryEntry("Log", "Startup"), std::logic_error);
+    EXPECT_TRUE(nxbase::ReadLogOptionsFromRegistry().empty());
+}
+
+TEST_F(RegistryTest, FullPathsCreateKeysOnReadingAndIgnoreOtherHives) {
+    const std::string path = "HKEY_CURRENT_USER\\Software\\K-Lume\\Fresh";
+    EXPECT_FALSE(RegistryStore::KeyExists(RegistryHive::CurrentUser, "Software\\K-Lume\\Fresh"));
+    EXPECT_FALSE(std::filesystem::exists(dir.File("user/registry.sqlite")));
+    EXPECT_EQ(NxReadRegistryKeyString(path, "Missing"), "");
+    EXPECT_TRUE(RegistryStore::KeyExists(RegistryHive::CurrentUser, "software\\k-lume\\fresh"));
+    EXPECT_TRUE(RegistryStore::KeyExists(RegistryHive::CurrentUser, "Software"));
+
+    EXPECT_TRUE(NxWriteRegistryKeyString(path, "Name", "value with \"quotes\""));
+    EXPECT_EQ(NxReadRegistryKeyString(path, "name"), "value with \"quotes\"");
+    EXPECT_EQ(NxReadRegistryKeysString(path),
+              (std::map<std::string, std::string>{{"Name", "value with \"quotes\""}}));
+
+    EXPECT_EQ(GetHKeyLocalMachine(), "HKEY_LOCAL_MACHINE");
+    EXPECT_EQ(GetHKeyCurrentUser(), "HKEY_CURRENT_USER");
+    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CLASSES_ROOT\\x", "y"), "");
+    EXPECT_TRUE(NxReadRegistryKeysString("HKCU\\Software").empty());
+    EXPECT_FALSE(NxWriteRegistryKeyString("HKEY_USERS\\x", "y", "z"));
+    EXPECT_FALSE(std::filesystem::exists(dir.File("machine/registry.sqlite")));
+}
+
+TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
+    constexpr int kProcesses = 2;
+    constexpr int kKeysEach = 1000;
+    constexpr int kMachineEvery = 10;
+    // The parent holds an open connection across fork().
+    RegistryStore::Write(RegistryHive::CurrentUser, "Software\\K-Lume",
+                         RegistryValue::Text("x", "1"));
+    pid_t children[kProcesses];
+    for (int p = 0; p < kProcesses; ++p) {
+        children[p] = ::fork();
+        ASSERT_GE(children[p], 0);
+        if (children[p] == 0) {
+            int status = 0;
+            try {
+                for (int i = 0; i < kKeysEach; ++i) {
+                    std::string key =
+                        "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
+                    RegistryStore::Write(RegistryHive::CurrentUser, key,
+                                         RegistryValue::Text("V", std::to_string(i)));
+                    // The machine's hive does not exist yet: both create it.
+                    if (i % kMachineEvery == 0) {
+                        RegistryStore::Write(RegistryHive::LocalMachine, key,
+                                             RegistryValue::Dword("V", i));
+                    }
+                }
+            } catch (const std::exception& error) {
+                std::fprintf(stderr, "child %d: %s\n", p, error.what());
+                status = 1;
+            }
+            ::_exit(status);
+        }
+    }
+    for (pid_t child : children) {
+        int status = 0;
+        ASSERT_EQ(::waitpid(child, &status, 0), child);
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    }
+    for (int p = 0; p < kProcesses; ++p) {
+        std::string parent = "Software\\K-Lume\\P" + std::to_string(p);
+        ASSERT_EQ(RegistryStore::SubKeys(RegistryHive::CurrentUser, parent).size(),
+                  static_cast<std::size_t>(kKeysEach));
+        for (int i = 0; i < kKeysEach; ++i) {
+            auto value = RegistryStore::Read(RegistryHive::CurrentUser,
+                                             parent + "\\K" + std::to_string(i), "V");
+            ASSERT_TRUE(value) << parent << " K" << i;
+            EXPECT_EQ(value->text, std::to_string(i));
+            if (i % kMachineEvery == 0) {
+                auto machineValue = RegistryStore::Read(RegistryHive::LocalMachine,
+                                                        parent + "\\K" + std::to_string(i), "V");
+                ASSERT_TRUE(machineValue) << parent << " K" << i;
+                EXPECT_EQ(machineValue->dword, static_cast<std::uint32_t>(i));
+            }
+        }
+    }
+}
+
+TEST_F(RegistryTest, ThreadsWritingAndReadingShareNothingButTheFile) {
+    constexpr int kThreads = 4;
+    constexpr int kWrites = 300;
+    std::vector<std::thread> threads;
+    std::atomic<int> failures{0};
+    for (int t = 0; t < kThreads; ++t) {
+        threads.emplace_back([t, &failures] {
+            for (int i = 0; i < kWrites; ++i) {
+                std::string name = "T" + std::to_string(t) + "_" + std::to_string(i);
+                RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Threads", name, name);
+                if (RegistryHandler::GetValue(HKEY_CURRENT_USER, "Threads", name) != name)
+                    ++failures;
+            }
+        });
+    }
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(failures, 0);
+    EXPECT_EQ(RegistryHandler::GetKeyCount(HKEY_CURRENT_USER, "Threads"),
+              static_cast<std::uint32_t>(kThreads * kWrites));
+}
+
+TEST_F(RegistryTest, CorruptFileGivesAnErrorNamingItAndStaysUntouched) {
+    const std::string file = dir.File("broken.sqlite");
+    const std::string junk = std::string(8192, 'x') + "definitely not SQLite";
+    nxtest::WriteFile(file, junk);
+    nxtest::ScopedEnv broken("NXBASE_USER_REGISTRY", file);
+    try {
+        RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup");
+        FAIL() << "no exception";
+    } catch (const nxbase::RegistryError& error) {
+        EXPECT_NE(std::string(error.what()).find(file), std::string::npos) << error.what();
+        EXPECT_NE(std::string(error.what()).find("corrupt"), std::string::npos) << error.what();
+    }
+    EXPECT_THROW(RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Log", "Startup", "1"),
+                 nxbase::RegistryError);
+    EXPECT_EQ(nxtest::ReadFile(file), junk);
+
+    // A valid SQLite file of someone else is refused as well.
+    const std::string foreign = dir.File("foreign.sqlite");
+    nxtest::ScopedEnv other("NXBASE_USER_REGISTRY", foreign);
+    ASSERT_EQ(std::system(("sqlite3 '" + foreign + "' 'CREATE TABLE t(a)'").c_str()), 0);
+    EXPECT_THROW(RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup"),
+                 nxbase::RegistryError);
+}
+
+TEST_F(RegistryTest, Regedit4ExportImportRoundTripKeepsEscapesAndDwords) {
+    const std::string key = "Software\\K-Lume\\Trip";
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Quote\"d", "say \"hi\""));
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Path", "C:\\Program Files\\K-Lume\\"));
+    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                         RegistryValue::Text("Lines", "one\r\ntwo"));
+    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Text("", "unnamed"));
+    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("Count", 10));
+    RegistryStore::Write(RegistryHive::LocalMachine, key, RegistryValue::Dword("Max", 0xFFFFFFFFu));
+    RegistryStore::Write(RegistryHive::LocalMachine, key + "\\Empty\\Deeper",
+                         RegistryValue::Text("x", ""));
+
+    std::string text = nxbase::ExportRegedit4(RegistryHive::LocalMachine, key);
+    EXPECT_NE(text.find("\"Count\"=dword:0000000a\n"), std::string::npos) << text;
+    EXPECT_NE(text.find("\"Max\"=dword:ffffffff\n"), std::string::npos) << text;
+    EXPECT_NE(text.find("\"Path\"=\"C:\\\\Program Files\\\\K-Lume\\\\\"\n"), std::string::npos)
+        << text;
+    EXPECT_NE(text.find("\"Quote\\\"d\"=\"say \\\"hi\\\"\"\n"), std::string::npos) << text;
+    EXPECT_NE(text.find("@=\"unnamed\"\n"), std::string::npos) << text;
+    EXPECT_EQ(text.rfind("REGEDIT4\n", 0), 0u);
+
+    ASSERT_TRUE(RegistryStore::DeleteKey(RegistryHive::LocalMachine, key));
+    // Windows line ends and a comment are read as well.
+    std::string windows;
+    for (char c : text) windows += c == '\n' ? std::string("\r\n") : std::string(1, c);
+    windows.insert(windows.find("\r\n") + 2, "; saved by the test\r\n");
+    RegistryStore::Apply(nxbase::ParseRegedit4(windows, "trip.reg"));
+    EXPECT_EQ(nxbase::ExportRegedit4(RegistryHive::LocalMachine, key), text);
+    EXPECT_EQ(RegistryStore::Read(RegistryHive::LocalMachine, key, "Lines")->text, "one\r\ntwo");
+
+    // Deletions: a value and a whole key.
+    RegistryStore::Apply(
+        nxbase::ParseRegedit4("REGEDIT4\n[HKLM\\Software\\K-Lume\\Trip]\n\"Count\"=-\n[-HKEY_LOCAL_"
+                              "MACHINE\\Software\\K-Lume\\Trip\\Empty]\n",
+                              "delete.reg"));
+    EXPECT_FALSE(RegistryStore::Read(RegistryHive::LocalMachine, key, "Count"));
+    EXPECT_FALSE(RegistryStore::KeyExists(RegistryHive::LocalMachine, key + "\\Empty"));
+}
+
+TEST_F(RegistryTest, Regedit4ErrorsNameSourceAndLineAndApplyNothing) {
+    struct Case {
+        const char* text;
+        const char* expected;
+    };
+    const Case cases[] = {
+        {"", "trip.reg: not REGEDIT4"},
+        {"REGEDIT5\n", "trip.reg:1: the first line must be REGEDIT4"},
+        {"REGEDIT4\n\"a\"=\"b\"\n", "trip.reg:2: a value outside a section"},
+        {"REGEDIT4\n[HKEY_USERS\\x]\n", "trip.reg:2: unknown hive"},
+        {"REGEDIT4\n[HKCU\\x\n", "trip.reg:2: a section must end with ]"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=dword:123456789\n", "trip.reg:3: a dword needs"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=dword:-1\n", "trip.reg:3: a dword needs"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\\q\"\n", "trip.reg:3: unknown escape \\q"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\n", "trip.reg:3: missing closing quote"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\" junk\n", "trip.reg:3: text after the closing quote"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=hex:01,02\n", "trip.reg:3: binary (hex) values"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"\n", "trip.reg:3: missing ="},
+        {"REGEDIT4\n[-HKCU\\]\n", "trip.reg:2: a whole hive cannot be deleted"},
+    };
+    for (const Case& c : cases) {
+        try {
+            nxbase::ParseRegedit4(c.text, "trip.reg");
+            ADD_FAILURE() << "accepted: " << c.text;
+        } catch (const std::runtime_error& error) {
+            EXPECT_EQ(std::string(error.what()).rfind(c.expected, 0), 0u) << error.what();
+        }
+    }
+    EXPECT_FALSE(std::filesystem::exists(dir.File("user/registry.sqlite")));
+}
+
+TEST_F(RegistryTest, LogOptionsInTheUsersHiveReachANewLogFile) {
+    nxtest::ScopedEnv logPath("NXBASE_LOG_PATH", dir.path().string());
+    nxtest::ScopedEnv logOptions("NXBASE_LOG_OPTIONS", "");
+    const std::string log = std::string(kRoot) + "\\Log";
+    RegistryStore::Write(RegistryHive::CurrentUser, log, RegistryValue::Text("Startup", "1"));
+    RegistryStore::Write(RegistryHive::CurrentUser, log, RegistryValue::Text("Language", "true"));
+    RegistryStore::Write(RegistryHive::CurrentUser, log, RegistryValue::Dword("ThreadId", 1));
+    RegistryStore::Write(RegistryHive::CurrentUser, log, RegistryValue::Text("Keys", "0"));
+    // The machine's hive does not count.
+    RegistryStore::Write(RegistryHive::LocalMachine, log, RegistryValue::Text("Locale", "1"));
+
+    EXPECT_EQ(nxbase::ReadLogOptionsFromRegistry(),
+              (std::map<std::string, std::string>{
+                  {"Keys", "0"}, {"Language", "true"}, {"Startup", "1"}, {"ThreadId", "1"}}));
+
+    LogFile logFile("registry-options");
+    EXPECT_TRUE(logFile.IsLogOptionEnabled("Startup"));
+    EXPECT_TRUE(logFile.IsLogOptionEnabled("Language"));
+    EXPECT_TRUE(logFile.IsLogOptionEnabled("ThreadId"));
+    EXPECT_FALSE(logFile.IsLogOptionEnabled("Keys"));
+    EXPECT_FALSE(logFile.IsLogOptionEnabled("Locale"));
+    logFile.WriteLog("from the registry", "Startup");
+    logFile.WriteLog("not enabled", "Locale");
+    std::string text = nxtest::ReadFile(dir.File("registry-options.log"));
+    EXPECT_NE(text.find("ThreadId: "), std::string::npos) << text;
+    EXPECT_NE(text.find("from the registry"), std::string::npos) << text;
+    EXPECT_EQ(text.find("not enabled"), std::string::npos) << text;
+}
+
+TEST_F(RegistryTest, KeyHolderOwnsOpenedKeysOnly) {
+    HKeyHolder holder;
+    EXPECT_EQ(holder.GetHKey(), nullptr);
+    *holder.GetHKeyPtr() = HKEY_CURRENT_USER;  // a hive is never freed
+    EXPECT_EQ(holder.GetHKey(), HKEY_CURRENT_USER);
+    RegistryEntry entry(HKEY_CURRENT_USER, "a", "b");
+    entry.SetKey(HKEY_LOCAL_MACHINE, "c");
+    EXPECT_EQ(entry.GetHKey(), HKEY_LOCAL_MACHINE);
+    EXPECT_EQ(entry.GetKey(), "c");
+    EXPECT_THROW(RegistryHandler::GetRegistryEntry(RegistryEntry(nullptr, "a", "b")),
+                 nxbase::RegistryError);
+}
+
+}  // namespace

@@ -1,0 +1,196 @@
+#include "nxbase/strhelp.h"
+
+#include <gtest/gtest.h>
+
+#include <clocale>
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+#include <vector>
+
+#include "test_util.h"
+
+namespace {
+
+using Strings = std::vector<std::string>;
+
+TEST(StringHelpers, SplitTrimsBlanksOnlyAndKeepsEmptyPieces) {
+    EXPECT_EQ(StringHelpers::Split("  a;b  ", ';'), (Strings{"a", "b"}));
+    EXPECT_EQ(StringHelpers::Split("a;;b", ';'), (Strings{"a", "", "b"}));
+    EXPECT_EQ(StringHelpers::Split("a;", ';'), (Strings{"a", ""}));
+    EXPECT_EQ(StringHelpers::Split(";", ';'), (Strings{"", ""}));
+    EXPECT_EQ(StringHelpers::Split("\ta ; b\t", ';'), (Strings{"\ta ", " b\t"}));
+    EXPECT_TRUE(StringHelpers::Split("   ", ';').empty());
+    EXPECT_TRUE(StringHelpers::Split("", ';').empty());
+
+    EXPECT_EQ(StringHelpers::SplitSearchStringToVector(" ", ';'), (Strings{"*"}));
+    EXPECT_EQ(StringHelpers::SplitSearchStringToVector("", ';'), (Strings{"*"}));
+    EXPECT_EQ(StringHelpers::SplitSearchStringToVector("*", ';'), (Strings{"*"}));
+    EXPECT_EQ(StringHelpers::SplitSearchStringToVector("a*;b", ';'), (Strings{"a*", "b"}));
+    EXPECT_TRUE(StringHelpers::SplitSearchStringToVector("  ", ';').empty());
+
+    EXPECT_EQ(StringHelpers::SplitStringToVector(String(""), ';'), (std::vector<String>{"*"}));
+    EXPECT_EQ(StringHelpers::SplitStringToVector(String(" a;;b;"), ';'),
+              (std::vector<String>{" a", "", "b", ""}));
+}
+
+TEST(StringHelpers, ConcatenatePutsSeparatorsBetweenNeighboursOnly) {
+    EXPECT_EQ(StringHelpers::Concatenate({"one"}, ", "), "one");
+    EXPECT_EQ(StringHelpers::Concatenate({"a", "", "c"}, "--"), "a----c");
+    EXPECT_EQ(StringHelpers::Concatenate({}, ";"), "");
+}
+
+TEST(StringHelpers, ReplaceDoesNotRescanInsertedText) {
+    std::string text = "aaa";
+    StringHelpers::Replace(text, "a", "aa");
+    EXPECT_EQ(text, "aaaaaa");
+    text = "a.b.c";
+    StringHelpers::Replace(text, ".", "");
+    EXPECT_EQ(text, "abc");
+    text = "abab";
+    StringHelpers::Replace(text, "aba", "X");
+    EXPECT_EQ(text, "Xb");
+    text = "unchanged";
+    StringHelpers::Replace(text, "", "X");
+    EXPECT_EQ(text, "unchanged");
+}
+
+TEST(StringHelpers, CaseAndBaseConversion) {
+    EXPECT_EQ(StringHelpers::ToUpper("Lab ä 1"), "LAB ä 1");
+    EXPECT_EQ(StringHelpers::ToLower("XYZ@["), "xyz@[");
+    EXPECT_EQ(StringHelpers::BaseConverter(0, StringHelpers::CharactersBase2()), "0");
+    EXPECT_EQ(StringHelpers::BaseConverter(5, StringHelpers::CharactersBase2()), "101");
+    EXPECT_EQ(StringHelpers::BaseConverter(8, StringHelpers::CharactersBase8()), "10");
+    EXPECT_EQ(StringHelpers::BaseConverter(4294967295u, StringHelpers::CharactersBase10()),
+              "4294967295");
+    EXPECT_EQ(StringHelpers::BaseConverter(0xBEEF, StringHelpers::CharactersBase16()), "BEEF");
+    EXPECT_EQ(StringHelpers::BaseConverter(7, "x"), "");
+}
+
+TEST(GString, MatchPatternIsUnanchored) {
+    GString text("xxabcyy");
+    EXPECT_TRUE(text.MatchPattern("abc*"));
+    EXPECT_TRUE(text.MatchPattern("*c*y"));
+    EXPECT_TRUE(text.MatchPattern("x*y"));
+    EXPECT_TRUE(text.MatchPattern("b"));
+    EXPECT_TRUE(text.MatchPattern(""));
+    EXPECT_TRUE(text.MatchPattern("*"));
+    EXPECT_TRUE(text.MatchPattern("**a**"));
+    EXPECT_FALSE(text.MatchPattern("c*a")) << "tokens must occur in order";
+    EXPECT_FALSE(text.MatchPattern("ABC")) << "matching is case-sensitive";
+    EXPECT_FALSE(text.MatchPattern("abc*abc")) << "a found token is used up";
+    EXPECT_FALSE(text.MatchPattern("yyy"));
+    EXPECT_TRUE(GString("").MatchPattern("*"));
+    EXPECT_FALSE(GString("").MatchPattern("a"));
+
+    EXPECT_FALSE(text.MatchVectorPattern({}));
+    EXPECT_TRUE(text.MatchVectorPattern({"abc", "*y"}));
+    EXPECT_FALSE(text.MatchVectorPattern({"abc", "z"}));
+}
+
+TEST(GString, FormatsNumbersWithWidthRoundingAndSign) {
+    EXPECT_EQ(GString(3.14159, 2), "3.14");
+    EXPECT_EQ(GString(2.5, 0), "2") << "ties to even, as printf";
+    EXPECT_EQ(GString(0.125, 2), "0.12");
+    EXPECT_EQ(GString(0.375, 2), "0.38");
+    EXPECT_EQ(GString(-0.001, 2), "0.00") << "no minus sign on a zero";
+    EXPECT_EQ(GString(-1.5, 1, 7), "   -1.5");
+    EXPECT_EQ(GString(-1.5, 1, 7, '.', true), "-0001.5");
+    EXPECT_EQ(GString(1.5, 1, 0, ',', false, true), "+1,5");
+    EXPECT_EQ(GString(12.0, -3), "12");
+    EXPECT_EQ(GString(1e300, 1).Len(), 303);
+    EXPECT_EQ(GString(std::nan(""), 2), "nan");
+    EXPECT_EQ(GString(-HUGE_VAL, 2, 5), " -inf");
+    EXPECT_EQ(GString(42, 5), "   42");
+    EXPECT_EQ(GString(-42, 0), "-42");
+    EXPECT_EQ(GString(-2147483647 - 1, 3), "-2147483648");
+}
+
+TEST(GString, ReadsNumbersWithPointOrComma) {
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("  12.5 mm")), 12.5);
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("12,5")), 12.5);
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("+3e2")), 300.0);
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("-0.25")), -0.25);
+    EXPECT_EQ(static_cast<double>(GString("abc")), 0.0);
+    EXPECT_EQ(static_cast<double>(GString("")), 0.0);
+    EXPECT_EQ(static_cast<double>(GString("+-1")), 0.0);
+    EXPECT_EQ(static_cast<double>(GString("1e999")), HUGE_VAL);
+    for (double value : {0.1, 1.0 / 3.0, -123456.789, 5e-7}) {
+        EXPECT_DOUBLE_EQ(static_cast<double>(GString(value, 17)), value);
+    }
+}
+
+// Switches LC_ALL to a locale whose decimal separator is ','. de_DE.UTF-8 is
+// used when installed; otherwise it is compiled into the test's directory
+// with localedef, when the locale sources are there.
+class CommaLocaleTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        if (std::setlocale(LC_ALL, "de_DE.UTF-8") == nullptr) {
+            std::string command =
+                "localedef -i de_DE -f UTF-8 '" + dir_.File("de_DE.UTF-8") + "' >/dev/null 2>&1";
+            if (std::system(command.c_str()) == 0) {
+                locpath_.emplace("LOCPATH", dir_.path().string());
+                std::setlocale(LC_ALL, "de_DE.UTF-8");
+            }
+        }
+        const char* active = std::setlocale(LC_ALL, nullptr);
+        if (active == nullptr || std::string(active) != "de_DE.UTF-8" ||
+            *std::localeconv()->decimal_point != ',') {
+            std::setlocale(LC_ALL, "C");
+            GTEST_SKIP() << "no locale with a decimal comma: de_DE.UTF-8 is not installed and "
+                            "could not be built with localedef";
+        }
+    }
+    void TearDown() override { std::setlocale(LC_ALL, "C"); }
+
+    nxtest::TempDir dir_;
+    std::optional<nxtest::ScopedEnv> locpath_;
+};
+
+TEST_F(CommaLocaleTest, GStringWritesAndReadsPointWhateverTheLocale) {
+    char printed[32];
+    std::snprintf(printed, sizeof printed, "%.1f", 2.5);
+    ASSERT_STREQ(printed, "2,5") << "the locale is in force";
+    EXPECT_EQ(GString(1234.5678, 2), "1234.57");
+    EXPECT_EQ(GString(-0.5, 3, 8), "  -0.500");
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("1234.5678")), 1234.5678);
+    EXPECT_DOUBLE_EQ(static_cast<double>(GString("7,25")), 7.25);
+}
+
+TEST(DynStringArray, SlotsOutsideTheArrayAreNeitherReadNorWritten) {
+    String a("a"), b("b"), alsoA("a");
+    DynStringArray array(2);
+    EXPECT_EQ(array.GetSize(), 2ul);
+    EXPECT_EQ(array.Get(0), nullptr);
+    EXPECT_EQ(array.Put(0, &a), &a);
+    EXPECT_EQ(array.Put(1, &b), &b);
+    EXPECT_EQ(array.Put(2, &a), nullptr);
+    EXPECT_EQ(array.Get(2), nullptr);
+    EXPECT_EQ(array.Get(~0ul), nullptr);
+    EXPECT_EQ(array.Get(1), &b);
+
+    DynStringArray copy(array);
+    EXPECT_EQ(copy, array);
+    DynStringArray other(2);
+    other.Put(0, &alsoA);
+    EXPECT_NE(other, array);
+    other.Put(1, &b);
+    EXPECT_EQ(other, array) << "equal texts in every slot";
+
+    array.ChangeSize(3);
+    EXPECT_EQ(array.Get(1), &b);
+    EXPECT_EQ(array.Get(2), nullptr);
+    EXPECT_NE(array, copy);
+    array.ChangeSize(1);
+    EXPECT_EQ(array.Get(0), &a);
+    EXPECT_EQ(array.Get(1), nullptr);
+    array.Clear();
+    EXPECT_EQ(array.GetSize(), 1ul);
+    EXPECT_EQ(array.Get(0), nullptr);
+    copy = array;
+    EXPECT_EQ(copy, array);
+}
+
+}  // namespace
