@@ -122,6 +122,21 @@ void BM_LabBatchPath(benchmark::State& state) {
 }
 BENCHMARK(BM_LabBatchPath)->Arg(kCacheSpectra)->Arg(kMemorySpectra);
 
+// Both cores (wall-clock rate): what an application sees for a large scan.
+void BM_LabBatchTwoThreads(benchmark::State& state) {
+    const int count = static_cast<int>(state.range(0));
+    const std::vector<float>& spectra = Spectra(count);
+    const nxbase::ColorBatch batch;
+    std::vector<float> lab(3 * static_cast<std::size_t>(count));
+    for (auto _ : state) {
+        batch.ToLabParallel(spectra.data(), count, lab.data(), 2);
+        benchmark::DoNotOptimize(lab.data());
+        benchmark::ClobberMemory();
+    }
+    state.SetItemsProcessed(state.iterations() * count);
+}
+BENCHMARK(BM_LabBatchTwoThreads)->Arg(kMemorySpectra)->UseRealTime();
+
 void BM_XyzBatchPath(benchmark::State& state) {
     const int count = static_cast<int>(state.range(0));
     const std::vector<float>& spectra = Spectra(count);
@@ -184,6 +199,8 @@ int main(int argc, char** argv) {
               kBatchBar);
     PrintLine("ColorBatch::ToLab, from memory", reporter.Rate("BM_LabBatchPath" + memory),
               yardstickMemory, kBatchBar);
+    PrintLine("ColorBatch::ToLabParallel, 2 threads", 
+              reporter.Rate("BM_LabBatchTwoThreads" + memory + "/real_time"), yardstickMemory, 0.0);
     PrintLine("ColorBatch::ToXYZ, in cache", reporter.Rate("BM_XyzBatchPath" + cache), yardstick, 0.0);
     benchmark::Shutdown();
     return 0;

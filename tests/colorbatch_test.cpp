@@ -60,6 +60,7 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
     std::vector<float> lab(3 * count);
     batch.ToXYZ(spectra.data(), count, xyz.data());
     batch.ToLab(spectra.data(), count, lab.data());
+    double worst = 0.0;
     for (std::size_t s = 0; s < count; ++s) {
         const ReflectanceSpectrum spectrum(&spectra[36 * s], PhysicalConditions());
         const LABVector object(spectrum, condition);
@@ -67,8 +68,12 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
         const double scale = Scale(object.getV());
         for (int i = 0; i < 3; ++i) {
             ASSERT_NEAR(b[i], object[i], kBatchRelative * scale) << "spectrum " << s << " Lab " << i;
+            worst = std::max(worst, std::fabs(b[i] - object[i]) / scale);
         }
     }
+    ::testing::Test::RecordProperty("worst_lab_relative_" + condition.GetIllum().GetName() + "_" +
+                                        condition.GetObserver().GetName().str(),
+                                    std::to_string(worst * 1e6) + "e-6");
     const CMetryFilter filter(Lichtart(condition.GetIllum()), Observer(condition.GetObserver()));
     for (std::size_t s = 0; s < count; ++s) {
         const XYZVector object(filter, ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));
@@ -103,6 +108,28 @@ TEST(ColorBatch, HandlesEveryTailLengthAndWritesNothingBeyond) {
         }
         for (int i = 0; i < 3; ++i) EXPECT_EQ(out[3 * count + i], -999.0f) << "count " << count;
     }
+}
+
+TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
+    const std::vector<float> base = TestSpectra();
+    std::vector<float> spectra;
+    while (spectra.size() < 36u * 70001u) spectra.insert(spectra.end(), base.begin(), base.end());
+    spectra.resize(36u * 70001u);  // not a multiple of eight or of the thread count
+    const std::size_t count = spectra.size() / 36;
+    const ColorBatch batch;
+    std::vector<float> serial(3 * count);
+    batch.ToLab(spectra.data(), count, serial.data());
+    for (unsigned threads : {0u, 1u, 2u, 3u, 7u}) {
+        std::vector<float> parallel(3 * count + 1, -1.0f);
+        batch.ToLabParallel(spectra.data(), count, parallel.data(), threads);
+        EXPECT_TRUE(std::equal(serial.begin(), serial.end(), parallel.begin())) << threads;
+        EXPECT_EQ(parallel.back(), -1.0f);
+    }
+    std::vector<float> xyz(3 * count);
+    std::vector<float> xyzParallel(3 * count);
+    batch.ToXYZ(spectra.data(), count, xyz.data());
+    batch.ToXYZParallel(spectra.data(), count, xyzParallel.data(), 2);
+    EXPECT_EQ(xyz, xyzParallel);
 }
 
 TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {

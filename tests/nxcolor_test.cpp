@@ -55,17 +55,19 @@ TEST(NxcolorCsv, ReportsBadRowsWithTheirLineAndKeepsTheOthers) {
                              "2,short," + Values(0.5f, 30) + "\n" +
                              "3,text,0.1,abc," + Values(0.5f, 34) + "\n" +
                              "4,nan," + Values(0.5f, 35) + ",nan\n" +
-                             "5,\"quoted, name\"," + Values(0.25f) + "\r\n";
+                             "5,\"quoted, name\"," + Values(0.25f) + "\r\n" +
+                             "6,huge,1e300," + Values(0.5f, 35) + "\n";
     const nxcolor::SpectraTable table = ParseSpectraCsv(text, "bad.csv");
     ASSERT_EQ(table.rows.size(), 2u);
     EXPECT_EQ(table.rows[0].id, "1 good");
     EXPECT_EQ(table.rows[1].id, "5 quoted, name");
     EXPECT_EQ(table.rows[1].values[35], 0.25f) << "CR of CR LF removed";
-    ASSERT_EQ(table.errors.size(), 3u);
+    ASSERT_EQ(table.errors.size(), 4u);
     EXPECT_EQ(table.errors[0], "bad.csv:3: 32 fields, expected 38");
     EXPECT_EQ(table.errors[1], "bad.csv:4: field 4 (390 nm): \"abc\" is not a number");
     EXPECT_EQ(table.errors[2], "bad.csv:5: field 38 (730 nm): \"nan\" is not a number");
-    EXPECT_FALSE(table.badGrid);
+    EXPECT_EQ(table.errors[3], "bad.csv:7: field 3 (380 nm): \"1e300\" is out of range");
+    EXPECT_FALSE(table.unusable);
 }
 
 TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
@@ -73,7 +75,7 @@ TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
                                std::string("id,SPEC_380,SPEC_385")}) {
         const nxcolor::SpectraTable table =
             ParseSpectraCsv("# comment\n" + header + "\n1,x," + Values(0.5f) + "\n", "grid.csv");
-        EXPECT_TRUE(table.badGrid) << header;
+        EXPECT_TRUE(table.unusable) << header;
         EXPECT_TRUE(table.rows.empty());
         ASSERT_EQ(table.errors.size(), 1u);
         EXPECT_EQ(table.errors[0].rfind("grid.csv:2: spectral columns", 0), 0u) << table.errors[0];
@@ -82,7 +84,7 @@ TEST(NxcolorCsv, RejectsAnyOtherWavelengthGrid) {
     std::string cgats = "SAMPLE_ID";
     for (int nm = 380; nm <= 730; nm += 10) cgats += ",SPECTRAL_NM" + std::to_string(nm);
     const auto table = ParseSpectraCsv("\xEF\xBB\xBF" + cgats + "\nA1," + Values(0.5f) + "\n", "s");
-    EXPECT_FALSE(table.badGrid);
+    EXPECT_FALSE(table.unusable);
     ASSERT_EQ(table.rows.size(), 1u);
     EXPECT_EQ(table.rows[0].id, "A1");
 }
@@ -115,6 +117,48 @@ TEST(NxcolorCsv, SurvivesArbitraryBytes) {
     ASSERT_EQ(longLine.errors.size(), 1u);
 }
 
+// A CGATS.17 file as measurement software writes it, with `sets` data lines.
+std::string Cgats(const std::vector<std::string>& sets, int first = 380, int last = 730) {
+    std::string text = "CGATS.17\nORIGINATOR \"test\"\nNUMBER_OF_FIELDS " +
+                       std::to_string(2 + (last - first) / 10 + 1) +
+                       "\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
+    for (int nm = first; nm <= last; nm += 10) text += " SPECTRAL_NM" + std::to_string(nm);
+    text += "\nEND_DATA_FORMAT\nNUMBER_OF_SETS " + std::to_string(sets.size()) + "\nBEGIN_DATA\n";
+    for (const std::string& set : sets) text += set + "\n";
+    return text + "END_DATA\n";
+}
+
+std::string SpaceValues(float v, int count = 36) {
+    std::string text = Values(v, count);
+    std::replace(text.begin(), text.end(), ',', ' ');
+    return text;
+}
+
+TEST(NxcolorCgats, ReadsSpectralFieldsThroughLittleCms) {
+    const std::string text = Cgats({"A1 \"paper white\" " + SpaceValues(0.9f),
+                                    "A2 \"bad\" 0.5 abc " + SpaceValues(0.5f, 34),
+                                    "A3 \"grey\" " + SpaceValues(0.2f)});
+    ASSERT_TRUE(nxcolor::LooksLikeCgats(text));
+    const nxcolor::SpectraTable table = nxcolor::ParseSpectra(text, "m.cgats");
+    ASSERT_EQ(table.rows.size(), 2u);
+    EXPECT_EQ(table.rows[0].id, "A1 paper white");
+    EXPECT_EQ(table.rows[0].values[35], 0.9f);
+    EXPECT_EQ(table.rows[1].id, "A3 grey");
+    EXPECT_EQ(table.rows[1].line, 11);
+    ASSERT_EQ(table.errors.size(), 1u);
+    EXPECT_EQ(table.errors[0], "m.cgats:10: SPECTRAL_NM390: \"abc\" is not a number");
+
+    const auto grid = nxcolor::ParseSpectra(Cgats({"A1 x " + SpaceValues(0.5f, 41)}, 380, 780), "g");
+    EXPECT_TRUE(grid.unusable);
+    ASSERT_EQ(grid.errors.size(), 1u);
+    EXPECT_EQ(grid.errors[0].rfind("g: spectral fields 380..780 nm (41 fields)", 0), 0u) << grid.errors[0];
+
+    const auto broken = nxcolor::ParseSpectra("CGATS.17\nBEGIN_DATA_FORMAT\nKEYWORD\n", "b");
+    EXPECT_TRUE(broken.unusable);
+    ASSERT_EQ(broken.errors.size(), 1u);
+    EXPECT_EQ(broken.errors[0].rfind("b:", 0), 0u) << broken.errors[0];
+}
+
 TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     const auto table = ParseSpectraCsv(nxcolor::EmbeddedChart(), "chart");
     const MeasuringCondition condition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG),
@@ -132,6 +176,15 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     std::ostringstream aligned;
     nxcolor::Writers().at("table")(report, aligned);
     EXPECT_EQ(aligned.str().rfind("# chart: 24 spectra, illuminant D50, observer 2", 0), 0u);
+    // CGATS output parses with LittleCMS: the reader gets past the syntax and
+    // finds the data format (colour fields, no spectral ones).
+    std::ostringstream cgats;
+    nxcolor::Writers().at("cgats")(report, cgats);
+    EXPECT_NE(cgats.str().find("SAMPLE_ID XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
+              std::string::npos);
+    const auto back = nxcolor::ParseSpectra(cgats.str(), "out.cgats");
+    ASSERT_EQ(back.errors.size(), 1u);
+    EXPECT_EQ(back.errors[0].rfind("out.cgats: spectral fields missing", 0), 0u) << back.errors[0];
     EXPECT_EQ(nxcolor::FormatNumber(-0.00001f, 2), "0.00");
     EXPECT_EQ(nxcolor::FormatNumber(-1.5f, 1), "-1.5");
 }
@@ -183,6 +236,14 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     ASSERT_EQ(RunNxcolor("--illuminant D65 --observer 10 --format csv --din99", &out, &err), 0) << err;
     EXPECT_EQ(out.substr(0, out.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 25);
+    // Densities of a flat 10% reflector are 1 in every channel.
+    nxtest::TempDir dir;
+    const std::string grey = dir.File("grey.csv");
+    std::ofstream(grey) << "grey," << Values(0.1f) << "\n";
+    ASSERT_EQ(RunNxcolor(grey + " --density 'Status T' -p 3 -f csv", &out, &err), 0) << err;
+    EXPECT_NE(out.find(",D_RED,D_GREEN,D_BLUE\ngrey,"), std::string::npos) << out;
+    EXPECT_NE(out.find(",1.000,1.000,1.000\n"), std::string::npos) << out;
+    EXPECT_EQ(RunNxcolor("--density 'Status Q'", &out, &err), 2);
     ASSERT_EQ(RunNxcolor("--help", &out, &err), 0);
     EXPECT_NE(out.find("Usage: nxcolor"), std::string::npos);
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);

@@ -1,6 +1,7 @@
 // ColorBatch turns contiguous arrays of spectra into XYZ or CIELAB under one
 // illuminant and observer, many spectra per call. An object is immutable after
-// construction: any number of threads may use one at once.
+// construction: any number of threads may use one at once. Nothing is checked
+// or thrown: the caller passes valid arrays of the stated sizes.
 //
 // A spectrum is 36 floats, 380..730 nm in 10 nm steps (reflectance factors,
 // white = 1.0); spectrum i of an array starts at float 36*i. Results are three
@@ -65,6 +66,15 @@ public:
     // L, a, b. Always CIE 1976: the process-wide DIN99 setting of LABVector
     // does not apply here. pSpectra and pLab must not overlap.
     void ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const;
+
+    // As ToXYZ and ToLab, with the array split over alThreads threads (0: one
+    // per core); the calling thread takes one part. Results are identical to
+    // the one-thread forms. Small counts, or threads that cannot be started,
+    // are done on the calling thread.
+    void ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
+                       unsigned alThreads = 0) const;
+    void ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
+                       unsigned alThreads = 0) const;
 
     // White point Xn, Yn (= 100), Zn of the weights.
     float WhitePoint(int alChannel) const;

@@ -10,15 +10,19 @@
 // builds an x86-64-v3 (AVX2) clone of the kernels that is picked at load time.
 #include "nxbase/colorbatch.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <cstring>
+#include <system_error>
+#include <thread>
+#include <vector>
 
 #include "nxbase/cmetry.h"
 #include "tristimulus.h"
 
-// The vector helpers below are file-local and inlined; the ABI note GCC gives
-// for 32-byte vector arguments without AVX does not apply to them.
-#if defined(__GNUC__) && !defined(__clang__)
+// The vector helpers below are file-local and inlined; the ABI note GCC and
+// Clang give for 32-byte vector arguments without AVX does not apply to them.
+#if defined(__GNUC__)
 #pragma GCC diagnostic ignored "-Wpsabi"
 #endif
 
@@ -261,6 +265,56 @@ void ColorBatch::ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) 
 
 void ColorBatch::ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const {
     RunLab(amTables, pSpectra, alCount, pLab);
+}
+
+namespace {
+
+// Spectra per thread below which starting a thread costs more than it saves.
+constexpr std::size_t kMinPerThread = 16384;
+
+// Runs fRun(first, count) over [0, alCount) in up to alThreads parts whose
+// starts are multiples of eight.
+template <typename Run>
+void SplitOverThreads(std::size_t alCount, unsigned alThreads, Run fRun) {
+    unsigned threads = alThreads ? alThreads : std::max(1u, std::thread::hardware_concurrency());
+    threads = static_cast<unsigned>(
+        std::min<std::size_t>(threads, std::max<std::size_t>(1, alCount / kMinPerThread)));
+    if (threads <= 1) {
+        fRun(0, alCount);
+        return;
+    }
+    const std::size_t part = (alCount / threads + kLanes - 1) / kLanes * kLanes;
+    std::vector<std::thread> workers;
+    std::size_t next = part;  // the calling thread takes [0, part)
+    for (unsigned t = 1; t < threads && next < alCount; ++t) {
+        const std::size_t first = next;
+        const std::size_t count = std::min(part, alCount - first);
+        try {
+            workers.emplace_back([=] { fRun(first, count); });
+        } catch (const std::system_error&) {
+            fRun(first, count);  // no thread to be had: do it here
+        }
+        next += count;
+    }
+    if (next < alCount) fRun(next, alCount - next);
+    fRun(0, std::min(part, alCount));
+    for (std::thread& worker : workers) worker.join();
+}
+
+}  // namespace
+
+void ColorBatch::ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
+                               unsigned alThreads) const {
+    SplitOverThreads(alCount, alThreads, [&](std::size_t first, std::size_t count) {
+        RunXyz(amTables, pSpectra + first * kSamples, count, pXYZ + 3 * first);
+    });
+}
+
+void ColorBatch::ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
+                               unsigned alThreads) const {
+    SplitOverThreads(alCount, alThreads, [&](std::size_t first, std::size_t count) {
+        RunLab(amTables, pSpectra + first * kSamples, count, pLab + 3 * first);
+    });
 }
 
 float ColorBatch::WhitePoint(int alChannel) const {

@@ -1,6 +1,6 @@
-// nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, DIN99) under
-// a chosen illuminant and observer, from a CSV file or the built-in
-// ColorChecker chart.
+// nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, xyY, DIN99,
+// densities) under a chosen illuminant, observer and density standard, from a
+// CSV or CGATS file or the built-in ColorChecker chart.
 #include <charconv>
 #include <cstdio>
 #include <iostream>
@@ -29,13 +29,15 @@ constexpr std::size_t kProgressMinRows = 20000;
 const char kUsage[] =
     "Usage: nxcolor [options] [FILE]\n"
     "Prints the colour values of reflectance spectra: XYZ, CIELAB and LCh, and\n"
-    "optionally xyY and DIN99, under one illuminant and observer.\n"
+    "optionally xyY, DIN99 and densities, under one illuminant and observer.\n"
     "\n"
     "FILE is CSV: optional id columns, then 36 reflectance factors (0..1) for\n"
     "380..730 nm in 10 nm steps, one spectrum per line; a header line is\n"
     "optional and, when present, must name exactly those wavelengths (r380,\n"
-    "380, nm380, SPEC_380, ...). \"-\" reads standard input. Without FILE the\n"
-    "built-in ColorChecker chart (BabelColor average, 24 patches) is used.\n"
+    "380, nm380, SPEC_380, ...). A CGATS file (BEGIN_DATA_FORMAT with\n"
+    "SPECTRAL_NM380..SPECTRAL_NM730 fields, SAMPLE_ID, SAMPLE_NAME) is read too.\n"
+    "\"-\" reads standard input. Without FILE the built-in ColorChecker chart\n"
+    "(BabelColor average, 24 patches) is used.\n"
     "\n"
     "Options:\n"
     "  -i, --illuminant NAME   A, C, D50 (default), D55, D65, D75, E, FL1..FL12,\n"
@@ -43,7 +45,12 @@ const char kUsage[] =
     "  -o, --observer 2|10     CIE 1931 2 degree (default) or CIE 1964 10 degree\n"
     "      --xyy               also print chromaticity x, y\n"
     "      --din99             also print DIN99 L99, a99, b99 (DIN 6176)\n"
-    "  -f, --format table|csv  output layout (default table)\n"
+    "  -d, --density NAME      also print densities D_RED, D_GREEN, D_BLUE of an\n"
+    "                          ISO 5-3 standard: \"Status A\", \"Status E\",\n"
+    "                          \"Status M\", \"Status T\", or one installed in\n"
+    "                          $NXBASE_DATA_DIR/density\n"
+    "  -f, --format table|csv|cgats\n"
+    "                          output layout (default table)\n"
     "  -p, --precision N       decimals, 0..9 (default 4)\n"
     "      --percent           the values are percentages (0..100)\n"
     "      --rgb               also print the screen colour: sRGB R, G, B (0..255)\n"
@@ -67,6 +74,7 @@ struct Options {
     std::string illuminant = "D50";
     std::string observer = "2";
     std::string format = "table";
+    std::string density;  // empty: no density columns
     int precision = 4;
     float scale = 1.0f;
     bool xyy = false;
@@ -116,8 +124,10 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             if (!take(&options->illuminant)) return arg + " needs a name";
         } else if (arg == "-o" || arg == "--observer") {
             if (!take(&options->observer)) return arg + " needs 2 or 10";
+        } else if (arg == "-d" || arg == "--density") {
+            if (!take(&options->density)) return arg + " needs a standard's name";
         } else if (arg == "-f" || arg == "--format") {
-            if (!take(&options->format)) return arg + " needs table or csv";
+            if (!take(&options->format)) return arg + " needs table, csv or cgats";
         } else if (arg == "-p" || arg == "--precision") {
             std::string text;
             if (!take(&text)) return arg + " needs a number";
@@ -177,9 +187,13 @@ int main(int argc, char** argv) {
     if (observer.GetObserverType() == OBSERVER_UNKNOWN) {
         return UsageError("unknown observer \"" + options.observer + "\"; use 2 or 10");
     }
+    if (!options.density.empty() &&
+        !klume::cmetry::DensityStandardRepository::Exists(options.density)) {
+        return UsageError("unknown or uninstalled density standard \"" + options.density + "\"");
+    }
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
-        return UsageError("unknown format \"" + options.format + "\"; use table or csv");
+        return UsageError("unknown format \"" + options.format + "\"; use table, csv or cgats");
     }
 
     nxcolor::SpectraTable table;
@@ -196,16 +210,19 @@ int main(int argc, char** argv) {
         }
     }
     for (const std::string& error : table.errors) std::cerr << "nxcolor: " << error << '\n';
-    if (table.badGrid) return kExitUsage;
+    if (table.unusable) return kExitUsage;
     if (table.rows.empty()) {
         std::cerr << "nxcolor: " << source << ": no spectra\n";
         return kExitUsage;
     }
 
-    const MeasuringCondition condition(IllumClass(options.illuminant), observer, PhysicalConditions());
+    const MeasuringCondition condition(
+        IllumClass(options.illuminant), observer,
+        options.density.empty() ? DStdClass() : DStdClass(options.density), PhysicalConditions());
     std::vector<std::string> quantities = {"xyz", "lab", "lch"};
     if (options.xyy) quantities.push_back("xyy");
     if (options.din99) quantities.push_back("din99");
+    if (!options.density.empty()) quantities.push_back("density");
     if (options.rgb) quantities.push_back("rgb");
     if (options.rgb || !options.svgReport.empty()) {
         const std::string warning = nxcolor::SetUpScreenColors(options.iccProfile);

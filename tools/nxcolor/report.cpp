@@ -30,35 +30,52 @@ void CopyThree(const ColorVector& v, float* pOut) {
 
 std::vector<Quantity> MakeQuantities() {
     std::vector<Quantity> q;
-    q.push_back({"xyz", {{"X"}, {"Y"}, {"Z"}},
+    q.push_back({"xyz", {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(XYZVector(filter, s), out);
                  }});
-    q.push_back({"xyy", {{"x"}, {"y"}, {"Y"}},
+    q.push_back({"xyy", {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(xyYVector(XYZVector(filter, s)), out);
                  }});
-    q.push_back({"lab", {{"L*"}, {"a*"}, {"b*"}},
+    q.push_back({"lab", {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      CopyThree(LABVector(s, mc), out);
                  }});
-    q.push_back({"lch", {{"C*"}, {"h"}},
+    q.push_back({"lch", {{"C*", "LAB_C"}, {"h", "LAB_H"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      const LChVector lch{LABVector(s, mc)};
                      out[0] = lch[1];
                      out[1] = lch[2];
                  }});
-    q.push_back({"din99", {{"L99"}, {"a99"}, {"b99"}},
+    q.push_back({"din99", {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType din(LAB_DIN99);
                      CopyThree(LABVector(s, mc), out);
                  }});
-    Column hex{"hex", 0, true, Column::Kind::kHexColor};
-    q.push_back({"rgb", {{"R", 0, true}, {"G", 0, true}, {"B", 0, true}, hex},
+    // ISO 5-3 status densities of the condition's density standard (red,
+    // green, blue filter: cyan, magenta, yellow density); NaN where the
+    // weighted reflectance is not positive.
+    q.push_back({"density", {{"D_RED", "D_RED"}, {"D_GREEN", "D_GREEN"}, {"D_BLUE", "D_BLUE"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     thread_local std::string name;
+                     thread_local DichteFilter filter;
+                     if (name != mc.GetDStd().GetName()) {
+                         filter = DichteFilter(mc.GetDStd());
+                         name = mc.GetDStd().GetName();
+                     }
+                     for (unsigned short c = 0; c < 3; ++c) {
+                         out[c] = std::nanf("");
+                         filter.GetDensity(s, c, out[c]);
+                     }
+                 }});
+    // Screen colour levels 0..255 and their hex code (not a CGATS.17 field).
+    Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
+    q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const ScreenColor c = ScreenColorOf(s, mc);
                      out[0] = c.red;
@@ -97,9 +114,48 @@ void WriteCsv(const Report& report, std::ostream& out) {
     }
 }
 
+// A CGATS string: double quotes, an inner quote written as a single quote.
+std::string CgatsString(const std::string& text) {
+    std::string out = "\"";
+    for (char c : text) out += (c == '"' || c == '\n' || c == '\r') ? '\'' : c;
+    return out + "\"";
+}
+
+void WriteCgats(const Report& report, std::ostream& out) {
+    out << "CGATS.17\n"
+        << "ORIGINATOR \"nxcolor\"\n"
+        << "DESCRIPTOR " << CgatsString(report.source) << "\n"
+        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
+        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer) << "\n"
+        << "NUMBER_OF_FIELDS " << report.columns.size() + 1 << "\n"
+        << "BEGIN_DATA_FORMAT\nSAMPLE_ID";
+    for (const Column& c : report.columns) out << ' ' << c.cgats;
+    out << "\nEND_DATA_FORMAT\n"
+        << "NUMBER_OF_SETS " << report.rows.size() << "\n"
+        << "BEGIN_DATA\n";
+    for (const ReportRow& row : report.rows) {
+        out << CgatsString(row.id);
+        for (std::size_t i = 0; i < row.values.size(); ++i) {
+            const Column& column = report.columns[i];
+            // Text cells (the screen colour's hex code) are quoted strings.
+            if (column.kind == Column::Kind::kNumber) {
+                out << ' ' << FormatNumber(row.values[i], column.precision);
+            } else {
+                out << ' ' << CgatsString(FormatCell(row.values[i], column));
+            }
+        }
+        out << '\n';
+    }
+    out << "END_DATA\n";
+}
+
 void WriteTable(const Report& report, std::ostream& out) {
     out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
-        << report.illuminant << ", observer " << report.observer << "\xC2\xB0\n";
+        << report.illuminant << ", observer " << report.observer << "\xC2\xB0";
+    const bool densities = std::any_of(report.columns.begin(), report.columns.end(),
+                                       [](const Column& c) { return c.name == "D_RED"; });
+    if (densities) out << ", density " << report.densityStandard;
+    out << '\n';
     std::size_t idWidth = 2;
     for (const ReportRow& row : report.rows) idWidth = std::max(idWidth, row.id.size());
     // Each column as wide as its widest entry.
@@ -148,6 +204,7 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
     report.source = source;
     report.illuminant = condition.GetIllum().GetName();
     report.observer = condition.GetObserver().GetName().str();
+    report.densityStandard = condition.GetDStd().GetName();
     std::vector<const Quantity*> chosen;
     for (const Quantity& q : Quantities()) {
         if (std::find(quantities.begin(), quantities.end(), q.key) == quantities.end()) continue;
@@ -178,7 +235,7 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
 }
 
 const std::map<std::string, Writer>& Writers() {
-    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}};
+    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}};
     return writers;
 }
 

@@ -22,6 +22,7 @@ namespace nxcolor {
 struct Column {
     enum class Kind { kNumber, kHexColor };
     std::string name;   // "X", "L*", ...
+    std::string cgats;  // the CGATS field name: "XYZ_X", "LAB_L", ...
     int precision = 4;  // decimals
     // A column whose precision is its own, not the report's (screen levels).
     bool ownPrecision = false;
@@ -32,7 +33,7 @@ struct Column {
 // One quantity: its columns and how to compute them from a spectrum under a
 // measuring condition (pOut receives one float per column).
 struct Quantity {
-    std::string key;  // as the options name it: "xyz", "lab", "lch", "din99"
+    std::string key;  // "xyz", "xyy", "lab", "lch", "din99", "density"
     std::vector<Column> columns;
     std::function<void(const ReflectanceSpectrum&, const MeasuringCondition&, float* pOut)> compute;
 };
@@ -50,6 +51,7 @@ struct Report {
     std::string source;       // file name or the built-in chart's name
     std::string illuminant;   // "D65"
     std::string observer;     // "10"
+    std::string densityStandard;  // "Status T" (used by the density columns)
     std::vector<Column> columns;
     std::vector<ReportRow> rows;
 };
@@ -61,7 +63,8 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
                 int precision, ProgressListener* progress = nullptr);
 
 using Writer = std::function<void(const Report&, std::ostream&)>;
-// Layouts by name: "table" (aligned columns, a "#" title line) and "csv".
+// Layouts by name: "table" (aligned columns, a "#" title line), "csv" and
+// "cgats" (CGATS.17 text with the standard field names).
 const std::map<std::string, Writer>& Writers();
 
 // A number with `precision` decimals and "." as separator, whatever the locale.

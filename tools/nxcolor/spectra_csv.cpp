@@ -4,11 +4,6 @@
 #include <cctype>
 #include <charconv>
 #include <cmath>
-#include <filesystem>
-#include <fstream>
-#include <iostream>
-#include <iterator>
-#include <sstream>
 
 namespace nxcolor {
 namespace {
@@ -49,7 +44,10 @@ std::vector<std::string> SplitFields(std::string_view line) {
     return fields;
 }
 
-// A finite decimal number, "." as separator, an optional leading "+".
+}  // namespace
+
+namespace detail {
+
 bool ParseNumber(std::string_view text, double* value) {
     text = Trim(text);
     if (!text.empty() && text.front() == '+') text.remove_prefix(1);
@@ -58,19 +56,27 @@ bool ParseNumber(std::string_view text, double* value) {
     return result.ec == std::errc() && result.ptr == text.data() + text.size() && std::isfinite(*value);
 }
 
-// The wavelength a header field names: its first run of digits, or -1.
 int WavelengthOf(std::string_view field) {
-    std::size_t i = 0;
-    while (i < field.size() && !std::isdigit(static_cast<unsigned char>(field[i]))) ++i;
-    if (i == field.size()) return -1;
-    int nm = 0;
-    const auto result = std::from_chars(field.data() + i, field.data() + field.size(), nm);
-    if (result.ec != std::errc()) return -1;
-    return nm;
+    // Known prefixes, longest first; compared without ASCII case.
+    static const char* const kPrefixes[] = {"SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
+    auto upper = [](char c) { return static_cast<char>(std::toupper(static_cast<unsigned char>(c))); };
+    for (const char* prefix : kPrefixes) {
+        const std::string_view p(prefix);
+        if (field.size() <= p.size()) continue;
+        bool match = true;
+        for (std::size_t i = 0; i < p.size() && match; ++i) match = upper(field[i]) == p[i];
+        if (!match) continue;
+        std::string_view rest = field.substr(p.size());
+        if (rest.size() > 2 && upper(rest[rest.size() - 2]) == 'N' && upper(rest.back()) == 'M') {
+            rest.remove_suffix(2);  // "380nm"
+        }
+        int nm = 0;
+        const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), nm);
+        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0) return nm;
+    }
+    return -1;
 }
 
-// Printable form of a field for messages: at most 40 characters, control
-// bytes as "?".
 std::string Shown(std::string_view field) {
     std::string out;
     for (char c : field.substr(0, 40)) {
@@ -79,6 +85,14 @@ std::string Shown(std::string_view field) {
     if (field.size() > 40) out += "...";
     return out;
 }
+
+}  // namespace detail
+
+namespace {
+
+using detail::ParseNumber;
+using detail::Shown;
+using detail::WavelengthOf;
 
 // A header ends in a field that is not a number, and either names a
 // wavelength there or has mostly text fields; a data row with one bad value
@@ -113,7 +127,7 @@ public:
                 return;
             }
         }
-        if (pTable->badGrid) return;
+        if (pTable->unusable) return;
         Row(fields, number);
     }
 
@@ -142,7 +156,7 @@ private:
                         std::to_string(count) + " columns)";
             }
             Error(line, what + "; nxcolor needs 36 columns, 380..730 nm in 10 nm steps");
-            pTable->badGrid = true;
+            pTable->unusable = true;
             return;
         }
         amIdFields = static_cast<int>(first);
@@ -180,7 +194,14 @@ private:
                                 Shown(field) + "\" is not a number");
                 return;
             }
-            row.values[k] = static_cast<float>(value / amScale);
+            const float scaled = static_cast<float>(value / amScale);
+            if (!std::isfinite(scaled)) {
+                Error(line, "field " + std::to_string(ids + k + 1) + " (" +
+                                std::to_string(kFirstWavelength + kWavelengthStep * k) + " nm): \"" +
+                                Shown(field) + "\" is out of range");
+                return;
+            }
+            row.values[k] = scaled;
         }
         pTable->rows.push_back(std::move(row));
     }
@@ -206,31 +227,6 @@ SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, f
         text.remove_prefix(end + 1);
     }
     return table;
-}
-
-bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, std::string* error) {
-    std::string text;
-    if (path == "-") {
-        text.assign(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
-    } else {
-        std::error_code ignored;
-        if (std::filesystem::is_directory(path, ignored)) {
-            *error = path + ": is a directory";
-            return false;
-        }
-        std::ifstream in(path, std::ios::binary);
-        if (!in) {
-            *error = path + ": cannot open the file";
-            return false;
-        }
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-        if (in.bad()) {
-            *error = path + ": read error";
-            return false;
-        }
-    }
-    *table = ParseSpectraCsv(text, path == "-" ? "<stdin>" : path, scale);
-    return true;
 }
 
 }  // namespace nxcolor
