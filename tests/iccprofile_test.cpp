@@ -1,6 +1,8 @@
 #include "nxbase/iccprofile.h"
 
 #include "nxbase/appconfig.h"
+#include "nxbase/colorconverter.h"
+#include "nxbase/logfile.h"
 
 #include <gtest/gtest.h>
 #include <lcms2.h>
@@ -118,8 +120,20 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         {cmyk, "is not an RGB profile"},
         {inputOnly, "cannot be used as an output profile"},
     };
+    const std::string logFile = LogFile::Instance()->GetFileName();
+    auto fallbackLines = [&] {
+        std::size_t n = 0;
+        for (const auto& line : nxtest::ReadLines(logFile))
+            n += line.find("ICC profile not used") != std::string::npos;
+        return n;
+    };
     for (const auto& [path, problem] : cases) {
+        std::size_t before = fallbackLines();
         EXPECT_NO_THROW(Configure("1", path));
+        RGBVector converted(LABVector(50, 0, 0, MeasuringCondition()));  // formulas, no new line
+        ICCProfile::EnableProfile(true);                                // tried already: no retry
+        EXPECT_EQ(fallbackLines(), before + 1) << path;
+        EXPECT_GT(converted[0], 0.0f);
         ICCEngine* engine = ICCEngine::Instance();
         EXPECT_TRUE(ICCProfile::ProfileEnabled());
         EXPECT_FALSE(ICCProfile::ProfileValid()) << path;
