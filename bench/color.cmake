@@ -1,1 +1,2 @@
 # Benchmarks: color.
+nxbase_add_bench(color_bench color_bench.cpp)

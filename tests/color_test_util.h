@@ -1,0 +1,56 @@
+// Helpers for the colour tests: the ColorChecker chart shipped with nxcolor
+// and its reference values, read without locale.
+#ifndef NXBASE_TESTS_COLOR_TEST_UTIL_H_
+#define NXBASE_TESTS_COLOR_TEST_UTIL_H_
+
+#include <array>
+#include <charconv>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+namespace nxtest {
+
+// One CSV row: the text fields and the numbers after the first two fields.
+struct CsvRow {
+    std::string id;
+    std::string name;
+    std::vector<double> values;
+};
+
+// Rows of a "patch_index,patch_name,v,v,..." file after its header; an
+// unparsable number becomes NaN (and fails the comparisons that read it).
+inline std::vector<CsvRow> ReadPatchCsv(const std::string& asPath) {
+    std::vector<CsvRow> rows;
+    std::ifstream in(asPath);
+    std::string line;
+    std::getline(in, line);  // header
+    while (std::getline(in, line)) {
+        if (line.empty()) continue;
+        std::stringstream fields(line);
+        CsvRow row;
+        std::getline(fields, row.id, ',');
+        std::getline(fields, row.name, ',');
+        std::string field;
+        while (std::getline(fields, field, ',')) {
+            double v = std::numeric_limits<double>::quiet_NaN();
+            std::from_chars(field.data(), field.data() + field.size(), v);
+            row.values.push_back(v);
+        }
+        rows.push_back(row);
+    }
+    return rows;
+}
+
+inline std::string ChartPath() {
+    return std::string(NXBASE_SOURCE_DIR) + "/tools/nxcolor/data/colorchecker_babelcolor_average.csv";
+}
+
+inline std::string ChartReferencePath() {
+    return std::string(NXBASE_TEST_DATA_DIR) + "/colorchecker_D50_2deg.csv";
+}
+
+}  // namespace nxtest
+
+#endif  // NXBASE_TESTS_COLOR_TEST_UTIL_H_

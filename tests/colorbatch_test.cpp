@@ -1,0 +1,178 @@
+#include "nxbase/colorbatch.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <random>
+#include <vector>
+
+#include "color_test_util.h"
+#include "nxbase/colorvector.h"
+
+namespace {
+
+using nxbase::ColorBatch;
+using nxbase::SpectraToLab;
+using nxbase::SpectraToXYZ;
+
+// The batch promise: equal to the object path to 1e-5 of the vector's length
+// (lengths below 1 count as 1, so that black is compared absolutely).
+constexpr double kBatchRelative = 1e-5;
+// The batch cube root against the double cube root, in units of the result.
+constexpr double kCbrtRelative = 4e-7;
+
+double Scale(const float* v) {
+    return std::max(1.0, std::sqrt(double(v[0]) * v[0] + double(v[1]) * v[1] + double(v[2]) * v[2]));
+}
+
+// The ColorChecker chart followed by random spectra: smooth ones, dark ones
+// near the linear branch, flat ones, and a count that leaves a tail of seven.
+std::vector<float> TestSpectra() {
+    std::vector<float> spectra;
+    for (const auto& row : nxtest::ReadPatchCsv(nxtest::ChartPath())) {
+        for (double v : row.values) spectra.push_back(static_cast<float>(v));
+    }
+    std::mt19937 random(20261122);
+    std::uniform_real_distribution<float> unit(0.0f, 1.0f);
+    for (int s = 0; s < 4000 + 7; ++s) {
+        const int kind = s % 4;
+        const float level = kind == 1 ? 0.004f * unit(random) : 1.1f * unit(random);
+        float value = level;
+        for (int k = 0; k < 36; ++k) {
+            if (kind == 2) {
+                spectra.push_back(level);
+                continue;
+            }
+            value = std::clamp(value + (unit(random) - 0.5f) * (kind == 1 ? 0.001f : 0.1f), 0.0f, 1.2f);
+            spectra.push_back(kind == 3 ? unit(random) : value);
+        }
+    }
+    for (int k = 0; k < 36; ++k) spectra.push_back(0.0f);  // black
+    return spectra;
+}
+
+void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
+    const std::vector<float> spectra = TestSpectra();
+    const std::size_t count = spectra.size() / 36;
+    const ColorBatch batch(condition);
+    std::vector<float> xyz(3 * count);
+    std::vector<float> lab(3 * count);
+    batch.ToXYZ(spectra.data(), count, xyz.data());
+    batch.ToLab(spectra.data(), count, lab.data());
+    double worst = 0.0;
+    for (std::size_t s = 0; s < count; ++s) {
+        const ReflectanceSpectrum spectrum(&spectra[36 * s], PhysicalConditions());
+        const LABVector object(spectrum, condition);
+        const float* b = &lab[3 * s];
+        const double scale = Scale(object.getV());
+        for (int i = 0; i < 3; ++i) {
+            ASSERT_NEAR(b[i], object[i], kBatchRelative * scale) << "spectrum " << s << " Lab " << i;
+            worst = std::max(worst, std::fabs(b[i] - object[i]) / scale);
+        }
+    }
+    ::testing::Test::RecordProperty("worst_lab_relative_" + condition.GetIllum().GetName() + "_" +
+                                        condition.GetObserver().GetName().str(),
+                                    std::to_string(worst * 1e6) + "e-6");
+    const CMetryFilter filter(Lichtart(condition.GetIllum()), Observer(condition.GetObserver()));
+    for (std::size_t s = 0; s < count; ++s) {
+        const XYZVector object(filter, ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));
+        for (int i = 0; i < 3; ++i) {
+            // Same products, same order, no contraction: bit-identical by design.
+            ASSERT_EQ(xyz[3 * s + i], object[i]) << "spectrum " << s;
+        }
+    }
+}
+
+TEST(ColorBatch, EqualsTheObjectPathUnderD50TwoDegrees) {
+    ExpectBatchEqualsObjects(
+        MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions()));
+}
+
+TEST(ColorBatch, EqualsTheObjectPathUnderOtherConditions) {
+    ExpectBatchEqualsObjects(
+        MeasuringCondition(IllumClass("D65"), ObserverClass(OBSERVER_10DEG), PhysicalConditions()));
+    ExpectBatchEqualsObjects(
+        MeasuringCondition(IllumClass("FL11"), ObserverClass(OBSERVER_2DEG), PhysicalConditions()));
+}
+
+TEST(ColorBatch, HandlesEveryTailLengthAndWritesNothingBeyond) {
+    const std::vector<float> spectra = TestSpectra();
+    const ColorBatch batch;  // the facade's current filter
+    for (std::size_t count = 0; count <= 17; ++count) {
+        std::vector<float> out(3 * count + 3, -999.0f);
+        batch.ToLab(spectra.data(), count, out.data());
+        for (std::size_t s = 0; s < count; ++s) {
+            const LABVector object(ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));
+            EXPECT_NEAR(out[3 * s], object[0], kBatchRelative * Scale(object.getV()));
+        }
+        for (int i = 0; i < 3; ++i) EXPECT_EQ(out[3 * count + i], -999.0f) << "count " << count;
+    }
+}
+
+TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
+    const std::vector<float> base = TestSpectra();
+    std::vector<float> spectra;
+    while (spectra.size() < 36u * 70001u) spectra.insert(spectra.end(), base.begin(), base.end());
+    spectra.resize(36u * 70001u);  // not a multiple of eight or of the thread count
+    const std::size_t count = spectra.size() / 36;
+    const ColorBatch batch;
+    std::vector<float> serial(3 * count);
+    batch.ToLab(spectra.data(), count, serial.data());
+    for (unsigned threads : {0u, 1u, 2u, 3u, 7u}) {
+        std::vector<float> parallel(3 * count + 1, -1.0f);
+        batch.ToLabParallel(spectra.data(), count, parallel.data(), threads);
+        EXPECT_TRUE(std::equal(serial.begin(), serial.end(), parallel.begin())) << threads;
+        EXPECT_EQ(parallel.back(), -1.0f);
+    }
+    std::vector<float> xyz(3 * count);
+    std::vector<float> xyzParallel(3 * count);
+    batch.ToXYZ(spectra.data(), count, xyz.data());
+    batch.ToXYZParallel(spectra.data(), count, xyzParallel.data(), 2);
+    EXPECT_EQ(xyz, xyzParallel);
+}
+
+TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {
+    const std::vector<float> spectra = TestSpectra();
+    const ColorBatch batch;
+    float before[3];
+    float after[3];
+    batch.ToLab(spectra.data(), 1, before);
+    LABVector::SetColorSpaceType(LAB_DIN99);
+    batch.ToLab(spectra.data(), 1, after);
+    LABVector::SetColorSpaceType(LAB_CIE1976);
+    for (int i = 0; i < 3; ++i) EXPECT_EQ(before[i], after[i]);
+}
+
+TEST(ColorBatch, OneCallFormsAndWhitePointMatchTheFilter) {
+    const MeasuringCondition condition(IllumClass("A"), ObserverClass(OBSERVER_10DEG),
+                                       PhysicalConditions());
+    const std::vector<float> white(36, 1.0f);
+    float xyz[3];
+    float lab[3];
+    SpectraToXYZ(condition, white.data(), 1, xyz);
+    SpectraToLab(condition, white.data(), 1, lab);
+    const ColorBatch batch(condition);
+    // The A/10 degree white point of the reference weights.
+    EXPECT_NEAR(batch.WhitePoint(0), 111.14224728562849, 5e-4);
+    EXPECT_NEAR(batch.WhitePoint(2), 35.20615588398067, 5e-4);
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(xyz[i], batch.WhitePoint(i), 1e-4);
+    EXPECT_NEAR(lab[0], 100.0f, 1e-4);
+    EXPECT_NEAR(lab[1], 0.0f, 1e-4);
+    EXPECT_NEAR(lab[2], 0.0f, 1e-4);
+}
+
+TEST(ColorBatch, CubeRootIsAccurateOverTheLabRange) {
+    std::vector<float> in;
+    for (float t = 0.008f; t < 2.0f; t *= 1.0137f) in.push_back(t);
+    in.push_back(1.0f);
+    in.push_back(0.125f);
+    std::vector<float> out(in.size());
+    nxbase::detail::BatchCbrt(in.data(), in.size(), out.data());
+    for (std::size_t i = 0; i < in.size(); ++i) {
+        const double exact = std::cbrt(static_cast<double>(in[i]));
+        EXPECT_NEAR(out[i], exact, kCbrtRelative * exact) << in[i];
+    }
+}
+
+}  // namespace

@@ -1,0 +1,339 @@
+#include "nxbase/colorvector.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cmath>
+#include <cstdlib>
+#include <new>
+#include <vector>
+
+#include "color_test_util.h"
+
+// Counts global allocations so that the object path can be shown to allocate
+// nothing per value.
+namespace {
+std::atomic<long> gAllocations{0};
+}  // namespace
+
+void* operator new(std::size_t size) {
+    gAllocations.fetch_add(1, std::memory_order_relaxed);
+    if (void* p = std::malloc(size ? size : 1)) return p;
+    throw std::bad_alloc();
+}
+void operator delete(void* p) noexcept { std::free(p); }
+void operator delete(void* p, std::size_t) noexcept { std::free(p); }
+
+namespace {
+
+// XYZ (white Y = 100) against the double-precision references: float weights
+// and 36 float products summed in float (measured worst 2.7e-5).
+constexpr double kXyzTolerance = 1e-4;
+// CIELAB against the references: the above through the float power with the
+// exponent 0.33333334 instead of 1/3 (measured worst 5.8e-5).
+constexpr double kLabTolerance = 2e-4;
+// Round trips through float formulas.
+constexpr double kRoundTripTolerance = 2e-3;
+// DIN99 in double from float input, stored as float.
+constexpr double kDinTolerance = 2e-4;
+// The interval searches stop at a step of 0.001 or an mg error of 0.001;
+// the flattest transform (chroma, slope about 0.18) turns that into 0.006.
+constexpr double kSearchTolerance = 0.01;
+
+MeasuringCondition D50Condition() {
+    return MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions());
+}
+
+ReflectanceSpectrum SpectrumOf(const nxtest::CsvRow& row) {
+    std::vector<float> values(row.values.begin(), row.values.end());
+    return ReflectanceSpectrum(values, PhysicalConditions());
+}
+
+// Restores the process-wide Lab type after a test changed it.
+struct LabTypeGuard {
+    ~LabTypeGuard() { LABVector::SetColorSpaceType(LAB_CIE1976); }
+};
+
+TEST(ColorVector, ColorCheckerMatchesD50References) {
+    const auto chart = nxtest::ReadPatchCsv(nxtest::ChartPath());
+    const auto refs = nxtest::ReadPatchCsv(nxtest::ChartReferencePath());
+    ASSERT_EQ(chart.size(), 24u);
+    ASSERT_EQ(refs.size(), 24u);
+    const CMetryFilter filter(Lichtart(IllumClass("D50")), Observer(ObserverClass(OBSERVER_2DEG)));
+    double worstXyz = 0.0;
+    double worstLab = 0.0;
+    for (std::size_t p = 0; p < chart.size(); ++p) {
+        ASSERT_EQ(chart[p].values.size(), 36u);
+        ASSERT_EQ(chart[p].id, refs[p].id);
+        const ReflectanceSpectrum spectrum = SpectrumOf(chart[p]);
+        const XYZVector xyz(filter, spectrum);
+        const LABVector lab(spectrum, D50Condition());
+        const LABVector labCurrent(spectrum);  // the facade starts with D50, type 0
+        for (int i = 0; i < 3; ++i) {
+            EXPECT_NEAR(xyz[i], refs[p].values[i], kXyzTolerance) << chart[p].name << " XYZ " << i;
+            EXPECT_NEAR(lab[i], refs[p].values[3 + i], kLabTolerance) << chart[p].name << " Lab " << i;
+            EXPECT_EQ(labCurrent[i], lab[i]) << "same filter, same float operations";
+            worstXyz = std::max(worstXyz, std::fabs(xyz[i] - refs[p].values[i]));
+            worstLab = std::max(worstLab, std::fabs(lab[i] - refs[p].values[3 + i]));
+        }
+        EXPECT_EQ(lab.GetMeasuringCondition(), D50Condition());
+        EXPECT_EQ(labCurrent.GetMeasuringCondition().GetIllum().GetName(), "D50");
+    }
+    RecordProperty("worst_xyz_error", std::to_string(worstXyz));
+    RecordProperty("worst_lab_error", std::to_string(worstLab));
+}
+
+TEST(ColorVector, WhiteSpectrumHasYOfHundredAndTheFilterWhitePoint) {
+    const ReflectanceSpectrum white(1.0f, PhysicalConditions(ActualFilterClass(FILTER_POL)));
+    const XYZVector xyz(white);
+    EXPECT_NEAR(xyz[1], 100.0f, 1e-4);
+    EXPECT_NEAR(xyz[0], 96.42379518406467, kXyzTolerance);
+    EXPECT_NEAR(xyz[2], 82.51290003017643, kXyzTolerance);
+    EXPECT_EQ(xyz.GetMeasuringCondition().GetPhysicalConditions().GetActualFilter(),
+              ActualFilterClass(FILTER_POL));
+    const LABVector lab(white);
+    EXPECT_NEAR(lab[0], 100.0f, 1e-4);
+    EXPECT_NEAR(lab[1], 0.0f, 1e-4);
+    EXPECT_NEAR(lab[2], 0.0f, 1e-4);
+    const xyYVector xyY(white);
+    EXPECT_NEAR(xyY[0], 0.3457, 5e-4);  // D50 chromaticity
+    EXPECT_NEAR(xyY[1], 0.3585, 5e-4);
+    EXPECT_EQ(xyY[2], xyz[1]);
+}
+
+TEST(ColorVector, ObjectPathAllocatesNothingPerValue) {
+    const ReflectanceSpectrum spectrum(0.5f, PhysicalConditions());
+    LABVector warm(spectrum);  // first use builds the facade and the per-thread caches
+    const long before = gAllocations.load();
+    float sink = 0.0f;
+    for (int i = 0; i < 1000; ++i) {
+        const LABVector lab(spectrum);
+        sink += lab[0];
+    }
+    EXPECT_EQ(gAllocations.load() - before, 0);
+    EXPECT_GT(sink, 0.0f);
+}
+
+TEST(ColorVector, ArithmeticIsComponentWiseAndKeepsTheCondition) {
+    const MeasuringCondition condition = D50Condition();
+    ColorVector v(3.0f, 4.0f, 12.0f, condition);
+    EXPECT_EQ(v.Length(), 13.0f);
+    v += ColorVector(1.0f, 1.0f, 1.0f, MeasuringCondition());
+    v *= 2.0f;
+    v -= ColorVector(0.0f, 2.0f, 6.0f, MeasuringCondition());
+    v /= ColorVector(2.0f, 4.0f, 5.0f, MeasuringCondition());
+    EXPECT_EQ(v[0], 4.0f);
+    EXPECT_EQ(v[1], 2.0f);
+    EXPECT_EQ(v[2], 4.0f);
+    EXPECT_EQ(v.GetMeasuringCondition(), condition);
+    EXPECT_EQ(String(ColorVector(12.345f, -5.0f, 0.004f, condition)).str(), "12.35 -5.00 0.00");
+    EXPECT_TRUE(ColorVector(1, 2, 3, condition) != ColorVector(1, 2, 4, condition));
+    EXPECT_FALSE(ColorVector(1, 2, 3, condition) != ColorVector(1, 2, 3, condition));
+}
+
+// The float within 64 units in the last place of axCenter that satisfies
+// fTest, or NaN.
+template <typename Test>
+float FloatNear(float axCenter, Test fTest) {
+    float v = axCenter;
+    for (int k = 0; k < 64; ++k) v = std::nextafter(v, 0.0f);
+    for (int k = 0; k < 128; ++k, v = std::nextafter(v, 1e9f)) {
+        if (fTest(v)) return v;
+    }
+    return std::nanf("");
+}
+
+TEST(LABVector, LinearBranchesIncludeTheirBoundaries) {
+    // Find a Y whose t is exactly 0.008856 with the formulas' float steps.
+    const CMetryFilter& filter = *CMetry::Instance()->GetLXYZFilter();
+    const float sumY = filter.GetWeightSum(1);
+    const float y = FloatNear(0.8856f, [&](float v) { return v * sumY / sumY / 100.0f == 0.008856f; });
+    ASSERT_FALSE(std::isnan(y));
+    const LABVector lab(filter, XYZVector(0.0f, y, 0.0f, D50Condition()));
+    const float linearL = 116.0f * (7.787f * 0.008856f + 0.13793103f) - 16.0f;
+    const float cubeL = 116.0f * std::pow(0.008856f, 0.33333334f) - 16.0f;
+    ASSERT_NE(linearL, cubeL);
+    EXPECT_FLOAT_EQ(lab[0], linearL);
+
+    // And back: f exactly 0.206893034423 takes the linear branch too. L steps
+    // are too coarse to hit it, so use f_X = a/500 + f_Y at L = 0.
+    const float fy = 16.0f / 116.0f;
+    const float a = FloatNear((0.206893034423f - fy) * 500.0f,
+                              [&](float v) { return v / 500.0f + fy == 0.206893034423f; });
+    ASSERT_FALSE(std::isnan(a));
+    const XYZVector back(LABVector(0.0f, a, 0.0f, D50Condition()));
+    const double xn = 100.0 * filter.GetWeightSum(0) / sumY;
+    const double linear = (0.206893034423 - 16.0 / 116.0) * xn / 7.787;
+    const double cube = std::pow(0.206893034423, 3.0) * xn;
+    EXPECT_NEAR(back[0], linear, 5e-7);  // float rounding of a value near 0.85
+    EXPECT_GT(std::fabs(back[0] - cube), 3e-6) << "the cube branch differs by 4e-6";
+}
+
+TEST(LABVector, RoundTripsThroughXYZAndLCh) {
+    const auto chart = nxtest::ReadPatchCsv(nxtest::ChartPath());
+    for (const auto& row : chart) {
+        const LABVector lab(SpectrumOf(row), D50Condition());
+        const XYZVector xyz(lab);
+        const LABVector again(xyz);
+        const LChVector lch(lab);
+        const LABVector fromLch(lch);
+        for (int i = 0; i < 3; ++i) {
+            EXPECT_NEAR(again[i], lab[i], kRoundTripTolerance) << row.name;
+            EXPECT_NEAR(fromLch[i], lab[i], kRoundTripTolerance) << row.name;
+        }
+    }
+    // A dark colour, below both linear thresholds.
+    const LABVector dark(2.0f, 1.0f, -1.0f, D50Condition());
+    const LABVector darkAgain{XYZVector(dark)};
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(darkAgain[i], dark[i], kRoundTripTolerance);
+}
+
+TEST(LChVector, HuesLieInZeroExclusiveToThreeSixtyInclusive) {
+    const MeasuringCondition mc;
+    auto hue = [&](float a, float b) { return LChVector(LABVector(50.0f, a, b, mc))[2]; };
+    EXPECT_EQ(hue(0.0f, 0.0f), 360.0f);        // grey
+    EXPECT_EQ(hue(0.000009f, -0.000009f), 360.0f);  // below the neutral threshold
+    EXPECT_EQ(hue(1.0f, 0.0f), 360.0f);        // exactly 0 degrees
+    EXPECT_EQ(hue(1.0f, -0.0f), 360.0f);
+    EXPECT_FLOAT_EQ(hue(0.0f, 1.0f), 90.0f);
+    EXPECT_FLOAT_EQ(hue(-1.0f, 0.0f), 180.0f);
+    EXPECT_FLOAT_EQ(hue(-1.0f, -0.0f), 180.0f);  // atan2 gives -180, folded
+    EXPECT_FLOAT_EQ(hue(0.0f, -1.0f), 270.0f);
+    EXPECT_NEAR(hue(1.0f, -0.01f), 359.427, 1e-3);
+    EXPECT_NEAR(hue(1.0f, 0.01f), 0.573, 1e-3);
+    const LChVector neutral(LABVector(40.0f, 0.0f, 0.0f, mc));
+    EXPECT_EQ(neutral[1], 0.0f);
+    EXPECT_EQ(neutral[0], 40.0f);
+}
+
+TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
+    LabTypeGuard guard;
+    // DIN 6176 evaluated in double from the same inputs (pi = 3.1415926).
+    struct Case {
+        float l, a, b;
+        double l99, a99, b99;
+    };
+    const Case cases[] = {
+        {50, 20, -30, 61.42957005065455, 7.218965945582522, -15.843488586394821},
+        {75, -40, 10, 82.46828607005237, -20.70878095204724, 8.381584951505413},
+        {30, 0, 0, 40.93574804037146, 0.0, 0.0},
+        {60, -5, -25, 70.35440618279843, -8.37454876966765, -11.352944505619925},
+        {95, 1, 2, 96.72003068149233, 1.4512856640255423, 1.1061363374218658},
+    };
+    // DIN99 is applied on construction from tristimulus values: go through XYZ.
+    for (const Case& c : cases) {
+        LABVector::SetColorSpaceType(LAB_CIE1976);
+        const XYZVector xyz(LABVector(c.l, c.a, c.b, D50Condition()));
+        const LABVector cie(xyz);
+        LABVector::SetColorSpaceType(LAB_DIN99);
+        const LABVector din(xyz);
+        EXPECT_EQ(din.GetLabVectorColorSpace(), LAB_DIN99);
+        EXPECT_EQ(cie.GetLabVectorColorSpace(), LAB_CIE1976);
+        EXPECT_NEAR(din[0], c.l99, kDinTolerance + 1e-3);  // plus the XYZ round trip
+        EXPECT_NEAR(din[1], c.a99, kDinTolerance + 1e-3);
+        EXPECT_NEAR(din[2], c.b99, kDinTolerance + 1e-3);
+        const LABVector back = din.GetCIELab();
+        EXPECT_EQ(back.GetLabVectorColorSpace(), LAB_CIE1976);
+        for (int i = 0; i < 3; ++i) EXPECT_NEAR(back[i], cie[i], kDinTolerance) << i;
+    }
+    // From a spectrum: type 1 gives DIN99 whose inverse is the CIELAB of type 0.
+    const ReflectanceSpectrum spectrum = SpectrumOf(nxtest::ReadPatchCsv(nxtest::ChartPath())[2]);
+    LABVector::SetColorSpaceType(LAB_CIE1976);
+    const LABVector cie(spectrum);
+    EXPECT_EQ(cie.GetCIELab(), cie) << "type 0 returns the vector unchanged";
+    LABVector::SetColorSpaceType(LAB_DIN99);
+    const LABVector din(spectrum);
+    EXPECT_NE(din[0], cie[0]);
+    const LABVector back = din.GetCIELab();
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(back[i], cie[i], kDinTolerance);
+    EXPECT_NE(String(din.ToString()).str().find("L99="), std::string::npos);
+    LABVector::SetColorSpaceType(static_cast<LabColorSpaceType>(7));
+    const LABVector zero = din.GetCIELab();
+    EXPECT_EQ(zero[0], 0.0f);
+    EXPECT_EQ(zero[1], 0.0f);
+    EXPECT_EQ(zero[2], 0.0f);
+}
+
+TEST(LCHmgVector, ForwardTransformHasItsFixedPoints) {
+    EXPECT_FLOAT_EQ(LCHmgVector::LightnessToMg(10.0f), 10.0f / 0.511f);
+    EXPECT_NEAR(LCHmgVector::LightnessToMg(50.0f),
+                (std::log(0.040975 * 50) + 0.01765 * 50) / 0.040975 + 34.7231, 1e-3);
+    EXPECT_NEAR(LCHmgVector::ChromaToMg(0.0f), 12.253 * std::log(0.638) + 5.50671, 1e-4);
+    // The hue series is built so that 0 and 360 degrees map onto themselves.
+    EXPECT_NEAR(LCHmgVector::HueToMg(0.0f), 0.0f, 1e-3);
+    EXPECT_NEAR(LCHmgVector::HueToMg(360.0f), 360.0f, 1e-3);
+    float previous = LCHmgVector::HueToMg(0.0f);
+    for (int h = 1; h <= 360; ++h) {
+        const float next = LCHmgVector::HueToMg(static_cast<float>(h));
+        EXPECT_GT(next, previous) << "monotonic, so the search needs no folding, at " << h;
+        previous = next;
+    }
+    const LABmgVector labmg(LCHmgVector(LChVector(60.0f, 30.0f, 90.0f, MeasuringCondition())));
+    const float hmg = LCHmgVector::HueToMg(90.0f);
+    EXPECT_NEAR(labmg[1], LCHmgVector::ChromaToMg(30.0f) * std::cos(hmg * M_PI / 180.0), 1e-4);
+    EXPECT_NEAR(labmg[2], LCHmgVector::ChromaToMg(30.0f) * std::sin(hmg * M_PI / 180.0), 1e-4);
+}
+
+TEST(LChVector, ProbiereSearchesInvertTheMgTransform) {
+    const MeasuringCondition mc = D50Condition();
+    for (float l : {0.0f, 5.0f, 15.9f, 16.0f, 50.0f, 99.5f}) {
+        for (float c : {0.0f, 0.5f, 20.0f, 80.0f, 150.0f}) {
+            for (float h : {0.3f, 45.0f, 133.3f, 200.0f, 359.5f, 360.0f}) {
+                const LChVector lch(l, c, h, mc);
+                const LCHmgVector mg(lch);
+                const LChVector back(mg);
+                EXPECT_NEAR(back[0], l, kSearchTolerance) << l << " " << c << " " << h;
+                EXPECT_NEAR(back[1], c, kSearchTolerance) << l << " " << c << " " << h;
+                EXPECT_NEAR(back[2], h, kSearchTolerance) << l << " " << c << " " << h;
+                EXPECT_EQ(back.GetMeasuringCondition(), mc);
+            }
+        }
+    }
+}
+
+TEST(dLCHVector, DecomposesKnownPairsWithTheHueSign) {
+    const MeasuringCondition mc;
+    const LABVector a(50.0f, 10.0f, 0.0f, mc);   // hue 0 (360)
+    const LABVector b(40.0f, 0.0f, 10.0f, mc);   // hue 90
+    const dLCHVector d(a, b);
+    EXPECT_FLOAT_EQ(d[0], 10.0f);
+    EXPECT_NEAR(d[1], 0.0f, 1e-6);
+    EXPECT_NEAR(d[2], -std::sqrt(200.0f), 1e-4) << "a's hue lies clockwise of b's";
+    const dLCHVector swapped(b, a);
+    EXPECT_FLOAT_EQ(swapped[0], -10.0f);
+    EXPECT_NEAR(swapped[2], std::sqrt(200.0f), 1e-4);
+    // Chroma difference only: same hue, dH vanishes.
+    const dLCHVector chroma(LABVector(50.0f, 30.0f, 40.0f, mc), LABVector(50.0f, 15.0f, 20.0f, mc));
+    EXPECT_FLOAT_EQ(chroma[1], 25.0f);
+    EXPECT_NEAR(chroma[2], 0.0f, 2e-3);
+    // dL^2 + dC^2 + dH^2 is dE^2 (CIE76).
+    const LABVector p(62.0f, -12.5f, 33.0f, mc);
+    const LABVector q(58.5f, -3.0f, 41.0f, mc);
+    const dLCHVector pq(p, q);
+    const float dE = std::sqrt(3.5f * 3.5f + 9.5f * 9.5f + 8.0f * 8.0f);
+    EXPECT_NEAR(pq.Length(), dE, 1e-4);
+    const dLCHVector same(p, p);
+    EXPECT_EQ(same[0], 0.0f);
+    EXPECT_EQ(same[1], 0.0f);
+    EXPECT_EQ(same[2], 0.0f);
+    EXPECT_EQ(pq.GetMeasuringCondition(), mc);
+}
+
+TEST(dLCHmgVector, DecomposesTheMgFormsAndFlipsWithTheArguments) {
+    const MeasuringCondition mc;
+    const LABVector p(62.0f, -12.5f, 33.0f, mc);
+    const LABVector q(58.5f, -3.0f, 41.0f, mc);
+    const dLCHmgVector pq(p, q);
+    const dLCHmgVector qp(q, p);
+    for (int i = 0; i < 3; ++i) EXPECT_FLOAT_EQ(pq[i], -qp[i]) << i;
+    const LABmgVector pm{LCHmgVector(LChVector(p))};
+    const LABmgVector qm{LCHmgVector(LChVector(q))};
+    ColorVector diff(pm);
+    diff -= qm;
+    EXPECT_NEAR(pq.Length(), diff.Length(), 1e-3);
+    EXPECT_FLOAT_EQ(pq[0], pm[0] - qm[0]);
+    const dLCHmgVector same(p, p);
+    EXPECT_EQ(same.Length(), 0.0f);
+}
+
+}  // namespace

@@ -1,0 +1,262 @@
+// nxcolor's quantities and output layouts.
+#include "report.h"
+
+#include "screen.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cmath>
+
+namespace nxcolor {
+namespace {
+
+// The process-wide Lab type set for one computation and restored after it.
+class ScopedLabType {
+public:
+    explicit ScopedLabType(LabColorSpaceType type) : amPrevious(LABVector::GetColorSpaceType()) {
+        LABVector::SetColorSpaceType(type);
+    }
+    ~ScopedLabType() { LABVector::SetColorSpaceType(amPrevious); }
+    ScopedLabType(const ScopedLabType&) = delete;
+    ScopedLabType& operator=(const ScopedLabType&) = delete;
+
+private:
+    LabColorSpaceType amPrevious;
+};
+
+void CopyThree(const ColorVector& v, float* pOut) {
+    for (int i = 0; i < 3; ++i) pOut[i] = v[i];
+}
+
+std::vector<Quantity> MakeQuantities() {
+    std::vector<Quantity> q;
+    q.push_back({"xyz", {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
+                     CopyThree(XYZVector(filter, s), out);
+                 }});
+    q.push_back({"xyy", {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
+                     CopyThree(xyYVector(XYZVector(filter, s)), out);
+                 }});
+    q.push_back({"lab", {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType cie(LAB_CIE1976);
+                     CopyThree(LABVector(s, mc), out);
+                 }});
+    q.push_back({"lch", {{"C*", "LAB_C"}, {"h", "LAB_H"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType cie(LAB_CIE1976);
+                     const LChVector lch{LABVector(s, mc)};
+                     out[0] = lch[1];
+                     out[1] = lch[2];
+                 }});
+    q.push_back({"din99", {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     ScopedLabType din(LAB_DIN99);
+                     CopyThree(LABVector(s, mc), out);
+                 }});
+    // ISO 5-3 status densities of the condition's density standard (red,
+    // green, blue filter: cyan, magenta, yellow density); NaN where the
+    // weighted reflectance is not positive.
+    q.push_back({"density", {{"D_RED", "D_RED"}, {"D_GREEN", "D_GREEN"}, {"D_BLUE", "D_BLUE"}},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     thread_local std::string name;
+                     thread_local DichteFilter filter;
+                     if (name != mc.GetDStd().GetName()) {
+                         filter = DichteFilter(mc.GetDStd());
+                         name = mc.GetDStd().GetName();
+                     }
+                     for (unsigned short c = 0; c < 3; ++c) {
+                         out[c] = std::nanf("");
+                         filter.GetDensity(s, c, out[c]);
+                     }
+                 }});
+    // Screen colour levels 0..255 and their hex code (not a CGATS.17 field).
+    Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
+    q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const ScreenColor c = ScreenColorOf(s, mc);
+                     out[0] = c.red;
+                     out[1] = c.green;
+                     out[2] = c.blue;
+                     out[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+                 }});
+
+    return q;
+}
+
+bool NeedsQuotes(const std::string& text) {
+    return text.find_first_of(",\"\n\r") != std::string::npos;
+}
+
+std::string CsvField(const std::string& text) {
+    if (!NeedsQuotes(text)) return text;
+    std::string out = "\"";
+    for (char c : text) {
+        if (c == '"') out += '"';
+        out += c;
+    }
+    return out + "\"";
+}
+
+void WriteCsv(const Report& report, std::ostream& out) {
+    out << "id";
+    for (const Column& c : report.columns) out << ',' << CsvField(c.name);
+    out << '\n';
+    for (const ReportRow& row : report.rows) {
+        out << CsvField(row.id);
+        for (std::size_t i = 0; i < row.values.size(); ++i) {
+            out << ',' << FormatCell(row.values[i], report.columns[i]);
+        }
+        out << '\n';
+    }
+}
+
+// A CGATS string: double quotes, an inner quote written as a single quote.
+std::string CgatsString(const std::string& text) {
+    std::string out = "\"";
+    for (char c : text) out += (c == '"' || c == '\n' || c == '\r') ? '\'' : c;
+    return out + "\"";
+}
+
+void WriteCgats(const Report& report, std::ostream& out) {
+    out << "CGATS.17\n"
+        << "ORIGINATOR \"nxcolor\"\n"
+        << "DESCRIPTOR " << CgatsString(report.source) << "\n"
+        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
+        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer) << "\n"
+        << "NUMBER_OF_FIELDS " << report.columns.size() + 1 << "\n"
+        << "BEGIN_DATA_FORMAT\nSAMPLE_ID";
+    for (const Column& c : report.columns) out << ' ' << c.cgats;
+    out << "\nEND_DATA_FORMAT\n"
+        << "NUMBER_OF_SETS " << report.rows.size() << "\n"
+        << "BEGIN_DATA\n";
+    for (const ReportRow& row : report.rows) {
+        out << CgatsString(row.id);
+        for (std::size_t i = 0; i < row.values.size(); ++i) {
+            const Column& column = report.columns[i];
+            // Text cells (the screen colour's hex code) are quoted strings.
+            if (column.kind == Column::Kind::kNumber) {
+                out << ' ' << FormatNumber(row.values[i], column.precision);
+            } else {
+                out << ' ' << CgatsString(FormatCell(row.values[i], column));
+            }
+        }
+        out << '\n';
+    }
+    out << "END_DATA\n";
+}
+
+void WriteTable(const Report& report, std::ostream& out) {
+    out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
+        << report.illuminant << ", observer " << report.observer << "\xC2\xB0";
+    const bool densities = std::any_of(report.columns.begin(), report.columns.end(),
+                                       [](const Column& c) { return c.name == "D_RED"; });
+    if (densities) out << ", density " << report.densityStandard;
+    out << '\n';
+    std::size_t idWidth = 2;
+    for (const ReportRow& row : report.rows) idWidth = std::max(idWidth, row.id.size());
+    // Each column as wide as its widest entry.
+    std::vector<std::size_t> widths;
+    std::vector<std::vector<std::string>> cells(report.rows.size());
+    for (std::size_t c = 0; c < report.columns.size(); ++c) {
+        std::size_t width = report.columns[c].name.size();
+        for (std::size_t r = 0; r < report.rows.size(); ++r) {
+            cells[r].push_back(FormatCell(report.rows[r].values[c], report.columns[c]));
+            width = std::max(width, cells[r].back().size());
+        }
+        widths.push_back(width);
+    }
+    auto pad = [&out](const std::string& text, std::size_t width, bool left) {
+        if (left) out << text;
+        for (std::size_t i = text.size(); i < width; ++i) out << ' ';
+        if (!left) out << text;
+    };
+    pad("id", idWidth, true);
+    for (std::size_t c = 0; c < report.columns.size(); ++c) {
+        out << "  ";
+        pad(report.columns[c].name, widths[c], false);
+    }
+    out << '\n';
+    for (std::size_t r = 0; r < report.rows.size(); ++r) {
+        pad(report.rows[r].id, idWidth, true);
+        for (std::size_t c = 0; c < cells[r].size(); ++c) {
+            out << "  ";
+            pad(cells[r][c], widths[c], false);
+        }
+        out << '\n';
+    }
+}
+
+}  // namespace
+
+const std::vector<Quantity>& Quantities() {
+    static const std::vector<Quantity> quantities = MakeQuantities();
+    return quantities;
+}
+
+Report Evaluate(const SpectraTable& table, const std::string& source,
+                const MeasuringCondition& condition, const std::vector<std::string>& quantities,
+                int precision, ProgressListener* progress) {
+    Report report;
+    report.source = source;
+    report.illuminant = condition.GetIllum().GetName();
+    report.observer = condition.GetObserver().GetName().str();
+    report.densityStandard = condition.GetDStd().GetName();
+    std::vector<const Quantity*> chosen;
+    for (const Quantity& q : Quantities()) {
+        if (std::find(quantities.begin(), quantities.end(), q.key) == quantities.end()) continue;
+        chosen.push_back(&q);
+        for (Column c : q.columns) {
+            if (!c.ownPrecision) c.precision = precision;
+            report.columns.push_back(c);
+        }
+    }
+    // Progress in steps of this many rows: cheap against the computation.
+    constexpr std::size_t kProgressRows = 1024;
+    for (const SpectrumRow& in : table.rows) {
+        if (progress != nullptr && report.rows.size() % kProgressRows == 0)
+            progress->DisplayProgress(static_cast<double>(report.rows.size()) / table.rows.size());
+        ReportRow row;
+        row.id = in.id;
+        row.spectrum = in.values;
+        const ReflectanceSpectrum spectrum(in.values.data(), PhysicalConditions());
+        for (const Quantity* q : chosen) {
+            float values[8] = {};
+            q->compute(spectrum, condition, values);
+            row.values.insert(row.values.end(), values, values + q->columns.size());
+        }
+        report.rows.push_back(std::move(row));
+    }
+    if (progress != nullptr) progress->DisplayProgress(1.0);
+    return report;
+}
+
+const std::map<std::string, Writer>& Writers() {
+    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}};
+    return writers;
+}
+
+std::string FormatCell(float value, const Column& column) {
+    if (column.kind == Column::Kind::kNumber) return FormatNumber(value, column.precision);
+    static const char kDigits[] = "0123456789ABCDEF";
+    auto packed = static_cast<std::uint32_t>(value);
+    std::string text = "#";
+    for (int shift = 20; shift >= 0; shift -= 4) text += kDigits[(packed >> shift) & 0xF];
+    return text;
+}
+
+std::string FormatNumber(float value, int precision) {
+    char buffer[64];
+    double v = value;
+    if (v == 0.0) v = 0.0;  // no "-0.0000"
+    const auto result = std::to_chars(buffer, buffer + sizeof buffer, v, std::chars_format::fixed, precision);
+    std::string text(buffer, result.ptr);
+    // A tiny negative value rounds to "-0.00": print it unsigned.
+    if (text.front() == '-' && text.find_first_not_of("-0.") == std::string::npos) text.erase(0, 1);
+    return text;
+}
+
+}  // namespace nxcolor
