@@ -34,16 +34,6 @@ class LogFileTest : public ::testing::Test {
     std::string File(const char* name) { return dir.File(std::string(name) + ".log"); }
 };
 
-class ListenerLog : public LogInterface {
-  public:
-    bool IsLogOptionEnabled(const String&) const override { return true; }
-    void WriteLog(const String& text, const String& key) override {
-        lines.push_back(key.str() + "|" + text.str());
-    }
-    void WriteStackTrace() override {}
-    void UpdateInfo(const String&, const String&) override {}
-    std::vector<std::string> lines;
-};
 
 TEST_F(LogFileTest, FirstWriteTruncatesAndLaterWritesAppend) {
     nxtest::WriteFile(File("trunc"), "old content of an earlier run\n");
@@ -144,7 +134,7 @@ TEST_F(LogFileTest, ThreadIdPrefixAndListenersAndOptionsFromEnvironment) {
     nxtest::ScopedEnv env("NXBASE_LOG_OPTIONS", "ThreadId,Extra");
     LogFile log("tid");
     EXPECT_TRUE(log.IsLogOptionEnabled("Extra"));
-    auto listener = boost::make_shared<ListenerLog>();
+    auto listener = boost::make_shared<nxtest::RecordingLog>();
     log.AddLogListener(listener);
     log.WriteLog("hello", "Extra");
     log.RemoveLogListener(listener);

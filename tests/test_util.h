@@ -12,6 +12,8 @@
 #include <string>
 #include <vector>
 
+#include "nxbase/logfile.h"
+
 namespace nxtest {
 
 // A fresh directory below the system's temporary directory, removed again.
@@ -77,6 +79,25 @@ inline void WriteFile(const std::string& path, const std::string& bytes) {
     std::ofstream out(path, std::ios::binary | std::ios::trunc);
     out << bytes;
 }
+
+// A log listener that records every line it is given as "key|text".
+class RecordingLog : public LogInterface {
+  public:
+    bool IsLogOptionEnabled(const String&) const override { return true; }
+    void WriteLog(const String& text, const String& key) override {
+        lines.push_back(key.str() + "|" + text.str());
+    }
+    void WriteStackTrace() override {}
+    void UpdateInfo(const String&, const String&) override {}
+
+    bool Contains(const std::string& line) const {
+        for (const std::string& recorded : lines) {
+            if (recorded == line) return true;
+        }
+        return false;
+    }
+    std::vector<std::string> lines;
+};
 
 }  // namespace nxtest
 

@@ -14,24 +14,7 @@
 
 namespace {
 
-// Records the lines of the keys the log has enabled.
-class RecordingLog : public LogInterface {
-  public:
-    bool IsLogOptionEnabled(const String&) const override { return true; }
-    void WriteLog(const String& text, const String& key) override {
-        lines.push_back(key.str() + "|" + text.str());
-    }
-    void WriteStackTrace() override {}
-    void UpdateInfo(const String&, const String&) override {}
-
-    bool Contains(const std::string& line) const {
-        for (const std::string& l : lines) {
-            if (l == line) return true;
-        }
-        return false;
-    }
-    std::vector<std::string> lines;
-};
+using nxtest::RecordingLog;
 
 class TextTest : public ::testing::Test {
   protected:
