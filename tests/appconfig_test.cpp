@@ -1,5 +1,6 @@
 // The application's name, directories, configuration files and settings.
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <filesystem>
 #include <memory>
@@ -125,7 +126,7 @@ TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults
     EXPECT_EQ(UserConfig::Instance()->GetPath(), String(dir.path().string() + "/K-Lume/Color_Check.INI"));
     UserConfig::CreateUserConfig("Color:Check", "", String(defaults));
     EXPECT_EQ(UserConfig::Instance()->ReadKey("Settings", "DirectLightPart"), "0.75");
-    EXPECT_FALSE(std::filesystem::exists(path + ".seed." + std::to_string(::getpid())));
+    EXPECT_FALSE(std::filesystem::exists(path + ".copy." + std::to_string(::getpid())));
 
     AppConfig::CreateAppConfig(String(dir.path().string()), "app");
     EXPECT_EQ(AppConfig::Instance()->GetPath(), String(dir.File("app.ini")));
@@ -186,7 +187,7 @@ TEST_F(AppConfigTest, SettingsReadDefaultsWithoutAUserFileAndRoundTripThroughIt)
     NxSetting* settings = NxSetting::Instance();
     EXPECT_EQ(settings->GetMeasurementDisplay(), NxSetting::INSTRUMENT);
     EXPECT_DOUBLE_EQ(settings->GetDirectLightPart(), 0.5);
-    EXPECT_EQ(settings->GetIllumName1(), "");
+    EXPECT_EQ(settings->GetIllumClass1(), IllumClass());
 
     UserConfig* user = UserConfig::CreateUserConfig("Settings Test", "", "");
     user->WriteKey("Settings", "MeasurementDisplay", "eye");  // case matters
@@ -195,12 +196,12 @@ TEST_F(AppConfigTest, SettingsReadDefaultsWithoutAUserFileAndRoundTripThroughIt)
     settings->LoadProperties();
     EXPECT_EQ(settings->GetMeasurementDisplay(), NxSetting::INSTRUMENT);
     EXPECT_DOUBLE_EQ(settings->GetDirectLightPart(), 0.125);
-    EXPECT_EQ(settings->GetIllumName1(), "D65");
-    EXPECT_EQ(settings->GetIllumName2(), "");
+    EXPECT_EQ(settings->GetIllumClass1().GetName(), "D65");
+    EXPECT_EQ(settings->GetIllumClass2(), IllumClass());
 
     settings->SetMeasurementDisplay(NxSetting::EYE);
     settings->SetDirectLightPart(0.333);
-    settings->SetIllumNames("A", "FL11");
+    settings->SetIllumClasses(IllumClass(ILLUM_A, 0), IllumClass(std::string("FL11")));
     settings->SaveProperties();
     EXPECT_EQ(user->ReadKey("Settings", "MeasurementDisplay"), "Eye");
     EXPECT_EQ(user->ReadKey("Settings", "DirectLightPart"), "0.33");
@@ -213,7 +214,10 @@ TEST_F(AppConfigTest, SettingsReadDefaultsWithoutAUserFileAndRoundTripThroughIt)
     EXPECT_NE(fresh, nullptr);
     EXPECT_EQ(fresh->GetMeasurementDisplay(), NxSetting::EYE);
     EXPECT_DOUBLE_EQ(fresh->GetDirectLightPart(), 0.5);
-    EXPECT_EQ(fresh->GetIllumName1(), "A");
+    IllumClass first, second;
+    fresh->GetIllumClasses(first, second);
+    EXPECT_EQ(first.GetName(), "A");
+    EXPECT_EQ(second.GetName(), "FL11");
 }
 
 }  // namespace

@@ -12,6 +12,8 @@
 #include <sstream>
 #include <stdexcept>
 
+#include "nxbase/appconfig.h"
+#include "nxbase/singleton.h"
 #include "test_util.h"
 
 namespace {
@@ -322,6 +324,19 @@ TEST_F(ASCIIFileTest, VersionSectionAcceptsOnlyVersionsFromTwoToTheHighestKnown)
         EXPECT_THROW(writer.SetVersion(3), std::logic_error);
     }
     EXPECT_EQ(nxtest::ReadFile(path), "");
+
+    // With one, its two-component version text names the writer.
+    AppName::CreateAppName("ColorLab", "ColorLab", "K-Lume ColorLab", ApplicationVersion(4, 2, 7));
+    std::stringstream named;
+    {
+        ASCIIFileImpl writer(&named, false);
+        writer.SetVersion(3);
+    }
+    EXPECT_EQ(named.str(), "[File]\nApplication=" + AppName::Instance()->GetVersionString().str() +
+                               "\nVersion=3\n");
+    ASCIIFileImpl reader2(&named, true);
+    EXPECT_TRUE(reader2.CheckVersion(3));
+    NxSingleton::DeleteAllSingleton();
 }
 
 TEST_F(ASCIIFileTest, SkippingAndMultilineReaders) {

@@ -108,7 +108,8 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
               "# second group\n"
               "[Alpha]\n"
               "b = 2\n"
-              "a = 1\n");
+              "a = 1\n\n"
+              "; end of file\n");
     Config config(path);
     config.SetGroup("Alpha");
     ASSERT_TRUE(config.WriteKey("c", "3"));
@@ -125,7 +126,8 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
         "[Alpha]\n"
         "b = 2\n"
         "a = 1\n"
-        "c = %\n";
+        "c = %\n\n"
+        "; end of file\n";
     auto withC = [&](const char* c) {
         std::string text = expected;
         return text.replace(text.find('%'), 1, c);
@@ -141,6 +143,51 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
     EXPECT_EQ(config.GetGroupName(0), "Zeta");
     EXPECT_EQ(config.GetGroupName(1), "Alpha");
     EXPECT_EQ(config.GetGroupName(2), "");
+}
+
+TEST(IniFile, AFileOfCommentsOnlyKeepsThemAboveTheFirstGroup) {
+    TempDir dir;
+    const std::string path = dir.File("comments.ini");
+    WriteFile(path, "; written by hand\n\n# nothing set yet\n");
+    Config config(path);
+    config.SetGroup("G");
+    ASSERT_TRUE(config.WriteKey("k", "v"));
+    EXPECT_EQ(ReadFile(path), "; written by hand\n\n# nothing set yet\n\n[G]\nk = v\n");
+    ASSERT_TRUE(config.WriteKey("k", "w"));
+    const std::string once = ReadFile(path);
+    ASSERT_TRUE(config.WriteKey("k", "v"));
+    ASSERT_TRUE(config.WriteKey("k", "w"));
+    EXPECT_EQ(ReadFile(path), once);
+    EXPECT_NE(once.find("; written by hand"), std::string::npos);
+    EXPECT_NE(once.find("# nothing set yet"), std::string::npos);
+
+    // A file from Windows: CRLF lines, a comment after the last key.
+    WriteFile(path, "[G]\r\nk = v\r\n; last\r\n; words\r\n");
+    ASSERT_TRUE(config.WriteKey("l", "w"));
+    EXPECT_EQ(ReadFile(path), "[G]\nk = v\nl = w\n\n; last\n; words\n");
+}
+
+TEST(IniFile, AByteOrderMarkIsASignatureOnlyAtTheStartOfTheFile) {
+    TempDir dir;
+    const std::string path = dir.File("bom.ini");
+    const std::string bom = "\xEF\xBB\xBF";
+    WriteFile(path, bom + "[G]\nk = v\n");
+    Config config(path);
+    EXPECT_EQ(Keys(config, "G"), (std::vector<std::string>{"k=v"}));
+    ASSERT_TRUE(config.WriteKey("l", "w"));
+    EXPECT_EQ(ReadFile(path), bom + "[G]\nk = v\nl = w\n");
+
+    // A key that begins with the mark's bytes keeps them, first in the file
+    // or not.
+    WriteFile(path, "\n" + bom + "key = 1\n");
+    Config top(path);
+    top.SetGroup("");
+    EXPECT_EQ(top.ReadKey(bom + "key"), "1");
+    ASSERT_TRUE(top.WriteKey("other", "2"));
+    Config reread(path);
+    reread.SetGroup("");
+    EXPECT_EQ(reread.ReadKey(bom + "key"), "1");
+    EXPECT_EQ(reread.ReadKey("key", "absent"), "absent");
 }
 
 TEST(IniFile, MalformedLinesAreSkippedAndTheRestIsRead) {

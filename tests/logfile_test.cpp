@@ -30,6 +30,7 @@ class LogFileTest : public ::testing::Test {
     nxtest::TempDir dir;
     nxtest::ScopedEnv path{"NXBASE_LOG_PATH", dir.path().string()};
     nxtest::ScopedEnv options{"NXBASE_LOG_OPTIONS", ""};
+    nxtest::ScopedEnv userConfig{"XDG_CONFIG_HOME", dir.File("config")};
     std::string File(const char* name) { return dir.File(std::string(name) + ".log"); }
 };
 
@@ -70,6 +71,16 @@ TEST_F(LogFileTest, PathOptionNamesTheFileOrItsDirectory) {
         LogFile log("");
         // Without a name the executable's base name is used.
         EXPECT_EQ(log.GetFileName(), dir.File("logfile_test.log"));
+    }
+    {
+        // "Path" in group "Log" of the application's option file in the
+        // per-user configuration directory.
+        nxtest::ScopedEnv noPath("NXBASE_LOG_PATH", "");
+        std::filesystem::create_directories(dir.File("config/K-Lume"));
+        nxtest::WriteFile(dir.File("config/K-Lume/logfile_test.ini"),
+                          "[Other]\nPath=/nowhere\n[log]\npath=" + dir.File("from-ini.txt") + "\n");
+        LogFile log("ignored");
+        EXPECT_EQ(log.GetFileName(), dir.File("from-ini.txt"));
     }
 }
 

@@ -1,1 +1,10 @@
-# Tests: progress.
+# Tests: progress, and the screen-colour families (toolkit bitmap, colour converter).
+nxbase_add_test(progress_test progress_test.cpp)
+nxbase_add_test(bitmap_test bitmap_test.cpp)
+nxbase_add_test(iccprofile_test iccprofile_test.cpp LIBS PkgConfig::LCMS2)
+nxbase_add_test(colorconverter_test colorconverter_test.cpp LIBS PkgConfig::LCMS2)
+if(TARGET nxcolor)
+    nxbase_add_test(nxcolor_screen_test nxcolor_screen_test.cpp LIBS nxcolor_core PkgConfig::LCMS2)
+    target_compile_definitions(nxcolor_screen_test PRIVATE NXCOLOR_PATH="$<TARGET_FILE:nxcolor>")
+    add_dependencies(nxcolor_screen_test nxcolor)
+endif()

@@ -12,6 +12,7 @@ configure_file(nxcolor/embedded_chart.cpp.in ${CMAKE_CURRENT_BINARY_DIR}/generat
 # The reader and the report are a library of their own so that tests reach them.
 add_library(nxcolor_core STATIC
     nxcolor/report.cpp
+    nxcolor/screen.cpp
     nxcolor/spectra_cgats.cpp
     nxcolor/spectra_csv.cpp
     ${CMAKE_CURRENT_BINARY_DIR}/generated/nxcolor_embedded_chart.cpp)

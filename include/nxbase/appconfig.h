@@ -7,7 +7,7 @@
 //
 // Where the files live on Linux:
 // - per-user directory: $XDG_CONFIG_HOME/K-Lume, else $HOME/.config/K-Lume
-//   (created on first use, one level);
+//   (created on first use, with ~/.config if that is missing too);
 // - UserConfig: <per-user directory>/<application name made a file name>.ini;
 // - LocalConfig: <per-user directory>/<short name>.ini;
 // - AppConfig and VELTRAConfig: wherever their creator points them.
@@ -166,7 +166,7 @@ class NXBASE_EXPORT UserConfig : public KLConfig, public NxSingleton {
     // - `asAppName`: the application's name; made a valid file name (see
     //   MakeValidFileName) it names the file, ".ini" appended unless present;
     // - `asDirectory`: the directory of the file; empty selects
-    //   GetConfigDirectoryPath();
+    //   GetConfigDirectoryPath() (the working directory if that is "");
     // - `asDefaultsPath`: an INI file copied to the user's file when that does
     //   not exist yet (the shipped defaults); empty for none.
     // Logs User config file: "<path>" under "Startup".
@@ -175,9 +175,9 @@ class NXBASE_EXPORT UserConfig : public KLConfig, public NxSingleton {
     // Throws std::logic_error "No UserConfig instance".
     static UserConfig* Instance();
     static bool IsInitialized();
-    // $XDG_CONFIG_HOME/K-Lume, else $HOME/.config/K-Lume (from the password
-    // database when HOME is unset), created (one level) when missing; "" when
-    // no base directory is known.
+    // $XDG_CONFIG_HOME/K-Lume (an absolute XDG_CONFIG_HOME only), else
+    // $HOME/.config/K-Lume (from the password database when HOME is unset),
+    // created with missing parents; "" when no base directory is known.
     static String GetConfigDirectoryPath();
 
     explicit UserConfig(const String& asPath);

@@ -6,6 +6,7 @@
 #ifndef NXBASE_APPSETTI_H_
 #define NXBASE_APPSETTI_H_
 
+#include "nxbase/cmetryfilter.h"
 #include "nxbase/export.h"
 #include "nxbase/singleton.h"
 #include "toolkit/string.h"
@@ -25,12 +26,12 @@ class NXBASE_EXPORT NxSetting : public NxSingleton {
     // with 2 decimals); does nothing unless UserConfig::IsInitialized().
     void SaveProperties();
 
-    // The illuminant names of the metamerism test ("" selects the provider's
-    // default illuminant).
-    void GetIllumNames(String& asFirst, String& asSecond) const;
-    const String& GetIllumName1() const { return amIllum1; }
-    const String& GetIllumName2() const { return amIllum2; }
-    void SetIllumNames(const String& asFirst, const String& asSecond);
+    // The two illuminants of the metamerism test. A name the colorimetry data
+    // does not know (or an empty one) gives its default illuminant.
+    void GetIllumClasses(IllumClass& axFirst, IllumClass& axSecond) const;
+    const IllumClass& GetIllumClass1() const { return amIllum1; }
+    const IllumClass& GetIllumClass2() const { return amIllum2; }
+    void SetIllumClasses(IllumClass axFirst, IllumClass axSecond);
 
     MeasurementDisplay GetMeasurementDisplay() const { return amDisplay; }
     void SetMeasurementDisplay(MeasurementDisplay axDisplay) { amDisplay = axDisplay; }
@@ -44,8 +45,8 @@ class NXBASE_EXPORT NxSetting : public NxSingleton {
     template <class T, class Load>
     friend T* nxbase::LazySingletonInstance(T*&, Load);
 
-    String amIllum1;
-    String amIllum2;
+    IllumClass amIllum1;
+    IllumClass amIllum2;
     MeasurementDisplay amDisplay = INSTRUMENT;
     double amDirectLightPart = 0.5;
     static NxSetting* smInstance;

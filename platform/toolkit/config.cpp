@@ -169,25 +169,75 @@ bool IsWellFormed(const char* begin, const char* end) {
     return equals != end && equals != begin;
 }
 
+// Comment lines SimpleIni would drop, kept aside to be written back: those
+// after the last group or key line (`after`), or every comment of a file
+// without any group or key (`before`).
+struct LooseComments {
+    std::string before;
+    std::string after;
+    bool signature = false;  // the file began with a UTF-8 byte-order mark
+};
+
+// A UTF-8 byte-order mark: a signature at the start of a file, ordinary bytes
+// anywhere else (even at the start of a key name).
+const char kBom[] = "\xEF\xBB\xBF";
+
+bool StartsWithBom(const std::string& text) { return text.compare(0, 3, kBom) == 0; }
+
+bool IsEntry(const std::string& line) {
+    std::size_t first = line.find_first_not_of(" \t");
+    return first != std::string::npos && line[first] != ';' && line[first] != '#';
+}
+
 // Hands SimpleIni the well-formed lines only, so that a malformed line is
 // skipped on its own and never changes how the lines after it read (SimpleIni
 // would file the keys after an unclosed "[" under a garbage group).
-void Parse(Ini& ini, const std::string& text) {
+LooseComments Parse(Ini& ini, const std::string& text) {
     ini.Reset();
-    std::string clean;
-    clean.reserve(text.size());
-    const char* p = text.data();
-    const char* const end = p + text.size();
+    std::vector<std::string> lines;
+    LooseComments loose;
+    loose.signature = StartsWithBom(text);
+    const char* p = text.data() + (loose.signature ? 3 : 0);
+    const char* const end = text.data() + text.size();
     while (p < end) {
         const char* eol = p;
         while (eol < end && *eol != '\n' && *eol != '\r') ++eol;
-        if (IsWellFormed(p, eol)) {
-            clean.append(p, eol);
-            clean += '\n';
-        }
+        if (IsWellFormed(p, eol)) lines.emplace_back(p, eol);
+        // "\r\n", "\n" and a lone "\r" each end one line.
+        if (eol + 1 < end && eol[0] == '\r' && eol[1] == '\n') ++eol;
         p = eol < end ? eol + 1 : end;
     }
+    std::size_t lastEntry = lines.size();
+    for (std::size_t i = lines.size(); i-- > 0;) {
+        if (IsEntry(lines[i])) {
+            lastEntry = i;
+            break;
+        }
+    }
+    std::string clean;
+    clean.reserve(text.size());
+    if (lastEntry == lines.size()) {
+        for (const std::string& line : lines) {
+            if (!loose.before.empty() || line.find_first_not_of(" \t") != std::string::npos) {
+                loose.before += line + "\n";
+            }
+        }
+    } else {
+        for (std::size_t i = 0; i < lines.size(); ++i) {
+            std::string& target = i <= lastEntry ? clean : loose.after;
+            if (i > lastEntry && target.empty() && !IsEntry(lines[i]) &&
+                lines[i].find_first_not_of(" \t") == std::string::npos) {
+                continue;  // blank lines between the last key and a comment
+            }
+            target += lines[i];
+            target += '\n';
+        }
+    }
+    // SimpleIni takes a mark at the start of its data as the signature: keep
+    // a key that merely begins with those bytes from starting the data.
+    if (StartsWithBom(clean)) clean.insert(0, "\n");
     ini.LoadData(clean.data(), clean.size());
+    return loose;
 }
 
 bool HasLineBreakOrNul(const std::string& s) {
@@ -286,7 +336,7 @@ struct Config::Impl {
         std::string error;
         if (!ReadWhole(target, text, oldId, error)) return Fail(error);
         std::unique_ptr<Ini> fresh(new Ini(false, false, false));
-        Parse(*fresh, text);
+        const LooseComments loose = Parse(*fresh, text);
         if (!change(*fresh)) {
             ini = std::move(fresh);
             id = oldId;
@@ -297,6 +347,10 @@ struct Config::Impl {
 
         std::string out;
         if (fresh->Save(out) != SI_OK) return Fail("cannot format the file");
+        if (!loose.before.empty()) out = loose.before + (out.empty() ? "" : "\n") + out;
+        if (!loose.after.empty()) out += (out.empty() ? "" : "\n") + loose.after;
+        if (StartsWithBom(out)) out.insert(0, "\n");
+        if (loose.signature) out.insert(0, kBom);
 
         // One temporary name per file: only the holder of the lock writes it,
         // and a leftover from a killed writer is simply overwritten.

@@ -1,6 +1,12 @@
 #include "toolkit/direntry.h"
 
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdlib>
 #include <system_error>
+#include <vector>
 
 #include "toolkit/system.h"
 
@@ -66,3 +72,61 @@ bool DirEntry::MakeDir() const {
     std::filesystem::create_directory(amPath, ec);
     return IsDirectory();
 }
+
+bool DirEntry::MakeDirs() const {
+    std::error_code ec;
+    std::filesystem::create_directories(amPath, ec);
+    return IsDirectory();
+}
+
+DirEntry DirEntry::GetMountPoint() const {
+    namespace fs = std::filesystem;
+    std::error_code ec;
+    fs::path at = fs::absolute(amPath, ec);
+    if (ec) return DirEntry("/");
+    at = at.lexically_normal();
+    struct stat st {};
+    // The nearest existing ancestor...
+    while (::stat(at.c_str(), &st) != 0) {
+        if (at == at.root_path() || at.empty()) return DirEntry("/");
+        at = at.parent_path();
+    }
+    // ...then up while the parent lies on the same device.
+    while (at != at.root_path()) {
+        fs::path parent = at.parent_path();
+        struct stat up {};
+        if (::stat(parent.c_str(), &up) != 0 || up.st_dev != st.st_dev) break;
+        at = parent;
+    }
+    return DirEntry(at);
+}
+
+bool DirEntry::CopyToIfAbsent(const DirEntry& target) const {
+    namespace fs = std::filesystem;
+    std::error_code ec;
+    if (fs::exists(target.amPath, ec)) return true;
+    if (!fs::is_regular_file(amPath, ec)) return false;
+    const std::string to = target.amPath.string();
+    const std::string temp = to + ".copy." + std::to_string(::getpid());
+    if (!fs::copy_file(amPath, temp, fs::copy_options::overwrite_existing, ec)) return false;
+    (void)::link(temp.c_str(), to.c_str());
+    ::unlink(temp.c_str());
+    return fs::exists(target.amPath, ec);
+}
+
+namespace toolkit {
+
+std::string HomeDirectory() {
+    const char* home = std::getenv("HOME");
+    if (home != nullptr && *home != '\0') return home;
+    std::vector<char> buffer(16384);
+    struct passwd entry {};
+    struct passwd* found = nullptr;
+    if (::getpwuid_r(::getuid(), &entry, buffer.data(), buffer.size(), &found) == 0 &&
+        found != nullptr && found->pw_dir != nullptr) {
+        return found->pw_dir;
+    }
+    return std::string();
+}
+
+}  // namespace toolkit

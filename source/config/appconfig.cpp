@@ -1,20 +1,12 @@
 #include "nxbase/appconfig.h"
 
-#include <pwd.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <cstdlib>
-#include <filesystem>
-#include <system_error>
-#include <vector>
+#include <string>
 
 #include "nxbase/check.h"
 #include "nxbase/files.h"
 #include "nxbase/logfile.h"
 #include "toolkit/config.h"
-
-namespace fs = std::filesystem;
 
 namespace {
 
@@ -29,31 +21,6 @@ String JoinPath(const String& directory, const String& name) {
     String path = directory;
     if (path.GetChar(path.Len() - 1) != '/' && path.GetChar(path.Len() - 1) != '\\') path += '/';
     return path + name;
-}
-
-// The user's home directory: $HOME, else the password database.
-std::string HomeDirectory() {
-    const char* home = std::getenv("HOME");
-    if (home != nullptr && *home != '\0') return home;
-    std::vector<char> buffer(16384);
-    struct passwd entry {};
-    struct passwd* found = nullptr;
-    if (::getpwuid_r(::getuid(), &entry, buffer.data(), buffer.size(), &found) == 0 &&
-        found != nullptr && found->pw_dir != nullptr) {
-        return found->pw_dir;
-    }
-    return std::string();
-}
-
-// Copies `from` to `to` unless `to` exists, never replacing a file another
-// process made meanwhile: the copy is linked into place.
-void SeedFile(const std::string& from, const std::string& to) {
-    std::error_code ec;
-    if (from.empty() || fs::exists(to, ec) || !fs::is_regular_file(from, ec)) return;
-    std::string temp = to + ".seed." + std::to_string(::getpid());
-    if (!fs::copy_file(from, temp, fs::copy_options::overwrite_existing, ec)) return;
-    (void)::link(temp.c_str(), to.c_str());
-    ::unlink(temp.c_str());
 }
 
 }  // namespace
@@ -130,26 +97,7 @@ DirEntry AppDir::LngDirEntry() const { return RootDirEntry() + DirEntry("LNG"); 
 
 DirEntry AppDir::HlpDirEntry() const { return RootDirEntry() + DirEntry("DOC"); }
 
-DirEntry AppDir::TargetDisk() const {
-    std::error_code ec;
-    fs::path at = fs::absolute(BinDirEntry().path(), ec);
-    if (ec) return DirEntry("/");
-    at = at.lexically_normal();
-    struct stat st {};
-    // The nearest existing ancestor...
-    while (::stat(at.c_str(), &st) != 0) {
-        if (at == at.root_path() || at.empty()) return DirEntry("/");
-        at = at.parent_path();
-    }
-    // ...then up while the parent is on the same device.
-    while (at != at.root_path()) {
-        fs::path parent = at.parent_path();
-        struct stat up {};
-        if (::stat(parent.c_str(), &up) != 0 || up.st_dev != st.st_dev) break;
-        at = parent;
-    }
-    return DirEntry(at);
-}
+DirEntry AppDir::TargetDisk() const { return BinDirEntry().GetMountPoint(); }
 
 // ----------------------------------------------------------------- KLConfig
 
@@ -239,15 +187,14 @@ String UserConfig::GetConfigDirectoryPath() {
     if (xdg != nullptr && xdg[0] == '/') {
         base = xdg;
     } else {
-        std::string home = HomeDirectory();
+        std::string home = toolkit::HomeDirectory();
         if (home.empty()) return String();
         base = home + "/.config";
     }
     while (base.size() > 1 && base.back() == '/') base.pop_back();
-    std::string dir = base + "/K-Lume";
-    std::error_code ec;
-    if (!fs::is_directory(dir, ec)) fs::create_directories(dir, ec);
-    return String(dir);
+    DirEntry dir(base + "/K-Lume");
+    if (!dir.IsDirectory()) dir.MakeDirs();
+    return dir.GetFull();
 }
 
 UserConfig* UserConfig::CreateUserConfig(const String& asAppName, const String& asDirectory,
@@ -257,7 +204,7 @@ UserConfig* UserConfig::CreateUserConfig(const String& asAppName, const String& 
     if (!EndsWithIgnoreCase(name, ".ini")) name += ".ini";
     String path = JoinPath(directory, name);
     LogFile::WriteToLog(String("User config file: \"") + path + "\"", String("Startup"));
-    SeedFile(asDefaultsPath.str(), path.str());
+    if (!asDefaultsPath.IsEmpty()) DirEntry(asDefaultsPath).CopyToIfAbsent(DirEntry(path));
     return nxbase::CreateOrReplaceSingleton(smInstance, path);
 }
 

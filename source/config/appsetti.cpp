@@ -4,6 +4,7 @@
 #include <cmath>
 #include <string>
 #include <system_error>
+#include <utility>
 
 #include "nxbase/appconfig.h"
 
@@ -58,8 +59,8 @@ NxSetting* NxSetting::Instance() {
 void NxSetting::LoadProperties() {
     if (!UserConfig::IsInitialized()) return;
     UserConfig* user = UserConfig::Instance();
-    amIllum1 = user->ReadKey(kGroup, kIllum1, String());
-    amIllum2 = user->ReadKey(kGroup, kIllum2, String());
+    amIllum1 = IllumClass(user->ReadKey(kGroup, kIllum1, String()).str());
+    amIllum2 = IllumClass(user->ReadKey(kGroup, kIllum2, String()).str());
     amDirectLightPart =
         ParseDouble(user->ReadKey(kGroup, kDirectLightPart, String("0.5")).str(),
                     kDefaultDirectLightPart);
@@ -70,18 +71,18 @@ void NxSetting::LoadProperties() {
 void NxSetting::SaveProperties() {
     if (!UserConfig::IsInitialized()) return;
     UserConfig* user = UserConfig::Instance();
-    user->WriteKey(kGroup, kIllum1, amIllum1);
-    user->WriteKey(kGroup, kIllum2, amIllum2);
+    user->WriteKey(kGroup, kIllum1, String(amIllum1.GetName()));
+    user->WriteKey(kGroup, kIllum2, String(amIllum2.GetName()));
     user->WriteKey(kGroup, kDirectLightPart, String(FormatFixed2(amDirectLightPart)));
     user->WriteKey(kGroup, kDisplay, DisplayText(amDisplay));
 }
 
-void NxSetting::GetIllumNames(String& asFirst, String& asSecond) const {
-    asFirst = amIllum1;
-    asSecond = amIllum2;
+void NxSetting::GetIllumClasses(IllumClass& axFirst, IllumClass& axSecond) const {
+    axFirst = amIllum1;
+    axSecond = amIllum2;
 }
 
-void NxSetting::SetIllumNames(const String& asFirst, const String& asSecond) {
-    amIllum1 = asFirst;
-    amIllum2 = asSecond;
+void NxSetting::SetIllumClasses(IllumClass axFirst, IllumClass axSecond) {
+    amIllum1 = std::move(axFirst);
+    amIllum2 = std::move(axSecond);
 }

@@ -13,7 +13,9 @@
 #include <mutex>
 #include <sstream>
 
+#include "nxbase/appconfig.h"
 #include "nxbase/thread.h"
+#include "toolkit/config.h"
 #include "toolkit/system.h"
 
 namespace {
@@ -22,6 +24,7 @@ constexpr const char* kLogWrite = "LogWrite";
 constexpr const char* kLogListeners = "LogListeners";
 constexpr const char* kUnlimited = "Unlimited";
 constexpr const char* kPath = "Path";
+constexpr const char* kLogGroup = "Log";
 constexpr const char* kThreadId = "ThreadId";
 
 // Bits of a key's state: announced once in "# - Available key: ", enabled.
@@ -117,9 +120,30 @@ std::map<std::string, std::string> OptionsFromEnvironment() {
     return options;
 }
 
+// The application's option file: the executable's name with a four-character
+// extension (".exe") replaced by ".ini", or ".ini" appended, in the per-user
+// configuration directory.
+std::string ApplicationOptionFile() {
+    std::string directory = UserConfig::GetConfigDirectoryPath().str();
+    std::string name = toolkit::ExecutableFileName();
+    name = name.substr(name.find_last_of('/') + 1);
+    if (directory.empty() || name.empty()) return std::string();
+    std::size_t dot = name.rfind('.');
+    if (dot != std::string::npos && dot + 4 == name.size()) name.erase(dot);
+    return directory + "/" + name + ".ini";
+}
+
+// Without a registry root path only the option "Path" is known: key "Path"
+// of group "Log" in the application's option file.
 class DefaultLogOptionProvider : public nxbase::LogOptionProvider {
   public:
-    std::string LogPath() override { return std::string(); }
+    std::string LogPath() override {
+        std::string file = ApplicationOptionFile();
+        if (file.empty()) return std::string();
+        Config options{String(file)};
+        options.SetGroup(kLogGroup);
+        return options.ReadKey(kPath).str();
+    }
     std::map<std::string, std::string> LogOptions() override { return {}; }
 };
 

@@ -1,5 +1,6 @@
 #include "nxbase/asciifile.h"
 
+
 #include <algorithm>
 #include <charconv>
 #include <climits>
@@ -11,6 +12,7 @@
 #include <stdexcept>
 
 #include "asciifile_io.h"
+#include "nxbase/appconfig.h"
 #include "nxbase/logfile.h"
 #include "toolkit/system.h"
 
@@ -123,12 +125,9 @@ void AppendEscaped(std::string& out, const std::string& text) {
     }
 }
 
-// The current application's version text, from the AppName singleton.
-// AppName is not in this tree yet: without it there is no application to
-// name, which is what AppName::Instance() reports.
-String ApplicationVersionText() {
-    throw std::logic_error("Please create the AppName-Singleton first !");
-}
+// The current application's version text, from the AppName singleton
+// (which throws when the application has not created it).
+String ApplicationVersionText() { return AppName::Instance()->GetVersionString(); }
 
 [[noreturn]] void Unsupported() { throw std::logic_error("Unsupported operation"); }
 

@@ -4,12 +4,15 @@
 #include <charconv>
 #include <cstdio>
 #include <iostream>
+#include <memory>
 #include <string>
 #include <vector>
 
 #include "klume/cmetry/repository.h"
 #include "nxbase/colorvector.h"
+#include "nxbase/progress.h"
 #include "report.h"
+#include "screen.h"
 #include "spectra_csv.h"
 
 namespace {
@@ -20,6 +23,8 @@ constexpr int kExitRowsRejected = 1;  // some rows bad, the others printed
 constexpr int kExitUsage = 2;         // bad options, unreadable or unusable input
 
 constexpr int kMaxPrecision = 9;
+// Inputs from this many spectra on get a progress bar (on a terminal).
+constexpr std::size_t kProgressMinRows = 20000;
 
 const char kUsage[] =
     "Usage: nxcolor [options] [FILE]\n"
@@ -48,6 +53,13 @@ const char kUsage[] =
     "                          output layout (default table)\n"
     "  -p, --precision N       decimals, 0..9 (default 4)\n"
     "      --percent           the values are percentages (0..100)\n"
+    "      --rgb               also print the screen colour: sRGB R, G, B (0..255)\n"
+    "                          and hex, through the ICC display profile when one\n"
+    "                          is configured (user configuration nxcolor.ini,\n"
+    "                          group Settings: ICCProfile=1, ICCProfilePath=FILE)\n"
+    "      --icc-profile FILE  use this ICC display profile for --rgb and --report\n"
+    "      --report FILE.svg   also draw the chart: a swatch per sample in its\n"
+    "                          screen colour, with its id, Lab and reflectance curve\n"
     "      --list-illuminants  print the built-in illuminant names and exit\n"
     "  -h, --help              print this text and exit\n"
     "\n"
@@ -67,6 +79,9 @@ struct Options {
     float scale = 1.0f;
     bool xyy = false;
     bool din99 = false;
+    bool rgb = false;
+    std::string iccProfile;
+    std::string svgReport;
     bool listIlluminants = false;
     bool help = false;
 };
@@ -128,6 +143,14 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             options->xyy = true;
         } else if (arg == "--din99" && !hasValue) {
             options->din99 = true;
+        } else if (arg == "--rgb" && !hasValue) {
+            options->rgb = true;
+        } else if (arg == "--icc-profile") {
+            if (!take(&options->iccProfile) || options->iccProfile.empty())
+                return arg + " needs a file";
+        } else if (arg == "--report") {
+            if (!take(&options->svgReport) || options->svgReport.empty())
+                return arg + " needs a file name";
         } else if (arg == "--list-illuminants" && !hasValue) {
             options->listIlluminants = true;
         } else {
@@ -200,8 +223,28 @@ int main(int argc, char** argv) {
     if (options.xyy) quantities.push_back("xyy");
     if (options.din99) quantities.push_back("din99");
     if (!options.density.empty()) quantities.push_back("density");
+    if (options.rgb) quantities.push_back("rgb");
+    if (options.rgb || !options.svgReport.empty()) {
+        const std::string warning = nxcolor::SetUpScreenColors(options.iccProfile);
+        if (!warning.empty()) std::cerr << "nxcolor: " << warning << '\n';
+    }
+    // A bar on stderr for large inputs, drawn only when stderr is a terminal.
+    std::unique_ptr<nxbase::TerminalProgressListener> bar;
+    if (table.rows.size() >= kProgressMinRows) {
+        bar = std::make_unique<nxbase::TerminalProgressListener>("nxcolor");
+        bar->SetTotal(table.rows.size(), "spectra");
+    }
     const nxcolor::Report report =
-        nxcolor::Evaluate(table, source, condition, quantities, options.precision);
+        nxcolor::Evaluate(table, source, condition, quantities, options.precision, bar.get());
+    bar.reset();
+    if (!options.svgReport.empty()) {
+        std::string error;
+        if (!nxcolor::WriteSvgReport(report, condition, options.svgReport, &error)) {
+            std::cerr << "nxcolor: " << error << '\n';
+            return kExitUsage;
+        }
+        std::cerr << "nxcolor: chart picture written to " << options.svgReport << '\n';
+    }
     writer->second(report, std::cout);
     std::cout.flush();
     if (!std::cout) {

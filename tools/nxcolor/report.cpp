@@ -1,6 +1,8 @@
 // nxcolor's quantities and output layouts.
 #include "report.h"
 
+#include "screen.h"
+
 #include <algorithm>
 #include <charconv>
 #include <cmath>
@@ -71,6 +73,17 @@ std::vector<Quantity> MakeQuantities() {
                          filter.GetDensity(s, c, out[c]);
                      }
                  }});
+    // Screen colour levels 0..255 and their hex code (not a CGATS.17 field).
+    Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
+    q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
+                 [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
+                     const ScreenColor c = ScreenColorOf(s, mc);
+                     out[0] = c.red;
+                     out[1] = c.green;
+                     out[2] = c.blue;
+                     out[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+                 }});
+
     return q;
 }
 
@@ -95,7 +108,7 @@ void WriteCsv(const Report& report, std::ostream& out) {
     for (const ReportRow& row : report.rows) {
         out << CsvField(row.id);
         for (std::size_t i = 0; i < row.values.size(); ++i) {
-            out << ',' << FormatNumber(row.values[i], report.columns[i].precision);
+            out << ',' << FormatCell(row.values[i], report.columns[i]);
         }
         out << '\n';
     }
@@ -123,7 +136,13 @@ void WriteCgats(const Report& report, std::ostream& out) {
     for (const ReportRow& row : report.rows) {
         out << CgatsString(row.id);
         for (std::size_t i = 0; i < row.values.size(); ++i) {
-            out << ' ' << FormatNumber(row.values[i], report.columns[i].precision);
+            const Column& column = report.columns[i];
+            // Text cells (the screen colour's hex code) are quoted strings.
+            if (column.kind == Column::Kind::kNumber) {
+                out << ' ' << FormatNumber(row.values[i], column.precision);
+            } else {
+                out << ' ' << CgatsString(FormatCell(row.values[i], column));
+            }
         }
         out << '\n';
     }
@@ -145,7 +164,7 @@ void WriteTable(const Report& report, std::ostream& out) {
     for (std::size_t c = 0; c < report.columns.size(); ++c) {
         std::size_t width = report.columns[c].name.size();
         for (std::size_t r = 0; r < report.rows.size(); ++r) {
-            cells[r].push_back(FormatNumber(report.rows[r].values[c], report.columns[c].precision));
+            cells[r].push_back(FormatCell(report.rows[r].values[c], report.columns[c]));
             width = std::max(width, cells[r].back().size());
         }
         widths.push_back(width);
@@ -180,7 +199,7 @@ const std::vector<Quantity>& Quantities() {
 
 Report Evaluate(const SpectraTable& table, const std::string& source,
                 const MeasuringCondition& condition, const std::vector<std::string>& quantities,
-                int precision) {
+                int precision, ProgressListener* progress) {
     Report report;
     report.source = source;
     report.illuminant = condition.GetIllum().GetName();
@@ -191,11 +210,15 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
         if (std::find(quantities.begin(), quantities.end(), q.key) == quantities.end()) continue;
         chosen.push_back(&q);
         for (Column c : q.columns) {
-            c.precision = precision;
+            if (!c.ownPrecision) c.precision = precision;
             report.columns.push_back(c);
         }
     }
+    // Progress in steps of this many rows: cheap against the computation.
+    constexpr std::size_t kProgressRows = 1024;
     for (const SpectrumRow& in : table.rows) {
+        if (progress != nullptr && report.rows.size() % kProgressRows == 0)
+            progress->DisplayProgress(static_cast<double>(report.rows.size()) / table.rows.size());
         ReportRow row;
         row.id = in.id;
         row.spectrum = in.values;
@@ -207,12 +230,22 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
         }
         report.rows.push_back(std::move(row));
     }
+    if (progress != nullptr) progress->DisplayProgress(1.0);
     return report;
 }
 
 const std::map<std::string, Writer>& Writers() {
     static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}};
     return writers;
+}
+
+std::string FormatCell(float value, const Column& column) {
+    if (column.kind == Column::Kind::kNumber) return FormatNumber(value, column.precision);
+    static const char kDigits[] = "0123456789ABCDEF";
+    auto packed = static_cast<std::uint32_t>(value);
+    std::string text = "#";
+    for (int shift = 20; shift >= 0; shift -= 4) text += kDigits[(packed >> shift) & 0xF];
+    return text;
 }
 
 std::string FormatNumber(float value, int precision) {

@@ -14,14 +14,20 @@
 #include <vector>
 
 #include "nxbase/colorvector.h"
+#include "nxbase/progress.h"
 #include "spectra_csv.h"
 
 namespace nxcolor {
 
 struct Column {
+    enum class Kind { kNumber, kHexColor };
     std::string name;   // "X", "L*", ...
     std::string cgats;  // the CGATS field name: "XYZ_X", "LAB_L", ...
     int precision = 4;  // decimals
+    // A column whose precision is its own, not the report's (screen levels).
+    bool ownPrecision = false;
+    // kHexColor: the value is 0xRRGGBB, printed "#RRGGBB".
+    Kind kind = Kind::kNumber;
 };
 
 // One quantity: its columns and how to compute them from a spectrum under a
@@ -50,10 +56,11 @@ struct Report {
     std::vector<ReportRow> rows;
 };
 
-// Computes `quantities` (keys of Quantities(), in that order) for every row.
+// Computes `quantities` (keys of Quantities(), in that order) for every row,
+// reporting the share of rows done to `progress` when given.
 Report Evaluate(const SpectraTable& table, const std::string& source,
                 const MeasuringCondition& condition, const std::vector<std::string>& quantities,
-                int precision);
+                int precision, ProgressListener* progress = nullptr);
 
 using Writer = std::function<void(const Report&, std::ostream&)>;
 // Layouts by name: "table" (aligned columns, a "#" title line), "csv" and
@@ -62,6 +69,8 @@ const std::map<std::string, Writer>& Writers();
 
 // A number with `precision` decimals and "." as separator, whatever the locale.
 std::string FormatNumber(float value, int precision);
+// A cell of `column`: FormatNumber, or "#RRGGBB" for a colour column.
+std::string FormatCell(float value, const Column& column);
 
 }  // namespace nxcolor
 

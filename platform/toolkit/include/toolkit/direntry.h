@@ -38,6 +38,18 @@ class NXBASE_EXPORT DirEntry {
     bool IsDirectory() const;
     // Creates this directory (one level); true if it exists afterwards.
     bool MakeDir() const;
+    // Creates this directory with every missing parent; true if it exists
+    // afterwards.
+    bool MakeDirs() const;
+
+    // The mount point of the file system holding this entry (of its nearest
+    // existing ancestor when it does not exist); "/" when unknown.
+    DirEntry GetMountPoint() const;
+
+    // Copies this file to `target` unless `target` exists, never replacing a
+    // file that another process creates meanwhile (the copy is linked into
+    // place). True if `target` exists afterwards.
+    bool CopyToIfAbsent(const DirEntry& target) const;
 
     const std::filesystem::path& path() const { return amPath; }
     bool operator==(const DirEntry& other) const { return amPath == other.amPath; }
@@ -46,5 +58,12 @@ class NXBASE_EXPORT DirEntry {
   private:
     std::filesystem::path amPath;
 };
+
+namespace toolkit {
+
+// The user's home directory: $HOME, else the password database; "" if unknown.
+NXBASE_EXPORT std::string HomeDirectory();
+
+}  // namespace toolkit
 
 #endif  // TOOLKIT_DIRENTRY_H_

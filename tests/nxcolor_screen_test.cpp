@@ -1,0 +1,160 @@
+// nxcolor's screen colours (--rgb, --icc-profile) and chart picture (--report).
+#include <gtest/gtest.h>
+#include <lcms2.h>
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <regex>
+#include <string>
+
+#include "report.h"
+#include "screen.h"
+#include "test_util.h"
+
+namespace {
+
+// Runs nxcolor with a shell command line, its user configuration in a
+// temporary directory; returns the exit status and fills the outputs.
+int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv config("XDG_CONFIG_HOME", dir.path().string());
+    const std::string outFile = dir.File("out");
+    const std::string errFile = dir.File("err");
+    const std::string command =
+        std::string(NXCOLOR_PATH) + " " + args + " >" + outFile + " 2>" + errFile;
+    const int status = std::system(command.c_str());
+    *out = nxtest::ReadFile(outFile);
+    *err = nxtest::ReadFile(errFile);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+std::vector<std::string> Lines(const std::string& text) {
+    std::vector<std::string> lines;
+    std::size_t start = 0;
+    for (std::size_t end; (end = text.find('\n', start)) != std::string::npos; start = end + 1)
+        lines.push_back(text.substr(start, end - start));
+    return lines;
+}
+
+TEST(NxcolorScreen, RgbColumnsGiveLevelsAndTheirHex) {
+    std::string out, err;
+    ASSERT_EQ(RunNxcolor("--rgb --format csv", &out, &err), 0) << err;
+    auto lines = Lines(out);
+    ASSERT_EQ(lines.size(), 25u);
+    EXPECT_EQ(lines[0], "id,X,Y,Z,L*,a*,b*,C*,h,R,G,B,hex");
+    const std::regex row(R"(.*,(\d+),(\d+),(\d+),#([0-9A-F]{6}))");
+    for (std::size_t i = 1; i < lines.size(); ++i) {
+        std::smatch m;
+        ASSERT_TRUE(std::regex_match(lines[i], m, row)) << lines[i];
+        int r = std::stoi(m[1]), g = std::stoi(m[2]), b = std::stoi(m[3]);
+        for (int v : {r, g, b}) {
+            EXPECT_GE(v, 0);
+            EXPECT_LE(v, 255);
+        }
+        EXPECT_EQ(std::stoi(m[4], nullptr, 16), (r << 16) | (g << 8) | b) << lines[i];
+    }
+    // Chart patch 19 is white, 24 black; 13 blue, 15 red.
+    auto levels = [&](int patch) {
+        std::smatch m;
+        std::regex_match(lines[patch], m, row);
+        return std::vector<int>{std::stoi(m[1]), std::stoi(m[2]), std::stoi(m[3])};
+    };
+    for (int v : levels(19)) EXPECT_GT(v, 225);
+    for (int v : levels(24)) EXPECT_LT(v, 70);
+    EXPECT_GT(levels(13)[2], levels(13)[0]);
+    EXPECT_GT(levels(15)[0], levels(15)[2]);
+}
+
+TEST(NxcolorScreen, IccProfileAgreesWithTheFormulasAndBadOnesFallBack) {
+    nxtest::TempDir dir;
+    std::string profile = dir.File("srgb.icc");
+    cmsHPROFILE p = cmsCreate_sRGBProfile();
+    ASSERT_TRUE(cmsSaveProfileToFile(p, profile.c_str()));
+    cmsCloseProfile(p);
+
+    std::string formula, icc, err;
+    ASSERT_EQ(RunNxcolor("--rgb --format csv -i D65", &formula, &err), 0) << err;
+    ASSERT_EQ(RunNxcolor("--rgb --format csv -i D65 --icc-profile " + profile, &icc, &err), 0);
+    EXPECT_TRUE(err.empty()) << err;
+    // Under D65 the two paths differ only by the D50 PCS adaptation; the
+    // neutral patches 19..24 agree to an 8-bit level or two.
+    constexpr int kNeutralLevels = 2;
+    auto f = Lines(formula), i = Lines(icc);
+    ASSERT_EQ(f.size(), i.size());
+    const std::regex row(R"(.*,(\d+),(\d+),(\d+),#[0-9A-F]{6})");
+    for (int patch = 19; patch <= 24; ++patch) {
+        std::smatch a, b;
+        ASSERT_TRUE(std::regex_match(f[patch], a, row));
+        ASSERT_TRUE(std::regex_match(i[patch], b, row));
+        for (int c = 1; c <= 3; ++c)
+            EXPECT_NEAR(std::stoi(a[c]), std::stoi(b[c]), kNeutralLevels) << f[patch] << " / " << i[patch];
+    }
+
+    std::string junk = dir.File("junk.icc");
+    nxtest::WriteFile(junk, "not a profile");
+    std::string out;
+    ASSERT_EQ(RunNxcolor("--rgb --format csv -i D65 --icc-profile " + junk, &out, &err), 0);
+    EXPECT_NE(err.find("ICC profile not used"), std::string::npos) << err;
+    EXPECT_EQ(out, formula);
+    EXPECT_EQ(RunNxcolor("--icc-profile", &out, &err), 2);
+    EXPECT_EQ(RunNxcolor("--report", &out, &err), 2);
+}
+
+TEST(NxcolorScreen, ReportDrawsOneSwatchCurveAndLabelPerSample) {
+    nxtest::TempDir dir;
+    std::string svg = dir.File("chart.svg"), out, err;
+    ASSERT_EQ(RunNxcolor("--report " + svg, &out, &err), 0) << err;
+    EXPECT_NE(err.find("chart picture written to " + svg), std::string::npos);
+    std::string text = nxtest::ReadFile(svg);
+    ASSERT_EQ(text.rfind("<?xml", 0), 0u);
+    EXPECT_NE(text.find("</svg>\n"), std::string::npos);
+    auto count = [&](const std::string& needle) {
+        std::size_t n = 0;
+        for (std::size_t at = text.find(needle); at != std::string::npos;
+             at = text.find(needle, at + 1))
+            ++n;
+        return n;
+    };
+    EXPECT_EQ(count("<polyline class=\"curve\""), 24u);
+    EXPECT_EQ(count("class=\"lab\">L* "), 24u);
+    EXPECT_EQ(count("rx=\"6\" fill=\"#"), 24u);
+    EXPECT_NE(text.find(">1 dark skin<"), std::string::npos);
+    EXPECT_NE(text.find("24 samples"), std::string::npos);
+    // Every curve has the 36 points of the spectrum.
+    const std::regex points("points=\"([^\"]*)\"");
+    for (auto it = std::sregex_iterator(text.begin(), text.end(), points);
+         it != std::sregex_iterator(); ++it) {
+        std::string p = (*it)[1];
+        EXPECT_EQ(std::count(p.begin(), p.end(), ','), 36);
+    }
+    // Nothing is left beside the picture.
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir.path()),
+                            std::filesystem::directory_iterator()),
+              1);
+}
+
+TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
+    nxtest::TempDir dir;
+    nxcolor::Report report;
+    report.source = "a<b>&\"c\"";
+    report.illuminant = "D50";
+    report.observer = "2";
+    nxcolor::ReportRow row;
+    row.id = "<script>&x\x01";
+    row.spectrum.fill(0.5f);
+    row.spectrum[3] = 7.0f;  // fluorescent peak: clipped into the plot
+    report.rows.push_back(row);
+    std::string error;
+    std::string svg = dir.File("x.svg");
+    ASSERT_TRUE(nxcolor::WriteSvgReport(report, MeasuringCondition(), svg, &error)) << error;
+    std::string text = nxtest::ReadFile(svg);
+    EXPECT_EQ(text.find("<script>"), std::string::npos);
+    EXPECT_NE(text.find("&lt;script&gt;&amp;x "), std::string::npos);
+    EXPECT_NE(text.find("a&lt;b&gt;&amp;&quot;c&quot;"), std::string::npos);
+    EXPECT_FALSE(nxcolor::WriteSvgReport(report, MeasuringCondition(),
+                                         dir.File("no/such/dir/x.svg"), &error));
+    EXPECT_NE(error.find("cannot write"), std::string::npos);
+}
+
+}  // namespace

@@ -1,0 +1,231 @@
+// nxcolor's screen colours and SVG chart picture.
+#include "screen.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cmath>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <unistd.h>
+
+#include "nxbase/appconfig.h"
+#include "nxbase/colorconverter.h"
+#include "nxbase/iccprofile.h"
+
+namespace nxcolor {
+namespace {
+
+// Layout of the picture, in SVG user units (px).
+constexpr int kCell = 210;         // cell width and height
+constexpr int kMargin = 20;
+constexpr int kTitleHeight = 56;
+constexpr int kSwatchHeight = 88;
+constexpr int kPlotHeight = 56;
+constexpr int kMaxColumns = 6;
+constexpr std::size_t kMaxIdChars = 26;  // of the bold 13 px id font in a cell
+
+std::string Num(double value, int precision) {
+    char buffer[64];
+    if (value == 0.0) value = 0.0;
+    auto result = std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed,
+                                precision);
+    return std::string(buffer, result.ptr);
+}
+
+std::string Escape(const std::string& text) {
+    std::string out;
+    for (char c : text) {
+        switch (c) {
+            case '&': out += "&amp;"; break;
+            case '<': out += "&lt;"; break;
+            case '>': out += "&gt;"; break;
+            case '"': out += "&quot;"; break;
+            default:
+                // Control characters are not allowed in XML 1.0.
+                if (static_cast<unsigned char>(c) < 0x20 && c != '\t') {
+                    out += ' ';
+                } else {
+                    out += c;
+                }
+        }
+    }
+    return out;
+}
+
+std::string Hex(const ScreenColor& c) {
+    static const char kDigits[] = "0123456789abcdef";
+    std::string text = "#";
+    for (int v : {c.red, c.green, c.blue}) {
+        text += kDigits[(v >> 4) & 0xF];
+        text += kDigits[v & 0xF];
+    }
+    return text;
+}
+
+// The curve is drawn in the sample's colour unless that is too light to see.
+std::string CurveColour(const ScreenColor& c) {
+    double luma = 0.2126 * c.red + 0.7152 * c.green + 0.0722 * c.blue;
+    return luma > 200.0 ? "#555555" : Hex(c);
+}
+
+// Dark text on light colours, light text on dark ones.
+const char* TextOn(const ScreenColor& c) {
+    double luma = 0.2126 * c.red + 0.7152 * c.green + 0.0722 * c.blue;
+    return luma > 140.0 ? "#222222" : "#f4f4f4";
+}
+
+// Ids longer than a cell is wide end in "...". Cuts before a UTF-8
+// continuation byte never happen: the cut moves back to a character start.
+std::string Shortened(const std::string& id) {
+    if (id.size() <= kMaxIdChars) return id;
+    std::size_t cut = kMaxIdChars - 3;
+    while (cut > 0 && (static_cast<unsigned char>(id[cut]) & 0xC0) == 0x80) --cut;
+    return id.substr(0, cut) + "...";
+}
+
+class ScopedLab {
+  public:
+    ScopedLab() : previous_(LABVector::GetColorSpaceType()) {
+        LABVector::SetColorSpaceType(LAB_CIE1976);
+    }
+    ~ScopedLab() { LABVector::SetColorSpaceType(previous_); }
+    ScopedLab(const ScopedLab&) = delete;
+    ScopedLab& operator=(const ScopedLab&) = delete;
+
+  private:
+    LabColorSpaceType previous_;
+};
+
+void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition& condition,
+               int x, int y) {
+    const ReflectanceSpectrum spectrum(row.spectrum.data(), PhysicalConditions());
+    ScopedLab cie;
+    const LABVector lab(spectrum, condition);
+    const ScreenColor colour = ScreenColorOf(spectrum, condition);
+    const int w = kCell - 14;
+    out << "<g transform=\"translate(" << x << "," << y << ")\">\n";
+    out << "  <rect width=\"" << w << "\" height=\"" << kSwatchHeight << "\" rx=\"6\" fill=\""
+        << Hex(colour) << "\" stroke=\"#888\" stroke-width=\"1\"/>\n";
+    // The hex code sits in the swatch's corner, in a colour that reads on it.
+    out << "  <text x=\"" << w - 6 << "\" y=\"" << kSwatchHeight - 7
+        << "\" class=\"hex\" text-anchor=\"end\" fill=\"" << TextOn(colour) << "\">"
+        << Hex(colour) << "</text>\n";
+    out << "  <text x=\"0\" y=\"" << kSwatchHeight + 16 << "\" class=\"id\">"
+        << Escape(Shortened(row.id)) << "</text>\n";
+    out << "  <text x=\"0\" y=\"" << kSwatchHeight + 31 << "\" class=\"lab\">L* " << Num(lab[0], 2)
+        << "  a* " << Num(lab[1], 2) << "  b* " << Num(lab[2], 2) << "</text>\n";
+    // Reflectance 0..1 over 380..730 nm; values above 1 (fluorescence) are
+    // clipped to the top of the plot.
+    const int top = kSwatchHeight + 40;
+    out << "  <rect x=\"0\" y=\"" << top << "\" width=\"" << w << "\" height=\"" << kPlotHeight
+        << "\" class=\"plot\"/>\n";
+    out << "  <line x1=\"0\" x2=\"" << w << "\" y1=\"" << top + kPlotHeight / 2 << "\" y2=\""
+        << top + kPlotHeight / 2 << "\" class=\"grid\"/>\n";
+    out << "  <polyline class=\"curve\" stroke=\"" << CurveColour(colour) << "\" points=\"";
+    for (int i = 0; i < kSpectrumSize; ++i) {
+        double r = std::clamp(static_cast<double>(row.spectrum[i]), 0.0, 1.0);
+        if (!std::isfinite(row.spectrum[i])) r = 0.0;
+        double px = w * i / double(kSpectrumSize - 1);
+        double py = top + kPlotHeight * (1.0 - r);
+        out << (i ? " " : "") << Num(px, 1) << "," << Num(py, 1);
+    }
+    out << "\"/>\n</g>\n";
+}
+
+}  // namespace
+
+ScreenColor ScreenColorOf(const ReflectanceSpectrum& spectrum, const MeasuringCondition& condition) {
+    ScopedLab cie;
+    const Color colour = ColorConverter::RGBToColor(RGBVector(LABVector(spectrum, condition)));
+    return {colour.GetRed8(), colour.GetGreen8(), colour.GetBlue8()};
+}
+
+std::string ScreenColorSource() {
+    if (ICCEngine::Instance()->IsActive())
+        return "ICC profile " + std::string(ICCProfile::GetProfileName().str());
+    return "sRGB (built-in formulas)";
+}
+
+std::string SetUpScreenColors(const std::string& profilePath) {
+    if (!profilePath.empty()) {
+        nxbase::SetICCSettingsReader([profilePath](const std::string& key, const std::string& def) {
+            if (key == ICCEngine::kEnableKey) return std::string("1");
+            if (key == ICCEngine::kPathKey) return profilePath;
+            return def;
+        });
+    } else if (!UserConfig::IsInitialized()) {
+        UserConfig::CreateUserConfig(String("nxcolor"), String(), String());
+    }
+    ICCEngine* engine = ICCEngine::CreateICCEngine();
+    if (engine->IsEnabled() && !engine->ProfileOK())
+        return "ICC profile not used (" + engine->GetProblem() + "); sRGB formulas instead";
+    return "";
+}
+
+bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
+                    const std::string& path, std::string* error) {
+    const std::size_t count = std::min(report.rows.size(), kMaxSvgSamples);
+    const int columns = static_cast<int>(std::min<std::size_t>(
+        std::max<std::size_t>(count, 1),
+        count <= 24 ? kMaxColumns
+                    : static_cast<std::size_t>(std::ceil(std::sqrt(count * 4.0 / 3.0)))));
+    const int rows = static_cast<int>((count + columns - 1) / columns);
+    const int width = 2 * kMargin + columns * kCell;
+    const int height = kTitleHeight + kMargin + std::max(rows, 1) * kCell;
+
+    std::ostringstream out;
+    out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
+        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\""
+        << height << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
+        << "<style>\n"
+        << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; }\n"
+        << "  .title, .sub, .id, .lab { fill: #222; }\n"
+        << "  .title { font-size: 18px; font-weight: bold; }\n"
+        << "  .sub { font-size: 12px; fill: #555; }\n"
+        << "  .id { font-size: 13px; font-weight: bold; }\n"
+        << "  .hex { font-size: 11px; font-family: 'DejaVu Sans Mono', monospace; }\n"
+        << "  .lab { font-size: 11px; fill: #444; }\n"
+        << "  .plot { fill: #fff; stroke: #ccc; stroke-width: 1; }\n"
+        << "  .grid { stroke: #e4e4e4; stroke-width: 1; }\n"
+        << "  .curve { fill: none; stroke-width: 2; stroke-linejoin: round; }\n"
+        << "</style>\n"
+        << "<rect width=\"100%\" height=\"100%\" fill=\"#f4f4f2\"/>\n";
+    std::string title = report.source + ": " + std::to_string(report.rows.size()) + " samples";
+    if (count < report.rows.size()) title += ", the first " + std::to_string(count) + " shown";
+    out << "<text x=\"" << kMargin << "\" y=\"28\" class=\"title\">" << Escape(title) << "</text>\n";
+    out << "<text x=\"" << kMargin << "\" y=\"46\" class=\"sub\">CIELAB under illuminant "
+        << Escape(report.illuminant) << ", observer " << Escape(report.observer)
+        << "\xC2\xB0; screen colours: " << Escape(ScreenColorSource())
+        << "; curves: reflectance 0..1 over 380..730 nm</text>\n";
+    for (std::size_t i = 0; i < count; ++i) {
+        int x = kMargin + static_cast<int>(i % columns) * kCell;
+        int y = kTitleHeight + kMargin + static_cast<int>(i / columns) * kCell;
+        WriteCell(out, report.rows[i], condition, x, y);
+    }
+    out << "</svg>\n";
+
+    // Written beside the target and renamed into place.
+    const std::string temp = path + ".tmp" + std::to_string(::getpid());
+    {
+        std::ofstream file(temp, std::ios::binary | std::ios::trunc);
+        file << out.str();
+        file.flush();
+        if (!file) {
+            std::error_code ignored;
+            std::filesystem::remove(temp, ignored);
+            *error = "cannot write " + path;
+            return false;
+        }
+    }
+    std::error_code failed;
+    std::filesystem::rename(temp, path, failed);
+    if (failed) {
+        std::filesystem::remove(temp, failed);
+        *error = "cannot write " + path;
+        return false;
+    }
+    return true;
+}
+
+}  // namespace nxcolor
