@@ -6,23 +6,29 @@
 #include <cmath>
 #include <cstdlib>
 #include <new>
+#include <thread>
 #include <vector>
 
 #include "color_test_util.h"
 
 // Counts global allocations so that the object path can be shown to allocate
 // nothing per value.
+// The allocation and release go through out-of-line helpers so that the
+// compiler does not pair an inlined operator new with free() and warn.
 namespace {
 std::atomic<long> gAllocations{0};
+
+__attribute__((noinline)) void* Allocate(std::size_t size) { return std::malloc(size ? size : 1); }
+__attribute__((noinline)) void Release(void* p) { std::free(p); }
 }  // namespace
 
 void* operator new(std::size_t size) {
     gAllocations.fetch_add(1, std::memory_order_relaxed);
-    if (void* p = std::malloc(size ? size : 1)) return p;
+    if (void* p = Allocate(size)) return p;
     throw std::bad_alloc();
 }
-void operator delete(void* p) noexcept { std::free(p); }
-void operator delete(void* p, std::size_t) noexcept { std::free(p); }
+void operator delete(void* p) noexcept { Release(p); }
+void operator delete(void* p, std::size_t) noexcept { Release(p); }
 
 namespace {
 
@@ -112,6 +118,41 @@ TEST(ColorVector, ObjectPathAllocatesNothingPerValue) {
     }
     EXPECT_EQ(gAllocations.load() - before, 0);
     EXPECT_GT(sink, 0.0f);
+}
+
+TEST(ColorVector, ThreadsComputeTheSameValuesUnderTheirOwnConditions) {
+    const auto chart = nxtest::ReadPatchCsv(nxtest::ChartPath());
+    const MeasuringCondition conditions[] = {
+        D50Condition(),
+        MeasuringCondition(IllumClass("D65"), ObserverClass(OBSERVER_10DEG), PhysicalConditions()),
+        MeasuringCondition(IllumClass("A"), ObserverClass(OBSERVER_2DEG), PhysicalConditions())};
+    std::vector<std::vector<float>> expected(3);
+    for (int c = 0; c < 3; ++c) {
+        for (const auto& row : chart) {
+            const LABVector lab(SpectrumOf(row), conditions[c]);
+            const XYZVector xyz(lab);
+            expected[c].insert(expected[c].end(), {lab[0], lab[1], lab[2], xyz[0], xyz[1], xyz[2]});
+        }
+    }
+    std::vector<std::thread> threads;
+    std::atomic<int> mismatches{0};
+    for (int t = 0; t < 6; ++t) {
+        threads.emplace_back([&, t] {
+            for (int round = 0; round < 50; ++round) {
+                const int c = (t + round) % 3;  // switch conditions to churn the per-thread caches
+                std::size_t k = 0;
+                for (const auto& row : chart) {
+                    const LABVector lab(SpectrumOf(row), conditions[c]);
+                    const XYZVector xyz(lab);
+                    for (float v : {lab[0], lab[1], lab[2], xyz[0], xyz[1], xyz[2]}) {
+                        if (v != expected[c][k++]) ++mismatches;
+                    }
+                }
+            }
+        });
+    }
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(mismatches.load(), 0);
 }
 
 TEST(ColorVector, ArithmeticIsComponentWiseAndKeepsTheCondition) {

@@ -71,7 +71,7 @@ NXBASE_EXPORT bool operator!=(const ColorVector& axA, const ColorVector& axB);
 
 class LABVector;
 
-// CIE XYZ tristimulus values, white Y = 100 (CIE 15:2004, 7.1).
+// CIE XYZ tristimulus values, white Y = 100 (CIE 15:2004; ASTM E308 weights).
 class NXBASE_EXPORT XYZVector : public ColorVector {
 public:
     XYZVector() = default;
@@ -99,7 +99,7 @@ public:
 
 class LChVector;
 
-// CIE 1976 L*a*b* (CIE 15:2004, 8.2.1) or DIN99 (DIN 6176), according to the
+// CIE 1976 L*a*b* (CIE 15:2004) or DIN99 (DIN 6176), according to the
 // process-wide colour-space type at construction from tristimulus values.
 //
 // f(t) = t^0.33333334 (single-precision pow) for t > 0.008856, else

@@ -44,7 +44,11 @@ using detail::kLabOffset;
 // The kernels' helpers are forced inline so that each clone gets its own copy.
 #define NXBASE_BATCH_INLINE inline __attribute__((always_inline))
 
-#if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__) && !defined(NXBASE_BATCH_NO_CLONES)
+// The clones are chosen by an IFUNC resolver that runs while the library is
+// relocated, before ThreadSanitizer's runtime is up; a TSan build uses the
+// default code only.
+#if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__) && \
+    !defined(NXBASE_BATCH_NO_CLONES) && !defined(__SANITIZE_THREAD__)
 #define NXBASE_BATCH_CLONES __attribute__((target_clones("arch=x86-64-v3", "default")))
 #else
 #define NXBASE_BATCH_CLONES
