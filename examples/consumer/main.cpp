@@ -1,12 +1,20 @@
-// Uses the installed library: a logged line and a named lock.
+// An application built against the installed library: a logged line under a
+// named lock, and the Lab value of a flat 50 % grey under the default
+// illuminant D50 and the 2° observer.
 #include <cstdio>
 
+#include <nxbase/colorvector.h>
 #include <nxbase/logfile.h>
+#include <nxbase/spectrum.h>
 #include <nxbase/thread.h>
 
 int main() {
     CriticalSection section("ConsumerStart");
     LogFile::WriteToLog("consumer started", "");
+    ReflectanceSpectrum grey(0.5f, PhysicalConditions());
+    LABVector lab(grey);
     std::printf("consumer logged to %s\n", LogFile::Instance()->GetFileName().c_str());
-    return 0;
+    std::printf("grey 50%%: L* %.2f a* %.2f b* %.2f\n", lab[0], lab[1], lab[2]);
+    // A flat 50 % reflector is neutral: L* = 116 * 0.5^(1/3) - 16.
+    return lab[0] > 76.0f && lab[0] < 76.1f ? 0 : 1;
 }
