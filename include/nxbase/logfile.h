@@ -144,4 +144,23 @@ class NXBASE_EXPORT AutoLog {
     static std::atomic<std::uint32_t> smAutoLogCounter;
 };
 
+namespace nxbase {
+
+// IsLogOptionEnabled of the process log for one fixed key, for hot paths:
+// while no option changes, the answer costs one atomic load instead of a
+// locked look-up. Any thread may call Enabled(); a change of the options is
+// seen by the next call.
+class NXBASE_EXPORT CachedLogOption {
+  public:
+    explicit CachedLogOption(std::string key) : amKey(std::move(key)) {}
+    bool Enabled();
+
+  private:
+    const String amKey;
+    // (options version << 1) | enabled; 0 before the first look-up.
+    std::atomic<std::uint64_t> amState{0};
+};
+
+}  // namespace nxbase
+
 #endif  // NXBASE_LOGFILE_H_

@@ -62,9 +62,19 @@ void Report(const std::string& message) {
     if (handler != nullptr) handler(message);
 }
 
-// Made once, on first use; read-only afterwards.
+// A handle that does not own: the repositories keep every table they hand
+// out for the life of the process, so handles need no reference count, and
+// colour values that carry them copy without atomic operations (copies on
+// many threads would otherwise contend for one counter).
+template <typename T>
+boost::shared_ptr<T> Unowned(const boost::shared_ptr<T>& table) {
+    return boost::shared_ptr<T>(boost::shared_ptr<T>(), table.get());
+}
+
+// Made once, on first use; read-only afterwards, never destroyed (handles
+// may be used until the very end of the process).
 const BuiltIns& GetBuiltIns() {
-    static const BuiltIns builtIns = [] {
+    static const BuiltIns* builtIns = new BuiltIns([] {
         BuiltIns b;
         for (int i = 0; i < embedded::kObserversCount; ++i) {
             const embedded::EmbeddedTable& t = embedded::kObservers[i];
@@ -105,8 +115,8 @@ const BuiltIns& GetBuiltIns() {
             b.standardNames.push_back(t.key);
         }
         return b;
-    }();
-    return builtIns;
+    }());
+    return *builtIns;
 }
 
 // Installed tables, by path; parsed once per process.
@@ -117,8 +127,8 @@ struct InstalledCache {
 };
 
 InstalledCache& GetInstalled() {
-    static InstalledCache cache;
-    return cache;
+    static InstalledCache* cache = new InstalledCache;  // never destroyed, as GetBuiltIns
+    return *cache;
 }
 
 bool SetError(std::string* error, std::string text) {
@@ -173,7 +183,7 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
                                                           std::string* error) {
     const BuiltIns& b = GetBuiltIns();
     const auto builtIn = b.illuminants.find(name);
-    if (builtIn != b.illuminants.end()) return builtIn->second;
+    if (builtIn != b.illuminants.end()) return Unowned(builtIn->second);
     if (!IsSafeFileName(name)) {
         SetError(error, "unknown illuminant \"" + name + "\"");
         return {};
@@ -187,7 +197,7 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
     InstalledCache& cache = GetInstalled();
     std::lock_guard<std::mutex> lock(cache.mutex);
     const auto cached = cache.illuminants.find(path);
-    if (cached != cache.illuminants.end()) return cached->second;
+    if (cached != cache.illuminants.end()) return Unowned(cached->second);
     detail::CsvTable table;
     if (!LoadTable(path, 2, table, error)) return {};
     if (table.columns.size() != 2) {
@@ -203,7 +213,7 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
         return {};
     }
     cache.illuminants[path] = illuminant;
-    return illuminant;
+    return Unowned(illuminant);
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
@@ -216,7 +226,7 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::GetDefault() {
-    return GetBuiltIns().illuminants.at(kDefaultIlluminant);
+    return Unowned(GetBuiltIns().illuminants.at(kDefaultIlluminant));
 }
 
 bool IlluminantRepository::Exists(const std::string& name) {
@@ -230,11 +240,11 @@ std::vector<std::string> IlluminantRepository::GetNames() {
 boost::shared_ptr<IObserver> ObserverRepository::Get(const std::string& name) {
     const BuiltIns& b = GetBuiltIns();
     const auto it = b.observers.find(name);
-    return it == b.observers.end() ? boost::shared_ptr<IObserver>() : it->second;
+    return it == b.observers.end() ? boost::shared_ptr<IObserver>() : Unowned(it->second);
 }
 
 boost::shared_ptr<IObserver> ObserverRepository::GetDefault() {
-    return GetBuiltIns().observers.at(kDefaultObserver);
+    return Unowned(GetBuiltIns().observers.at(kDefaultObserver));
 }
 
 std::vector<std::string> ObserverRepository::GetNames() { return GetBuiltIns().observerNames; }
@@ -243,7 +253,7 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
                                                                     std::string* error) {
     const BuiltIns& b = GetBuiltIns();
     const auto builtIn = b.standards.find(name);
-    if (builtIn != b.standards.end()) return builtIn->second;
+    if (builtIn != b.standards.end()) return Unowned(builtIn->second);
     if (!IsSafeFileName(name)) {
         SetError(error, "unknown density standard \"" + name + "\"");
         return {};
@@ -258,7 +268,7 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
     InstalledCache& cache = GetInstalled();
     std::lock_guard<std::mutex> lock(cache.mutex);
     const auto cached = cache.standards.find(path);
-    if (cached != cache.standards.end()) return cached->second;
+    if (cached != cache.standards.end()) return Unowned(cached->second);
     detail::CsvTable table;
     if (!LoadTable(path, 2, table, error)) return {};
     std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
@@ -270,7 +280,7 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
         return {};
     }
     cache.standards[path] = standard;
-    return standard;
+    return Unowned(standard);
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::string& name) {
@@ -283,7 +293,7 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::st
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::GetDefault() {
-    return GetBuiltIns().standards.at(kDefaultDensityStandard);
+    return Unowned(GetBuiltIns().standards.at(kDefaultDensityStandard));
 }
 
 bool DensityStandardRepository::Exists(const std::string& name) {

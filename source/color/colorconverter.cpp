@@ -19,8 +19,8 @@ const String& LogKey() {
 }
 
 bool LogEnabled() {
-    static const boost::shared_ptr<LogFile> log = LogFile::Instance();
-    return log->IsLogOptionEnabled(LogKey());
+    static nxbase::CachedLogOption option(LogKey().str());
+    return option.Enabled();
 }
 
 void Log(const String& text) {
