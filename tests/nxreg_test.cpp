@@ -38,13 +38,13 @@ class NxregTest : public ::testing::Test {
 
 TEST_F(NxregTest, RegistersTheServerAndPeersAndShowsThem) {
     const std::string server = "'HKLM\\Software\\K-Lume\\LumaServer'";
-    EXPECT_EQ(Run("set " + server + " Path /opt/k-lume/bin").status, 0);
-    EXPECT_EQ(Run("set " + server + " Executable /opt/k-lume/bin/LumaServer").status, 0);
-    EXPECT_EQ(Run("set " + server + " Version 3.2").status, 0);
-    EXPECT_EQ(Run("set 'HKEY_LOCAL_MACHINE\\Software\\K-Lume\\ChromaLink\\Applications' "
-                  "ColorLab '/opt/k-lume/bin/ColorLab'")
-                  .status,
-              0);
+    for (const std::string& set :
+         {"set " + server + " Path /opt/k-lume/bin",
+          "set " + server + " Executable /opt/k-lume/bin/LumaServer", "set " + server + " Version 3.2",
+          std::string("set 'HKEY_LOCAL_MACHINE\\Software\\K-Lume\\ChromaLink\\Applications' "
+                      "ColorLab '/opt/k-lume/bin/ColorLab'")}) {
+        EXPECT_EQ(Run(set).status, 0) << set;
+    }
 
     Result version = Run("get 'hklm\\software\\k-lume\\lumaserver' VERSION");
     EXPECT_EQ(version.status, 0);
@@ -86,11 +86,10 @@ TEST_F(NxregTest, ExportDeleteImportRestoresTheKeys) {
 
 TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     EXPECT_EQ(Run("--help").status, 0);
-    EXPECT_EQ(Run("").status, 2);
-    EXPECT_EQ(Run("frobnicate").status, 2);
-    EXPECT_EQ(Run("get 'HKEY_USERS\\x' y").status, 2);
-    EXPECT_EQ(Run("set --dword 'HKCU\\x' y 12z").status, 2);
-    EXPECT_EQ(Run("delete HKCU").status, 2);
+    for (const char* usage :
+         {"", "frobnicate", "get 'HKEY_USERS\\x' y", "set --dword 'HKCU\\x' y 12z", "delete HKCU"}) {
+        EXPECT_EQ(Run(usage).status, 2) << usage;
+    }
 
     const std::string bad = dir.File("bad.reg");
     nxtest::WriteFile(bad, "REGEDIT4\n[HKCU\\Software\\K-Lume]\n\"a\"=\"1\"\n\"b\"=dword:xyz\n");

@@ -11,8 +11,12 @@ namespace {
 
 class OSInfoTest : public ::testing::Test {
   protected:
-    nxtest::TempDir dir;
-    nxtest::ScopedEnv logPath{"NXBASE_LOG_PATH", dir.path().string()};
+    // The process log is made once, by the first test: all tests share its directory.
+    static const nxtest::TempDir& Dir() {
+        static nxtest::TempDir dir;
+        return dir;
+    }
+    nxtest::ScopedEnv logPath{"NXBASE_LOG_PATH", Dir().path().string()};
     nxtest::ScopedEnv logOptions{"NXBASE_LOG_OPTIONS", "Info"};
 };
 
@@ -46,7 +50,7 @@ TEST_F(OSInfoTest, ARemoteSessionCountsAsTerminalServer) {
     }
     OSInfo::GetMachineName();
     std::string log;
-    for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
+    for (const auto& entry : std::filesystem::directory_iterator(Dir().path())) {
         log += nxtest::ReadFile(entry.path().string());
     }
     EXPECT_NE(log.find("TerminalServer: 0"), std::string::npos) << log;
