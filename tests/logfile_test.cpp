@@ -4,6 +4,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <boost/make_shared.hpp>
 #include <map>
 #include <regex>
@@ -220,6 +221,32 @@ TEST(LogFileInstance, IsCreatedOnceAndShared) {
     LogFile::CreateLogFile("ignored-second-name");
     EXPECT_EQ(first, LogFile::Instance());
     EXPECT_NE(first->GetFileName().find(".log"), std::string::npos);
+}
+
+TEST(LogFileInstance, CachedOptionFollowsEveryChangeAlsoUnderConcurrentReaders) {
+    boost::shared_ptr<LogFile> log = LogFile::Instance();
+    nxbase::CachedLogOption cached("CachedKey");
+    EXPECT_FALSE(cached.Enabled());
+    log->SetLogOption("CachedKey", true);
+    EXPECT_TRUE(cached.Enabled());
+    log->SetLogOption("OtherKey", true);  // another key's change keeps the answer
+    EXPECT_TRUE(cached.Enabled());
+    log->SetLogOption("CachedKey", false);
+    EXPECT_FALSE(cached.Enabled());
+
+    // Readers racing a writer: once the writer has finished, every reader
+    // sees its last setting.
+    std::atomic<bool> done{false};
+    std::vector<std::thread> readers;
+    for (int r = 0; r < 4; ++r) {
+        readers.emplace_back([&] {
+            while (!done.load()) cached.Enabled();
+        });
+    }
+    for (int i = 0; i < 2000; ++i) log->SetLogOption("CachedKey", i % 2 == 0);
+    done = true;
+    for (auto& reader : readers) reader.join();
+    EXPECT_FALSE(cached.Enabled());  // the last write (i = 1999) disabled it
 }
 
 }  // namespace
