@@ -56,7 +56,12 @@ std::vector<std::string> AssertionConditions(const RecordingUserInterface& ui) {
     return conditions;
 }
 
-TEST(ProgressListenerRange, MapsItsOwnFractionOntoTheParentsShare) {
+void ExpectRange(std::pair<double, double> range, double first, double second) {
+    EXPECT_NEAR(range.first, first, kTolerance);
+    EXPECT_NEAR(range.second, second, kTolerance);
+}
+
+TEST(ProgressListenerRange, MapsOntoTheParentsShareNestsAndTilesOnUpdate) {
     RecordingListener parent;
     ProgressListenerRange range(parent, 0.2, 0.6);
     range.DisplayProgress(0.5);
@@ -66,31 +71,20 @@ TEST(ProgressListenerRange, MapsItsOwnFractionOntoTheParentsShare) {
     EXPECT_NEAR(parent.values[0], 0.4, kTolerance);
     EXPECT_NEAR(parent.values[1], 0.6, kTolerance);
     EXPECT_EQ(parent.texts, (std::vector<std::string>{"done", "text only"}));
-
     parent.aborted = true;
     EXPECT_TRUE(range.IsAborted());
-}
 
-TEST(ProgressListenerRange, UpdateRunRangeTilesTheParentAndShowsTheNewStart) {
-    RecordingListener parent;
-    ProgressListenerRange range(parent, 0.0, 0.1);
-    range.UpdateRunRange(0.3);
-    EXPECT_NEAR(range.GetRunRange().first, 0.1, kTolerance);
-    EXPECT_NEAR(range.GetRunRange().second, 0.3, kTolerance);
-    ASSERT_EQ(parent.values.size(), 1u);
-    EXPECT_NEAR(parent.values[0], 0.1, kTolerance);
-    range.UpdateRunRange(1.0);
-    range.DisplayProgress(0.5);
-    EXPECT_NEAR(parent.values.back(), 0.65, kTolerance);
-}
-
-TEST(ProgressListenerRange, NestedRangesMultiplyTheirShares) {
+    // An update starts the next share where the last one ended and shows it.
     RecordingListener root;
     ProgressListenerRange outer(root, 0.5, 1.0);
-    ProgressListenerRange inner(outer, 0.2, 0.4);
-    inner.DisplayProgress(0.5);  // 0.3 of outer -> 0.5 + 0.3 * 0.5
+    ProgressListenerRange inner(outer, 0.0, 0.1);
+    inner.UpdateRunRange(0.3);
+    ExpectRange(inner.GetRunRange(), 0.1, 0.3);
     ASSERT_EQ(root.values.size(), 1u);
-    EXPECT_NEAR(root.values[0], 0.65, kTolerance);
+    EXPECT_NEAR(root.values[0], 0.55, kTolerance);
+    inner.UpdateRunRange(0.2, 0.4);
+    inner.DisplayProgress(0.5);  // 0.3 of outer -> 0.5 + 0.3 * 0.5
+    EXPECT_NEAR(root.values.back(), 0.65, kTolerance);
 }
 
 TEST(ProgressListenerRange, BadRangesRaiseTheAssertionsInOrderAndStayUsable) {
@@ -124,24 +118,18 @@ TEST(ProgressListenerRange, BadRangesRaiseTheAssertionsInOrderAndStayUsable) {
 }
 
 TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirst) {
-    EXPECT_EQ(WaitVisualizerRunRange::GetCurrentRunRange(), std::make_pair(0.0, 1.0));
+    ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.0, 1.0);
     {
         WaitVisualizerRunRange outer(0.5, 1.0);
         {
             WaitVisualizerRunRange inner(0.0, 0.5);
-            auto range = WaitVisualizerRunRange::GetCurrentRunRange();
-            EXPECT_NEAR(range.first, 0.5, kTolerance);
-            EXPECT_NEAR(range.second, 0.75, kTolerance);
+            ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.5, 0.75);
             inner.SetRunRange(0.5, 1.0);
-            range = WaitVisualizerRunRange::GetCurrentRunRange();
-            EXPECT_NEAR(range.first, 0.75, kTolerance);
-            EXPECT_NEAR(range.second, 1.0, kTolerance);
+            ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.75, 1.0);
         }
-        auto range = WaitVisualizerRunRange::GetCurrentRunRange();
-        EXPECT_NEAR(range.first, 0.5, kTolerance);
-        EXPECT_NEAR(range.second, 1.0, kTolerance);
+        ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.5, 1.0);
     }
-    EXPECT_EQ(WaitVisualizerRunRange::GetCurrentRunRange(), std::make_pair(0.0, 1.0));
+    ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.0, 1.0);
 }
 
 TEST(WaitVisualizerRunRange, UpdateMovesOnAndReportsThroughTheCurrentVisualizer) {
@@ -224,7 +212,6 @@ TEST(ProgressListener, MinimalStepThrottlesAndOneThreadWinsEachValue) {
     }
     for (auto& thread : threads) thread.join();
     EXPECT_GE(wins.load(), 1);
-    EXPECT_LE(wins.load(), 101 * 8);
     EXPECT_TRUE(listener.Worth(0.0));  // last shown was not 0 any more
 }
 
