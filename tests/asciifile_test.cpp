@@ -1,11 +1,9 @@
 #include "nxbase/asciifile.h"
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <charconv>
 #include <clocale>
-#include <cmath>
 #include <filesystem>
 #include <functional>
 #include <limits>
@@ -139,7 +137,7 @@ TEST_F(ASCIIFileTest, WriterLinesAreExactlyTheDocumentedText) {
     EXPECT_EQ(nxtest::ReadFile(path), "I=\t      5\t-123456\n");
 }
 
-TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineForTheNextReader) {
+TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineAndSkippingFindsTitles) {
     std::stringstream stream("[Data]\nCount=  42\nValues=1 2\nName=x\n");
     ASCIIFileImpl file(&stream, true);
     int count = 0;
@@ -161,6 +159,22 @@ TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineForTheNextReader) {
     EXPECT_EQ(name, "Name=x");
     EXPECT_FALSE(file.GetKeyString(name));
     EXPECT_TRUE(file.AtEnd());
+
+    // Skipping to a title, and multiline values.
+    std::stringstream sections(
+        "junk\n[A]\nx\n[B]\nNote=one\nNote=two^Jhalf\nNote=\nOther=1\n[C]\n");
+    ASCIIFileImpl skipping(&sections, true);
+    String note;
+    std::vector<String> notes;
+    EXPECT_TRUE(skipping.SkipToTitel("B"));
+    EXPECT_FALSE(skipping.GetString("Other", notes));
+    EXPECT_TRUE(notes.empty());
+    ASSERT_TRUE(skipping.GetMultilineString("Note", note));
+    EXPECT_EQ(note.str(), "one\ntwo\nhalf\n");
+    EXPECT_TRUE(skipping.SkipLines(1));
+    EXPECT_TRUE(skipping.GetTitel("C"));
+    EXPECT_FALSE(skipping.SkipToTitel("A"));
+    EXPECT_TRUE(skipping.SkipLines(5));
 }
 
 TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
@@ -336,23 +350,6 @@ TEST_F(ASCIIFileTest, VersionSectionAcceptsOnlyVersionsFromTwoToTheHighestKnown)
     ASCIIFileImpl reader2(&named, true);
     EXPECT_TRUE(reader2.CheckVersion(3));
     NxSingleton::DeleteAllSingleton();
-}
-
-TEST_F(ASCIIFileTest, SkippingAndMultilineReaders) {
-    std::stringstream stream(
-        "junk\n[A]\nx\n[B]\nNote=one\nNote=two^Jhalf\nNote=\nOther=1\n[C]\n");
-    ASCIIFileImpl file(&stream, true);
-    String note;
-    std::vector<String> notes;
-    EXPECT_TRUE(file.SkipToTitel("B"));
-    EXPECT_FALSE(file.GetString("Other", notes));
-    EXPECT_TRUE(notes.empty());
-    ASSERT_TRUE(file.GetMultilineString("Note", note));
-    EXPECT_EQ(note.str(), "one\ntwo\nhalf\n");
-    EXPECT_TRUE(file.SkipLines(1));
-    EXPECT_TRUE(file.GetTitel("C"));
-    EXPECT_FALSE(file.SkipToTitel("A"));
-    EXPECT_TRUE(file.SkipLines(5));
 }
 
 TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
