@@ -61,6 +61,10 @@ void ExpectRange(std::pair<double, double> range, double first, double second) {
     EXPECT_NEAR(range.second, second, kTolerance);
 }
 
+void ExpectAllInUnitRange(const std::vector<double>& values) {
+    for (double v : values) ASSERT_TRUE(v >= 0.0 && v <= 1.0) << "outside 0..1: " << v;
+}
+
 TEST(ProgressListenerRange, MapsOntoTheParentsShareNestsAndTilesOnUpdate) {
     RecordingListener parent;
     ProgressListenerRange range(parent, 0.2, 0.6);
@@ -111,13 +115,10 @@ TEST(ProgressListenerRange, BadRangesRaiseTheAssertionsInOrderAndStayUsable) {
     EXPECT_EQ(AssertionConditions(*ui),
               (std::vector<std::string>{"axProgress >= 0.0 && axProgress <= 1.0"}));
     // Whatever went wrong, the parent only ever saw values inside 0..1.
-    for (double v : parent.values) {
-        EXPECT_GE(v, 0.0);
-        EXPECT_LE(v, 1.0);
-    }
+    ExpectAllInUnitRange(parent.values);
 }
 
-TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirst) {
+TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirstAndReportsUpdates) {
     ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.0, 1.0);
     {
         WaitVisualizerRunRange outer(0.5, 1.0);
@@ -130,9 +131,8 @@ TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirst) {
         ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.5, 1.0);
     }
     ExpectRange(WaitVisualizerRunRange::GetCurrentRunRange(), 0.0, 1.0);
-}
 
-TEST(WaitVisualizerRunRange, UpdateMovesOnAndReportsThroughTheCurrentVisualizer) {
+    // An update moves on and reports through the current visualizer.
     auto listener = boost::shared_ptr<RecordingListener>(new RecordingListener());
     CurrentWaitVisualizer current(listener);
     WaitVisualizerRunRange outer(0.0, 0.5);
@@ -232,10 +232,7 @@ TEST(ProgressListenerRange, ListenersFedFromSeveralThreadsLoseNothing) {
     }
     for (auto& thread : threads) thread.join();
     EXPECT_EQ(root.values.size(), static_cast<size_t>(kThreads * (kReports + 1 + 5)));
-    for (double v : root.values) {
-        EXPECT_GE(v, 0.0);
-        EXPECT_LE(v, 1.0);
-    }
+    ExpectAllInUnitRange(root.values);
 }
 
 TEST(TerminalProgressListener, FormatsBarRateAndTimeLeft) {
