@@ -1,11 +1,9 @@
 #include "nxbase/asciifile.h"
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <charconv>
 #include <clocale>
-#include <cmath>
 #include <filesystem>
 #include <functional>
 #include <limits>
@@ -73,7 +71,6 @@ TEST_F(ASCIIFileTest, EveryValueTypeReadsBackAsWrittenInBothSeparatorModes) {
             EXPECT_FALSE(file->GetError());
         }
         auto file = ASCIIFile::Get(String(path), true, tabMode);
-        EXPECT_EQ(file->Trennzeichen(), tabMode ? "\t" : " ");
         bool valid = false, stale = true;
         short s = 0, shortsBack[4] = {};
         int i = 0, intsBack[3] = {};
@@ -140,7 +137,7 @@ TEST_F(ASCIIFileTest, WriterLinesAreExactlyTheDocumentedText) {
     EXPECT_EQ(nxtest::ReadFile(path), "I=\t      5\t-123456\n");
 }
 
-TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineForTheNextReader) {
+TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineAndSkippingFindsTitles) {
     std::stringstream stream("[Data]\nCount=  42\nValues=1 2\nName=x\n");
     ASCIIFileImpl file(&stream, true);
     int count = 0;
@@ -162,6 +159,22 @@ TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineForTheNextReader) {
     EXPECT_EQ(name, "Name=x");
     EXPECT_FALSE(file.GetKeyString(name));
     EXPECT_TRUE(file.AtEnd());
+
+    // Skipping to a title, and multiline values.
+    std::stringstream sections(
+        "junk\n[A]\nx\n[B]\nNote=one\nNote=two^Jhalf\nNote=\nOther=1\n[C]\n");
+    ASCIIFileImpl skipping(&sections, true);
+    String note;
+    std::vector<String> notes;
+    EXPECT_TRUE(skipping.SkipToTitel("B"));
+    EXPECT_FALSE(skipping.GetString("Other", notes));
+    EXPECT_TRUE(notes.empty());
+    ASSERT_TRUE(skipping.GetMultilineString("Note", note));
+    EXPECT_EQ(note.str(), "one\ntwo\nhalf\n");
+    EXPECT_TRUE(skipping.SkipLines(1));
+    EXPECT_TRUE(skipping.GetTitel("C"));
+    EXPECT_FALSE(skipping.SkipToTitel("A"));
+    EXPECT_TRUE(skipping.SkipLines(5));
 }
 
 TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
@@ -177,6 +190,8 @@ TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
     }
     EXPECT_EQ(out.str(), "R=3.25\n");
 
+    // A lone minus or separator reads as 0; there is no plus sign; an
+    // exponent or hexadecimal prefix ends the number; out of range saturates.
     std::stringstream in(
         "A=3,25\nB=-  7.5\nC=-\nD=,\nE=+5\nF=1e3\nG=12 ,5 -0,5\nH=99999999999\nI=0x1F\nJ=.5\n");
     ASCIIFileImpl file(&in, true);
@@ -290,7 +305,6 @@ TEST_F(ASCIIFileTest, CarriageReturnsAreDroppedSoCrLfFilesReadLikeLfFiles) {
                                          "Date=2026 - 11 -22   10 : 15:\r30\r\nName=a\rb\r\n");
     auto file = ASCIIFile::Get(String(path), true);
     EXPECT_TRUE(file->CheckVersion(3));
-    EXPECT_EQ(file->GetVersion(), 3);
     int d[6] = {};
     String name;
     ASSERT_TRUE(file->GetDate("Date", d[0], d[1], d[2], d[3], d[4], d[5]));
@@ -305,7 +319,6 @@ TEST_F(ASCIIFileTest, VersionSectionAcceptsOnlyVersionsFromTwoToTheHighestKnown)
         {
             ASCIIFileImpl writer(&stream, false);
             nxbase::detail::WriteVersionSection(writer, version, "K-Lume 4.2");
-            EXPECT_EQ(writer.GetVersion(), version);
         }
         EXPECT_EQ(stream.str(),
                   "[File]\nApplication=K-Lume 4.2\nVersion=" + std::to_string(version) + "\n");
@@ -339,28 +352,10 @@ TEST_F(ASCIIFileTest, VersionSectionAcceptsOnlyVersionsFromTwoToTheHighestKnown)
     NxSingleton::DeleteAllSingleton();
 }
 
-TEST_F(ASCIIFileTest, SkippingAndMultilineReaders) {
-    std::stringstream stream(
-        "junk\n[A]\nx\n[B]\nNote=one\nNote=two^Jhalf\nNote=\nOther=1\n[C]\n");
-    ASCIIFileImpl file(&stream, true);
-    String note;
-    std::vector<String> notes;
-    EXPECT_TRUE(file.SkipToTitel("B"));
-    EXPECT_FALSE(file.GetString("Other", notes));
-    EXPECT_TRUE(notes.empty());
-    ASSERT_TRUE(file.GetMultilineString("Note", note));
-    EXPECT_EQ(note.str(), "one\ntwo\nhalf\n");
-    EXPECT_TRUE(file.SkipLines(1));
-    EXPECT_TRUE(file.GetTitel("C"));
-    EXPECT_FALSE(file.SkipToTitel("A"));
-    EXPECT_TRUE(file.SkipLines(5));
-}
-
 TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
-    auto empty = ASCIIFile::Get(String(Write("empty.dat", "")), true);
-    EXPECT_EQ(empty->GetPercentDone(), -1.0f);
-    auto missing = ASCIIFile::Get(String(dir.File("none.dat")), true);
-    EXPECT_EQ(missing->GetPercentDone(), -1.0f);
+    for (const std::string& path : {Write("empty.dat", ""), dir.File("none.dat")}) {
+        EXPECT_EQ(ASCIIFile::Get(String(path), true)->GetPercentDone(), -1.0f) << path;
+    }
 
     std::string content;
     for (int i = 0; i < 100; ++i) content += "Value=" + std::to_string(1000 + i) + "\n";
@@ -429,12 +424,7 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
 
 TEST_F(ASCIIFileTest, ASCIIFile2ReadsButRefusesEveryWrite) {
     std::stringstream stream("Value=5\n");
-    try {
-        ASCIIFile2 writer(&stream, false);
-        FAIL() << "constructed for writing";
-    } catch (const std::exception& error) {
-        EXPECT_STREQ(error.what(), "ASCIIFile 2 does not support write");
-    }
+    EXPECT_THROW(ASCIIFile2(&stream, false), std::exception);
     ASCIIFile2 file(&stream, true);
     int value = 0;
     EXPECT_TRUE(file.GetInt("Value", value));
@@ -444,12 +434,7 @@ TEST_F(ASCIIFileTest, ASCIIFile2ReadsButRefusesEveryWrite) {
     const int i[1] = {1};
     const double r[1] = {1};
     auto expectUnsupported = [](const std::function<void()>& write) {
-        try {
-            write();
-            ADD_FAILURE() << "no exception";
-        } catch (const std::exception& error) {
-            EXPECT_STREQ(error.what(), "Unsupported operation");
-        }
+        EXPECT_THROW(write(), std::exception);
     };
     expectUnsupported([&] { base.PutTitel("T"); });
     expectUnsupported([&] { base.PutBOOL("K", true); });

@@ -8,11 +8,6 @@
 
 namespace {
 
-TEST(Check, CommonErrStrSeparatesFieldsByThreeBlanks) {
-    EXPECT_EQ(Check::CommonErrStr("a", "b", "c", 7).str(),
-              "Module: a   Date: b   Time: c   Line: 7");
-}
-
 TEST(Check, PoetAcceptsZeroTo1999AndReportsTheRest) {
     auto ui = std::make_shared<RecordingUserInterface>();
     ScopedUserInterface scope(ui);
