@@ -5,10 +5,18 @@
 
 #include <array>
 #include <charconv>
+#include <cstdlib>
+#include <limits>
 #include <fstream>
 #include <sstream>
 #include <string>
 #include <vector>
+
+#ifdef NXCOLOR_PATH
+#include <sys/wait.h>
+
+#include "test_util.h"
+#endif
 
 namespace nxtest {
 
@@ -50,6 +58,21 @@ inline std::string ChartPath() {
 inline std::string ChartReferencePath() {
     return std::string(NXBASE_TEST_DATA_DIR) + "/colorchecker_D50_2deg.csv";
 }
+
+#ifdef NXCOLOR_PATH
+// Runs nxcolor with a shell command line, its user configuration in a
+// temporary directory; returns the exit status and fills the outputs.
+inline int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
+    TempDir dir;
+    ScopedEnv config("XDG_CONFIG_HOME", dir.path().string());
+    const std::string command = std::string(NXCOLOR_PATH) + " " + args + " >" + dir.File("out") +
+                                " 2>" + dir.File("err");
+    const int status = std::system(command.c_str());
+    *out = ReadFile(dir.File("out"));
+    *err = ReadFile(dir.File("err"));
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+#endif
 
 }  // namespace nxtest
 
