@@ -117,28 +117,24 @@ TEST(ColorVector, ThreadsComputeTheSameValuesUnderTheirOwnConditions) {
         D50Condition(),
         MeasuringCondition(IllumClass("D65"), ObserverClass(OBSERVER_10DEG), PhysicalConditions()),
         MeasuringCondition(IllumClass("A"), ObserverClass(OBSERVER_2DEG), PhysicalConditions())};
-    std::vector<std::vector<float>> expected(3);
-    for (int c = 0; c < 3; ++c) {
+    // Lab and the XYZ back from it for every patch, in one list.
+    auto values = [&](int c) {
+        std::vector<float> all;
         for (const auto& row : chart) {
             const LABVector lab(SpectrumOf(row), conditions[c]);
             const XYZVector xyz(lab);
-            expected[c].insert(expected[c].end(), {lab[0], lab[1], lab[2], xyz[0], xyz[1], xyz[2]});
+            all.insert(all.end(), {lab[0], lab[1], lab[2], xyz[0], xyz[1], xyz[2]});
         }
-    }
+        return all;
+    };
+    const std::vector<std::vector<float>> expected = {values(0), values(1), values(2)};
     std::vector<std::thread> threads;
     std::atomic<int> mismatches{0};
     for (int t = 0; t < 6; ++t) {
         threads.emplace_back([&, t] {
             for (int round = 0; round < 50; ++round) {
                 const int c = (t + round) % 3;  // switch conditions to churn the per-thread caches
-                std::size_t k = 0;
-                for (const auto& row : chart) {
-                    const LABVector lab(SpectrumOf(row), conditions[c]);
-                    const XYZVector xyz(lab);
-                    for (float v : {lab[0], lab[1], lab[2], xyz[0], xyz[1], xyz[2]}) {
-                        if (v != expected[c][k++]) ++mismatches;
-                    }
-                }
+                if (values(c) != expected[c]) ++mismatches;
             }
         });
     }
@@ -221,10 +217,9 @@ TEST(LABVector, RoundTripsThroughXYZAndLCh) {
 TEST(LChVector, HuesLieInZeroExclusiveToThreeSixtyInclusive) {
     const MeasuringCondition mc;
     auto hue = [&](float a, float b) { return LChVector(LABVector(50.0f, a, b, mc))[2]; };
-    EXPECT_EQ(hue(0.0f, 0.0f), 360.0f);        // grey
-    EXPECT_EQ(hue(0.000009f, -0.000009f), 360.0f);  // below the neutral threshold
-    EXPECT_EQ(hue(1.0f, 0.0f), 360.0f);        // exactly 0 degrees
-    EXPECT_EQ(hue(1.0f, -0.0f), 360.0f);
+    // Grey, below the neutral threshold, exactly 0 degrees (both zero signs).
+    const std::pair<float, float> zeroHues[] = {{0.0f, 0.0f}, {0.000009f, -0.000009f}, {1.0f, 0.0f}, {1.0f, -0.0f}};
+    for (auto [a, b] : zeroHues) EXPECT_EQ(hue(a, b), 360.0f) << a << " " << b;
     EXPECT_FLOAT_EQ(hue(0.0f, 1.0f), 90.0f);
     EXPECT_FLOAT_EQ(hue(-1.0f, 0.0f), 180.0f);
     EXPECT_FLOAT_EQ(hue(-1.0f, -0.0f), 180.0f);  // atan2 gives -180, folded
