@@ -9,6 +9,7 @@
 #include <thread>
 #include <vector>
 
+#include "color_test_util.h"
 #include "colorimetry_test_util.h"
 #include "nxbase/cmetry.h"
 
@@ -129,24 +130,22 @@ TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
 
 TEST(CMetryFilter, ColorCheckerTristimulusValuesMatchTheReference) {
     const auto samples =
-        nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
-    const auto reference = nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
+        nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
+    const auto reference = nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
     ASSERT_EQ(samples.size(), 24u);
     ASSERT_EQ(reference.size(), 24u);
     const CMetryFilter filter(Lichtart(IllumClass(ILLUM_D50, 0)), Observer(OBSERVER_2DEG));
     const float ySum = filter.GetWeightSum(1);
     for (std::size_t p = 0; p < samples.size(); ++p) {
-        SCOPED_TRACE(samples[p][1]);
-        std::vector<float> values;
-        for (int i = 0; i < Spectrum::kSize; ++i) {
-            values.push_back(static_cast<float>(nxtest::ToDouble(samples[p][2 + i])));
-        }
+        SCOPED_TRACE(samples[p].name);
+        ASSERT_EQ(samples[p].values.size(), static_cast<std::size_t>(Spectrum::kSize));
+        const std::vector<float> values(samples[p].values.begin(), samples[p].values.end());
         const ReflectanceSpectrum spectrum(values, PhysicalConditions());
         float sums[3];
         filter.Tristimulus(spectrum.GetData(), sums);
         for (int c = 0; c < 3; ++c) {
             const double xyz = 100.0 * sums[c] / ySum;
-            const double expected = nxtest::ToDouble(reference[p][2 + c]);
+            const double expected = reference[p].values[c];
             EXPECT_NEAR(xyz, expected, kXyzTolerance) << "channel " << c;
             // The vector dot product of a filter gives the same raw sum.
             EXPECT_EQ(filter[static_cast<unsigned short>(c)] * values, sums[c]);

@@ -35,10 +35,7 @@ TEST(NxcolorScreen, RgbColumnsGiveLevelsAndTheirHex) {
         std::smatch m;
         ASSERT_TRUE(std::regex_match(lines[i], m, row)) << lines[i];
         int r = std::stoi(m[1]), g = std::stoi(m[2]), b = std::stoi(m[3]);
-        for (int v : {r, g, b}) {
-            EXPECT_GE(v, 0);
-            EXPECT_LE(v, 255);
-        }
+        for (int v : {r, g, b}) EXPECT_TRUE(v >= 0 && v <= 255) << lines[i];
         EXPECT_EQ(std::stoi(m[4], nullptr, 16), (r << 16) | (g << 8) | b) << lines[i];
     }
     // Chart patch 19 is white, 24 black; 13 blue, 15 red.
