@@ -188,19 +188,22 @@ TEST(LinAlg, GaussElSolvesLargerSystemsThroughItsOwnIndexArrays) {
     for (int i = 0; i < n; ++i) EXPECT_NEAR(x[i], expect[i], kSolveTolerance) << i;
 }
 
+// Runs LeastSquareFit on m observations of N unknowns; returns its flag.
+template <int N, typename T>
+int Fit(T* w, T* y, T* a, T* x, int m) {
+    T nm[N * N], r[N];
+    int rowStart[N], rowIndex[N], ok = -1;
+    LinAlg::LeastSquareFit(w, y, a, x, m, N, nm, r, rowStart, rowIndex, ok);
+    return ok;
+}
+
 TEST(LinAlg, LeastSquareFitRecoversALineFromWeightedObservations) {
     // y = 2 + 3 t at t = 0..4, with one outlier that has weight 0.
     double w[5] = {1, 1, 1, 1, 0};
     double y[5] = {2, 5, 8, 11, 1000};
     double a[10] = {1, 0, 1, 1, 1, 2, 1, 3, 1, 4};
     double x[2] = {0, 0};
-    double nm[4];
-    double r[2];
-    int rowStart[2];
-    int rowIndex[2];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 5, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 1);
+    EXPECT_EQ(Fit<2>(w, y, a, x, 5), 1);
     EXPECT_NEAR(x[0], 2.0, kSolveTolerance);
     EXPECT_NEAR(x[1], 3.0, kSolveTolerance);
     // The weights were applied in place to A and y.
@@ -213,13 +216,7 @@ TEST(LinAlg, LeastSquareFitWithSquareSystemIgnoresWeights) {
     float y[2] = {3, 4};
     float a[4] = {1, 1, 1, -1};
     float x[2];
-    float nm[4];
-    float r[2];
-    int rowStart[2];
-    int rowIndex[2];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 2, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 1);
+    EXPECT_EQ(Fit<2>(w, y, a, x, 2), 1);
     EXPECT_NEAR(x[0], 3.5f, kSolveToleranceF);
     EXPECT_NEAR(x[1], -0.5f, kSolveToleranceF);
 }
@@ -229,13 +226,7 @@ TEST(LinAlg, LeastSquareFitFailsOnTooFewObservationsOrSingularNormals) {
     double y[3] = {1, 2, 3};
     double a[9] = {1, 2, 3, 4, 5, 6, 7, 8, 9};
     double x[3] = {-5, -5, -5};
-    double nm[9];
-    double r[3];
-    int rowStart[3];
-    int rowIndex[3];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 2, 3, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 0);
+    EXPECT_EQ(Fit<3>(w, y, a, x, 2), 0);
     EXPECT_EQ(x[0], -5.0);
     EXPECT_EQ(a[0], 1.0);  // nothing computed
 
@@ -243,8 +234,7 @@ TEST(LinAlg, LeastSquareFitFailsOnTooFewObservationsOrSingularNormals) {
     double w2[3] = {1, 1, 1};
     double y2[3] = {1, 2, 3};
     double a2[6] = {1, 1, 2, 2, 4, 4};
-    LinAlg::LeastSquareFit(w2, y2, a2, x, 3, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 0);
+    EXPECT_EQ(Fit<2>(w2, y2, a2, x, 3), 0);
 }
 
 }  // namespace
