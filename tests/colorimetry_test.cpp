@@ -257,7 +257,7 @@ TEST(MeasuringCondition, StringShowsIlluminantAndObserverOrQuestionMarks) {
     EXPECT_EQ(unknown.GetMeasuringConditionString(), "?,?");
     ObserverClass::SetDegreeString(saved);
 
-    const MeasuringCondition statusA(DStdClass(DSTD_STATUS_A), PhysicalConditions());
+    const MeasuringCondition statusA{DStdClass(DSTD_STATUS_A), PhysicalConditions()};
     EXPECT_NE(statusA, d65);
     EXPECT_EQ(statusA.GetIllum().GetName(), "D50");
 }
