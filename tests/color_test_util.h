@@ -7,16 +7,15 @@
 #include <charconv>
 #include <cstdlib>
 #include <limits>
-#include <fstream>
 #include <sstream>
 #include <string>
 #include <vector>
 
 #ifdef NXCOLOR_PATH
 #include <sys/wait.h>
+#endif
 
 #include "test_util.h"
-#endif
 
 namespace nxtest {
 
@@ -31,17 +30,14 @@ struct CsvRow {
 // unparsable number becomes NaN (and fails the comparisons that read it).
 inline std::vector<CsvRow> ReadPatchCsv(const std::string& asPath) {
     std::vector<CsvRow> rows;
-    std::ifstream in(asPath);
-    std::string line;
-    std::getline(in, line);  // header
-    while (std::getline(in, line)) {
-        if (line.empty()) continue;
-        std::stringstream fields(line);
+    const std::vector<std::string> lines = ReadLines(asPath);
+    for (std::size_t i = 1; i < lines.size(); ++i) {  // after the header
+        if (lines[i].empty()) continue;
+        std::stringstream fields(lines[i]);
         CsvRow row;
         std::getline(fields, row.id, ',');
         std::getline(fields, row.name, ',');
-        std::string field;
-        while (std::getline(fields, field, ',')) {
+        for (std::string field; std::getline(fields, field, ',');) {
             double v = std::numeric_limits<double>::quiet_NaN();
             std::from_chars(field.data(), field.data() + field.size(), v);
             row.values.push_back(v);
