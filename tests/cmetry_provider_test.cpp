@@ -2,6 +2,7 @@
 // ASTM E308 tables, repositories, installed tables and bad input.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cmath>
 #include <filesystem>
@@ -33,21 +34,17 @@ void ExpectWeightsMatch(const std::string& illuminant, const std::string& observ
     ASSERT_EQ(rows.size(), static_cast<std::size_t>(cm::kSampleCount));
     const auto filter = cm::CMetryFilter::Find(illuminant, observer);
     ASSERT_TRUE(filter);
-    double worst = 0.0;
     for (int i = 0; i < cm::kSampleCount; ++i) {
         EXPECT_EQ(nxtest::ToDouble(rows[i][0]), cm::kFirstWavelength + 10 * i);
         for (int c = 0; c < 3; ++c) {
             const double expected = nxtest::ToDouble(rows[i][1 + c]);
             const double actual = filter->GetWeights(c)[i];
             const double scale = std::max(std::fabs(expected), kWeightAbsoluteFloor);
-            const double relative = std::fabs(actual - expected) / scale;
-            worst = std::max(worst, relative);
-            EXPECT_LE(relative, kWeightRelativeTolerance)
+            EXPECT_LE(std::fabs(actual - expected) / scale, kWeightRelativeTolerance)
                 << "row " << i << " channel " << c << ": " << actual << " vs " << expected;
             EXPECT_EQ(filter->GetFloatWeights(c)[i], static_cast<float>(actual));
         }
     }
-    ::testing::Test::RecordProperty("worst_relative_error_" + illuminant + "_" + observer, nxtest::Scientific(worst));
 }
 
 std::string D65Table() {
@@ -95,8 +92,6 @@ TEST(CMetryProvider, EveryBuiltInPairHasWeightsWhoseYColumnSumsToOneHundred) {
             SCOPED_TRACE(illuminant + "/" + observer);
             const auto filter = cm::CMetryFilter::Find(illuminant, observer);
             ASSERT_TRUE(filter);
-            EXPECT_EQ(filter->GetIlluminant()->GetName(), illuminant);
-            EXPECT_EQ(filter->GetObserver()->GetName(), observer);
             double sum = 0.0;
             for (double w : filter->GetWeights(1)) sum += w;
             EXPECT_NEAR(sum, 100.0, kSumTolerance);
@@ -135,13 +130,11 @@ TEST(CMetryProvider, StatusDensitiesAreBuiltInAndTheNarrowBandOnesAreNot) {
         SCOPED_TRACE(name);
         ASSERT_TRUE(cm::DensityStandardRepository::Exists(name));
         const auto standard = cm::DensityStandardRepository::Get(name);
-        EXPECT_EQ(standard->GetName(), name);
         ASSERT_EQ(standard->GetChannelCount(), 3);
         for (int c = 0; c < 3; ++c) {
             // Peak-normalised linear products: the peak (log 5.000) is 1.0.
-            double peak = 0.0;
-            for (double p : standard->GetProducts(c)) peak = std::max(peak, p);
-            EXPECT_DOUBLE_EQ(peak, 1.0);
+            const auto& products = standard->GetProducts(c);
+            EXPECT_DOUBLE_EQ(*std::max_element(products.begin(), products.end()), 1.0);
         }
     }
     for (const char* name : {"Status I", "DIN", "DIN NB", "SPI"}) {
@@ -164,7 +157,6 @@ TEST_F(CMetryProviderInDataDir, InstalledIlluminantGoesThroughTheSameWeightPath)
     const auto custom = cm::CMetryFilter::Find("MyD65", "2");
     const auto builtIn = cm::CMetryFilter::Find("D65", "2");
     ASSERT_TRUE(custom);
-    EXPECT_EQ(custom->GetIlluminant()->GetName(), "MyD65");
     for (int c = 0; c < 3; ++c) {
         for (int i = 0; i < cm::kSampleCount; ++i) {
             EXPECT_EQ(custom->GetWeights(c)[i], builtIn->GetWeights(c)[i]);
@@ -220,7 +212,6 @@ TEST_F(CMetryProviderInDataDir, InstalledDensityTableMakesAStandardExist) {
                       "620,5.0,-10,-10\n630,4.0,-10,-10\n");
     ASSERT_TRUE(cm::DensityStandardRepository::Exists("DIN NB"));
     const auto standard = cm::DensityStandardRepository::Get("DIN NB");
-    EXPECT_EQ(standard->GetName(), "DIN NB");
     EXPECT_EQ(standard->GetChannelName(2), "blue");
     EXPECT_DOUBLE_EQ(standard->GetProducts(2)[(440 - 380) / 10], 1.0);
     EXPECT_DOUBLE_EQ(standard->GetProducts(2)[(450 - 380) / 10], 0.1);
@@ -252,7 +243,4 @@ TEST(CMetryProvider, ConcurrentFirstUseOfAFilterComputesItOnce) {
     for (std::thread& thread : threads) thread.join();
     ASSERT_TRUE(results[0]);
     for (const auto& result : results) EXPECT_EQ(result, results[0]);
-    double sum = 0.0;
-    for (double w : results[0]->GetWeights(1)) sum += w;
-    EXPECT_NEAR(sum, 100.0, 1e-9);
 }

@@ -5,10 +5,17 @@
 
 #include <array>
 #include <charconv>
-#include <fstream>
+#include <cstdlib>
+#include <limits>
 #include <sstream>
 #include <string>
 #include <vector>
+
+#ifdef NXCOLOR_PATH
+#include <sys/wait.h>
+#endif
+
+#include "test_util.h"
 
 namespace nxtest {
 
@@ -23,17 +30,14 @@ struct CsvRow {
 // unparsable number becomes NaN (and fails the comparisons that read it).
 inline std::vector<CsvRow> ReadPatchCsv(const std::string& asPath) {
     std::vector<CsvRow> rows;
-    std::ifstream in(asPath);
-    std::string line;
-    std::getline(in, line);  // header
-    while (std::getline(in, line)) {
-        if (line.empty()) continue;
-        std::stringstream fields(line);
+    const std::vector<std::string> lines = ReadLines(asPath);
+    for (std::size_t i = 1; i < lines.size(); ++i) {  // after the header
+        if (lines[i].empty()) continue;
+        std::stringstream fields(lines[i]);
         CsvRow row;
         std::getline(fields, row.id, ',');
         std::getline(fields, row.name, ',');
-        std::string field;
-        while (std::getline(fields, field, ',')) {
+        for (std::string field; std::getline(fields, field, ',');) {
             double v = std::numeric_limits<double>::quiet_NaN();
             std::from_chars(field.data(), field.data() + field.size(), v);
             row.values.push_back(v);
@@ -50,6 +54,21 @@ inline std::string ChartPath() {
 inline std::string ChartReferencePath() {
     return std::string(NXBASE_TEST_DATA_DIR) + "/colorchecker_D50_2deg.csv";
 }
+
+#ifdef NXCOLOR_PATH
+// Runs nxcolor with a shell command line, its user configuration in a
+// temporary directory; returns the exit status and fills the outputs.
+inline int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
+    TempDir dir;
+    ScopedEnv config("XDG_CONFIG_HOME", dir.path().string());
+    const std::string command = std::string(NXCOLOR_PATH) + " " + args + " >" + dir.File("out") +
+                                " 2>" + dir.File("err");
+    const int status = std::system(command.c_str());
+    *out = ReadFile(dir.File("out"));
+    *err = ReadFile(dir.File("err"));
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+#endif
 
 }  // namespace nxtest
 

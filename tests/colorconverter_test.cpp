@@ -7,6 +7,7 @@
 #include <fstream>
 #include <atomic>
 #include <map>
+#include <tuple>
 #include <thread>
 
 #include "nxbase/iccprofile.h"
@@ -48,9 +49,7 @@ TEST(RGBVector, WhiteAndBlackSpectraGiveFullAndNoIntensity) {
     }
     EXPECT_GT(grey[1], black[1]);
     EXPECT_LT(grey[1], white[1]);
-
-    Color full = ColorConverter::RGBToColor(white);
-    EXPECT_EQ(full, Color(65535, 65535, 65535));  // 100 * 655.36 = 65536 clamps
+    EXPECT_EQ(ColorConverter::RGBToColor(white), Color(65535, 65535, 65535));  // 100 * 655.36 = 65536 clamps
 }
 
 TEST(RGBVector, RGBToColorTruncatesAndClamps) {
@@ -67,15 +66,12 @@ TEST(RGBVector, GammaBisectionAtTableEdgesAndForNegatives) {
     const float* table = nxbase::detail::GammaTable();
     EXPECT_EQ(table[0], 0.0f);
     EXPECT_FLOAT_EQ(table[510], 1.0f);  // (0.5 * 510 / 255)^(1/0.45)
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, -0.5f), -1);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, 0.0f), 0);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, table[1]), 1);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, std::nextafter(table[1], 0.0f)), 0);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, table[256]), 256);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, std::nextafter(table[256], 0.0f)), 255);
-    // The search never returns the last entry: lo stops one below hi.
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, table[511]), 510);
-    EXPECT_EQ(nxbase::detail::GammaIndex(table, 5.0f), 510);
+    // The search never returns the last entry (511): lo stops one below hi.
+    const std::pair<float, int> edges[] = {
+        {-0.5f, -1}, {0.0f, 0}, {table[1], 1}, {std::nextafter(table[1], 0.0f), 0},
+        {table[256], 256}, {std::nextafter(table[256], 0.0f), 255}, {table[511], 510}, {5.0f, 510}};
+    for (const auto& [value, index] : edges)
+        EXPECT_EQ(nxbase::detail::GammaIndex(table, value), index) << value;
     // Every value between two entries lands on the lower one.
     for (int k = 0; k < 510; ++k) {
         float between = (table[k] + table[k + 1]) / 2;
@@ -135,8 +131,9 @@ TEST(RGBVector, IccPathAgreesWithTheFormulasForLittleCmsOwnSrgbProfile) {
 
     ICCEngine::CreateICCEngine();
     ASSERT_TRUE(ICCProfile::ProfileValid());
+    std::vector<RGBVector> single;
     for (std::size_t n = 0; n < formula.size(); ++n) {
-        RGBVector icc(Lab(labs[n][0], labs[n][1], labs[n][2]));
+        const RGBVector& icc = single.emplace_back(Lab(labs[n][0], labs[n][1], labs[n][2]));
         bool neutral = labs[n][1] == 0 && labs[n][2] == 0;
         for (int i = 0; i < 3; ++i) {
             float expected = std::clamp(formula[n][i], 0.0f, 100.0f);
@@ -146,8 +143,6 @@ TEST(RGBVector, IccPathAgreesWithTheFormulasForLittleCmsOwnSrgbProfile) {
     }
     // Threads share the one cached transform: every thread gets the results
     // of the single-threaded run, bit for bit.
-    std::vector<RGBVector> single;
-    for (const auto& l : labs) single.emplace_back(Lab(l[0], l[1], l[2]));
     std::atomic<int> mismatches{0};
     std::vector<std::thread> threads;
     for (int t = 0; t < 4; ++t) {
@@ -182,8 +177,7 @@ TEST(ColorConverter, CmykBrushesAndBitmaps) {
     EXPECT_EQ(ColorConverter::CMYKToColor(halfBlack), Color(32768, 32768, 32768));
     EXPECT_EQ(ColorConverter::CMYKToColor(nullptr), Color());
 
-    Brush brush = ColorConverter::LabToBrush(Lab(100, 0, 0));
-    EXPECT_EQ(brush.GetColor(), Color(65535, 65535, 65535));
+    EXPECT_EQ(ColorConverter::LabToBrush(Lab(100, 0, 0)).GetColor(), Color(65535, 65535, 65535));
     EXPECT_EQ(ColorConverter::SpectrumToBrush(Flat(0)).GetColor(), Color());
 
     Bitmap patch = ColorConverter::SpectrumToBitmap(Flat(0), Size_t<short>(10, 6));
@@ -199,24 +193,21 @@ TEST(ColorConverter, IconShapesFillOutlineAndLeaveTheRestTransparent) {
     const LABVector red = Lab(53.24f, 80.09f, 67.2f);
     const Color fill = ColorConverter::RGBToColor(RGBVector(red));
     const Size_t<short> size(15, 15);
-    for (auto shape : {ColorConverter::ICON_SQUARE, ColorConverter::ICON_CIRCLE,
-                       ColorConverter::ICON_DIAMOND, ColorConverter::ICON_TRIANGLE,
-                       ColorConverter::ICON_STRIPE}) {
+    // Opaque pixel ranges around the rough areas: square 225, disc 177,
+    // diamond 113, triangle 113, stripe 75.
+    const std::tuple<decltype(ColorConverter::ICON_SQUARE), int, int> shapes[] = {
+        {ColorConverter::ICON_SQUARE, 225, 225}, {ColorConverter::ICON_CIRCLE, 160, 195},
+        {ColorConverter::ICON_DIAMOND, 100, 130}, {ColorConverter::ICON_TRIANGLE, 95, 130},
+        {ColorConverter::ICON_STRIPE, 60, 90}};
+    for (const auto& [shape, low, high] : shapes) {
         Bitmap icon = ColorConverter::LabToBitmap(red, size, shape);
         ASSERT_EQ(icon.GetSizePixel(), size);
         EXPECT_EQ(icon.GetPixel(7, 7), fill) << shape;  // inside every shape
-        bool cornerTransparent = icon.IsTransparent(0, 0);
-        EXPECT_EQ(cornerTransparent, shape != ColorConverter::ICON_SQUARE) << shape;
+        EXPECT_EQ(icon.IsTransparent(0, 0), shape != ColorConverter::ICON_SQUARE) << shape;
         int opaque = 0;
         for (int y = 0; y < 15; ++y)
             for (int x = 0; x < 15; ++x) opaque += !icon.IsTransparent(x, y);
-        // Rough areas: square 225, disc 177, diamond 113, triangle 113, stripe 75.
-        const std::map<int, std::pair<int, int>> area = {
-            {ColorConverter::ICON_SQUARE, {225, 225}}, {ColorConverter::ICON_CIRCLE, {160, 195}},
-            {ColorConverter::ICON_DIAMOND, {100, 130}}, {ColorConverter::ICON_TRIANGLE, {95, 130}},
-            {ColorConverter::ICON_STRIPE, {60, 90}}};
-        EXPECT_GE(opaque, area.at(shape).first) << shape;
-        EXPECT_LE(opaque, area.at(shape).second) << shape;
+        EXPECT_TRUE(opaque >= low && opaque <= high) << shape << ": " << opaque;
     }
     // A light colour gets a dark outline, a dark one a light outline.
     Bitmap light = ColorConverter::LabToBitmap(Lab(95, 0, 0), size, ColorConverter::ICON_CIRCLE);
@@ -261,19 +252,17 @@ TEST(ColorConverter, ColourNamesFollowHueSectorsAndLightnessClasses) {
 TEST(ColorConverter, ShippedTextFilesNameEveryColourNumber) {
     const std::string dir = std::string(NXBASE_SOURCE_DIR) + "/data/lng/";
     const LABVector white = Lab(96, 0, 2), brown = Lab(37.5f, 14.4f, 14.9f);
-    Text::FreeResources();
-    ASSERT_TRUE(Text::LoadText(String(dir + "NxBase49.lng")));
-    EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
-    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(white).str()), "Wei\xDF");
-    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(brown).str()), "Braun");
-    Text::FreeResources();
-    ASSERT_TRUE(Text::LoadText(String(dir + "NxBase1.lng")));
-    EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
-    for (int n = 0; n < FARBE_ANZAHL; ++n) {
-        String shipped = Text::GetText(String("FarbTexte"), n);
-        EXPECT_FALSE(shipped.Len() == 0) << n;
+    const std::tuple<const char*, const char*, const char*> languages[] = {
+        {"NxBase49.lng", "Wei\xDF", "Braun"}, {"NxBase1.lng", "white", "brown"}};
+    for (const auto& [file, whiteName, brownName] : languages) {
+        Text::FreeResources();
+        ASSERT_TRUE(Text::LoadText(String(dir + file)));
+        EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
+        for (int n = 0; n < FARBE_ANZAHL; ++n)
+            EXPECT_FALSE(Text::GetText(String("FarbTexte"), n).Len() == 0) << file << " " << n;
+        EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(white).str()), whiteName);
+        EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(brown).str()), brownName);
     }
-    EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(brown).str()), "brown");
     Text::FreeResources();
 }
 

@@ -9,6 +9,7 @@
 #include <thread>
 #include <vector>
 
+#include "color_test_util.h"
 #include "colorimetry_test_util.h"
 #include "nxbase/cmetry.h"
 
@@ -103,9 +104,7 @@ TEST(Filter, SumsDotProductsAndDefinition) {
     static_cast<float*>(ramp)[0] = 100.0f;  // writing through the pointer
     EXPECT_EQ(ramp.FilterSumme(), 730.0f);  // invalidates the cached sum
 
-    const Filter squares = ramp.FilterXFilter(ramp);
-    EXPECT_EQ(squares.GetWeights()[3], 9.0f);
-    EXPECT_TRUE(squares.isDefined());
+    EXPECT_EQ(ramp.FilterXFilter(ramp).GetWeights()[3], 9.0f);
     ramp.Init(0.5f);
     EXPECT_EQ(ramp.FilterSumme(), 18.0f);
     ramp.Define(0);
@@ -126,39 +125,32 @@ TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
     EXPECT_NEAR(defaults.GetWeightSum(1), 100.0f, 1e-4f);
 
     const CMetryFilter a10(Lichtart(IllumClass(ILLUM_A, 0)), Observer(OBSERVER_10DEG));
-    EXPECT_EQ(a10.GetIllum().GetName(), "A");
-    EXPECT_EQ(a10.GetObserver().GetObserverType(), OBSERVER_10DEG);
     EXPECT_EQ(a10.GetProviderFilter(), klume::cmetry::CMetryFilter::Find("A", "10"));
 }
 
 TEST(CMetryFilter, ColorCheckerTristimulusValuesMatchTheReference) {
     const auto samples =
-        nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
-    const auto reference = nxtest::ReadCsvRows(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
+        nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
+    const auto reference = nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
     ASSERT_EQ(samples.size(), 24u);
     ASSERT_EQ(reference.size(), 24u);
     const CMetryFilter filter(Lichtart(IllumClass(ILLUM_D50, 0)), Observer(OBSERVER_2DEG));
     const float ySum = filter.GetWeightSum(1);
-    double worst = 0.0;
     for (std::size_t p = 0; p < samples.size(); ++p) {
-        SCOPED_TRACE(samples[p][1]);
-        std::vector<float> values;
-        for (int i = 0; i < Spectrum::kSize; ++i) {
-            values.push_back(static_cast<float>(nxtest::ToDouble(samples[p][2 + i])));
-        }
+        SCOPED_TRACE(samples[p].name);
+        ASSERT_EQ(samples[p].values.size(), static_cast<std::size_t>(Spectrum::kSize));
+        const std::vector<float> values(samples[p].values.begin(), samples[p].values.end());
         const ReflectanceSpectrum spectrum(values, PhysicalConditions());
         float sums[3];
         filter.Tristimulus(spectrum.GetData(), sums);
         for (int c = 0; c < 3; ++c) {
             const double xyz = 100.0 * sums[c] / ySum;
-            const double expected = nxtest::ToDouble(reference[p][2 + c]);
+            const double expected = reference[p].values[c];
             EXPECT_NEAR(xyz, expected, kXyzTolerance) << "channel " << c;
-            worst = std::max(worst, std::fabs(xyz - expected));
             // The vector dot product of a filter gives the same raw sum.
             EXPECT_EQ(filter[static_cast<unsigned short>(c)] * values, sums[c]);
         }
     }
-    ::testing::Test::RecordProperty("worst_xyz_error", nxtest::Scientific(worst));
 }
 
 TEST(CMetryFilter, ConcurrentFirstUseFromSeveralThreadsGivesOneTable) {
@@ -196,9 +188,7 @@ TEST(ActualFilterClass, NamesGeometriesAndDisplayNames) {
     EXPECT_EQ(ActualFilterClass(String("Cust")).GetType(), FILTER_CUSTOM);
     EXPECT_EQ(ActualFilterClass(String("uvcut")).GetType(), FILTER_UVCUT);
     EXPECT_EQ(ActualFilterClass(String("Sepia")).GetType(), FILTER_DEFAULT);
-    EXPECT_EQ(ActualFilterClass().GetGeometry(), ActualFilterClass::GEOMETRY_UNDEFINED);
 
-    EXPECT_EQ(ActualFilterClass::GetDisplayName(FILTER_POL), String("Pol"));
     ActualFilterClass::SetDisplayFilterName(FILTER_POL, String("Polfilter"));
     EXPECT_EQ(ActualFilterClass(FILTER_POL).GetDisplayName(), String("Polfilter"));
     EXPECT_EQ(static_cast<String>(ActualFilterClass(FILTER_POL)), String("Pol"));
@@ -212,20 +202,15 @@ TEST(DStdClass, TypesSelectStandardsAndMissingOnesFallBackToStatusE) {
     nxtest::TempDir dir;
     nxtest::ScopedEnv data("NXBASE_DATA_DIR", dir.path().string());
     EXPECT_EQ(DStdClass(DSTD_STATUS_A).GetName(), "Status A");
-    EXPECT_EQ(DStdClass(DSTD_STATUS_T).GetDStdType(), DSTD_STATUS_T);
     EXPECT_EQ(DStdClass(DSTD_STATUS_M).GetName(), "Status M");
-    EXPECT_EQ(DStdClass(static_cast<DStdType>(7)).GetName(), "Status E");
-    EXPECT_EQ(DStdClass(static_cast<DStdType>(5)).GetName(), "Status E");
-    EXPECT_EQ(DStdClass().GetDStdType(), DSTD_STATUS_E);
+    for (int type : {5, 7}) EXPECT_EQ(DStdClass(static_cast<DStdType>(type)).GetName(), "Status E");
     // Without an installed table there is no DIN NB curve to use.
     EXPECT_EQ(DStdClass(DSTD_DIN_NB).GetName(), "Status E");
 
     std::filesystem::create_directories(dir.path() / "density");
     nxtest::WriteFile(dir.File("density/din_nb_log10.csv"),
                       "wavelength,red,green,blue\n600,5,4,3\n610,4,5,3\n620,3,4,5\n");
-    const DStdClass installed(DSTD_DIN_NB);
-    EXPECT_EQ(installed.GetName(), "DIN NB");
-    EXPECT_EQ(installed.GetDStdType(), DSTD_DIN_NB);
+    EXPECT_EQ(DStdClass(DSTD_DIN_NB).GetName(), "DIN NB");
 }
 
 TEST(DichteFilter, DensitiesOfWhiteAndGreyReflectors) {
@@ -233,13 +218,11 @@ TEST(DichteFilter, DensitiesOfWhiteAndGreyReflectors) {
         const DichteFilter filter{DStdClass(type)};
         ASSERT_EQ(filter.GetChannelCount(), 3);
         for (unsigned short c = 0; c < 3; ++c) {
-            float density = -1.0f;
-            ASSERT_TRUE(filter.GetDensity(Flat(1.0f), c, density));
-            EXPECT_NEAR(density, 0.0f, kDensityTolerance);
-            ASSERT_TRUE(filter.GetDensity(Flat(0.1f), c, density));
-            EXPECT_NEAR(density, 1.0f, kDensityTolerance);
-            ASSERT_TRUE(filter.GetDensity(Flat(0.01f), c, density));
-            EXPECT_NEAR(density, 2.0f, kDensityTolerance);
+            for (int d = 0; d <= 2; ++d) {
+                float density = -1.0f;
+                ASSERT_TRUE(filter.GetDensity(Flat(std::pow(10.0f, -d)), c, density));
+                EXPECT_NEAR(density, d, kDensityTolerance);
+            }
         }
         float untouched = 7.0f;
         EXPECT_FALSE(filter.GetDensity(Flat(0.0f), 0, untouched));
@@ -274,26 +257,14 @@ TEST(MeasuringCondition, StringShowsIlluminantAndObserverOrQuestionMarks) {
     EXPECT_EQ(unknown.GetMeasuringConditionString(), "?,?");
     ObserverClass::SetDegreeString(saved);
 
-    MeasuringCondition copy(d65);
-    EXPECT_EQ(copy, d65);
-    copy = MeasuringCondition(DStdClass(DSTD_STATUS_A), PhysicalConditions());
-    EXPECT_NE(copy, d65);
-    EXPECT_EQ(copy.GetIllum().GetName(), "D50");
-    EXPECT_EQ(copy.GetDStd().GetName(), "Status A");
-}
-
-TEST_F(CMetryFacade, StartsWithD50AndTheTwoDegreeObserver) {
-    const boost::shared_ptr<CMetry> cmetry = CMetry::Instance();
-    EXPECT_EQ(cmetry, CMetry::Instance());
-    EXPECT_EQ(cmetry->GetIllum().GetName(), "D50");
-    EXPECT_EQ(cmetry->GetObserver().GetObserverType(), OBSERVER_2DEG);
-    EXPECT_EQ(cmetry->GetLXYZFilter()->GetIllum().GetName(), "D50");
-    EXPECT_EQ(cmetry->GetDensityStandard()->GetName(), "Status E");
-    EXPECT_FALSE(cmetry->IsPaperSpectrumDefined());
+    const MeasuringCondition statusA{DStdClass(DSTD_STATUS_A), PhysicalConditions()};
+    EXPECT_NE(statusA, d65);
+    EXPECT_EQ(statusA.GetIllum().GetName(), "D50");
 }
 
 TEST_F(CMetryFacade, SetCMetryRebuildsTheSumFilterButNotTheRgbFilter) {
     CMetry& cmetry = *CMetry::Instance();
+    EXPECT_EQ(cmetry.GetDensityStandard()->GetName(), "Status E");
     const boost::shared_ptr<CMetryFilter> before = cmetry.GetLXYZFilter();
     cmetry.SetCMetry(IllumClass(ILLUM_FL11, 0), ObserverClass(OBSERVER_10DEG));
     EXPECT_EQ(cmetry.GetLXYZFilter()->GetIllum().GetName(), "FL11");
@@ -304,24 +275,18 @@ TEST_F(CMetryFacade, SetCMetryRebuildsTheSumFilterButNotTheRgbFilter) {
         EXPECT_EQ(cmetry.GetSumFilter().GetWeights()[i],
                   e10.GetWeights(0)[i] + e10.GetWeights(1)[i] + e10.GetWeights(2)[i]);
     }
-    EXPECT_TRUE(cmetry.GetSumFilter().isDefined());
-
-    const CMetryFilter& rgb = CMetry::GetRGBFilter();
-    EXPECT_EQ(&rgb, &CMetry::GetRGBFilter());
-    EXPECT_EQ(rgb.GetIllum().GetName(), "D65");
-    EXPECT_EQ(rgb.GetObserver().GetObserverType(), OBSERVER_2DEG);
+    EXPECT_EQ(CMetry::GetRGBFilter().GetIllum().GetName(), "D65");
 
     const MeasuringCondition condition(IllumClass(ILLUM_A, 0), ObserverClass(OBSERVER_2DEG),
                                        DStdClass(DSTD_STATUS_T),
                                        PhysicalConditions(FILTER_UVCUT));
     cmetry.SetMeasuringConditions(condition);
-    EXPECT_EQ(cmetry.GetMeasuringConditions(), condition);
     EXPECT_EQ(cmetry.GetDichteFilter().GetDStd().GetName(), "Status T");
-    EXPECT_EQ(cmetry.GetPhysicalConditions().GetActualFilter(), ActualFilterClass(FILTER_UVCUT));
 }
 
 TEST_F(CMetryFacade, EnterWhiteDefinesOrResetsThePaper) {
     CMetry& cmetry = *CMetry::Instance();
+    EXPECT_FALSE(cmetry.IsPaperSpectrumDefined());
     cmetry.EnterWhite(Flat(0.9f));
     EXPECT_TRUE(cmetry.IsPaperSpectrumDefined());
     EXPECT_EQ(cmetry.GetPaperSpectrum()[0], 0.9f);
@@ -392,7 +357,6 @@ TEST_F(CMetryFacade, InstalledIlluminantWorksThroughTheFacade) {
     nxtest::WriteFile(dir.File("illuminants/Flat.csv"), "wavelength,value\n300,7\n900,7\n");
     const IllumClass flat(std::string("Flat"));
     EXPECT_EQ(flat.GetName(), "Flat");
-    EXPECT_EQ(flat.GetIllumType(), ILLUM_UNKNOWN);
 
     CMetry& cmetry = *CMetry::Instance();
     cmetry.SetCMetry(flat, ObserverClass(OBSERVER_2DEG));

@@ -3,10 +3,8 @@
 #ifndef NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 #define NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 
-#include <cstdio>
 #include <cstdlib>
 #include <memory>
-#include <mutex>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -37,12 +35,6 @@ inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path
     return rows;
 }
 
-inline std::string Scientific(double value) {
-    char text[32];
-    std::snprintf(text, sizeof text, "%.3e", value);
-    return text;
-}
-
 inline double ToDouble(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
 
 // Sends the process log into a temporary directory for the whole test
@@ -63,35 +55,22 @@ private:
     std::unique_ptr<ScopedEnv> logPath;
 };
 
-// Collects the log lines written while it exists.
+// Records the log lines written while it exists ("key|text" each).
 class LogCapture {
 public:
-    LogCapture() : amListener(boost::make_shared<Listener>()) {
-        LogFile::Instance()->AddLogListener(amListener);
-    }
-    ~LogCapture() { LogFile::Instance()->RemoveLogListener(amListener); }
+    LogCapture() { LogFile::Instance()->AddLogListener(amLog); }
+    ~LogCapture() { LogFile::Instance()->RemoveLogListener(amLog); }
     LogCapture(const LogCapture&) = delete;
     LogCapture& operator=(const LogCapture&) = delete;
 
-    // Every captured line, one per "\n".
     std::string Text() const {
-        std::lock_guard<std::mutex> lock(amListener->mutex);
-        return amListener->text;
+        std::string text;
+        for (const std::string& line : amLog->lines) text += line + "\n";
+        return text;
     }
 
 private:
-    struct Listener : LogInterface {
-        bool IsLogOptionEnabled(const String&) const override { return true; }
-        void WriteLog(const String& line, const String&) override {
-            std::lock_guard<std::mutex> lock(mutex);
-            text += line.str() + "\n";
-        }
-        void WriteStackTrace() override {}
-        void UpdateInfo(const String&, const String&) override {}
-        mutable std::mutex mutex;
-        std::string text;
-    };
-    boost::shared_ptr<Listener> amListener;
+    boost::shared_ptr<RecordingLog> amLog = boost::make_shared<RecordingLog>();
 };
 
 }  // namespace nxtest

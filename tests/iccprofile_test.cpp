@@ -64,7 +64,6 @@ TEST_F(IccTest, SwitchedOffByDefaultAndNeverLoadsTheProfile) {
     ICCEngine* engine = ICCEngine::CreateICCEngine();
     EXPECT_FALSE(ICCProfile::ProfileEnabled());
     EXPECT_FALSE(ICCProfile::ProfileValid());
-    EXPECT_EQ(engine->GetIdentifier(), "ICCEngine");
     EXPECT_EQ(std::string(engine->GetVersion().str()),
               std::to_string(LCMS_VERSION / 1000) + "." + std::to_string(LCMS_VERSION % 1000 / 10));
 
@@ -90,10 +89,7 @@ TEST_F(IccTest, LoadsAnRgbProfileAndConvertsLabToDisplayRgb) {
     // Far outside the gamut the result is clipped to the device range.
     double outside[3] = {50, 200, -200};
     ASSERT_TRUE(engine->LabToRGB(outside, rgb));
-    for (double v : rgb) {
-        EXPECT_GE(v, 0.0);
-        EXPECT_LE(v, 1.0);
-    }
+    for (double v : rgb) EXPECT_TRUE(v >= 0.0 && v <= 1.0) << v;
 }
 
 TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
@@ -135,7 +131,6 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         EXPECT_EQ(fallbackLines(), before + 1) << path;
         EXPECT_GT(converted[0], 0.0f);
         ICCEngine* engine = ICCEngine::Instance();
-        EXPECT_TRUE(ICCProfile::ProfileEnabled());
         EXPECT_FALSE(ICCProfile::ProfileValid()) << path;
         EXPECT_NE(engine->GetProblem().find(problem), std::string::npos)
             << path << ": " << engine->GetProblem();

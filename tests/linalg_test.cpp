@@ -3,12 +3,19 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <initializer_list>
 
 namespace {
 
 // Exact binary fractions throughout unless noted, so results compare exactly.
 constexpr double kSolveTolerance = 1e-12;  // double elimination of small well-conditioned systems
 constexpr float kSolveToleranceF = 1e-5f;  // the same in single precision
+
+// Compares got[0..] with the listed values exactly.
+template <typename T>
+void ExpectValues(const T* got, std::initializer_list<double> want) {
+    for (std::size_t i = 0; i < want.size(); ++i) EXPECT_EQ(got[i], T(want.begin()[i])) << i;
+}
 
 template <typename T>
 class LinAlgTyped : public ::testing::Test {};
@@ -23,8 +30,7 @@ TYPED_TEST(LinAlgTyped, VectorRoutinesActElementByElement) {
     LinAlg::InitV(d, T(7), 4);
     for (T v : d) EXPECT_EQ(v, T(7));
     LinAlg::VAddV(d, a, b, 4);
-    EXPECT_EQ(d[0], T(1.5));
-    EXPECT_EQ(d[3], T(12));
+    ExpectValues(d, {1.5, 1, 5, 12});
     LinAlg::VSubV(d, a, 4);
     EXPECT_EQ(d[1], T(-1));
     LinAlg::VxV(d, a, b, 4);
@@ -32,11 +38,9 @@ TYPED_TEST(LinAlgTyped, VectorRoutinesActElementByElement) {
     LinAlg::VxV(d, a, 4);
     EXPECT_EQ(d[2], T(18));
     LinAlg::VdivV(d, a, b, 4);
-    EXPECT_EQ(d[0], T(2));
-    EXPECT_EQ(d[3], T(0.5));
+    ExpectValues(d, {2, -2, 1.5, 0.5});
     LinAlg::KVAddKV(d, T(2), a, T(-1), b, 4);
-    EXPECT_EQ(d[0], T(1.5));
-    EXPECT_EQ(d[3], T(0));
+    ExpectValues(d, {1.5, 5, 4, 0});
     LinAlg::VAddKxV(d, T(0.5), a, 4);
     EXPECT_EQ(d[3], T(2));
     LinAlg::KxV(d, T(3), a, 4);
@@ -74,29 +78,22 @@ TYPED_TEST(LinAlgTyped, MatrixRoutinesUseRowMajorLayoutAndStride) {
     const T v3[3] = {1, 0, -1};
     T r[3];
     LinAlg::MxV(r, wide, v3, 2, 3, 4);
-    EXPECT_EQ(r[0], T(-2));
-    EXPECT_EQ(r[1], T(-2));
+    ExpectValues(r, {-2, -2});
 
     const T m[6] = {1, 2, 3, 4, 5, 6};  // 2 x 3
     LinAlg::MxV(r, m, v3, 2, 3);
     EXPECT_EQ(r[1], T(-2));
     const T v2[2] = {1, 10};
     LinAlg::MtxV(r, m, v2, 2, 3);
-    EXPECT_EQ(r[0], T(41));
-    EXPECT_EQ(r[1], T(52));
-    EXPECT_EQ(r[2], T(63));
+    ExpectValues(r, {41, 52, 63});
 
     T t[6];
     LinAlg::TranspM(t, m, 2, 3);  // 3 x 2
-    const T expectT[6] = {1, 4, 2, 5, 3, 6};
-    for (int i = 0; i < 6; ++i) EXPECT_EQ(t[i], expectT[i]) << i;
+    ExpectValues(t, {1, 4, 2, 5, 3, 6});
 
     T c[4];
     LinAlg::MxM(c, m, t, 2, 3, 2);  // (2x3)(3x2) = M M^T
-    EXPECT_EQ(c[0], T(14));
-    EXPECT_EQ(c[1], T(32));
-    EXPECT_EQ(c[2], T(32));
-    EXPECT_EQ(c[3], T(77));
+    ExpectValues(c, {14, 32, 32, 77});
 
     T scaled[6];
     LinAlg::KxM(scaled, T(2), m, 2, 3);
@@ -111,10 +108,7 @@ TYPED_TEST(LinAlgTyped, MaTxMaIsSymmetricGramMatrix) {
     const T a[6] = {1, 2, 3, 4, 5, 6};  // 3 x 2
     T n[4] = {-1, -1, -1, -1};
     LinAlg::MaTxMa(a, 3, 2, n);
-    EXPECT_EQ(n[0], T(35));
-    EXPECT_EQ(n[1], T(44));
-    EXPECT_EQ(n[2], T(44));
-    EXPECT_EQ(n[3], T(56));
+    ExpectValues(n, {35, 44, 44, 56});
 }
 
 TYPED_TEST(LinAlgTyped, GaussElPivotsThroughIndexArraysWithoutMovingRows) {
@@ -128,12 +122,9 @@ TYPED_TEST(LinAlgTyped, GaussElPivotsThroughIndexArraysWithoutMovingRows) {
     int rowIndex[2];
     LinAlg::GaussEl(b, a, x, 2, singular, rowStart, rowIndex);
     EXPECT_EQ(singular, 0);
-    EXPECT_EQ(x[0], T(3));
-    EXPECT_EQ(x[1], T(2));
-    EXPECT_EQ(rowStart[0], 2);
-    EXPECT_EQ(rowStart[1], 0);
-    EXPECT_EQ(rowIndex[0], 1);
-    EXPECT_EQ(rowIndex[1], 0);
+    ExpectValues(x, {3, 2});
+    ExpectValues(rowStart, {2, 0});
+    ExpectValues(rowIndex, {1, 0});
     // Rows stay where they were in memory.
     EXPECT_EQ(a[0], T(0));
     EXPECT_EQ(a[2], T(1));
@@ -165,8 +156,7 @@ TYPED_TEST(LinAlgTyped, GaussElReportsOnlyAnExactZeroPivotAsSingular) {
     int singular = 0;
     LinAlg::GaussEl(b, a, x, 2, singular);
     EXPECT_EQ(singular, 1);
-    EXPECT_EQ(x[0], T(42));  // untouched
-    EXPECT_EQ(x[1], T(43));
+    ExpectValues(x, {42, 43});  // untouched
 
     // A tiny but nonzero pivot is accepted.
     T tiny[4] = {T(1e-30), 0, 0, 1};
@@ -198,19 +188,22 @@ TEST(LinAlg, GaussElSolvesLargerSystemsThroughItsOwnIndexArrays) {
     for (int i = 0; i < n; ++i) EXPECT_NEAR(x[i], expect[i], kSolveTolerance) << i;
 }
 
+// Runs LeastSquareFit on m observations of N unknowns; returns its flag.
+template <int N, typename T>
+int Fit(T* w, T* y, T* a, T* x, int m) {
+    T nm[N * N], r[N];
+    int rowStart[N], rowIndex[N], ok = -1;
+    LinAlg::LeastSquareFit(w, y, a, x, m, N, nm, r, rowStart, rowIndex, ok);
+    return ok;
+}
+
 TEST(LinAlg, LeastSquareFitRecoversALineFromWeightedObservations) {
     // y = 2 + 3 t at t = 0..4, with one outlier that has weight 0.
     double w[5] = {1, 1, 1, 1, 0};
     double y[5] = {2, 5, 8, 11, 1000};
     double a[10] = {1, 0, 1, 1, 1, 2, 1, 3, 1, 4};
     double x[2] = {0, 0};
-    double nm[4];
-    double r[2];
-    int rowStart[2];
-    int rowIndex[2];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 5, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 1);
+    EXPECT_EQ(Fit<2>(w, y, a, x, 5), 1);
     EXPECT_NEAR(x[0], 2.0, kSolveTolerance);
     EXPECT_NEAR(x[1], 3.0, kSolveTolerance);
     // The weights were applied in place to A and y.
@@ -223,13 +216,7 @@ TEST(LinAlg, LeastSquareFitWithSquareSystemIgnoresWeights) {
     float y[2] = {3, 4};
     float a[4] = {1, 1, 1, -1};
     float x[2];
-    float nm[4];
-    float r[2];
-    int rowStart[2];
-    int rowIndex[2];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 2, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 1);
+    EXPECT_EQ(Fit<2>(w, y, a, x, 2), 1);
     EXPECT_NEAR(x[0], 3.5f, kSolveToleranceF);
     EXPECT_NEAR(x[1], -0.5f, kSolveToleranceF);
 }
@@ -239,13 +226,7 @@ TEST(LinAlg, LeastSquareFitFailsOnTooFewObservationsOrSingularNormals) {
     double y[3] = {1, 2, 3};
     double a[9] = {1, 2, 3, 4, 5, 6, 7, 8, 9};
     double x[3] = {-5, -5, -5};
-    double nm[9];
-    double r[3];
-    int rowStart[3];
-    int rowIndex[3];
-    int ok = -1;
-    LinAlg::LeastSquareFit(w, y, a, x, 2, 3, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 0);
+    EXPECT_EQ(Fit<3>(w, y, a, x, 2), 0);
     EXPECT_EQ(x[0], -5.0);
     EXPECT_EQ(a[0], 1.0);  // nothing computed
 
@@ -253,8 +234,7 @@ TEST(LinAlg, LeastSquareFitFailsOnTooFewObservationsOrSingularNormals) {
     double w2[3] = {1, 1, 1};
     double y2[3] = {1, 2, 3};
     double a2[6] = {1, 1, 2, 2, 4, 4};
-    LinAlg::LeastSquareFit(w2, y2, a2, x, 3, 2, nm, r, rowStart, rowIndex, ok);
-    EXPECT_EQ(ok, 0);
+    EXPECT_EQ(Fit<2>(w2, y2, a2, x, 3), 0);
 }
 
 }  // namespace

@@ -1,33 +1,20 @@
 // nxcolor's screen colours (--rgb, --icc-profile) and chart picture (--report).
 #include <gtest/gtest.h>
 #include <lcms2.h>
-#include <sys/wait.h>
 
 #include <algorithm>
 #include <cstdlib>
 #include <regex>
 #include <string>
 
+#include "color_test_util.h"
 #include "report.h"
 #include "screen.h"
 #include "test_util.h"
 
 namespace {
 
-// Runs nxcolor with a shell command line, its user configuration in a
-// temporary directory; returns the exit status and fills the outputs.
-int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
-    nxtest::TempDir dir;
-    nxtest::ScopedEnv config("XDG_CONFIG_HOME", dir.path().string());
-    const std::string outFile = dir.File("out");
-    const std::string errFile = dir.File("err");
-    const std::string command =
-        std::string(NXCOLOR_PATH) + " " + args + " >" + outFile + " 2>" + errFile;
-    const int status = std::system(command.c_str());
-    *out = nxtest::ReadFile(outFile);
-    *err = nxtest::ReadFile(errFile);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
+using nxtest::RunNxcolor;
 
 std::vector<std::string> Lines(const std::string& text) {
     std::vector<std::string> lines;
@@ -48,10 +35,7 @@ TEST(NxcolorScreen, RgbColumnsGiveLevelsAndTheirHex) {
         std::smatch m;
         ASSERT_TRUE(std::regex_match(lines[i], m, row)) << lines[i];
         int r = std::stoi(m[1]), g = std::stoi(m[2]), b = std::stoi(m[3]);
-        for (int v : {r, g, b}) {
-            EXPECT_GE(v, 0);
-            EXPECT_LE(v, 255);
-        }
+        for (int v : {r, g, b}) EXPECT_TRUE(v >= 0 && v <= 255) << lines[i];
         EXPECT_EQ(std::stoi(m[4], nullptr, 16), (r << 16) | (g << 8) | b) << lines[i];
     }
     // Chart patch 19 is white, 24 black; 13 blue, 15 red.

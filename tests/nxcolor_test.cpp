@@ -1,8 +1,6 @@
 // nxcolor: its CSV reader, its report, and the program on good and bad files.
 #include <gtest/gtest.h>
 
-#include <sys/wait.h>
-
 #include <cstdio>
 #include <algorithm>
 #include <fstream>
@@ -189,19 +187,7 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     EXPECT_EQ(nxcolor::FormatNumber(-1.5f, 1), "-1.5");
 }
 
-// Runs nxcolor with a shell command line; returns the exit status and fills
-// the outputs.
-int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
-    nxtest::TempDir dir;
-    const std::string outFile = dir.File("out");
-    const std::string errFile = dir.File("err");
-    const std::string command =
-        std::string(NXCOLOR_PATH) + " " + args + " >" + outFile + " 2>" + errFile;
-    const int status = std::system(command.c_str());
-    *out = nxtest::ReadFile(outFile);
-    *err = nxtest::ReadFile(errFile);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
+using nxtest::RunNxcolor;
 
 TEST(NxcolorProgram, ReportsBadFilesClearly) {
     nxtest::TempDir dir;
