@@ -156,9 +156,7 @@ TEST(MyMemoryBlock, MinimizeGivesBackSlackAndKeepsReading) {
 
     MyMemoryBlock empty;
     empty.Minimize();
-    EXPECT_EQ(empty.Capacity(), 0);
-    empty << 1;
-    EXPECT_EQ(empty.Len(), 4);
+    EXPECT_EQ(empty.Capacity(), 0);  // growth from zero: see ZeroCapacityAndAppendingFromItselfWork
 }
 
 TEST(MyMemoryBlock, CopyReadsFromItsStartAndForgetsRememberedPositions) {
