@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <clocale>
 #include <locale>
 
@@ -29,19 +30,14 @@ TEST(String, TokensCountSeparatorsPlusOneAndEmptyTextHasNone) {
     EXPECT_EQ(String().GetTokenCount(';'), 0);
     String text("a;;b;");
     EXPECT_EQ(text.GetTokenCount(';'), 4);
-    EXPECT_EQ(text.GetToken(0, ';'), "a");
-    EXPECT_EQ(text.GetToken(1, ';'), "");
-    EXPECT_EQ(text.GetToken(2, ';'), "b");
-    EXPECT_EQ(text.GetToken(3, ';'), "");
-    EXPECT_EQ(text.GetToken(9, ';'), "");
+    const char* tokens[] = {"a", "", "b", "", ""};  // the last stands for any index beyond
+    for (int k : {0, 1, 2, 3, 9}) EXPECT_EQ(text.GetToken(k, ';'), tokens[std::min(k, 4)]) << k;
     EXPECT_EQ(String("ANSWER!SPECTRUM").GetToken(1, '!'), "SPECTRUM");
 }
 
 TEST(String, NumbersAreReadWithoutLocale) {
     EXPECT_TRUE(String("0123").IsNumeric());
-    EXPECT_FALSE(String("").IsNumeric());
-    EXPECT_FALSE(String("-1").IsNumeric());
-    EXPECT_FALSE(String("1.5").IsNumeric());
+    for (const char* text : {"", "-1", "1.5"}) EXPECT_FALSE(String(text).IsNumeric()) << text;
     EXPECT_EQ(String("  -42x").ToLong(), -42);
     EXPECT_EQ(String("junk").ToLong(), 0);
     const char* previous = std::setlocale(LC_NUMERIC, "de_DE.UTF-8");
