@@ -48,6 +48,16 @@ void BM_LogLineDisabledKey(benchmark::State& state) {
 }
 BENCHMARK(BM_LogLineDisabledKey);
 
+// The same through the process log, as library code writes its lines.
+void BM_WriteToLogDisabledKey(benchmark::State& state) {
+    nxtest::TempDir dir;
+    nxtest::ScopedEnv path("NXBASE_LOG_PATH", dir.File("log.log"));
+    String text(kText), key("Quiet");
+    for (auto _ : state) LogFile::WriteToLog(text, key);
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_WriteToLogDisabledKey);
+
 // The yardstick for the disabled key: one look-up in a set of a few keys.
 void BM_OneSetLookup(benchmark::State& state) {
     std::set<std::string, std::less<>> keys{"Startup", "Language", "Keys", "Measure", "Communication"};

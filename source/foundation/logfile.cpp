@@ -201,6 +201,17 @@ boost::shared_ptr<LogFile>& InstanceSlot() {
     return *instance;
 }
 
+// The process log once made. It is never replaced or destroyed, so
+// WriteToLog may use it without the lock and without a reference count.
+std::atomic<LogFile*> gInstance{nullptr};
+
+// Makes the process log under InstanceMutex if there is none yet.
+void EnsureInstance(const std::string& name) {
+    if (InstanceSlot()) return;
+    InstanceSlot().reset(new LogFile(name));
+    gInstance.store(InstanceSlot().get(), std::memory_order_release);
+}
+
 }  // namespace
 
 namespace nxbase {
@@ -246,17 +257,19 @@ void LogFile::ApplyOptions(const std::map<std::string, std::string>& options) {
 
 void LogFile::CreateLogFile(const std::string& name) {
     std::lock_guard<std::mutex> lock(InstanceMutex());
-    if (!InstanceSlot()) InstanceSlot().reset(new LogFile(name));
+    EnsureInstance(name);
 }
 
 boost::shared_ptr<LogFile> LogFile::Instance() {
     std::lock_guard<std::mutex> lock(InstanceMutex());
-    if (!InstanceSlot()) InstanceSlot().reset(new LogFile(std::string()));
+    EnsureInstance(std::string());
     return InstanceSlot();
 }
 
 void LogFile::WriteToLog(const String& text, const String& key) {
-    Instance()->WriteLog(text, key);
+    LogFile* log = gInstance.load(std::memory_order_acquire);
+    if (log == nullptr) log = Instance().get();
+    log->WriteLog(text, key);
 }
 
 bool LogFile::IsLogOptionEnabled(const String& key) const {
