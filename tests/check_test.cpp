@@ -64,6 +64,19 @@ TEST(Check, DecliningToQuitReturnsWithTheAssertionLogged) {
     EXPECT_EQ(ui->Boxes()[1].text.substr(0, 26), "*****ERROR*****\ndisk gone\n");
 }
 
+TEST(Check, TheDefaultHandlerLogsAnAssertionOnce) {
+    // No handler installed: the library's default logs every box it shows.
+    int uniqueCondition = 0;
+    NX_ASSERT(uniqueCondition == 17);
+    std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
+    std::size_t count = 0;
+    for (std::size_t at = log.find("uniqueCondition == 17"); at != std::string::npos;
+         at = log.find("uniqueCondition == 17", at + 1)) {
+        ++count;
+    }
+    EXPECT_EQ(count, 1u);
+}
+
 TEST(CheckDeathTest, AnsweringYesEndsTheProcessWithMinusOne) {
     EXPECT_EXIT(
         {

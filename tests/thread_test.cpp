@@ -10,6 +10,7 @@
 
 #include "nxbase/logfile.h"
 #include "test_util.h"
+#include "toolkit/userinterface.h"
 #include "toolkit/system.h"
 
 namespace {
@@ -103,6 +104,67 @@ TEST(Thread, ExceptionInBodyIsLoggedAndTheThreadEnds) {
     EXPECT_TRUE(worker.IsFinished());
     std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
     EXPECT_NE(log.find("!!! Thread Exception: boom"), std::string::npos);
+}
+
+// Runs until asked to stop and counts its runs; ends its thread itself.
+class StopWorker : public Thread {
+  public:
+    explicit StopWorker(const std::string& id) : Thread(id, NORMAL_PRIORITY) {}
+    ~StopWorker() override { KillThread(); }
+    std::atomic<int> runs{0};
+
+  protected:
+    unsigned int Run() override {
+        ++runs;
+        while (!IsStopRequested()) std::this_thread::yield();
+        return 3;
+    }
+};
+
+TEST(Thread, StopRequestsRightAfterStartAreSeenAndFinishedThreadsRestart) {
+    StopWorker worker("cycler");
+    for (int cycle = 0; cycle < 2000; ++cycle) {
+        worker.StartThread();
+        if (cycle % 2 == 0) worker.RequestStop();
+        worker.KillThread();  // must not hang: the body sees the request
+        ASSERT_TRUE(worker.IsFinished());
+    }
+    EXPECT_EQ(worker.runs.load(), 2000);
+    // Finished but not killed, then started again: the old thread is collected.
+    for (int cycle = 0; cycle < 200; ++cycle) {
+        worker.StartThread();
+        worker.RequestStop();
+        while (!worker.IsFinished()) std::this_thread::yield();
+        ASSERT_EQ(worker.GetExitCode(), 3u);
+    }
+    worker.StartThread();
+    worker.StartThread();  // running: left alone, no second registration
+    auto running = Thread::GetRunningThreads();
+    EXPECT_EQ(std::count(running.begin(), running.end(), "cycler"), 1);
+    worker.KillThread();
+    EXPECT_EQ(worker.runs.load(), 2201);
+}
+
+// A derived class that forgets to end its thread.
+class CarelessWorker : public Thread {
+  public:
+    CarelessWorker() : Thread("careless", NORMAL_PRIORITY) {}
+
+  protected:
+    unsigned int Run() override {
+        while (!IsStopRequested()) std::this_thread::yield();
+        return 0;
+    }
+};
+
+TEST(Thread, DestroyingARunningThreadIsReportedWithItsName) {
+    auto ui = std::make_shared<RecordingUserInterface>(false);
+    ScopedUserInterface scoped(ui);
+    { CarelessWorker worker; worker.StartThread(); }
+    auto boxes = ui->Boxes();
+    ASSERT_EQ(boxes.size(), 1u);
+    EXPECT_NE(boxes[0].text.find("*****ASSERT*****"), std::string::npos);
+    EXPECT_NE(boxes[0].text.find("\"careless\" destroyed while running"), std::string::npos);
 }
 
 }  // namespace

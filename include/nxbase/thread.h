@@ -5,6 +5,7 @@
 #define NXBASE_THREAD_H_
 
 #include <atomic>
+#include <condition_variable>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -40,13 +41,18 @@ enum ThreadPriorityTYPE {
 class NXBASE_EXPORT Thread {
   public:
     Thread(const std::string& id, ThreadPriorityTYPE priority);
-    // Stops and joins a thread still running.
+    // A derived class ends its thread in its own destructor (KillThread):
+    // by the time this base destructor runs, the derived part that Run()
+    // uses is gone. A thread still running here is reported as an assertion
+    // naming the thread, then stopped and joined.
     virtual ~Thread();
     Thread(const Thread&) = delete;
     Thread& operator=(const Thread&) = delete;
 
     // Registers the id in smRunningThreads, starts the body on a new thread
-    // and applies the stored priority.
+    // and applies the stored priority. A stop request made at any time after
+    // this call is seen by the body. A finished thread may be started again
+    // (with or without KillThread in between); a running one is left alone.
     void StartThread();
     // Applies the priority to a started thread; the stored priority does not change.
     void SetPriority(ThreadPriorityTYPE priority);
@@ -70,10 +76,12 @@ class NXBASE_EXPORT Thread {
     virtual void StopThread();
     virtual void RequestChildrenStop() {}
     virtual void KillChildThreads() {}
-    bool IsStopRequested() const { return stopRequested.load(); }
+    bool IsStopRequested() const;
 
   private:
     static void ThreadRoutine(Thread* self);
+    void JoinOrDetach();
+    void MarkBodyEntered() const;
     void ApplyPriority();
 
     std::unique_ptr<std::thread> pHandle;
@@ -83,6 +91,10 @@ class NXBASE_EXPORT Thread {
     std::string amId;
     std::atomic<unsigned int> exitCode{0};
     std::atomic<int> systemThreadId{0};
+    mutable std::mutex amStartMutex;
+    mutable std::condition_variable amStartCondition;
+    mutable std::atomic<bool> amBodyEntered{false};
+    std::atomic<bool> amDestroying{false};
 
     static std::mutex smRunningMutex;
     static std::vector<std::string> smRunningThreads;

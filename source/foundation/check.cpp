@@ -20,11 +20,17 @@ String Decimal(long value) {
     throw 1;
 }
 
+// Set while a report that is already in the log asks its question, so that
+// the default handler does not write the same text a second time.
+thread_local bool tReportInLog = false;
+
 // The yes/no part of the assertion and error reports.
 void AskToQuit(const String& text) {
     LogFile::WriteToLog(text, String());
     LogFile::Instance()->WriteStackTrace();
+    tReportInLog = true;
     bool quit = UserInterface::Current()->QueryBox((text + "\n\nQuit application?").str(), false);
+    tReportInLog = false;
     if (quit) std::_Exit(-1);
 }
 
@@ -41,7 +47,7 @@ class LogAndStderrUserInterface : public StderrUserInterface {
         StderrUserInterface::InfoBox(text);
     }
     bool QueryBox(const std::string& text, bool defaultAnswer) override {
-        LogFile::WriteToLog(String(text), String());
+        if (!tReportInLog) LogFile::WriteToLog(String(text), String());
         return StderrUserInterface::QueryBox(text, defaultAnswer);
     }
 };

@@ -4,10 +4,12 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cerrno>
 #include <exception>
 #include <map>
 
+#include "nxbase/check.h"
 #include "nxbase/logfile.h"
 #include "toolkit/system.h"
 
@@ -92,40 +94,87 @@ Thread::Thread(const std::string& id, ThreadPriorityTYPE priority)
     : amPriority(priority), amId(id) {}
 
 Thread::~Thread() {
-    if (pHandle && pHandle->joinable()) {
-        stopRequested = true;
-        if (pHandle->get_id() == std::this_thread::get_id()) {
-            pHandle->detach();
-        } else {
-            pHandle->join();
-        }
+    amDestroying = true;
+    if (!pHandle || !pHandle->joinable()) return;
+    if (running.load()) {
+        // The derived part is gone already, so the body may be running on a
+        // destroyed object: say which thread, then stop it as well as we can.
+        std::string text = "Thread \"" + amId +
+                           "\" destroyed while running: a derived class must call KillThread "
+                           "in its own destructor";
+        Check::AssertFailed(text.c_str(), __FILE__, __LINE__);
+    }
+    stopRequested = true;
+    JoinOrDetach();
+}
+
+void Thread::JoinOrDetach() {
+    if (pHandle->get_id() == std::this_thread::get_id()) {
+        pHandle->detach();
+    } else {
+        pHandle->join();
     }
 }
 
 void Thread::StartThread() {
+    if (pHandle) {
+        if (running.load()) return;  // already running: nothing to start
+        // Finished but not killed: collect the old thread before a new one.
+        if (pHandle->joinable()) JoinOrDetach();
+        pHandle.reset();
+    }
     {
         std::lock_guard<std::mutex> lock(smRunningMutex);
-        smRunningThreads.push_back(amId);
+        if (std::find(smRunningThreads.begin(), smRunningThreads.end(), amId) ==
+            smRunningThreads.end()) {
+            smRunningThreads.push_back(amId);
+        }
     }
+    // Cleared here, before the body can run, so that a stop requested at any
+    // moment after StartThread returns is seen by the body.
+    stopRequested = false;
+    exitCode = 0;
     running = true;
-    pHandle = std::make_unique<std::thread>(&Thread::ThreadRoutine, this);
-    // The new thread applies the stored priority itself once its system id is known.
+    amBodyEntered = false;
+    try {
+        pHandle = std::make_unique<std::thread>(&Thread::ThreadRoutine, this);
+    } catch (...) {
+        running = false;
+        throw;
+    }
+    // Wait until the body runs (its first IsStopRequested() or its return), at
+    // most a moment: an owner that destroys the object right after starting it
+    // then gets the destructor's report, never a call through a half-destroyed
+    // object.
+    std::unique_lock<std::mutex> lock(amStartMutex);
+    amStartCondition.wait_for(lock, std::chrono::milliseconds(100),
+                              [this] { return amBodyEntered.load(); });
+}
+
+void Thread::MarkBodyEntered() const {
+    if (amBodyEntered.load() || amBodyEntered.exchange(true)) return;
+    std::lock_guard<std::mutex> lock(amStartMutex);
+    amStartCondition.notify_all();
+}
+
+bool Thread::IsStopRequested() const {
+    MarkBodyEntered();
+    return stopRequested.load();
 }
 
 void Thread::ThreadRoutine(Thread* self) {
     self->systemThreadId = static_cast<int>(toolkit::CurrentThreadId());
     ApplyNice(self->systemThreadId, self->amPriority);
-    self->running = true;
-    self->stopRequested = false;
     unsigned int result = 0;
     try {
-        result = self->Run();
+        if (!self->amDestroying.load()) result = self->Run();
     } catch (const std::exception& e) {
         LogFile::WriteToLog(String("!!! Thread Exception: ") + String(e.what()), String());
     } catch (...) {
         LogFile::WriteToLog(String("!!! Thread Exception: Unknown"), String());
     }
     self->exitCode = result;
+    self->MarkBodyEntered();
     self->running = false;
 }
 
@@ -147,13 +196,7 @@ void Thread::KillThread() {
     KillChildThreads();
     StopThread();
     if (pHandle) {
-        if (pHandle->joinable()) {
-            if (pHandle->get_id() == std::this_thread::get_id()) {
-                pHandle->detach();
-            } else {
-                pHandle->join();
-            }
-        }
+        if (pHandle->joinable()) JoinOrDetach();
         pHandle.reset();
     }
     running = false;
