@@ -274,7 +274,9 @@ TEST(FlagSet, SetOperatorsWorkAcrossWordsAndCounts) {
     EXPECT_EQ((a - b).GetFlag(69), 1);
     EXPECT_EQ((a ^ b).CountSet(), 2);
     EXPECT_EQ((~a).CountSet(), 68) << "the complement stays inside the count";
-    EXPECT_EQ(FlagSet(70, 1).CountSet(), 70);
+    FlagSet full(70);
+    full.SetAll();
+    EXPECT_EQ(full.CountSet(), 70);
 
     a.SetFlag(70);
     a.SetFlag(-1);
@@ -284,6 +286,41 @@ TEST(FlagSet, SetOperatorsWorkAcrossWordsAndCounts) {
     EXPECT_NE(a, FlagSet(70));
     a.ClearAll();
     EXPECT_EQ(a, FlagSet(70));
+}
+
+TEST(FlagSet, TwoIntsAreARangeThatSerialisesByIndexAndReadsBackFromZero) {
+    FlagSet messages(-2, 135);
+    EXPECT_EQ(messages.Count(), 137);
+    EXPECT_EQ(messages.Low(), -2);
+    EXPECT_EQ(messages.High(), 135);
+    for (int flag : {-2, -1, 0, 134}) messages.SetFlag(flag);
+    messages.SetFlag(-3);   // below the range
+    messages.SetFlag(135);  // the end is not a flag
+    EXPECT_EQ(messages.CountSet(), 4);
+    EXPECT_EQ(messages.GetFlag(-2), 1);
+    EXPECT_EQ(messages.GetFlag(1), 0);
+    EXPECT_EQ(messages.GetFlag(135), 0);
+    EXPECT_EQ(FlagSet(0, 3).Count(), 3);
+    EXPECT_EQ(FlagSet(5, 5).Count(), 0);
+    EXPECT_EQ(FlagSet(5, 2).Count(), 0);
+    EXPECT_EQ(FlagSet(INT_MAX, INT_MIN).Count(), 0) << "no overflow in the width";
+
+    // Index order on the wire: flag -2 is the first byte, 134 the last.
+    MyMemoryBlock block;
+    block << messages;
+    Bytes bytes = Image(block);
+    ASSERT_EQ(bytes.size(), 4u + 137u);
+    EXPECT_EQ(bytes[0], 137);
+    EXPECT_EQ(bytes[4], 1);   // -2
+    EXPECT_EQ(bytes[5], 1);   // -1
+    EXPECT_EQ(bytes[6], 1);   // 0
+    EXPECT_EQ(bytes[7], 0);   // 1
+    EXPECT_EQ(bytes[4 + 136], 1);  // 134
+    FlagSet back;
+    block >> back;
+    EXPECT_EQ(back.Low(), 0);
+    EXPECT_EQ(back.Count(), 137);
+    for (int i = 0; i < 137; ++i) EXPECT_EQ(back.GetFlag(i), messages.GetFlag(i - 2)) << i;
 }
 
 }  // namespace

@@ -27,26 +27,33 @@
 #include "nxbase/export.h"
 #include "toolkit/string.h"
 
-// A set of flags numbered 0 to Count()-1, all clear unless set.
+// A set of flags numbered Low() to High()-1, all clear unless set. The
+// serialised form holds only the count and the flags in order, so a set read
+// from a block is numbered from 0.
 class NXBASE_EXPORT FlagSet {
   public:
-    // `alCount` flags (a negative count gives an empty set); all of them set
-    // when `axInitial` is non-zero, else all clear.
-    explicit FlagSet(int alCount = 0, int axInitial = 0);
+    // `alCount` flags numbered from 0 (a negative count gives an empty set).
+    explicit FlagSet(int alCount = 0);
+    // The flags numbered `alLow` to `alHigh` - 1: FlagSet(-2, 135) holds 137
+    // flags, -2 to 134; an empty range gives an empty set.
+    FlagSet(int alLow, int alHigh);
 
     int Count() const { return amCount; }
-    // 1 when flag `alIndex` is set, 0 when it is clear or out of range.
-    unsigned char GetFlag(int alIndex) const;
-    // Sets or clears one flag; an index out of range changes nothing.
-    void SetFlag(int alIndex);
-    void ClearFlag(int alIndex);
+    int Low() const { return amLow; }
+    int High() const { return amLow + amCount; }
+    // 1 when flag number `alFlag` is set, 0 when it is clear or out of range.
+    unsigned char GetFlag(int alFlag) const;
+    // Sets or clears one flag; a number out of range changes nothing.
+    void SetFlag(int alFlag);
+    void ClearFlag(int alFlag);
     void SetAll();
     void ClearAll();
     bool IsEmpty() const;  // no flag set
     int CountSet() const;
 
-    // Set operators. Operands of different counts act as if the shorter one
-    // were extended with clear flags; the result has the larger count.
+    // Set operators, flag by flag in index order (the left operand keeps its
+    // numbering). Operands of different counts act as if the shorter one were
+    // extended with clear flags; the result has the larger count.
     FlagSet& operator|=(const FlagSet& axOther);
     FlagSet& operator&=(const FlagSet& axOther);
     FlagSet& operator-=(const FlagSet& axOther);  // difference: clears the other's flags
@@ -54,16 +61,19 @@ class NXBASE_EXPORT FlagSet {
     // Complement within the same count.
     FlagSet operator~() const;
 
-    // Equal when the counts and every flag agree.
+    // Equal when the numbering, the counts and every flag agree.
     friend bool operator==(const FlagSet& a, const FlagSet& b) {
-        return a.amCount == b.amCount && a.amWords == b.amWords;
+        return a.amLow == b.amLow && a.amCount == b.amCount && a.amWords == b.amWords;
     }
     friend bool operator!=(const FlagSet& a, const FlagSet& b) { return !(a == b); }
 
   private:
     void Resize(int alCount);
     void ClearUnusedBits();
+    // Index of flag number `alFlag`, or -1 when it is out of range.
+    int IndexOf(int alFlag) const;
 
+    int amLow = 0;
     int amCount = 0;
     std::vector<std::uint64_t> amWords;
 };

@@ -43,16 +43,26 @@ std::uint32_t Decode(const unsigned char* p) {
 }
 
 int WordCount(int alCount) {
-    return (alCount + kWordBits - 1) / kWordBits;
+    return static_cast<int>((static_cast<long long>(alCount) + kWordBits - 1) / kWordBits);
 }
 
 }  // namespace
 
 // ---------------------------------------------------------------- FlagSet
 
-FlagSet::FlagSet(int alCount, int axInitial) {
+FlagSet::FlagSet(int alCount) {
     Resize(alCount);
-    if (axInitial != 0) SetAll();
+}
+
+FlagSet::FlagSet(int alLow, int alHigh) : amLow(alLow) {
+    // In 64 bits: a range as wide as the whole int range must not overflow.
+    long long count = static_cast<long long>(alHigh) - alLow;
+    Resize(static_cast<int>(std::clamp<long long>(count, 0, std::numeric_limits<int>::max())));
+}
+
+int FlagSet::IndexOf(int alFlag) const {
+    long long index = static_cast<long long>(alFlag) - amLow;
+    return index >= 0 && index < amCount ? static_cast<int>(index) : -1;
 }
 
 void FlagSet::Resize(int alCount) {
@@ -66,18 +76,21 @@ void FlagSet::ClearUnusedBits() {
     if (used != 0 && !amWords.empty()) amWords.back() &= (std::uint64_t{1} << used) - 1;
 }
 
-unsigned char FlagSet::GetFlag(int alIndex) const {
-    if (alIndex < 0 || alIndex >= amCount) return 0;
+unsigned char FlagSet::GetFlag(int alFlag) const {
+    int alIndex = IndexOf(alFlag);
+    if (alIndex < 0) return 0;
     return static_cast<unsigned char>((amWords[alIndex / kWordBits] >> (alIndex % kWordBits)) & 1u);
 }
 
-void FlagSet::SetFlag(int alIndex) {
-    if (alIndex < 0 || alIndex >= amCount) return;
+void FlagSet::SetFlag(int alFlag) {
+    int alIndex = IndexOf(alFlag);
+    if (alIndex < 0) return;
     amWords[alIndex / kWordBits] |= std::uint64_t{1} << (alIndex % kWordBits);
 }
 
-void FlagSet::ClearFlag(int alIndex) {
-    if (alIndex < 0 || alIndex >= amCount) return;
+void FlagSet::ClearFlag(int alFlag) {
+    int alIndex = IndexOf(alFlag);
+    if (alIndex < 0) return;
     amWords[alIndex / kWordBits] &= ~(std::uint64_t{1} << (alIndex % kWordBits));
 }
 
@@ -315,7 +328,7 @@ MyMemoryBlock& MyMemoryBlock::operator<<(const FlagSet& axValue) {
     *this << count;
     CheckSize(count);
     for (int i = 0; i < count; ++i) {
-        unsigned char byte = axValue.GetFlag(i);
+        unsigned char byte = axValue.GetFlag(axValue.Low() + i);
         PutBytes<1>(&byte);
     }
     return *this;
