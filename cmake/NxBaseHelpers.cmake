@@ -1,5 +1,8 @@
 # nxbase_add_test(<name> <sources...> [LABELS <labels...>])
 # One GoogleTest executable per family, registered with ctest.
+set(NXBASE_TEST_TMPDIR ${PROJECT_BINARY_DIR}/test-tmp)
+file(MAKE_DIRECTORY ${NXBASE_TEST_TMPDIR})
+
 function(nxbase_add_test name)
     cmake_parse_arguments(ARG "" "" "LABELS;LIBS" ${ARGN})
     add_executable(${name} ${ARG_UNPARSED_ARGUMENTS})
@@ -9,7 +12,13 @@ function(nxbase_add_test name)
         NXBASE_TEST_DATA_DIR="${PROJECT_SOURCE_DIR}/tests/data"
         NXBASE_SOURCE_DIR="${PROJECT_SOURCE_DIR}"
         NXBASE_BINARY_DIR="${PROJECT_BINARY_DIR}")
-    gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES LABELS "${ARG_LABELS}")
+    # Tests keep their scratch files under the build tree, never in the
+    # shared /tmp.
+    set(properties ENVIRONMENT "TMPDIR=${NXBASE_TEST_TMPDIR}")
+    if(ARG_LABELS)
+        list(APPEND properties LABELS "${ARG_LABELS}")
+    endif()
+    gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES ${properties})
 endfunction()
 
 # nxbase_add_bench(<name> <sources...>)
@@ -35,6 +44,7 @@ function(nxbase_add_fuzzer name source)
     set(corpus ${PROJECT_SOURCE_DIR}/fuzz/corpus/${name})
     if(NXBASE_BUILD_TESTS AND EXISTS ${corpus})
         add_test(NAME ${name}.replay COMMAND ${name} ${corpus})
-        set_tests_properties(${name}.replay PROPERTIES LABELS fuzz-replay)
+        set_tests_properties(${name}.replay PROPERTIES LABELS fuzz-replay
+            ENVIRONMENT "TMPDIR=${NXBASE_TEST_TMPDIR}")
     endif()
 endfunction()

@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <limits>
 #include <sstream>
@@ -156,7 +157,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (byName) {
         // One scratch file per process, removed at exit.
         static const struct Scratch {
-            std::string path = "/tmp/nxbase-asciifile-fuzz-" + std::to_string(::getpid()) + ".dat";
+            std::string path = (std::filesystem::temp_directory_path() /
+                                ("nxbase-asciifile-fuzz-" + std::to_string(::getpid()) + ".dat"))
+                                   .string();
             ~Scratch() { std::remove(path.c_str()); }
         } scratch;
         const std::string& path = scratch.path;

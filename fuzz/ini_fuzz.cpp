@@ -30,14 +30,25 @@ std::vector<Entry> ReadAll(Config& config) {
     return entries;
 }
 
-const std::string& ScratchFile() {
-    static const std::string path = [] {
+// One scratch directory per process, removed at exit.
+struct ScratchDirectory {
+    ScratchDirectory() {
         std::string base = (std::filesystem::temp_directory_path() / "nxbase-ini-fuzz-XXXXXX").string();
         std::vector<char> buffer(base.begin(), base.end());
         buffer.push_back('\0');
-        const char* dir = ::mkdtemp(buffer.data());
-        return std::string(dir ? dir : ".") + "/fuzz.ini";
-    }();
+        if (::mkdtemp(buffer.data()) != nullptr) directory = buffer.data();
+    }
+    ~ScratchDirectory() {
+        std::error_code ignored;
+        if (!directory.empty()) std::filesystem::remove_all(directory, ignored);
+    }
+    std::string directory;
+};
+
+const std::string& ScratchFile() {
+    static const ScratchDirectory scratch;
+    static const std::string path =
+        (scratch.directory.empty() ? std::string(".") : scratch.directory) + "/fuzz.ini";
     return path;
 }
 

@@ -34,6 +34,8 @@ TEST_F(AppConfigTest, SingletonsFailWithTheirMessagesUntilCreated) {
             instance();
         } catch (const std::logic_error& e) {
             return std::string(e.what());
+        } catch (const std::runtime_error& e) {
+            return std::string("runtime_error: ") + e.what();
         }
         return std::string("no exception");
     };
@@ -41,8 +43,8 @@ TEST_F(AppConfigTest, SingletonsFailWithTheirMessagesUntilCreated) {
     EXPECT_EQ(message([] { AppDir::Instance(); }), "Please create the AppDir-Singleton first !");
     EXPECT_EQ(message([] { VELTRAConfig::Instance(); }),
               "Please create the VELTRAConfig-Singleton first !");
-    EXPECT_EQ(message([] { AppConfig::Instance(); }), "No AppConfig instance");
-    EXPECT_EQ(message([] { UserConfig::Instance(); }), "No UserConfig instance");
+    EXPECT_EQ(message([] { AppConfig::Instance(); }), "runtime_error: No AppConfig instance");
+    EXPECT_EQ(message([] { UserConfig::Instance(); }), "runtime_error: No UserConfig instance");
 
     AppName* first = AppName::CreateAppName("Check", "ColorCheck", "K-Lume ColorCheck",
                                             ApplicationVersion(2, 10, 3));

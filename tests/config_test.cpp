@@ -493,9 +493,9 @@ TEST_F(CascadeTest, TheFactoryHandsOutIndependentStoresOnTheSingletonsFiles) {
     EXPECT_EQ(CascadedConfig::ReadKey("G", "K", ""), "from app store");
 
     NxSingleton::DeleteAllSingleton();
-    EXPECT_THROW(ConfigurationFactory::CreateAppConfig(), std::logic_error);
-    EXPECT_THROW(ConfigurationFactory::CreateUserConfig(), std::logic_error);
-    EXPECT_THROW(CascadedConfig::ReadKey("G", "K", ""), std::logic_error);
+    EXPECT_THROW(ConfigurationFactory::CreateAppConfig(), std::runtime_error);
+    EXPECT_THROW(ConfigurationFactory::CreateUserConfig(), std::runtime_error);
+    EXPECT_THROW(CascadedConfig::ReadKey("G", "K", ""), std::runtime_error);
 }
 
 }  // namespace

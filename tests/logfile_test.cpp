@@ -1,7 +1,10 @@
 #include "nxbase/logfile.h"
 
 #include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
+#include <csignal>
 #include <unistd.h>
 
 #include <atomic>
@@ -59,8 +62,12 @@ TEST_F(LogFileTest, PathOptionNamesTheFileOrItsDirectory) {
         nxtest::ScopedEnv noPath("NXBASE_LOG_PATH", "");
         nxtest::ScopedEnv tmp("TMPDIR", dir.path().string());
         LogFile log("");
-        // Without a name the executable's base name is used.
-        EXPECT_EQ(log.GetFileName(), dir.File("logfile_test.log"));
+        // Without a name the executable's base name is used, in the user's
+        // private directory of the temporary directory.
+        std::string privateDir = dir.File("k-lume-" + std::to_string(::geteuid()));
+        EXPECT_EQ(log.GetFileName(), privateDir + "/logfile_test.log");
+        EXPECT_EQ(std::filesystem::status(privateDir).permissions(),
+                  std::filesystem::perms::owner_all);
     }
     {
         // "Path" in group "Log" of the application's option file in the
@@ -119,6 +126,15 @@ TEST_F(LogFileTest, RestartsAfterLineLimitUnlessUnlimited) {
     EXPECT_EQ(lines[0], "Log restarted (LogedLines: 50001");
     EXPECT_EQ(lines[1].substr(kStampWidth), "fresh");
 
+    // The note survives a restart whose next text is "APPEND" (no truncation).
+    LogFile appended("appended");
+    for (std::uint32_t i = 2; i <= LogFile::kLineLimit + 2; ++i) appended.WriteLog("x", "");
+    appended.WriteLog("APPEND", "");
+    lines = nxtest::ReadLines(File("appended"));
+    ASSERT_EQ(lines.size(), LogFile::kLineLimit + 4);
+    EXPECT_EQ(lines[lines.size() - 2], "Log restarted (LogedLines: 50001");
+    EXPECT_EQ(lines.back().substr(kStampWidth), "APPEND");
+
     LogFile unlimited("unlimited");
     unlimited.SetLogOption("Unlimited", true);
     for (std::uint32_t i = 0; i < LogFile::kLineLimit + 10; ++i) unlimited.WriteLog("x", "");
@@ -144,6 +160,57 @@ TEST_F(LogFileTest, UnwritableFileLosesLinesWithoutThrowing) {
     LogFile log("bad");
     EXPECT_NO_THROW(log.WriteLog("lost", ""));
     EXPECT_FALSE(std::filesystem::exists(dir.File("missing-dir")));
+}
+
+TEST_F(LogFileTest, ForeignOrOpenDirectoriesAndPlantedSymlinksAreNotUsed) {
+    nxtest::ScopedEnv noPath("NXBASE_LOG_PATH", "");
+    nxtest::ScopedEnv tmp("TMPDIR", dir.path().string());
+    std::string usual = dir.File("k-lume-" + std::to_string(::geteuid()));
+    std::filesystem::create_directory(usual);
+    ::chmod(usual.c_str(), 0777);  // open to everyone: refused
+    {
+        LogFile log("open");
+        EXPECT_EQ(log.GetFileName().rfind(usual + "-", 0), 0u) << log.GetFileName();
+        EXPECT_FALSE(std::filesystem::exists(usual + "/open.log"));
+    }
+    if (::geteuid() == 0) {
+        ::chmod(usual.c_str(), 0700);
+        ASSERT_EQ(::chown(usual.c_str(), 65534, 65534), 0);  // someone else's
+        LogFile log("foreign");
+        EXPECT_EQ(log.GetFileName().rfind(usual + "-", 0), 0u) << log.GetFileName();
+        EXPECT_FALSE(std::filesystem::exists(usual + "/foreign.log"));
+    }
+    // A symlink where the log file should be is never followed.
+    std::string target = dir.File("victim");
+    nxtest::WriteFile(target, "precious\n");
+    std::filesystem::create_symlink(target, dir.File("planted.log"));
+    nxtest::ScopedEnv path("NXBASE_LOG_PATH", dir.path().string());
+    LogFile log("planted");
+    log.WriteLog("line", "");
+    EXPECT_EQ(nxtest::ReadFile(target), "precious\n");
+}
+
+TEST_F(LogFileTest, AShortWriteCountsAsFailedAndListenersHearOfIt) {
+    // A child process with a tiny file-size limit: the line is cut short.
+    pid_t child = ::fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        ::signal(SIGXFSZ, SIG_IGN);
+        LogFile log("full");
+        auto listener = boost::make_shared<nxtest::RecordingLog>();
+        log.AddLogListener(listener);
+        struct rlimit limit {};
+        limit.rlim_cur = limit.rlim_max = 200;
+        ::setrlimit(RLIMIT_FSIZE, &limit);
+        log.WriteLog(std::string(400, 'y').c_str(), "");
+        bool told = listener->lines.size() == 2 &&
+                    listener->lines[1].find("!!! Log write failed") != std::string::npos;
+        ::_exit(told ? 0 : 1);
+    }
+    int status = 0;
+    ::waitpid(child, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "the listeners were not told of the failed write";
 }
 
 TEST_F(LogFileTest, StackTraceIsWrittenOnlyWhenEnabled) {

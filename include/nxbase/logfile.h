@@ -20,6 +20,12 @@
 #include "nxbase/export.h"
 #include "toolkit/string.h"
 
+// The log's fixed option names.
+inline constexpr const char* kLogOptionUnlimited = "Unlimited";
+inline constexpr const char* kLogOptionPath = "Path";
+inline constexpr const char* kLogOptionThreadId = "ThreadId";
+inline constexpr const char* kLogOptionUILog = "UILog";
+
 class NXBASE_EXPORT LogInterface {
   public:
     virtual ~LogInterface() = default;

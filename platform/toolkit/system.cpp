@@ -1,10 +1,15 @@
 #include "toolkit/system.h"
 
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
+
 #include <algorithm>
 #include <cstdlib>
+#include <cstdio>
 #include <ctime>
 #include <vector>
 
@@ -38,6 +43,47 @@ std::string ExecutableFileName() {
 
 std::uint32_t CurrentThreadId() {
     return static_cast<std::uint32_t>(syscall(SYS_gettid));
+}
+
+std::string EnsurePrivateDirectory(const std::string& path) {
+    if (path.empty()) return "no directory name";
+    // Parents are made as needed (mode 0700 too); each must end up a directory.
+    for (std::size_t slash = path.find('/', 1); slash != std::string::npos;
+         slash = path.find('/', slash + 1)) {
+        std::string parent = path.substr(0, slash);
+        if (::mkdir(parent.c_str(), 0700) != 0 && errno != EEXIST) {
+            return "cannot create " + parent + ": " + std::strerror(errno);
+        }
+    }
+    if (::mkdir(path.c_str(), 0700) != 0 && errno != EEXIST) {
+        return "cannot create " + path + ": " + std::strerror(errno);
+    }
+    struct stat info {};
+    if (::lstat(path.c_str(), &info) != 0) return path + ": " + std::strerror(errno);
+    if (S_ISLNK(info.st_mode)) return path + " is a symbolic link";
+    if (!S_ISDIR(info.st_mode)) return path + " is not a directory";
+    if (info.st_uid != ::geteuid()) {
+        return path + " belongs to user id " + std::to_string(info.st_uid);
+    }
+    if ((info.st_mode & 077) != 0) {
+        char mode[8];
+        std::snprintf(mode, sizeof mode, "%04o", static_cast<unsigned>(info.st_mode & 07777));
+        return path + " is open to other users (mode " + mode + ")";
+    }
+    return std::string();
+}
+
+std::string UserTempDirectory(std::string* refusal) {
+    std::string base = TempDirectory() + "/k-lume-" + std::to_string(::geteuid());
+    std::string reason = EnsurePrivateDirectory(base);
+    if (reason.empty()) return base;
+    if (refusal) *refusal = reason;
+    // Someone else holds the usual name: a fresh directory only we can own.
+    std::string pattern = base + "-XXXXXX";
+    std::vector<char> buffer(pattern.begin(), pattern.end());
+    buffer.push_back('\0');
+    if (::mkdtemp(buffer.data()) == nullptr) return std::string();
+    return std::string(buffer.data());
 }
 
 std::string NormalizePath(const std::string& path) {

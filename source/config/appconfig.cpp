@@ -1,12 +1,16 @@
 #include "nxbase/appconfig.h"
 
 #include <cstdlib>
+#include <map>
+#include <memory>
+#include <stdexcept>
 #include <string>
 
 #include "nxbase/check.h"
 #include "nxbase/files.h"
 #include "nxbase/logfile.h"
 #include "toolkit/config.h"
+#include "toolkit/system.h"
 
 namespace {
 
@@ -22,6 +26,39 @@ String JoinPath(const String& directory, const String& name) {
     if (path.GetChar(path.Len() - 1) != '/' && path.GetChar(path.Len() - 1) != '\\') path += '/';
     return path + name;
 }
+
+// The application's option file: the executable's name with a four-character
+// extension (".exe") replaced by ".ini", or ".ini" appended, in the per-user
+// configuration directory.
+std::string ApplicationOptionFile() {
+    std::string directory = UserConfig::GetConfigDirectoryPath().str();
+    std::string name = toolkit::ExecutableFileName();
+    name = name.substr(name.find_last_of('/') + 1);
+    if (directory.empty() || name.empty()) return std::string();
+    std::size_t dot = name.rfind('.');
+    if (dot != std::string::npos && dot + 4 == name.size()) name.erase(dot);
+    return directory + "/" + name + ".ini";
+}
+
+// Gives the log the option "Path": key "Path" of group "Log" in the
+// application's option file.
+class OptionFileLogProvider : public nxbase::LogOptionProvider {
+  public:
+    std::string LogPath() override {
+        std::string file = ApplicationOptionFile();
+        if (file.empty()) return std::string();
+        Config options{String(file)};
+        options.SetGroup("Log");
+        return options.ReadKey(kLogOptionPath).str();
+    }
+    std::map<std::string, std::string> LogOptions() override { return {}; }
+};
+
+// Installed when the library loads, before any log is made.
+const bool kOptionFileProviderInstalled = [] {
+    nxbase::SetLogOptionProvider(std::make_shared<OptionFileLogProvider>());
+    return true;
+}();
 
 }  // namespace
 
@@ -154,7 +191,8 @@ AppConfig* AppConfig::CreateAppConfig(const String& asDirectory, const String& a
 }
 
 AppConfig* AppConfig::Instance() {
-    return nxbase::StrictSingletonInstance(smInstance, "No AppConfig instance");
+    return nxbase::StrictSingletonInstance<AppConfig, std::runtime_error>(smInstance,
+                                                                     "No AppConfig instance");
 }
 
 bool AppConfig::IsInitialized() { return smInstance != nullptr; }
@@ -209,7 +247,8 @@ UserConfig* UserConfig::CreateUserConfig(const String& asAppName, const String& 
 }
 
 UserConfig* UserConfig::Instance() {
-    return nxbase::StrictSingletonInstance(smInstance, "No UserConfig instance");
+    return nxbase::StrictSingletonInstance<UserConfig, std::runtime_error>(
+        smInstance, "No UserConfig instance");
 }
 
 bool UserConfig::IsInitialized() { return smInstance != nullptr; }

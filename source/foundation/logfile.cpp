@@ -8,24 +8,22 @@
 #include <boost/stacktrace.hpp>
 #include <cerrno>
 #include <charconv>
+#include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
 #include <mutex>
 #include <sstream>
 
-#include "nxbase/appconfig.h"
 #include "nxbase/thread.h"
-#include "toolkit/config.h"
 #include "toolkit/system.h"
 
 namespace {
 
 constexpr const char* kLogWrite = "LogWrite";
 constexpr const char* kLogListeners = "LogListeners";
-constexpr const char* kUnlimited = "Unlimited";
-constexpr const char* kPath = "Path";
-constexpr const char* kLogGroup = "Log";
-constexpr const char* kThreadId = "ThreadId";
+constexpr const char* kUnlimited = kLogOptionUnlimited;
+constexpr const char* kThreadId = kLogOptionThreadId;
 
 // Bits of a key's state: announced once in "# - Available key: ", enabled.
 constexpr std::uint8_t kAvailable = 1;
@@ -33,27 +31,27 @@ constexpr std::uint8_t kEnabled = 2;
 
 // ---- operating-system seam: one whole line per write() on O_APPEND ----
 
-// Appends `bytes` to `path` (truncating first when asked); false when the
-// file cannot be opened. A single write() keeps lines whole across threads
-// and processes; the loop only finishes the rare short write.
+// Appends `bytes` to `path` (truncating first when asked) in one write(), so
+// that lines stay whole across threads and processes. False, with errno set,
+// when the file cannot be opened or the write comes up short (a full disk):
+// finishing a short write later would interleave with other writers' lines.
+// The last component is never followed as a symlink.
 bool AppendToFile(const std::string& path, const std::string& bytes, bool truncate) {
-    int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | (truncate ? O_TRUNC : 0);
+    int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW | (truncate ? O_TRUNC : 0);
     int fd;
     do {
         fd = ::open(path.c_str(), flags, 0644);
     } while (fd < 0 && errno == EINTR);
     if (fd < 0) return false;
-    const char* data = bytes.data();
-    std::size_t left = bytes.size();
-    while (left > 0) {
-        ssize_t n = ::write(fd, data, left);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        data += n;
-        left -= static_cast<std::size_t>(n);
-    }
+    ssize_t n;
+    do {
+        n = ::write(fd, bytes.data(), bytes.size());
+    } while (n < 0 && errno == EINTR);
+    int writeError = n < 0 ? errno : ENOSPC;
     ::close(fd);
-    return true;
+    if (n == static_cast<ssize_t>(bytes.size())) return true;
+    errno = writeError;
+    return false;
 }
 
 bool IsDirectory(const std::string& path) {
@@ -124,30 +122,11 @@ std::map<std::string, std::string> OptionsFromEnvironment() {
     return options;
 }
 
-// The application's option file: the executable's name with a four-character
-// extension (".exe") replaced by ".ini", or ".ini" appended, in the per-user
-// configuration directory.
-std::string ApplicationOptionFile() {
-    std::string directory = UserConfig::GetConfigDirectoryPath().str();
-    std::string name = toolkit::ExecutableFileName();
-    name = name.substr(name.find_last_of('/') + 1);
-    if (directory.empty() || name.empty()) return std::string();
-    std::size_t dot = name.rfind('.');
-    if (dot != std::string::npos && dot + 4 == name.size()) name.erase(dot);
-    return directory + "/" + name + ".ini";
-}
-
-// Without a registry root path only the option "Path" is known: key "Path"
-// of group "Log" in the application's option file.
+// Until the configuration installs its provider, a log knows only what the
+// environment says.
 class DefaultLogOptionProvider : public nxbase::LogOptionProvider {
   public:
-    std::string LogPath() override {
-        std::string file = ApplicationOptionFile();
-        if (file.empty()) return std::string();
-        Config options{String(file)};
-        options.SetGroup(kLogGroup);
-        return options.ReadKey(kPath).str();
-    }
+    std::string LogPath() override { return std::string(); }
     std::map<std::string, std::string> LogOptions() override { return {}; }
 };
 
@@ -174,11 +153,23 @@ std::string ExecutableBaseName() {
     return base.substr(0, base.find('.'));
 }
 
+// The user's private log directory, <temp>/k-lume-<uid>: nobody else can
+// plant the log's name there first or put a symlink in its place.
+std::string DefaultLogDirectory() {
+    std::string refusal;
+    std::string directory = toolkit::UserTempDirectory(&refusal);
+    if (!refusal.empty()) {
+        std::fprintf(stderr, "Log directory refused (%s); using %s\n", refusal.c_str(),
+                     directory.c_str());
+    }
+    return directory.empty() ? toolkit::TempDirectory() : directory;
+}
+
 // The log path: "Path" names the file, or the directory when it is one (or
 // ends in "/"); without it, <temp>/<name or executable>.log.
 std::string ResolveLogPath(const std::string& name, const std::string& pathOption) {
     std::string fileName = (name.empty() ? ExecutableBaseName() : name) + ".log";
-    if (pathOption.empty()) return toolkit::TempDirectory() + "/" + fileName;
+    if (pathOption.empty()) return DefaultLogDirectory() + "/" + fileName;
     std::string path = toolkit::NormalizePath(pathOption);
     if (path.back() == '/') return path + fileName;
     if (IsDirectory(path)) return path + "/" + fileName;
@@ -343,22 +334,34 @@ void LogFile::WriteLog(const String& text, const String& key) {
     line += text.str();
     line += '\n';
 
+    bool written = false;
+    int writeError = 0;
     {
         CriticalSection section(kLogWrite);
-        bool truncate = firstWrite && !appendRequested;
+        bool fresh = firstWrite;
+        bool truncate = fresh && !appendRequested;
         firstWrite = false;
         if (!unlimited && loggedLines > kLineLimit) {
             restartNote = "Log restarted (LogedLines: " + std::to_string(loggedLines) + "\n";
             loggedLines = 0;
             firstWrite = true;
-        } else if (truncate && !restartNote.empty()) {
-            // The fresh file after a restart begins with the note.
+        } else if (fresh && !restartNote.empty()) {
+            // The first line after a restart carries the note, whether it
+            // starts the file afresh or ("APPEND") continues it.
             line.insert(0, restartNote);
             restartNote.clear();
         }
-        if (AppendToFile(fileName, line, truncate)) ++loggedLines;
+        written = AppendToFile(fileName, line, truncate);
+        if (written) ++loggedLines;
+        else writeError = errno;
     }
-    if (hasListeners) NotifyListeners(text, key);
+    if (!hasListeners) return;
+    NotifyListeners(text, key);
+    if (!written) {
+        NotifyListeners(String("!!! Log write failed (") + String(std::strerror(writeError)) +
+                            "): " + String(fileName),
+                        String());
+    }
 }
 
 void LogFile::NotifyListeners(const String& text, const String& key) {

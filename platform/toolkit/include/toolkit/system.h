@@ -39,6 +39,19 @@ NXBASE_EXPORT std::string ExecutableFileName();
 // The calling thread's operating-system id (gettid).
 NXBASE_EXPORT std::uint32_t CurrentThreadId();
 
+// Creates `path` (and missing parents) with mode 0700 when it does not exist.
+// Returns "" when `path` is then a directory (not a symlink), owned by the
+// calling user and not open to group or others; otherwise a text that says
+// why it is refused. An existing directory is never changed.
+NXBASE_EXPORT std::string EnsurePrivateDirectory(const std::string& path);
+
+// The calling user's private directory in the temporary directory,
+// <temp>/k-lume-<uid>, made by EnsurePrivateDirectory. When that name is
+// taken by someone else (or is not private), a fresh private directory
+// <temp>/k-lume-<uid>-XXXXXX is made instead and `refusal` (if given) says why.
+// "" only when no directory can be made at all.
+NXBASE_EXPORT std::string UserTempDirectory(std::string* refusal = nullptr);
+
 // Converts "\" to "/" so that paths written by Windows applications work.
 NXBASE_EXPORT std::string NormalizePath(const std::string& path);
 
