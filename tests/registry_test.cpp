@@ -207,6 +207,73 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
     }
 }
 
+TEST_F(RegistryTest, ProcessesCreatingOneFreshHiveAtOnceAllSucceed) {
+    // Four processes race to create each of many fresh hives; every one must
+    // see a registry database, never a half-made file.
+    constexpr int kRounds = 300;
+    constexpr int kProcesses = 4;
+    int failures = 0;
+    for (int round = 0; round < kRounds && failures == 0; ++round) {
+        std::string file = dir.File("race/" + std::to_string(round) + ".sqlite");
+        nxtest::ScopedEnv hive("NXBASE_USER_REGISTRY", file);
+        pid_t children[kProcesses];
+        for (int p = 0; p < kProcesses; ++p) {
+            children[p] = ::fork();
+            if (children[p] == 0) {
+                int code = 0;
+                try {
+                    RegistryStore::Write(RegistryHive::CurrentUser, "Software\\Race",
+                                         RegistryValue::Dword("p" + std::to_string(p), 1));
+                } catch (const std::exception& e) {
+                    std::fprintf(stderr, "round %d process %d: %s\n", round, p, e.what());
+                    code = 1;
+                }
+                ::_exit(code);
+            }
+        }
+        for (pid_t child : children) {
+            int status = 0;
+            ::waitpid(child, &status, 0);
+            if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) ++failures;
+        }
+        EXPECT_EQ(RegistryStore::Values(RegistryHive::CurrentUser, "Software\\Race").size(),
+                  static_cast<std::size_t>(kProcesses));
+    }
+    EXPECT_EQ(failures, 0);
+}
+
+TEST_F(RegistryTest, TheMachineHiveKeepsNoSideFilesAndReadsFromAReadOnlyPlace) {
+    std::string file = dir.File("machine/registry.sqlite");
+    RegistryStore::Write(RegistryHive::LocalMachine, "Software\\K-Lume\\LumaServer",
+                         RegistryValue::Text("Version", "3.0"));
+    EXPECT_FALSE(std::filesystem::exists(file + "-wal"));
+    EXPECT_FALSE(std::filesystem::exists(file + "-shm"));
+    // Another process reads it from a directory and file it cannot write.
+    ::chmod(file.c_str(), 0444);
+    ::chmod(dir.File("machine").c_str(), 0555);
+    ::chmod(dir.path().c_str(), 0755);
+    pid_t child = ::fork();
+    if (child == 0) {
+        if (::geteuid() == 0 && ::setuid(65534) != 0) ::_exit(3);  // a user without rights
+        if (::access(file.c_str(), R_OK) != 0) ::_exit(4);  // the build tree is closed to it
+        int code = 1;
+        try {
+            auto value = RegistryStore::Read(RegistryHive::LocalMachine,
+                                             "Software\\K-Lume\\LumaServer", "Version");
+            code = value && value->ToString() == "3.0" ? 0 : 2;
+        } catch (const std::exception& e) {
+            std::fprintf(stderr, "%s\n", e.what());
+        }
+        ::_exit(code);
+    }
+    int status = 0;
+    ::waitpid(child, &status, 0);
+    ::chmod(dir.File("machine").c_str(), 0755);
+    ASSERT_TRUE(WIFEXITED(status));
+    if (WEXITSTATUS(status) == 4) GTEST_SKIP() << "the test directory is not readable by user 65534";
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+}
+
 TEST_F(RegistryTest, ThreadsWritingAndReadingShareNothingButTheFile) {
     constexpr int kThreads = 4;
     constexpr int kWrites = 300;

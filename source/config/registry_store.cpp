@@ -248,23 +248,31 @@ void Run(Connection& axConnection, sqlite3_stmt* pStatement, const char* asWhat)
 }
 
 // Creates the tables in a fresh file, or checks that an existing file is ours.
+// The check of a file that is not (yet) ours reads the application id and the
+// tables in one transaction, so that a process creating the same hive at this
+// moment is seen either not at all or whole; a writer holds the write lock
+// while it decides, so that only one creates.
 void PrepareSchema(Connection& axConnection) {
     long long applicationId = axConnection.QueryInt("PRAGMA application_id", "cannot read");
     if (applicationId == kApplicationId) return;
-    long long tables =
-        axConnection.QueryInt("SELECT count(*) FROM sqlite_master", "cannot read the schema");
-    if (applicationId != 0 || tables != 0) {
-        throw RegistryError(0, "Registry database '" + axConnection.File() +
-                                   "': the file is not a registry database");
-    }
-    if (!axConnection.Writable()) return;  // an empty file read-only: reads as empty
-    axConnection.Exec("BEGIN IMMEDIATE", "cannot create the tables");
+    bool writable = axConnection.Writable();
+    axConnection.Exec(writable ? "BEGIN IMMEDIATE" : "BEGIN", "cannot read the schema");
     try {
-        axConnection.Exec(kSchema, "cannot create the tables");
-        axConnection.Exec(("PRAGMA application_id = " + std::to_string(kApplicationId) +
-                           "; PRAGMA user_version = " + std::to_string(kSchemaVersion))
-                              .c_str(),
-                          "cannot create the tables");
+        long long tables =
+            axConnection.QueryInt("SELECT count(*) FROM sqlite_master", "cannot read the schema");
+        applicationId = axConnection.QueryInt("PRAGMA application_id", "cannot read");
+        if (applicationId != kApplicationId && (applicationId != 0 || tables != 0)) {
+            throw RegistryError(0, "Registry database '" + axConnection.File() +
+                                       "': the file is not a registry database");
+        }
+        // Ours by now, or an empty file opened read-only: it reads as empty.
+        if (applicationId == 0 && writable) {
+            axConnection.Exec(kSchema, "cannot create the tables");
+            axConnection.Exec(("PRAGMA application_id = " + std::to_string(kApplicationId) +
+                               "; PRAGMA user_version = " + std::to_string(kSchemaVersion))
+                                  .c_str(),
+                              "cannot create the tables");
+        }
         axConnection.Exec("COMMIT", "cannot create the tables");
     } catch (...) {
         sqlite3_exec(axConnection.Db(), "ROLLBACK", nullptr, nullptr, nullptr);
@@ -272,16 +280,16 @@ void PrepareSchema(Connection& axConnection) {
     }
 }
 
-// Switching a new file to WAL mode needs a lock for which SQLite does not
-// call the busy handler, so a process that races another one creating the
-// same hive waits here.
-void SwitchToWal(Connection& axConnection) {
+// Switching the journal mode needs a lock for which SQLite does not call the
+// busy handler, so a process that races another one creating the same hive
+// waits here.
+void SetJournalMode(Connection& axConnection, const std::string& asMode) {
     constexpr auto kPause = std::chrono::milliseconds(2);
     auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(kBusyTimeoutMs);
     while (true) {
         sqlite3_stmt* pragma = nullptr;
-        int result = sqlite3_prepare_v2(axConnection.Db(), "PRAGMA journal_mode = WAL", -1, &pragma,
-                                        nullptr);
+        std::string sql = "PRAGMA journal_mode = " + asMode;
+        int result = sqlite3_prepare_v2(axConnection.Db(), sql.c_str(), -1, &pragma, nullptr);
         std::string mode;
         if (result == SQLITE_OK) {
             result = sqlite3_step(pragma);
@@ -291,12 +299,12 @@ void SwitchToWal(Connection& axConnection) {
             }
         }
         sqlite3_finalize(pragma);
-        if (result == SQLITE_OK && mode == "wal") return;
+        if (result == SQLITE_OK && mode == asMode) return;
         // Another mode back means the switch could not take its lock either.
         bool busy = result == SQLITE_OK || (result & 0xFF) == SQLITE_BUSY ||
                     (result & 0xFF) == SQLITE_LOCKED;
         if (!busy || std::chrono::steady_clock::now() > deadline) {
-            Fail(axConnection, result, "cannot switch to WAL mode");
+            Fail(axConnection, result, "cannot switch to journal mode " + asMode);
         }
         std::this_thread::sleep_for(kPause);
     }
@@ -330,15 +338,15 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
     sqlite3_extended_result_codes(pDb, 1);
     sqlite3_busy_timeout(pDb, kBusyTimeoutMs);
     if (writable) {
-        // Keep -wal and -shm of the machine hive after the last writer
-        // closes, so that users without write access to its directory can
-        // still read it.
         if (axHive == RegistryHive::LocalMachine) {
-            int persist = 1;
-            sqlite3_file_control(pDb, "main", SQLITE_FCNTL_PERSIST_WAL, &persist);
+            // The machine hive is written rarely, by administrators, and read
+            // by every user: a rollback journal leaves no -wal/-shm files
+            // that a reader would need to write.
+            SetJournalMode(*connection, "delete");
+        } else {
+            SetJournalMode(*connection, "wal");
+            connection->Exec("PRAGMA synchronous = NORMAL", "cannot set the sync mode");
         }
-        SwitchToWal(*connection);
-        connection->Exec("PRAGMA synchronous = NORMAL", "cannot set the sync mode");
     }
     PrepareSchema(*connection);
     return connection;
