@@ -1,7 +1,11 @@
 // nxreg as an administrator uses it: registering LumaServer and a peer,
 // reading the log options, moving keys through REGEDIT4 files.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
+
+#include <filesystem>
+#include <thread>
 
 #include <cstdio>
 
@@ -102,6 +106,55 @@ TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     Result corrupt = Run("get 'HKCU\\Software' a");
     EXPECT_EQ(corrupt.status, 3);
     EXPECT_NE(corrupt.out.find(dir.File("user.sqlite")), std::string::npos) << corrupt.out;
+}
+
+TEST_F(NxregTest, OutputsKeepLinksFifosAndDevicesAndFailuresAreReported) {
+    const std::string key = "'HKCU\\Software\\K-Lume\\Out'";
+    ASSERT_EQ(Run("set " + key + " Name value").status, 0);
+    // Standard output that cannot be written is a failure.
+    EXPECT_EQ(Run("export " + key + " > /dev/full").status, 3);
+    EXPECT_EQ(Run("list " + key + " > /dev/full").status, 3);
+    // A device is written, never replaced by a plain file.
+    EXPECT_EQ(Run("export " + key + " /dev/null").status, 0);
+    EXPECT_EQ(Run("export " + key + " /dev/full").status, 3);
+    struct stat info {};
+    ASSERT_EQ(::stat("/dev/null", &info), 0);
+    EXPECT_TRUE(S_ISCHR(info.st_mode));
+    // A symlink stays a link; its target gets the text.
+    std::string target = dir.File("real.reg");
+    nxtest::WriteFile(target, "old");
+    std::filesystem::create_symlink(target, dir.File("link.reg"));
+    ASSERT_EQ(Run("export " + key + " " + dir.File("link.reg")).status, 0);
+    EXPECT_TRUE(std::filesystem::is_symlink(dir.File("link.reg")));
+    EXPECT_NE(nxtest::ReadFile(target).find("\"Name\"=\"value\""), std::string::npos);
+    // A FIFO is written through.
+    std::string fifo = dir.File("pipe.reg");
+    ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
+    std::string received;
+    std::thread reader([&] { received = nxtest::ReadFile(fifo); });
+    EXPECT_EQ(Run("export " + key + " " + fifo).status, 0);
+    reader.join();
+    EXPECT_NE(received.find("REGEDIT4"), std::string::npos);
+    struct stat fifoInfo {};
+    ASSERT_EQ(::lstat(fifo.c_str(), &fifoInfo), 0);
+    EXPECT_TRUE(S_ISFIFO(fifoInfo.st_mode));
+    // Nothing is left beside the targets.
+    for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
+        EXPECT_EQ(entry.path().filename().string().find(".XXX"), std::string::npos);
+        EXPECT_NE(entry.path().filename().string().front(), '.') << entry.path();
+    }
+}
+
+TEST_F(NxregTest, AnImportTouchingBothHivesWritesBothOrNeither) {
+    // The machine hive cannot be written (its directory does not exist and
+    // cannot be made): the user hive must stay untouched as well.
+    nxtest::ScopedEnv machineHive("NXBASE_MACHINE_REGISTRY", "/proc/nxbase-no/machine.sqlite");
+    const std::string file = dir.File("both.reg");
+    nxtest::WriteFile(file,
+                      "REGEDIT4\n[HKEY_CURRENT_USER\\Software\\K-Lume\\Both]\n\"u\"=\"1\"\n"
+                      "[HKEY_LOCAL_MACHINE\\Software\\K-Lume\\Both]\n\"m\"=\"1\"\n");
+    EXPECT_EQ(Run("import " + file).status, 3);
+    EXPECT_EQ(Run("get 'HKCU\\Software\\K-Lume\\Both' u").status, 1);
 }
 
 }  // namespace

@@ -9,6 +9,7 @@
 
 #include "nxbase/logfile.h"
 #include "test_util.h"
+#include "toolkit/string.h"
 
 namespace {
 
@@ -374,7 +375,9 @@ TEST_F(RegistryTest, Regedit4ErrorsNameSourceAndLineAndApplyNothing) {
         {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\\q\"\n", "trip.reg:3: unknown escape \\q"},
         {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\n", "trip.reg:3: missing closing quote"},
         {"REGEDIT4\n[HKCU\\x]\n\"a\"=\"b\" junk\n", "trip.reg:3: text after the closing quote"},
-        {"REGEDIT4\n[HKCU\\x]\n\"a\"=hex:01,02\n", "trip.reg:3: binary (hex) values"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=hex:01,0g\n", "trip.reg:3: hex data must be byte pairs"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=hex:01,\n", "trip.reg:3: hex data ends with a comma"},
+        {"REGEDIT4\n[HKCU\\x]\n\"a\"=hex(z):01\n", "trip.reg:3: hex(N) needs"},
         {"REGEDIT4\n[HKCU\\x]\n\"a\"\n", "trip.reg:3: missing ="},
         {"REGEDIT4\n[-HKCU\\]\n", "trip.reg:2: a whole hive cannot be deleted"},
     };
@@ -387,6 +390,93 @@ TEST_F(RegistryTest, Regedit4ErrorsNameSourceAndLineAndApplyNothing) {
         }
     }
     EXPECT_FALSE(std::filesystem::exists(dir.File("user/registry.sqlite")));
+}
+
+// The UTF-16LE bytes, with byte-order mark, of what regedit writes by default.
+std::string Utf16Le(const std::u16string& text) {
+    std::string bytes = "\xFF\xFE";
+    for (char16_t unit : text) {
+        bytes += static_cast<char>(unit & 0xFF);
+        bytes += static_cast<char>(unit >> 8);
+    }
+    return bytes;
+}
+
+TEST_F(RegistryTest, RegeditFiveInUtf16WithHexValuesImportsTypedAndInUtf8) {
+    const std::u16string file =
+        u"Windows Registry Editor Version 5.00\r\n\r\n"
+        u"[HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\u00fc\u00dfe]\r\n"
+        u"\"Name\"=\"Wei\u00df \u20ac\"\r\n"
+        u"\"Blob\"=hex:00,01,ff\r\n"
+        u"\"Expand\"=hex(2):25,00,54,00,45,00,4d,00,50,00,25,00,00,00\r\n"
+        u"\"Multi\"=hex(7):61,00,00,00,c4,00,62,00,00,00,\\\r\n"
+        u"  00,00\r\n";
+    auto changes = nxbase::ParseRegedit4(Utf16Le(file), "v5.reg");
+    RegistryStore::Apply(changes);
+    const std::string key = "Software\\K-Lume\\Gr\xC3\xBC\xC3\x9F" "e";  // UTF-8 in the hive
+    auto name = RegistryStore::Read(RegistryHive::CurrentUser, key, "Name");
+    ASSERT_TRUE(name);
+    EXPECT_EQ(name->text, "Wei\xC3\x9F \xE2\x82\xAC");
+    auto blob = RegistryStore::Read(RegistryHive::CurrentUser, key, "Blob");
+    ASSERT_TRUE(blob);
+    EXPECT_EQ(blob->type, nxbase::RegistryType::Binary);
+    EXPECT_EQ(blob->text, std::string("\x00\x01\xFF", 3));
+    auto expand = RegistryStore::Read(RegistryHive::CurrentUser, key, "Expand");
+    ASSERT_TRUE(expand);
+    EXPECT_EQ(expand->type, nxbase::RegistryType::ExpandString);
+    EXPECT_EQ(expand->text, "%TEMP%");
+    auto multi = RegistryStore::Read(RegistryHive::CurrentUser, key, "Multi");
+    ASSERT_TRUE(multi);
+    EXPECT_EQ(multi->type, nxbase::RegistryType::MultiString);
+    EXPECT_EQ(multi->text, std::string("a\0\xC3\x84" "b\0", 6));
+
+    // The application's ANSI view: Windows-1252 bytes, and the key-type error
+    // for the typed values.
+    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF" "e", "Name"),
+              "Wei\xDF \x80");
+    EXPECT_THROW(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF" "e",
+                                         "Multi"),
+                 nxbase::RegistryKeyTypeError);
+
+    // Exported and read back: the same typed values.
+    std::string exported = nxbase::ExportRegedit4(RegistryHive::CurrentUser, key);
+    nxtest::TempDir other;
+    nxtest::ScopedEnv otherHive("NXBASE_USER_REGISTRY", other.File("r.sqlite"));
+    RegistryStore::Apply(nxbase::ParseRegedit4(exported, "exported.reg"));
+    for (const char* value : {"Name", "Blob", "Expand", "Multi"}) {
+        auto back = RegistryStore::Read(RegistryHive::CurrentUser, key, value);
+        ASSERT_TRUE(back) << value;
+        auto original = value == std::string("Name") ? name : value == std::string("Blob") ? blob
+                        : value == std::string("Expand")                          ? expand
+                                                                                   : multi;
+        EXPECT_EQ(back->type, original->type) << value;
+        EXPECT_EQ(back->text, original->text) << value;
+    }
+
+    // A name holding a NUL byte is refused with file and line, the byte escaped.
+    try {
+        std::u16string withNul = u"Windows Registry Editor Version 5.00\r\n[HKCU\\x]\r\n\"a";
+        withNul += char16_t(0);
+        withNul += u"b\"=\"c\"\r\n";
+        nxbase::ParseRegedit4(Utf16Le(withNul), "nul.reg");
+        ADD_FAILURE() << "a NUL in a name was accepted";
+    } catch (const std::runtime_error& error) {
+        EXPECT_EQ(std::string(error.what()),
+                  "nul.reg:3: a value name holding a NUL byte: \"a\\x00b\"=\"c\"");
+    }
+}
+
+TEST_F(RegistryTest, ApplicationStringsReadBackByteForByteAndTheHiveHoldsUtf8) {
+    std::string ansi;
+    for (int byte = 0x20; byte < 0x100; ++byte) ansi += static_cast<char>(byte);
+    ASSERT_TRUE(RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Texts", "All\xE4", ansi));
+    EXPECT_EQ(RegistryHandler::GetValue(HKEY_CURRENT_USER, "Texts", "All\xE4"), ansi);
+    auto stored = RegistryStore::Read(RegistryHive::CurrentUser, std::string(kRoot) + "\\Texts",
+                                      "All\xC3\xA4");
+    ASSERT_TRUE(stored);
+    EXPECT_EQ(stored->text, toolkit::Windows1252ToUtf8(ansi));
+    EXPECT_EQ(toolkit::Utf8ToWindows1252(stored->text), ansi);
+    EXPECT_EQ(toolkit::Utf8ToWindows1252("\xE2\x82\xAC \xE4\xB8\xAD \xFF"), "\x80 ? ?");
 }
 
 TEST_F(RegistryTest, LogOptionsInTheUsersHiveReachANewLogFile) {

@@ -3,6 +3,9 @@
 #ifndef NXBASE_FILES_H_
 #define NXBASE_FILES_H_
 
+#include <string>
+#include <string_view>
+
 #include "nxbase/export.h"
 #include "toolkit/string.h"
 
@@ -12,5 +15,23 @@
 // dots become "_" as well (so "." and ".." cannot result), and an empty name
 // becomes "_".
 NXBASE_EXPORT String MakeValidFileName(const String& asName);
+
+namespace nxbase {
+
+// Writes `content` as the whole of the file at `path`, so that the file is
+// either the old one or the complete new one, never a part:
+// - a regular file (or a missing one) is replaced through a temporary file
+//   in its directory, synced and renamed over it; an existing file keeps its
+//   permissions. When the directory cannot take the temporary file but the
+//   file itself is writable, the file is rewritten in place instead.
+// - a symbolic link is followed to its final target, which is replaced as
+//   above; the link stays a link.
+// - anything else (a FIFO, a terminal, /dev/null, /dev/full) is opened and
+//   written directly, never replaced by a plain file.
+// Every write is checked; throws std::runtime_error naming the file and the
+// reason on failure, leaving no temporary file behind.
+NXBASE_EXPORT void WriteWholeFile(const std::string& path, std::string_view content);
+
+}  // namespace nxbase
 
 #endif  // NXBASE_FILES_H_

@@ -216,18 +216,31 @@ NXBASE_EXPORT bool SplitRegistryPath(const std::string& asPath, RegistryHive& ax
 // The hive's database file from the environment (see the top of this file).
 NXBASE_EXPORT std::string RegistryHiveFile(RegistryHive axHive);
 
-// Value types, numbered as Windows numbers them.
-enum class RegistryType : std::uint32_t { String = 1, Dword = 4 };
+// Value types, numbered as Windows numbers them. Only String values are read
+// by the library's string readers; the others exist so that files written by
+// Windows' regedit import whole (and those readers raise the key-type error).
+enum class RegistryType : std::uint32_t {
+    String = 1,
+    ExpandString = 2,
+    Binary = 3,
+    Dword = 4,
+    MultiString = 7
+};
 
+// Names, key paths and texts in the store are UTF-8.
 struct NXBASE_EXPORT RegistryValue {
     std::string name;
     RegistryType type = RegistryType::String;
-    std::string text;         // data of a String value
+    // The data of every type but Dword: the text of a String or ExpandString,
+    // the bytes of a Binary (or of a type not listed above), and the strings
+    // of a MultiString, each followed by one zero byte.
+    std::string text;
     std::uint32_t dword = 0;  // data of a Dword value
 
     static RegistryValue Text(const std::string& asName, const std::string& asText);
     static RegistryValue Dword(const std::string& asName, std::uint32_t alValue);
-    // The data as text (a Dword in decimal).
+    // The data as text: a Dword in decimal, a MultiString's strings one per
+    // line, a Binary as hexadecimal byte pairs ("0a,ff").
     std::string ToString() const;
 };
 
@@ -270,15 +283,22 @@ class NXBASE_EXPORT RegistryStore {
 
 // ---- REGEDIT4 text ----
 
-// Parses REGEDIT4 text: the header line "REGEDIT4", then sections
-// "[HKEY_CURRENT_USER\...]" (or "[-HKEY_...]" to delete a key) holding lines
-// "name"="text" (with \" and \\ escaped; \n and \r stand for line breaks),
-// "name"=dword:0000000a, "name"=- (delete) and @ for the unnamed value;
-// ";" starts a comment line. Throws std::runtime_error naming the source,
-// the line and the offending text on the first error; nothing is applied.
+// Parses registry text: the header line "REGEDIT4" or "Windows Registry
+// Editor Version 5.00", then sections "[HKEY_CURRENT_USER\...]" (or
+// "[-HKEY_...]" to delete a key) holding lines "name"="text" (quote and
+// backslash escaped; \n and \r stand for line breaks), "name"=dword:0000000a,
+// "name"=hex:.., hex(2):.. (expandable), hex(7):.. (multi-string) and
+// hex(N):.., each continued over lines ending in ",\", "name"=- (delete) and
+// @ for the unnamed value; ";" starts a comment line. The text is UTF-16LE
+// when it starts with its byte-order mark (what regedit writes by default;
+// hex(2)/hex(7) bytes are then UTF-16LE too), else UTF-8 when it is valid
+// UTF-8, else Windows-1252; the changes hold UTF-8. Throws
+// std::runtime_error naming the source, the line and the offending text
+// (control bytes escaped as \xNN) on the first error; nothing is applied.
 NXBASE_EXPORT std::vector<RegistryStore::Change> ParseRegedit4(const std::string& asText,
                                                                const std::string& asSource);
-// Writes the key and everything below it as REGEDIT4 text.
+// Writes the key and everything below it as REGEDIT4 text in UTF-8 (hex(2)
+// and hex(7) data as UTF-8 bytes with their zero bytes).
 NXBASE_EXPORT std::string ExportRegedit4(RegistryHive axHive, const std::string& asKey);
 
 // ---- log options ----

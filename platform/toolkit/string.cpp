@@ -187,3 +187,90 @@ String operator+(const char* a, const String& b) {
 std::ostream& operator<<(std::ostream& out, const String& text) {
     return out << text.str();
 }
+
+namespace toolkit {
+namespace {
+
+// Code points of the bytes 0x80..0x9F; the rest of the code page is Latin-1.
+constexpr char32_t kHighControls[32] = {
+    0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021,
+    0x02C6, 0x2030, 0x0160, 0x2039, 0x0152, 0x008D, 0x017D, 0x008F,
+    0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022, 0x2013, 0x2014,
+    0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
+
+bool IsAscii(std::string_view text) {
+    for (char c : text) {
+        if (static_cast<unsigned char>(c) >= 0x80) return false;
+    }
+    return true;
+}
+
+void AppendUtf8(std::string& out, char32_t code) {
+    if (code < 0x80) {
+        out += static_cast<char>(code);
+    } else if (code < 0x800) {
+        out += static_cast<char>(0xC0 | (code >> 6));
+        out += static_cast<char>(0x80 | (code & 0x3F));
+    } else {
+        out += static_cast<char>(0xE0 | (code >> 12));
+        out += static_cast<char>(0x80 | ((code >> 6) & 0x3F));
+        out += static_cast<char>(0x80 | (code & 0x3F));
+    }
+}
+
+// The byte for `code`, or '?' when the code page has none.
+char ByteFor(char32_t code) {
+    if (code < 0x80 || (code >= 0xA0 && code <= 0xFF)) return static_cast<char>(code);
+    for (int i = 0; i < 32; ++i) {
+        if (kHighControls[i] == code) return static_cast<char>(0x80 + i);
+    }
+    return '?';
+}
+
+// Decodes one UTF-8 sequence at `at`; returns its length, 0 when invalid.
+std::size_t DecodeUtf8(std::string_view text, std::size_t at, char32_t& code) {
+    unsigned char lead = static_cast<unsigned char>(text[at]);
+    std::size_t length = lead < 0xC2 ? 0 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 0;
+    if (length == 0 || at + length > text.size()) return 0;
+    code = lead & (0x7F >> length);
+    for (std::size_t i = 1; i < length; ++i) {
+        unsigned char next = static_cast<unsigned char>(text[at + i]);
+        if ((next & 0xC0) != 0x80) return 0;
+        code = (code << 6) | (next & 0x3F);
+    }
+    bool overlong = (length == 3 && code < 0x800) || (length == 4 && code < 0x10000);
+    bool surrogate = code >= 0xD800 && code <= 0xDFFF;
+    return overlong || surrogate || code > 0x10FFFF ? 0 : length;
+}
+
+}  // namespace
+
+std::string Windows1252ToUtf8(std::string_view ansi) {
+    if (IsAscii(ansi)) return std::string(ansi);
+    std::string out;
+    out.reserve(ansi.size() * 2);
+    for (char c : ansi) {
+        unsigned char byte = static_cast<unsigned char>(c);
+        AppendUtf8(out, byte >= 0x80 && byte < 0xA0 ? kHighControls[byte - 0x80] : byte);
+    }
+    return out;
+}
+
+std::string Utf8ToWindows1252(std::string_view utf8) {
+    if (IsAscii(utf8)) return std::string(utf8);
+    std::string out;
+    out.reserve(utf8.size());
+    for (std::size_t at = 0; at < utf8.size();) {
+        if (static_cast<unsigned char>(utf8[at]) < 0x80) {
+            out += utf8[at++];
+            continue;
+        }
+        char32_t code = 0;
+        std::size_t length = DecodeUtf8(utf8, at, code);
+        out += length == 0 ? '?' : ByteFor(code);
+        at += length == 0 ? 1 : length;
+    }
+    return out;
+}
+
+}  // namespace toolkit

@@ -4,6 +4,7 @@
 #include <string_view>
 
 #include "nxbase/registry.h"
+#include "toolkit/string.h"
 
 namespace nxbase {
 namespace {
@@ -17,12 +18,89 @@ class ParseError : public std::runtime_error {
     using std::runtime_error::runtime_error;
 };
 
+// The start of the offending text, with control bytes written as \xNN so
+// that an error message never carries them to a terminal.
 std::string Excerpt(std::string_view asText) {
-    std::string excerpt(asText.substr(0, kMaxExcerpt));
-    for (char& c : excerpt) {
-        if (static_cast<unsigned char>(c) < 0x20) c = '?';
+    static const char kDigits[] = "0123456789ABCDEF";
+    std::string excerpt;
+    for (char c : asText.substr(0, kMaxExcerpt)) {
+        unsigned char byte = static_cast<unsigned char>(c);
+        if (byte < 0x20 || byte == 0x7F) {
+            excerpt += "\\x";
+            excerpt += kDigits[byte >> 4];
+            excerpt += kDigits[byte & 15];
+        } else {
+            excerpt += c;
+        }
     }
     return asText.size() > kMaxExcerpt ? excerpt + "..." : excerpt;
+}
+
+// ---- the text's encoding ----
+
+void AppendUtf8(std::string& axOut, char32_t alCode) {
+    if (alCode < 0x80) {
+        axOut += static_cast<char>(alCode);
+    } else if (alCode < 0x800) {
+        axOut += static_cast<char>(0xC0 | (alCode >> 6));
+        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
+    } else if (alCode < 0x10000) {
+        axOut += static_cast<char>(0xE0 | (alCode >> 12));
+        axOut += static_cast<char>(0x80 | ((alCode >> 6) & 0x3F));
+        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
+    } else {
+        axOut += static_cast<char>(0xF0 | (alCode >> 18));
+        axOut += static_cast<char>(0x80 | ((alCode >> 12) & 0x3F));
+        axOut += static_cast<char>(0x80 | ((alCode >> 6) & 0x3F));
+        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
+    }
+}
+
+// UTF-16LE bytes (an odd last byte ignored) as UTF-8; a lone surrogate
+// becomes U+FFFD.
+std::string Utf16LeToUtf8(std::string_view asBytes) {
+    std::string out;
+    out.reserve(asBytes.size());
+    auto unit = [&](std::size_t at) {
+        return static_cast<char16_t>(static_cast<unsigned char>(asBytes[at]) |
+                                     (static_cast<unsigned char>(asBytes[at + 1]) << 8));
+    };
+    for (std::size_t at = 0; at + 1 < asBytes.size(); at += 2) {
+        char32_t code = unit(at);
+        if (code >= 0xD800 && code <= 0xDBFF && at + 3 < asBytes.size()) {
+            char32_t low = unit(at + 2);
+            if (low >= 0xDC00 && low <= 0xDFFF) {
+                code = 0x10000 + ((code - 0xD800) << 10) + (low - 0xDC00);
+                at += 2;
+            }
+        }
+        if (code >= 0xD800 && code <= 0xDFFF) code = 0xFFFD;
+        AppendUtf8(out, code);
+    }
+    return out;
+}
+
+bool IsValidUtf8(std::string_view asText) {
+    for (std::size_t at = 0; at < asText.size();) {
+        unsigned char lead = static_cast<unsigned char>(asText[at]);
+        std::size_t length = lead < 0x80   ? 1
+                             : lead < 0xC2 ? 0
+                             : lead < 0xE0 ? 2
+                             : lead < 0xF0 ? 3
+                             : lead < 0xF5 ? 4
+                                           : 0;
+        if (length == 0 || at + length > asText.size()) return false;
+        for (std::size_t i = 1; i < length; ++i) {
+            if ((static_cast<unsigned char>(asText[at + i]) & 0xC0) != 0x80) return false;
+        }
+        at += length;
+    }
+    return true;
+}
+
+// Eight-bit text as UTF-8: kept when it is UTF-8 already, else Windows-1252.
+std::string NarrowToUtf8(std::string_view asText) {
+    return IsValidUtf8(asText) ? std::string(asText) : toolkit::Windows1252ToUtf8(asText);
 }
 
 std::string_view TrimRight(std::string_view asText) {
@@ -73,7 +151,81 @@ std::string ReadQuoted(std::string_view& axText) {
     return result;
 }
 
-RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDelete) {
+// The bytes of "0a,ff,..." (spaces allowed around the commas; may be empty).
+std::string ReadHexBytes(std::string_view asList) {
+    std::string bytes;
+    asList = TrimLeft(TrimRight(asList));
+    while (!asList.empty()) {
+        std::size_t comma = asList.find(',');
+        std::string_view pair = TrimLeft(TrimRight(asList.substr(0, comma)));
+        unsigned value = 0;
+        auto [end, error] = std::from_chars(pair.data(), pair.data() + pair.size(), value, 16);
+        if (pair.empty() || pair.size() > 2 || error != std::errc() ||
+            end != pair.data() + pair.size()) {
+            throw ParseError("hex data must be byte pairs separated by commas");
+        }
+        bytes += static_cast<char>(value);
+        if (comma == std::string_view::npos) break;
+        asList.remove_prefix(comma + 1);
+        if (TrimLeft(asList).empty()) throw ParseError("hex data ends with a comma");
+    }
+    return bytes;
+}
+
+// hex(2) and hex(7) data: zero-terminated strings in the file's units.
+std::vector<std::string> ReadStrings(const std::string& asBytes, bool abWide) {
+    std::string text = abWide ? Utf16LeToUtf8(asBytes) : NarrowToUtf8(asBytes);
+    std::vector<std::string> strings;
+    std::size_t start = 0;
+    while (start < text.size()) {
+        std::size_t end = text.find('\0', start);
+        if (end == std::string::npos) end = text.size();
+        if (end == start) break;  // the empty string ends a multi-string
+        strings.push_back(text.substr(start, end - start));
+        start = end + 1;
+    }
+    return strings;
+}
+
+RegistryValue ReadHexValue(std::string_view asData, std::string asName, bool abWide) {
+    std::uint32_t type = static_cast<std::uint32_t>(RegistryType::Binary);
+    asData.remove_prefix(3);  // "hex"
+    if (!asData.empty() && asData.front() == '(') {
+        std::size_t close = asData.find(')');
+        std::string_view digits = asData.substr(1, close == std::string_view::npos ? 0 : close - 1);
+        auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), type, 16);
+        if (close == std::string_view::npos || digits.empty() || error != std::errc() ||
+            end != digits.data() + digits.size()) {
+            throw ParseError("hex(N) needs a hexadecimal type number");
+        }
+        asData.remove_prefix(close + 1);
+    }
+    if (asData.empty() || asData.front() != ':') throw ParseError("missing : after hex");
+    RegistryValue value;
+    value.name = std::move(asName);
+    value.type = static_cast<RegistryType>(type);
+    std::string bytes = ReadHexBytes(asData.substr(1));
+    if (value.type == RegistryType::ExpandString) {
+        std::vector<std::string> strings = ReadStrings(bytes, abWide);
+        value.text = strings.empty() ? std::string() : strings.front();
+    } else if (value.type == RegistryType::MultiString) {
+        for (const std::string& one : ReadStrings(bytes, abWide)) {
+            value.text += one;
+            value.text += '\0';
+        }
+    } else if (value.type == RegistryType::Dword) {
+        if (bytes.size() != 4) throw ParseError("hex(4) needs four bytes");
+        value.dword = 0;
+        for (int i = 3; i >= 0; --i) {
+            value.dword = (value.dword << 8) | static_cast<unsigned char>(bytes[i]);
+        }
+    } else {
+        value.text = std::move(bytes);
+    }
+    return value;
+}
+
+RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDelete, bool abWide) {
     axDelete = false;
     if (asData == "-") {
         axDelete = true;
@@ -96,11 +248,17 @@ RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDele
         }
         return RegistryValue::Dword(asName, number);
     }
-    if (asData.substr(0, 3) == "hex") throw ParseError("binary (hex) values are not supported");
-    throw ParseError("a value must be \"text\", dword:XXXXXXXX or -");
+    if (asData.substr(0, 3) == "hex") return ReadHexValue(asData, std::move(asName), abWide);
+    throw ParseError("a value must be \"text\", dword:XXXXXXXX, hex...: or -");
 }
 
-void ParseLine(std::string_view asLine, bool& axHeaderSeen, bool& axInSection,
+void RefuseZeroByte(const std::string& asName, const char* asWhat) {
+    if (asName.find('\0') != std::string::npos) {
+        throw ParseError(std::string("a ") + asWhat + " holding a NUL byte");
+    }
+}
+
+void ParseLine(std::string_view asLine, bool abWide, bool& axHeaderSeen, bool& axInSection,
                RegistryStore::Change& axSection, std::vector<RegistryStore::Change>& axChanges) {
     std::string_view line = TrimLeft(TrimRight(asLine));
     if (!axHeaderSeen) {
@@ -118,6 +276,7 @@ void ParseLine(std::string_view asLine, bool& axHeaderSeen, bool& axInSection,
         bool remove = !path.empty() && path.front() == '-';
         if (remove) path.remove_prefix(1);
         RegistryStore::Change change;
+        RefuseZeroByte(std::string(path), "key path");
         if (!SplitRegistryPath(std::string(path), change.hive, change.key)) {
             throw ParseError("unknown hive (HKEY_CURRENT_USER or HKEY_LOCAL_MACHINE)");
         }
@@ -137,6 +296,7 @@ void ParseLine(std::string_view asLine, bool& axHeaderSeen, bool& axInSection,
         line.remove_prefix(1);
     } else if (line.front() == '"') {
         name = ReadQuoted(line);
+        RefuseZeroByte(name, "value name");
     } else {
         throw ParseError("a value line must start with \"name\" or @");
     }
@@ -145,7 +305,7 @@ void ParseLine(std::string_view asLine, bool& axHeaderSeen, bool& axInSection,
     line = TrimLeft(line.substr(1));
     bool remove = false;
     RegistryStore::Change change = axSection;
-    change.value = ReadData(line, name, remove);
+    change.value = ReadData(line, name, remove, abWide);
     change.kind =
         remove ? RegistryStore::Change::Kind::DeleteValue : RegistryStore::Change::Kind::SetValue;
     axChanges.push_back(std::move(change));
@@ -174,32 +334,80 @@ void AppendQuoted(std::string& axOut, const std::string& asText) {
     axOut += '"';
 }
 
+// hex:, hex(2): or hex(N): and the bytes of a value that is neither a
+// String nor a Dword; the strings of hex(2)/hex(7) as UTF-8 with their zeros.
+void AppendHex(std::string& axOut, const RegistryValue& axValue) {
+    static const char kDigits[] = "0123456789abcdef";
+    std::string bytes = axValue.text;
+    if (axValue.type == RegistryType::Binary) {
+        axOut += "hex:";
+    } else {
+        char type[9];
+        auto end = std::to_chars(type, type + sizeof type, static_cast<std::uint32_t>(axValue.type), 16);
+        axOut += "hex(";
+        axOut.append(type, end.ptr);
+        axOut += "):";
+        if (axValue.type == RegistryType::ExpandString) bytes += '\0';
+        if (axValue.type == RegistryType::MultiString) bytes += '\0';
+    }
+    for (std::size_t i = 0; i < bytes.size(); ++i) {
+        if (i > 0) axOut += ',';
+        unsigned char byte = static_cast<unsigned char>(bytes[i]);
+        axOut += kDigits[byte >> 4];
+        axOut += kDigits[byte & 15];
+    }
+}
+
 }  // namespace
 
 std::vector<RegistryStore::Change> ParseRegedit4(const std::string& asText,
                                                  const std::string& asSource) {
+    bool wide = asText.size() >= 2 && asText[0] == '\xFF' && asText[1] == '\xFE';
+    std::string decoded;
+    if (wide) {
+        decoded = Utf16LeToUtf8(std::string_view(asText).substr(2));
+    } else {
+        std::string_view narrow(asText);
+        if (narrow.substr(0, 3) == "\xEF\xBB\xBF") narrow.remove_prefix(3);  // UTF-8 mark
+        decoded = NarrowToUtf8(narrow);
+    }
     std::vector<RegistryStore::Change> changes;
-    std::string_view text(asText);
-    if (text.substr(0, 3) == "\xEF\xBB\xBF") text.remove_prefix(3);  // UTF-8 byte order mark
+    std::string_view text(decoded);
     bool headerSeen = false;
     bool inSection = false;
     RegistryStore::Change section;
     std::size_t lineNumber = 0;
     std::size_t start = 0;
-    while (start < text.size()) {
+    auto nextLine = [&](std::string_view& axLine) {
         std::size_t end = text.find('\n', start);
         if (end == std::string_view::npos) end = text.size();
-        std::string_view line = text.substr(start, end - start);
-        if (!line.empty() && line.back() == '\r') line.remove_suffix(1);
-        ++lineNumber;
-        try {
-            if (line.size() > kMaxLineLength) throw ParseError("line too long");
-            ParseLine(line, headerSeen, inSection, section, changes);
-        } catch (const ParseError& error) {
-            throw std::runtime_error(asSource + ":" + std::to_string(lineNumber) + ": " +
-                                     error.what() + ": " + Excerpt(line));
-        }
+        axLine = text.substr(start, end - start);
+        if (!axLine.empty() && axLine.back() == '\r') axLine.remove_suffix(1);
         start = end + 1;
+        ++lineNumber;
+    };
+    while (start < text.size()) {
+        std::string_view physical;
+        nextLine(physical);
+        std::size_t firstLine = lineNumber;
+        std::string logical(physical);
+        try {
+            // Hex data continues on the next line after ",\".
+            while (TrimRight(logical).size() >= 2 && TrimRight(logical).substr(
+                                                         TrimRight(logical).size() - 2) == ",\\" &&
+                   start < text.size()) {
+                logical.resize(TrimRight(logical).size() - 1);
+                std::string_view more;
+                nextLine(more);
+                logical += TrimLeft(more);
+                if (logical.size() > kMaxLineLength) throw ParseError("line too long");
+            }
+            if (logical.size() > kMaxLineLength) throw ParseError("line too long");
+            ParseLine(logical, wide, headerSeen, inSection, section, changes);
+        } catch (const ParseError& error) {
+            throw std::runtime_error(asSource + ":" + std::to_string(firstLine) + ": " +
+                                     error.what() + ": " + Excerpt(logical));
+        }
     }
     if (!headerSeen) throw std::runtime_error(asSource + ": not REGEDIT4 text (empty)");
     return changes;
@@ -219,7 +427,9 @@ std::string ExportRegedit4(RegistryHive axHive, const std::string& asKey) {
                 AppendQuoted(out, value.name);
             }
             out += '=';
-            if (value.type == RegistryType::Dword) {
+            if (value.type != RegistryType::Dword && value.type != RegistryType::String) {
+                AppendHex(out, value);
+            } else if (value.type == RegistryType::Dword) {
                 char digits[kMaxDwordDigits + 1] = "00000000";
                 char number[kMaxDwordDigits];
                 auto result = std::to_chars(number, number + sizeof number, value.dword, 16);

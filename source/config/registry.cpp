@@ -7,6 +7,7 @@
 #include <mutex>
 
 #include "nxbase/logfile.h"
+#include "toolkit/string.h"
 
 // An opened key: the hive and the normalised key path.
 struct HKEY__ {
@@ -25,6 +26,17 @@ std::string Upper(std::string asText) {
     std::transform(asText.begin(), asText.end(), asText.begin(),
                    [](unsigned char c) { return static_cast<char>(std::toupper(c)); });
     return asText;
+}
+
+// The hive holds UTF-8; the applications' strings are ANSI (Windows-1252).
+// Converting at this boundary gives an application back exactly the bytes it
+// wrote, and tools that read the hive see one encoding.
+std::string ToHive(const std::string& asAnsi) {
+    return toolkit::Windows1252ToUtf8(asAnsi);
+}
+
+std::string FromHive(const std::string& asUtf8) {
+    return toolkit::Utf8ToWindows1252(asUtf8);
 }
 
 bool StartsWith(const std::string& asText, const char* asPrefix) {
@@ -49,11 +61,12 @@ RegistryHive RequireHive(HKEY axHKey) {
                                asKey + " is not a string");
 }
 
+// The string values of an ANSI key path, names and data in ANSI.
 std::map<std::string, std::string> StringValues(RegistryHive axHive, const std::string& asKey) {
     std::map<std::string, std::string> values;
-    for (RegistryValue& value : RegistryStore::Values(axHive, asKey)) {
-        if (value.type != RegistryType::String) ThrowTypeError(axHive, asKey, value.name);
-        values.emplace(std::move(value.name), std::move(value.text));
+    for (RegistryValue& value : RegistryStore::Values(axHive, ToHive(asKey))) {
+        if (value.type != RegistryType::String) ThrowTypeError(axHive, asKey, FromHive(value.name));
+        values.emplace(FromHive(value.name), FromHive(value.text));
     }
     return values;
 }
@@ -76,9 +89,9 @@ bool SplitFullPath(const std::string& asPath, RegistryHive& axHive, std::string&
 // Opening a full path creates its key. A hive that this process may not
 // write (the machine's, for a user) is only read.
 void CreateKeyForReading(RegistryHive axHive, const std::string& asKey) {
-    if (RegistryStore::KeyExists(axHive, asKey)) return;
+    if (RegistryStore::KeyExists(axHive, ToHive(asKey))) return;
     try {
-        RegistryStore::CreateKey(axHive, asKey);
+        RegistryStore::CreateKey(axHive, ToHive(asKey));
     } catch (const RegistryError& error) {
         switch (error.Code() & 0xFF) {
             case 0:   // a directory that cannot be made
@@ -112,7 +125,29 @@ RegistryValue RegistryValue::Dword(const std::string& asName, std::uint32_t alVa
 }
 
 std::string RegistryValue::ToString() const {
-    return type == RegistryType::Dword ? std::to_string(dword) : text;
+    switch (type) {
+        case RegistryType::Dword:
+            return std::to_string(dword);
+        case RegistryType::String:
+        case RegistryType::ExpandString:
+            return text;
+        case RegistryType::MultiString: {
+            std::string lines = text;
+            while (!lines.empty() && lines.back() == '\0') lines.pop_back();
+            std::replace(lines.begin(), lines.end(), '\0', '\n');
+            return lines;
+        }
+        default: {
+            static const char kDigits[] = "0123456789abcdef";
+            std::string hex;
+            for (unsigned char byte : text) {
+                if (!hex.empty()) hex += ',';
+                hex += kDigits[byte >> 4];
+                hex += kDigits[byte & 15];
+            }
+            return hex;
+        }
+    }
 }
 
 std::optional<RegistryHive> HiveOf(HKEY axHKey) {
@@ -188,13 +223,13 @@ const std::string& RegistryHandler::GetRootPath() {
 std::string RegistryHandler::GetRegistryEntry(const RegistryEntry& axEntry,
                                               const std::string& asDefault) {
     RegistryHive hive = nxbase::RequireHive(axEntry.GetHKey());
-    std::optional<RegistryValue> value =
-        RegistryStore::Read(hive, axEntry.GetSubKey(), axEntry.GetKey());
+    std::optional<RegistryValue> value = RegistryStore::Read(
+        hive, nxbase::ToHive(axEntry.GetSubKey()), nxbase::ToHive(axEntry.GetKey()));
     if (!value) return asDefault;
     if (value->type != RegistryType::String) {
         nxbase::ThrowTypeError(hive, axEntry.GetSubKey(), axEntry.GetKey());
     }
-    return std::move(value->text);
+    return nxbase::FromHive(value->text);
 }
 
 std::string RegistryHandler::GetValue(HKEY axHKey, const std::string& asSubKey,
@@ -216,7 +251,9 @@ std::string RegistryHandler::GetGlobalValue(HKEY axHKey, const std::string& asSu
 
 bool RegistryHandler::AddRegistryEntry(const RegistryEntry& axEntry, const std::string& asValue) {
     RegistryHive hive = nxbase::RequireHive(axEntry.GetHKey());
-    RegistryStore::Write(hive, axEntry.GetSubKey(), RegistryValue::Text(axEntry.GetKey(), asValue));
+    RegistryStore::Write(
+        hive, nxbase::ToHive(axEntry.GetSubKey()),
+        RegistryValue::Text(nxbase::ToHive(axEntry.GetKey()), nxbase::ToHive(asValue)));
     return true;
 }
 
@@ -236,7 +273,8 @@ std::map<std::string, std::string> RegistryHandler::GetKeys(HKEY axHKey,
 
 std::uint32_t RegistryHandler::GetKeyCount(const RegistryEntry& axEntry) {
     RegistryHive hive = nxbase::RequireHive(axEntry.GetHKey());
-    return static_cast<std::uint32_t>(RegistryStore::Values(hive, axEntry.GetSubKey()).size());
+    return static_cast<std::uint32_t>(
+        RegistryStore::Values(hive, nxbase::ToHive(axEntry.GetSubKey())).size());
 }
 
 std::uint32_t RegistryHandler::GetKeyCount(HKEY axHKey, const std::string& asSubKey) {
@@ -248,7 +286,7 @@ bool RegistryHandler::DeleteKey(const RegistryEntry& axEntry) {
     HKeyHolder holder;
     if (!HasKey(axEntry, holder)) return false;
     return RegistryStore::DeleteValue(holder.GetHKey()->hive, holder.GetHKey()->path,
-                                      axEntry.GetKey());
+                                      nxbase::ToHive(axEntry.GetKey()));
 }
 
 bool RegistryHandler::DeleteKey(HKEY axHKey, const std::string& asKey) {
@@ -268,14 +306,16 @@ bool RegistryHandler::DeleteGroup(HKEY axHKey, const std::string& asGroup) {
 
 bool RegistryHandler::OpenKey(const RegistryEntry& axEntry, HKeyHolder& axHolder) {
     RegistryHive hive = nxbase::RequireHive(axEntry.GetHKey());
-    if (!RegistryStore::KeyExists(hive, axEntry.GetSubKey())) return false;
-    *axHolder.GetHKeyPtr() = new HKEY__{hive, axEntry.GetSubKey()};
+    std::string path = nxbase::ToHive(axEntry.GetSubKey());
+    if (!RegistryStore::KeyExists(hive, path)) return false;
+    *axHolder.GetHKeyPtr() = new HKEY__{hive, path};
     return true;
 }
 
 bool RegistryHandler::HasKey(const RegistryEntry& axEntry, HKeyHolder& axHolder) {
     if (!OpenKey(axEntry, axHolder)) return false;
-    return RegistryStore::Read(axHolder.GetHKey()->hive, axHolder.GetHKey()->path, axEntry.GetKey())
+    return RegistryStore::Read(axHolder.GetHKey()->hive, axHolder.GetHKey()->path,
+                               nxbase::ToHive(axEntry.GetKey()))
         .has_value();
 }
 
@@ -308,13 +348,14 @@ std::string NxReadRegistryKeyString(const std::string& asPath, const std::string
     RegistryHive hive;
     std::string key;
     if (!nxbase::SplitFullPath(asPath, hive, key)) return std::string();
-    std::optional<RegistryValue> value = RegistryStore::Read(hive, key, asValueName);
+    std::optional<RegistryValue> value =
+        RegistryStore::Read(hive, nxbase::ToHive(key), nxbase::ToHive(asValueName));
     if (!value) {
         nxbase::CreateKeyForReading(hive, key);
         return std::string();
     }
     if (value->type != RegistryType::String) nxbase::ThrowTypeError(hive, key, asValueName);
-    return std::move(value->text);
+    return nxbase::FromHive(value->text);
 }
 
 std::map<std::string, std::string> NxReadRegistryKeysString(const std::string& asPath) {
@@ -330,7 +371,8 @@ bool NxWriteRegistryKeyString(const std::string& asPath, const std::string& asVa
     RegistryHive hive;
     std::string key;
     if (!nxbase::SplitFullPath(asPath, hive, key)) return false;
-    RegistryStore::Write(hive, key, RegistryValue::Text(asValueName, asValue));
+    RegistryStore::Write(hive, nxbase::ToHive(key),
+                         RegistryValue::Text(nxbase::ToHive(asValueName), nxbase::ToHive(asValue)));
     return true;
 }
 
@@ -374,8 +416,9 @@ std::map<std::string, std::string> ReadLogOptionsFromRegistry() {
     std::map<std::string, std::string> options;
     const std::string& root = RegistryHandler::GetRootPath();
     if (root.empty()) return options;
-    for (RegistryValue& value : RegistryStore::Values(RegistryHive::CurrentUser, root + "\\Log")) {
-        options[value.name] = value.ToString();
+    for (RegistryValue& value :
+         RegistryStore::Values(RegistryHive::CurrentUser, ToHive(root) + "\\Log")) {
+        options[FromHive(value.name)] = FromHive(value.ToString());
     }
     return options;
 }

@@ -471,12 +471,11 @@ bool Upsert(Connection& axConnection, std::string_view asKey, const RegistryValu
 RegistryValue ValueFromRow(sqlite3_stmt* pStatement, int alTypeColumn, std::string asName) {
     RegistryValue value;
     value.name = std::move(asName);
-    if (sqlite3_column_int(pStatement, alTypeColumn) == static_cast<int>(RegistryType::Dword)) {
-        value.type = RegistryType::Dword;
+    value.type = static_cast<RegistryType>(sqlite3_column_int(pStatement, alTypeColumn));
+    if (value.type == RegistryType::Dword) {
         value.dword =
             static_cast<std::uint32_t>(sqlite3_column_int64(pStatement, alTypeColumn + 1));
     } else {
-        value.type = RegistryType::String;
         value.text = ColumnText(pStatement, alTypeColumn + 1);
     }
     return value;
@@ -654,7 +653,44 @@ bool RegistryStore::DeleteKey(RegistryHive axHive, const std::string& asKey) {
     return existed;
 }
 
+namespace {
+
+void ApplyToHive(Connection& axConnection, RegistryHive axHive,
+                 const std::vector<RegistryStore::Change>& axChanges) {
+    using Change = RegistryStore::Change;
+    for (const Change& change : axChanges) {
+        if (change.hive != axHive) continue;
+        std::string key = NormalizeKey(change.key);
+        switch (change.kind) {
+            case Change::Kind::CreateKey:
+                if (!key.empty()) EnsureKey(axConnection, key);
+                break;
+            case Change::Kind::DeleteKey:
+                DeleteTree(axConnection, key);
+                break;
+            case Change::Kind::SetValue:
+                EnsureKey(axConnection, key);
+                Upsert(axConnection, key, change.value);
+                break;
+            case Change::Kind::DeleteValue: {
+                sqlite3_stmt* erase = axConnection.Get(kDeleteValue);
+                Reset reset(erase);
+                BindText(erase, 1, key);
+                BindText(erase, 2, change.value.name);
+                Run(axConnection, erase, "cannot delete a value");
+                break;
+            }
+        }
+    }
+}
+
+}  // namespace
+
 void RegistryStore::Apply(const std::vector<Change>& axChanges) {
+    // Every hive's changes are made inside its own open transaction before
+    // any is committed, so that a hive this process may not write (or any
+    // other failure while changing) leaves both hives as they were.
+    std::vector<RegistryHive> hives;
     for (RegistryHive hive : {RegistryHive::CurrentUser, RegistryHive::LocalMachine}) {
         bool any = std::any_of(axChanges.begin(), axChanges.end(),
                                [&](const Change& change) { return change.hive == hive; });
@@ -664,33 +700,25 @@ void RegistryStore::Apply(const std::vector<Change>& axChanges) {
                 RefuseWholeHive(NormalizeKey(change.key));
             }
         }
-        Connection* connection = Connect(hive, true);
-        Transaction transaction(*connection);
-        for (const Change& change : axChanges) {
-            if (change.hive != hive) continue;
-            std::string key = NormalizeKey(change.key);
-            switch (change.kind) {
-                case Change::Kind::CreateKey:
-                    if (!key.empty()) EnsureKey(*connection, key);
-                    break;
-                case Change::Kind::DeleteKey:
-                    DeleteTree(*connection, key);
-                    break;
-                case Change::Kind::SetValue:
-                    EnsureKey(*connection, key);
-                    Upsert(*connection, key, change.value);
-                    break;
-                case Change::Kind::DeleteValue: {
-                    sqlite3_stmt* erase = connection->Get(kDeleteValue);
-                    Reset reset(erase);
-                    BindText(erase, 1, key);
-                    BindText(erase, 2, change.value.name);
-                    Run(*connection, erase, "cannot delete a value");
-                    break;
-                }
-            }
+        hives.push_back(hive);
+    }
+    std::vector<Connection*> connections;
+    for (RegistryHive hive : hives) connections.push_back(Connect(hive, true));
+    std::vector<std::unique_ptr<Transaction>> transactions;
+    for (std::size_t i = 0; i < hives.size(); ++i) {
+        transactions.push_back(std::make_unique<Transaction>(*connections[i]));
+        ApplyToHive(*connections[i], hives[i], axChanges);
+    }
+    for (std::size_t i = 0; i < hives.size(); ++i) {
+        try {
+            transactions[i]->Commit();
+        } catch (const RegistryError& error) {
+            if (i == 0) throw;
+            // The first hive is committed already: say exactly what happened.
+            throw RegistryError(error.Code(), std::string(HiveName(hives[0])) +
+                                                  " was written; " + HiveName(hives[i]) +
+                                                  " was not: " + error.what());
         }
-        transaction.Commit();
     }
 }
 

@@ -1,4 +1,5 @@
 // nxcolor's screen colours and SVG chart picture.
+#include "nxbase/files.h"
 #include "screen.h"
 
 #include <algorithm>
@@ -205,24 +206,10 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
     }
     out << "</svg>\n";
 
-    // Written beside the target and renamed into place.
-    const std::string temp = path + ".tmp" + std::to_string(::getpid());
-    {
-        std::ofstream file(temp, std::ios::binary | std::ios::trunc);
-        file << out.str();
-        file.flush();
-        if (!file) {
-            std::error_code ignored;
-            std::filesystem::remove(temp, ignored);
-            *error = "cannot write " + path;
-            return false;
-        }
-    }
-    std::error_code failed;
-    std::filesystem::rename(temp, path, failed);
-    if (failed) {
-        std::filesystem::remove(temp, failed);
-        *error = "cannot write " + path;
+    try {
+        nxbase::WriteWholeFile(path, out.str());
+    } catch (const std::exception& failure) {
+        *error = failure.what();
         return false;
     }
     return true;

@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "nxbase/files.h"
 #include "nxbase/registry.h"
 
 namespace {
@@ -91,10 +92,18 @@ std::uint32_t ParseDword(const std::string& asText) {
 }
 
 std::string Describe(const nxbase::RegistryValue& axValue) {
-    if (axValue.type == nxbase::RegistryType::Dword) {
-        return "DWORD  " + std::to_string(axValue.dword);
+    switch (axValue.type) {
+        case nxbase::RegistryType::Dword:
+            return "DWORD  " + std::to_string(axValue.dword);
+        case nxbase::RegistryType::String:
+            return "SZ     " + axValue.text;
+        case nxbase::RegistryType::ExpandString:
+            return "EXPAND " + axValue.text;
+        case nxbase::RegistryType::MultiString:
+            return "MULTI  " + axValue.ToString();
+        default:
+            return "BINARY " + axValue.ToString();
     }
-    return "SZ     " + axValue.text;
 }
 
 void PrintKey(const Key& axKey) {
@@ -188,22 +197,7 @@ int Export(const std::vector<std::string>& asArguments) {
         std::cout << text;
         return kOk;
     }
-    // Written beside the target and renamed, so a failed write leaves no half file.
-    const std::string& file = asArguments[1];
-    std::string temporary = file + ".tmp";
-    {
-        std::ofstream out(temporary, std::ios::binary | std::ios::trunc);
-        out << text;
-        out.flush();
-        if (!out) {
-            std::remove(temporary.c_str());
-            throw std::runtime_error("cannot write " + file);
-        }
-    }
-    if (std::rename(temporary.c_str(), file.c_str()) != 0) {
-        std::remove(temporary.c_str());
-        throw std::runtime_error("cannot write " + file);
-    }
+    nxbase::WriteWholeFile(asArguments[1], text);
     return kOk;
 }
 
@@ -245,6 +239,33 @@ int Files() {
 
 }  // namespace
 
+// Every command's output must reach standard output whole: a full disk or a
+// closed pipe is a failure, not a silent success.
+int CheckedOutput(int alResult) {
+    std::cout.flush();
+    if (!std::cout || std::fflush(stdout) != 0 || std::ferror(stdout)) {
+        std::cerr << "nxreg: cannot write to standard output\n";
+        return kFailed;
+    }
+    return alResult;
+}
+
+int Run(const std::string& command, const std::vector<std::string>& arguments) {
+    if (command == "--help" || command == "-h" || command == "help") {
+        std::cout << kHelp;
+        return kOk;
+    }
+    if (command == "list") return List(arguments);
+    if (command == "get") return Get(arguments);
+    if (command == "set") return Set(arguments);
+    if (command == "delete") return Delete(arguments);
+    if (command == "export") return Export(arguments);
+    if (command == "import") return Import(arguments);
+    if (command == "log-options") return LogOptions(arguments);
+    if (command == "files" && arguments.empty()) return Files();
+    throw UsageError("unknown command: " + command);
+}
+
 int main(int argc, char** argv) {
     std::vector<std::string> arguments(argv + 1, argv + argc);
     if (arguments.empty()) {
@@ -254,19 +275,7 @@ int main(int argc, char** argv) {
     std::string command = arguments[0];
     arguments.erase(arguments.begin());
     try {
-        if (command == "--help" || command == "-h" || command == "help") {
-            std::cout << kHelp;
-            return kOk;
-        }
-        if (command == "list") return List(arguments);
-        if (command == "get") return Get(arguments);
-        if (command == "set") return Set(arguments);
-        if (command == "delete") return Delete(arguments);
-        if (command == "export") return Export(arguments);
-        if (command == "import") return Import(arguments);
-        if (command == "log-options") return LogOptions(arguments);
-        if (command == "files" && arguments.empty()) return Files();
-        throw UsageError("unknown command: " + command);
+        return CheckedOutput(Run(command, arguments));
     } catch (const UsageError& error) {
         std::cerr << "nxreg: " << error.what() << "\n(nxreg --help lists the commands)\n";
         return kUsage;

@@ -100,4 +100,17 @@ NXBASE_EXPORT String operator+(const String& a, const char* b);
 NXBASE_EXPORT String operator+(const char* a, const String& b);
 NXBASE_EXPORT std::ostream& operator<<(std::ostream& out, const String& text);
 
+namespace toolkit {
+
+// Windows-1252 (the ANSI code page of String) to UTF-8. Every byte has a
+// character: the five bytes the code page leaves undefined become U+0081,
+// U+008D, U+008F, U+0090 and U+009D, so that Utf8ToWindows1252 gives back
+// every byte string unchanged.
+NXBASE_EXPORT std::string Windows1252ToUtf8(std::string_view ansi);
+// UTF-8 to Windows-1252: a character the code page lacks becomes "?", and so
+// does each byte of an invalid UTF-8 sequence.
+NXBASE_EXPORT std::string Utf8ToWindows1252(std::string_view utf8);
+
+}  // namespace toolkit
+
 #endif  // TOOLKIT_STRING_H_
