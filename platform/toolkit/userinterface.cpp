@@ -64,6 +64,37 @@ bool RecordingUserInterface::QueryBox(const std::string& text, bool /*defaultAns
     return queryAnswer_;
 }
 
+void RecordingUserInterface::RecordEvent(const std::string& event) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    events_.push_back(event);
+}
+
+void RecordingUserInterface::SetWaiting(bool waiting) {
+    RecordEvent(waiting ? "wait 1" : "wait 0");
+}
+
+bool RecordingUserInterface::IsTopWindowEnabled() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return topWindowEnabled_;
+}
+
+void RecordingUserInterface::EnableTopWindow(bool enable) {
+    {
+        std::lock_guard<std::mutex> lock(mutex_);
+        topWindowEnabled_ = enable;
+    }
+    RecordEvent(enable ? "enable 1" : "enable 0");
+}
+
+void RecordingUserInterface::Beep(unsigned frequency, unsigned milliseconds) {
+    RecordEvent("beep " + std::to_string(frequency) + " " + std::to_string(milliseconds));
+}
+
+std::vector<std::string> RecordingUserInterface::Events() const {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return events_;
+}
+
 std::vector<RecordingUserInterface::Box> RecordingUserInterface::Boxes() const {
     std::lock_guard<std::mutex> lock(mutex_);
     return boxes_;
@@ -72,4 +103,5 @@ std::vector<RecordingUserInterface::Box> RecordingUserInterface::Boxes() const {
 void RecordingUserInterface::Clear() {
     std::lock_guard<std::mutex> lock(mutex_);
     boxes_.clear();
+    events_.clear();
 }

@@ -25,6 +25,16 @@ class NXBASE_EXPORT UserInterface {
     // answers `defaultAnswer`.
     virtual bool QueryBox(const std::string& text, bool defaultAnswer) = 0;
 
+    // The application's waiting state (busy cursor, input locked).
+    virtual void SetWaiting(bool /*waiting*/) {}
+    // The active top window: whether there is one, whether it takes input,
+    // and switching its input on or off. Without a window there is nothing to do.
+    virtual bool HasTopWindow() { return false; }
+    virtual bool IsTopWindowEnabled() { return true; }
+    virtual void EnableTopWindow(bool /*enable*/) {}
+    // A tone of `frequency` Hz for `milliseconds`; silent unless a GUI plays it.
+    virtual void Beep(unsigned /*frequency*/, unsigned /*milliseconds*/) {}
+
     // The current handler; never null.
     static std::shared_ptr<UserInterface> Current();
     // Installs `handler` (null restores the default) and returns the previous one.
@@ -53,16 +63,26 @@ class NXBASE_EXPORT RecordingUserInterface : public UserInterface {
     void ErrorBox(const std::string& text) override;
     void InfoBox(const std::string& text) override;
     bool QueryBox(const std::string& text, bool defaultAnswer) override;
+    // Recorded as "wait 1", "enable 0", "beep 5000 200"; it has a top window.
+    void SetWaiting(bool waiting) override;
+    bool HasTopWindow() override { return true; }
+    bool IsTopWindowEnabled() override;
+    void EnableTopWindow(bool enable) override;
+    void Beep(unsigned frequency, unsigned milliseconds) override;
 
     std::vector<Box> Boxes() const;
+    std::vector<std::string> Events() const;
     void Clear();
 
   private:
     void Record(BoxKind kind, const std::string& text);
+    void RecordEvent(const std::string& event);
 
     mutable std::mutex mutex_;
     std::vector<Box> boxes_;
+    std::vector<std::string> events_;
     bool queryAnswer_ = false;
+    bool topWindowEnabled_ = true;
 };
 
 // Installs a handler for the lifetime of a scope, then puts the previous back.

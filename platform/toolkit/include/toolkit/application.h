@@ -1,0 +1,135 @@
+// The toolkit's event loop: one boost::asio::io_context run by the
+// user-interface thread. Timers, socket completions and posted user events
+// are handlers on it, so they never run concurrently with each other.
+//
+// A GUI port drives the same context from its own main loop instead of
+// Execute(): either poll it from an idle or short periodic source
+// (`Application::Get().GetContext().poll()` from a GTK idle function or a Qt
+// zero-interval QTimer), or, to sleep when idle, run it on the GUI's thread
+// between events (`run_one_for` with the time-out the GUI's loop allows).
+// Whatever drives it, it must be the one thread that also calls into the
+// messaging classes.
+#ifndef TOOLKIT_APPLICATION_H_
+#define TOOLKIT_APPLICATION_H_
+
+#include <array>
+#include <boost/asio/io_context.hpp>
+#include <boost/asio/steady_timer.hpp>
+#include <chrono>
+#include <cstring>
+#include <functional>
+#include <memory>
+
+#include "nxbase/export.h"
+
+// A bound member function taking void* and returning long: the toolkit's
+// call-back. An unset link calls nothing and returns 0. Two links are equal
+// when they bind the same member function to the same object.
+class NXBASE_EXPORT Link {
+  public:
+    Link() = default;
+    template <class T>
+    Link(T* pObject, long (T::*pMember)(void*))
+        : call_([pObject, pMember](void* pData) { return (pObject->*pMember)(pData); }),
+          object_(pObject) {
+        static_assert(sizeof pMember <= sizeof member_, "member pointer too large");
+        std::memcpy(member_.data(), &pMember, sizeof pMember);
+    }
+
+    long Call(void* pData) const { return call_ ? call_(pData) : 0; }
+    bool IsSet() const { return static_cast<bool>(call_); }
+    explicit operator bool() const { return IsSet(); }
+
+    friend bool operator==(const Link& a, const Link& b) {
+        return a.IsSet() == b.IsSet() && a.object_ == b.object_ && a.member_ == b.member_;
+    }
+    friend bool operator!=(const Link& a, const Link& b) { return !(a == b); }
+
+  private:
+    std::function<long(void*)> call_;
+    const void* object_ = nullptr;
+    std::array<unsigned char, 2 * sizeof(void*)> member_{};
+};
+
+#define LINK(Class, pObject, Member) Link(pObject, &Class::Member)
+
+class NXBASE_EXPORT Application {
+  public:
+    // The process's one application object.
+    static Application& Get();
+
+    boost::asio::io_context& GetContext() { return context_; }
+
+    // Runs handlers until Quit(). Handlers posted before Execute run in it.
+    void Execute();
+    // Ends Execute() (and any wait) after the running handler returns.
+    void Quit();
+    bool IsQuitting() const { return quitting_; }
+    // Clears a Quit(), so that the loop can run again (tests).
+    void ResetQuit();
+    bool IsInExecute() const { return executing_ > 0; }
+
+    // Runs the handlers that are ready, without blocking.
+    void Reschedule();
+    // Blocks until one handler ran or `timeout` passed; true when one ran.
+    bool RunOneFor(std::chrono::milliseconds timeout);
+
+    // The waiting state of the user interface (busy cursor, input off),
+    // passed to the UserInterface handler.
+    void Wait(bool abWaiting);
+    bool IsWaiting() const { return waiting_; }
+
+    // Calls `handler` with (id, data) on the loop, after the running handler.
+    void PostUserEvent(unsigned long alId, void* pData);
+    void SetUserEventHandler(std::function<void(unsigned long, void*)> handler);
+
+  private:
+    Application() = default;
+
+    boost::asio::io_context context_;
+    std::function<void(unsigned long, void*)> userEventHandler_;
+    bool quitting_ = false;
+    bool waiting_ = false;
+    int executing_ = 0;
+};
+
+// A one-shot timer on the application's loop: after Start() it calls its
+// handler link once, `timeout` later, unless stopped.
+class NXBASE_EXPORT Timer {
+  public:
+    Timer();
+    virtual ~Timer();
+    Timer(const Timer&) = delete;
+    Timer& operator=(const Timer&) = delete;
+
+    void SetTimeout(unsigned long alMilliseconds) { timeout_ = alMilliseconds; }
+    unsigned long GetTimeout() const { return timeout_; }
+    void SetTimeoutHdl(const Link& axHandler) { handler_ = axHandler; }
+    const Link& GetTimeoutHdl() const { return handler_; }
+    void Start();
+    void Stop();
+    bool IsActive() const { return active_; }
+
+  protected:
+    virtual void Fired();
+
+  private:
+    void Arm();
+
+    boost::asio::steady_timer timer_;
+    Link handler_;
+    unsigned long timeout_ = 0;
+    bool active_ = false;
+    // Invalidates handlers of an earlier Start() or of a destroyed timer.
+    std::shared_ptr<unsigned long> generation_ = std::make_shared<unsigned long>(0);
+
+    friend class AutoTimer;
+};
+
+// A timer that restarts itself after every call of its handler.
+class NXBASE_EXPORT AutoTimer : public Timer {
+  protected:
+    void Fired() override;
+};
+
+#endif  // TOOLKIT_APPLICATION_H_

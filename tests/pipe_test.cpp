@@ -1,0 +1,321 @@
+// The Unix-socket transport between real processes: frames on the wire, a
+// peer started on demand, bad input from raw sockets, foreign users refused.
+#include "nxbase/pipe.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <cstring>
+#include <functional>
+#include <thread>
+
+#include "nxbase/logfile.h"
+#include "nxbase/msgcat.h"
+#include "nxbase/poapps.h"
+#include "nxbase/registry.h"
+#include "test_util.h"
+#include "toolkit/application.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+std::vector<VELTRAEvent> gReceived;
+
+void Record(VELTRAEvent& event) {
+    gReceived.push_back(event);
+}
+
+std::string Hex(const std::string& bytes) {
+    static const char kDigits[] = "0123456789abcdef";
+    std::string hex;
+    for (unsigned char c : bytes) {
+        hex += kDigits[c >> 4];
+        hex += kDigits[c & 15];
+        hex += ' ';
+    }
+    return hex;
+}
+
+std::string BytesOf(const MyMemoryBlock& block) {
+    return std::string(block.GetDatenZeiger(), static_cast<std::size_t>(block.Len()));
+}
+
+MyMemoryBlock BlockOf(const std::string& bytes) {
+    MyMemoryBlock block(static_cast<long>(bytes.size()));
+    block.Put(bytes.data(), static_cast<long>(bytes.size()));
+    return block;
+}
+
+bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
+    auto deadline = std::chrono::steady_clock::now() + limit;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        Application::Get().RunOneFor(20ms);
+    }
+    return true;
+}
+
+TEST(PipeWire, FramesAndTheHandshakeByteForByte) {
+    std::string stuffed = nxbase::EncodeBytes("\x00\x01\x02", 3);
+    EXPECT_EQ(Hex(nxbase::EncodeFrame(nxbase::MessageBody("App", "LOCK", stuffed))),
+              "0e 00 00 00 41 70 70 00 4c 4f 43 4b 00 01 0a 01 01 02 ");
+    EXPECT_EQ(Hex(nxbase::EncodeFrame("App_42")), "06 00 00 00 41 70 70 5f 34 32 ");
+    EXPECT_EQ(Hex(nxbase::EncodeFrame(std::string(300, 'x')).substr(0, 4)), "2c 01 00 00 ");
+    {
+        nxtest::ScopedEnv user("USERNAME", "");
+        EXPECT_EQ(nxbase::PipeName("PipeRequest-LumaServer"), "PipeRequest-LumaServer");
+    }
+    nxtest::ScopedEnv user("USERNAME", "anna");
+    EXPECT_EQ(nxbase::PipeName("PipeRequest-LumaServer"), "PipeRequest-LumaServer_anna");
+
+    std::string sender, command, data;
+    ASSERT_TRUE(nxbase::SplitMessageBody(std::string("A\0B\0", 4), sender, command, data));
+    EXPECT_EQ(command, "B");
+    EXPECT_EQ(data, "");
+    EXPECT_FALSE(nxbase::SplitMessageBody(std::string("A\0B", 3), sender, command, data));
+}
+
+TEST(PipeWire, TheFrameReaderTakesBytesInAnyPiecesAndRefusesHugeLengths) {
+    std::string stream = nxbase::EncodeFrame("one") + nxbase::EncodeFrame("") +
+                         nxbase::EncodeFrame(std::string(5000, 'z')) + nxbase::EncodeFrame("two");
+    nxbase::FrameReader reader;
+    std::vector<std::string> bodies;
+    std::string body;
+    for (char c : stream) {  // one byte at a time
+        reader.Append(&c, 1);
+        while (reader.Next(body) == nxbase::FrameReader::Result::kFrame) bodies.push_back(body);
+    }
+    ASSERT_EQ(bodies.size(), 3u);  // the empty frame is consumed, not delivered
+    EXPECT_EQ(bodies[0], "one");
+    EXPECT_EQ(bodies[1].size(), 5000u);
+    EXPECT_EQ(bodies[2], "two");
+    EXPECT_EQ(reader.Buffered(), 0u);
+
+    nxbase::FrameReader huge;
+    std::string limit = nxbase::EncodeFrame("");
+    std::uint32_t length = nxbase::kMaxFrameLength + 1;
+    std::memcpy(limit.data(), &length, 4);  // little-endian host
+    huge.Append(limit.data(), limit.size());
+    EXPECT_EQ(huge.Next(body), nxbase::FrameReader::Result::kMalformed);
+    huge.Append("more", 4);
+    EXPECT_EQ(huge.Next(body), nxbase::FrameReader::Result::kMalformed);
+}
+
+class PipeTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        char pattern[] = "/tmp/nxbase-pipe-XXXXXX";  // short: socket paths are limited
+        ASSERT_NE(::mkdtemp(pattern), nullptr);
+        root = pattern;
+        runtime = root + "/run";
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_RUNTIME_DIR", runtime));
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("USERNAME", ""));
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_MACHINE_REGISTRY",
+                                                             root + "/machine.sqlite"));
+        env.emplace_back(
+            std::make_unique<nxtest::ScopedEnv>("NXBASE_USER_REGISTRY", root + "/user.sqlite"));
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_LOG_PATH", root + "/log"));
+        // The peer under a name of its own, so that no other test's peer counts as running.
+        std::filesystem::create_directories(root + "/bin");
+        peerProgram = root + "/bin/echopeer" + std::to_string(::getpid());
+        std::filesystem::copy_file(NXBASE_PIPE_PEER, peerProgram);
+        RegistryHandler::AddRegistryEntry(
+            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Path"), "/none");
+        RegistryHandler::AddRegistryEntry(
+            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Executable"),
+            "/none/lumaserver");
+        RegistryHandler::AddRegistryEntry(
+            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Version"), "3.0");
+        RegistryHandler::AddRegistryEntry(
+            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\ChromaLink\\Applications",
+                          "EchoPeer"),
+            peerProgram);
+        applications = std::make_unique<PostOfficeApplications>("PipeTestClient");
+        pipe = Pipe::CreatePipe("PipeTestClient");
+        pipe->SetReceiveFunction(Record);
+        pipe->SetApplications(applications.get());
+        pipe->SetCountryCode(49);
+        gReceived.clear();
+        Application::Get().ResetQuit();
+    }
+
+    void TearDown() override {
+        if (pipe->HasChannel("EchoPeer")) {
+            MyMemoryBlock none;
+            pipe->Send("EchoPeer", "QUIT", none);
+            RunUntil([&] { return !pipe->HasChannel("EchoPeer"); }, 5s);
+        }
+        Pipe::DeletePipe();
+        for (int i = 0; i < 100 && ::waitpid(-1, nullptr, WNOHANG) >= 0; ++i) {
+            std::this_thread::sleep_for(20ms);
+        }
+        std::error_code ignored;
+        std::filesystem::remove_all(root, ignored);
+    }
+
+    // Sends `data` as GET_DEVICE_NAME to the echo peer and waits for the echo.
+    std::string RoundTrip(const std::string& data) {
+        std::size_t before = gReceived.size();
+        MyMemoryBlock block = BlockOf(data);
+        nxbase::EncodeBlock(block);
+        if (!pipe->Send("EchoPeer", "GET_DEVICE_NAME", block)) return "<send failed>";
+        if (!RunUntil([&] { return gReceived.size() > before; })) return "<no answer>";
+        return BytesOf(gReceived.back().GetData());
+    }
+
+    // A raw connection to our own request socket, handshake done.
+    int RawClient(const std::string& name) {
+        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
+        EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        std::string request = nxbase::EncodeFrame(name + "_1");
+        EXPECT_EQ(::write(fd, request.data(), request.size()), static_cast<ssize_t>(request.size()));
+        EXPECT_TRUE(RunUntil([&] { return pipe->HasChannel(name); }));
+        char reply[256];
+        ssize_t n = ::recv(fd, reply, sizeof reply, 0);
+        EXPECT_GT(n, 4);
+        EXPECT_EQ(std::string(reply + 4, static_cast<std::size_t>(n) - 4),
+                  "DirectPipe-PipeTestClient_" + std::to_string(::getpid()));
+        return fd;
+    }
+
+    std::string root, runtime, peerProgram;
+    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
+    std::unique_ptr<PostOfficeApplications> applications;
+    Pipe* pipe = nullptr;
+};
+
+TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
+    EXPECT_TRUE(pipe->IsListening());
+    EXPECT_EQ(pipe->GetSocketPath(), runtime + "/PipeRequest-PipeTestClient");
+    struct stat info {};
+    ASSERT_EQ(::stat(runtime.c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 0777, 0700u);
+
+    std::string pattern;
+    for (int i = 0; i < (1 << 20); ++i) pattern += static_cast<char>((i * 7 + i / 251) & 0xFF);
+    for (std::size_t size : {0u, 1u, 4095u, 4096u, 4097u, 1u << 20}) {
+        std::string data = pattern.substr(0, size);
+        EXPECT_EQ(RoundTrip(data), data) << size;
+    }
+    ASSERT_EQ(gReceived.size(), 6u);
+    EXPECT_EQ(gReceived[0].GetSender(), "EchoPeer");
+    EXPECT_EQ(gReceived[0].GetCommand(), "ANSWER!GET_DEVICE_NAME");
+
+    // It was started with the start line, in its own directory.
+    std::vector<std::string> started = nxtest::ReadLines(runtime + "/EchoPeer.started");
+    ASSERT_EQ(started.size(), 2u);
+    EXPECT_EQ(started[0], peerProgram + " -S -LNG 49");
+    EXPECT_EQ(started[1], root + "/bin");
+    EXPECT_TRUE(nxbase::IsApplicationRunning("echopeer" + std::to_string(::getpid())));
+
+    // A second process under a name that is taken fails to listen and leaves
+    // ours alone.
+    int status = 0;
+    pid_t twin = ::fork();
+    if (twin == 0) {
+        ::execl(NXBASE_PIPE_PEER, NXBASE_PIPE_PEER, "PipeTestClient", nullptr);
+        ::_exit(127);
+    }
+    ::waitpid(twin, &status, 0);
+    EXPECT_FALSE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    EXPECT_EQ(RoundTrip("still here"), "still here");
+}
+
+TEST_F(PipeTest, BackToBackFramesAllArriveAndBadInputClosesOnlyItsChannel) {
+    ASSERT_EQ(RoundTrip("warm"), "warm");
+    int fd = RawClient("Raw");
+    std::string burst;
+    for (int i = 0; i < 50; ++i) {
+        std::string data = nxbase::EncodeBytes(std::string(1, static_cast<char>(i)).data(), 1);
+        burst += nxbase::EncodeFrame(nxbase::MessageBody("Raw", "IS_READY", data));
+        if (i == 10) burst += nxbase::EncodeFrame("");  // consumed, not delivered
+    }
+    std::size_t before = gReceived.size();
+    ASSERT_EQ(::write(fd, burst.data(), burst.size()), static_cast<ssize_t>(burst.size()));
+    ASSERT_TRUE(RunUntil([&] { return gReceived.size() == before + 50; }));
+    for (int i = 0; i < 50; ++i) {
+        EXPECT_EQ(BytesOf(gReceived[before + i].GetData()), std::string(1, static_cast<char>(i)));
+    }
+    ::close(fd);
+
+    std::string random(4096, '\0');
+    unsigned state = 12345;
+    for (char& c : random) c = static_cast<char>((state = state * 1103515245u + 12345u) >> 16);
+    std::string huge = "\xFF\xFF\xFF\xFF";
+    const std::vector<std::pair<std::string, std::string>> bad = {
+        {"length above the limit", huge},
+        {"a body without its zero bytes", nxbase::EncodeFrame("no zeros here")},
+        {"a frame cut short", nxbase::EncodeFrame(std::string(100, 'x')).substr(0, 30)},
+        {"random bytes", random},
+    };
+    for (const auto& [what, bytes] : bad) {
+        int raw = RawClient("Bad");
+        std::size_t channels = pipe->ChannelCount();
+        ASSERT_EQ(::write(raw, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
+        if (what == "a frame cut short") ::shutdown(raw, SHUT_WR);
+        EXPECT_TRUE(RunUntil([&] { return pipe->ChannelCount() == channels - 1; }, 3s)) << what;
+        EXPECT_FALSE(pipe->HasChannel("Bad")) << what;
+        EXPECT_EQ(RoundTrip(what), what) << "after " << what;
+        ::close(raw);
+    }
+}
+
+TEST_F(PipeTest, ALostPeerIsReportedAndTheNextSendStartsItAgain) {
+    std::vector<std::string> lost;
+    pipe->SetChannelLostFunction([&](const std::string& peer) { lost.push_back(peer); });
+    ASSERT_EQ(RoundTrip("one"), "one");
+    MyMemoryBlock none;
+    ASSERT_TRUE(pipe->Send("EchoPeer", "QUIT", none));
+    ASSERT_TRUE(RunUntil([&] { return !lost.empty(); }));
+    EXPECT_EQ(lost, std::vector<std::string>{"EchoPeer"});
+    EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
+    RunUntil([&] { return !nxbase::IsApplicationRunning("echopeer" + std::to_string(::getpid())); },
+             5s);
+    EXPECT_EQ(RoundTrip("two"), "two");
+    // An application nobody registered is not started and the send fails.
+    EXPECT_FALSE(pipe->Send("Nobody", "IS_READY", none));
+    pipe->SetChannelLostFunction(nullptr);
+}
+
+TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
+    if (::geteuid() != 0) GTEST_SKIP() << "needs root to act as another user";
+    // Let user 65534 reach the socket, so that only the credential check stands.
+    ::chmod(root.c_str(), 0711);
+    ::chmod(runtime.c_str(), 0711);
+    ::chmod(pipe->GetSocketPath().c_str(), 0666);
+    std::size_t channels = pipe->ChannelCount();
+    pid_t child = ::fork();
+    if (child == 0) {
+        if (::setgid(65534) != 0 || ::setuid(65534) != 0) ::_exit(3);
+        int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
+        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(4);
+        std::string request = nxbase::EncodeFrame("Intruder_1");
+        (void)!::send(fd, request.data(), request.size(), MSG_NOSIGNAL);
+        char reply[64];
+        ssize_t n = ::recv(fd, reply, sizeof reply, 0);  // closed without a reply
+        ::_exit(n <= 0 ? 0 : 5);
+    }
+    int status = -1;
+    ASSERT_TRUE(RunUntil([&] { return ::waitpid(child, &status, WNOHANG) == child; }));
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+    EXPECT_EQ(pipe->ChannelCount(), channels);
+    EXPECT_FALSE(pipe->HasChannel("Intruder"));
+    std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
+    EXPECT_EQ(log.find("Intruder"), std::string::npos);
+}
+
+}  // namespace
