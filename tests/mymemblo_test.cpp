@@ -288,6 +288,16 @@ TEST(FlagSet, SetOperatorsWorkAcrossWordsAndCounts) {
     EXPECT_EQ(a, FlagSet(70));
 }
 
+TEST(MyMemoryBlock, ASignedCharIsOneByteLikeAChar) {
+    MyMemoryBlock block;
+    block << static_cast<signed char>(-2) << static_cast<signed char>(1);
+    EXPECT_EQ(Image(block), (Bytes{0xFE, 0x01}));
+    signed char first = 0, second = 0;
+    block >> first >> second;
+    EXPECT_EQ(first, -2);
+    EXPECT_EQ(second, 1);
+}
+
 TEST(FlagSet, TwoIntsAreARangeThatSerialisesByIndexAndReadsBackFromZero) {
     FlagSet messages(-2, 135);
     EXPECT_EQ(messages.Count(), 137);

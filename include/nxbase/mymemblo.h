@@ -133,6 +133,7 @@ class NXBASE_EXPORT MyMemoryBlock {
 
     MyMemoryBlock& operator<<(char axValue);
     MyMemoryBlock& operator<<(unsigned char axValue);
+    MyMemoryBlock& operator<<(signed char axValue);  // one byte, as char
     MyMemoryBlock& operator<<(short axValue);
     MyMemoryBlock& operator<<(unsigned short axValue);
     MyMemoryBlock& operator<<(int axValue);
@@ -148,6 +149,7 @@ class NXBASE_EXPORT MyMemoryBlock {
 
     MyMemoryBlock& operator>>(char& axValue);
     MyMemoryBlock& operator>>(unsigned char& axValue);
+    MyMemoryBlock& operator>>(signed char& axValue);
     MyMemoryBlock& operator>>(short& axValue);
     MyMemoryBlock& operator>>(unsigned short& axValue);
     MyMemoryBlock& operator>>(int& axValue);

@@ -90,6 +90,20 @@ void RecordingUserInterface::Beep(unsigned frequency, unsigned milliseconds) {
     RecordEvent("beep " + std::to_string(frequency) + " " + std::to_string(milliseconds));
 }
 
+void RecordingUserInterface::OpenAbortDialog(const std::string& title, const std::string&) {
+    RecordEvent("abort-dialog " + title);
+}
+
+bool RecordingUserInterface::IsAbortDialogAborted() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return aborted_;
+}
+
+void RecordingUserInterface::SetAborted(bool aborted) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    aborted_ = aborted;
+}
+
 std::vector<std::string> RecordingUserInterface::Events() const {
     std::lock_guard<std::mutex> lock(mutex_);
     return events_;

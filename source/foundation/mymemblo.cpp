@@ -278,6 +278,17 @@ void MyMemoryBlock::GetBytes(unsigned char* p) {
 
 // ------------------------------------------------------------- writers
 
+MyMemoryBlock& MyMemoryBlock::operator<<(signed char axValue) {
+    return *this << static_cast<char>(axValue);
+}
+
+MyMemoryBlock& MyMemoryBlock::operator>>(signed char& axValue) {
+    char value = static_cast<char>(axValue);
+    *this >> value;
+    axValue = static_cast<signed char>(value);
+    return *this;
+}
+
 MyMemoryBlock& MyMemoryBlock::operator<<(char axValue) {
     unsigned char byte = static_cast<unsigned char>(axValue);
     PutBytes<1>(&byte);

@@ -1,7 +1,8 @@
 // A peer for the transport tests: listens under the name given as its first
 // argument (or "EchoPeer"), writes its command line and working directory to
 // $NXBASE_RUNTIME_DIR/<name>.started, and answers every message with
-// "ANSWER!" + the command and the same data. "QUIT" ends it.
+// "ANSWER!" + the command and the same data. "QUIT" ends it; CANCEL_REQUEST
+// makes it die without an answer, IS_APP_READY is never answered.
 #include <unistd.h>
 
 #include <fstream>
@@ -18,6 +19,8 @@ void Echo(VELTRAEvent& event) {
         Application::Get().Quit();
         return;
     }
+    if (event.GetCommand() == "CANCEL_REQUEST") ::_exit(0);
+    if (event.GetCommand() == "IS_APP_READY") return;
     MyMemoryBlock data = event.GetData();
     nxbase::EncodeBlock(data);
     Pipe::Instance()->Send(event.GetSender(), kAnswerPrefix + event.GetCommand(), data);

@@ -34,6 +34,14 @@ class NXBASE_EXPORT UserInterface {
     virtual void EnableTopWindow(bool /*enable*/) {}
     // A tone of `frequency` Hz for `milliseconds`; silent unless a GUI plays it.
     virtual void Beep(unsigned /*frequency*/, unsigned /*milliseconds*/) {}
+    // Whether a person can answer: a GUI says yes. Waits that would need a
+    // person to end them end by a time-out instead when nobody can.
+    virtual bool IsInteractive() { return false; }
+    // A modeless dialog with an abort button, shown while a long wait goes
+    // on; IsAbortDialogAborted() is true once the person pressed abort.
+    virtual void OpenAbortDialog(const std::string& /*title*/, const std::string& /*text*/) {}
+    virtual bool IsAbortDialogAborted() { return false; }
+    virtual void CloseAbortDialog() {}
 
     // The current handler; never null.
     static std::shared_ptr<UserInterface> Current();
@@ -69,6 +77,12 @@ class NXBASE_EXPORT RecordingUserInterface : public UserInterface {
     bool IsTopWindowEnabled() override;
     void EnableTopWindow(bool enable) override;
     void Beep(unsigned frequency, unsigned milliseconds) override;
+    // Recorded as "abort-dialog <title>"; aborted once SetAborted(true).
+    void OpenAbortDialog(const std::string& title, const std::string& text) override;
+    bool IsAbortDialogAborted() override;
+    bool IsInteractive() override { return interactive_; }
+    void SetInteractive(bool interactive) { interactive_ = interactive; }
+    void SetAborted(bool aborted);
 
     std::vector<Box> Boxes() const;
     std::vector<std::string> Events() const;
@@ -83,6 +97,8 @@ class NXBASE_EXPORT RecordingUserInterface : public UserInterface {
     std::vector<std::string> events_;
     bool queryAnswer_ = false;
     bool topWindowEnabled_ = true;
+    bool interactive_ = false;
+    bool aborted_ = false;
 };
 
 // Installs a handler for the lifetime of a scope, then puts the previous back.

@@ -1,0 +1,310 @@
+// The post office against raw peers on its own socket and a real peer
+// process: the protocol messages, the lock, the queue, waiting for answers.
+#include "nxbase/postoffice.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <filesystem>
+#include <functional>
+#include <thread>
+
+#include "nxbase/applock.h"
+#include "nxbase/logfile.h"
+#include "nxbase/pipe.h"
+#include "nxbase/registry.h"
+#include "test_util.h"
+#include "toolkit/userinterface.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
+    auto deadline = std::chrono::steady_clock::now() + limit;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        Application::Get().RunOneFor(10ms);
+    }
+    return true;
+}
+
+// A peer speaking the wire protocol by hand on a connection to the post office.
+class RawPeer {
+  public:
+    RawPeer(const std::string& name, const std::string& socketPath) : name_(name) {
+        fd_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, socketPath.c_str());
+        EXPECT_EQ(::connect(fd_, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        Write(nxbase::EncodeFrame(name + "_7"));
+        Next();  // the "DirectPipe-..." reply
+    }
+    ~RawPeer() { ::close(fd_); }
+
+    void Send(const std::string& command, const std::string& data) {
+        std::string stuffed = nxbase::EncodeBytes(data.data(), data.size());
+        Write(nxbase::EncodeFrame(nxbase::MessageBody(name_, command, stuffed)));
+    }
+    // The next frame's command and decoded data, the loop running meanwhile;
+    // "<none>" when nothing came within the time.
+    std::pair<std::string, std::string> Next(std::chrono::milliseconds limit = 3s) {
+        std::string body;
+        bool got = RunUntil(
+            [&] {
+                char buffer[4096];
+                ssize_t n = ::recv(fd_, buffer, sizeof buffer, MSG_DONTWAIT);
+                if (n > 0) reader_.Append(buffer, static_cast<std::size_t>(n));
+                return reader_.Next(body) == nxbase::FrameReader::Result::kFrame;
+            },
+            limit);
+        if (!got) return {"<none>", ""};
+        std::string sender, command, data;
+        if (!nxbase::SplitMessageBody(body, sender, command, data)) return {body, ""};
+        return {command, nxbase::DecodeBytes(data.data(), data.size())};
+    }
+
+  private:
+    void Write(const std::string& bytes) {
+        ASSERT_EQ(::send(fd_, bytes.data(), bytes.size(), MSG_NOSIGNAL),
+                  static_cast<ssize_t>(bytes.size()));
+    }
+    std::string name_;
+    int fd_ = -1;
+    nxbase::FrameReader reader_;
+};
+
+class PostOfficeTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        char pattern[] = "/tmp/nxbase-po-XXXXXX";
+        ASSERT_NE(::mkdtemp(pattern), nullptr);
+        root = pattern;
+        Env("NXBASE_RUNTIME_DIR", root + "/run");
+        Env("USERNAME", "");
+        Env("NXBASE_MACHINE_REGISTRY", root + "/machine.sqlite");
+        Env("NXBASE_USER_REGISTRY", root + "/user.sqlite");
+        Env("NXBASE_LOG_PATH", root + "/log");
+        Env("NXBASE_LOG_OPTIONS", "Communication,ApplicationLock");
+        std::filesystem::create_directories(root + "/bin");
+        peerExecutable = "popeer" + std::to_string(::getpid());
+        std::filesystem::copy_file(NXBASE_PIPE_PEER, root + "/bin/" + peerExecutable);
+        Register("Software\\K-Lume\\LumaServer", "Path", "/none");
+        Register("Software\\K-Lume\\LumaServer", "Executable", "/none/lumaserver");
+        Register("Software\\K-Lume\\LumaServer", "Version", "3.0");
+        Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer",
+                 root + "/bin/" + peerExecutable);
+        Application::Get().ResetQuit();
+    }
+    void TearDown() override {
+        if (PostOffice::IsInitialized() && Pipe::Instance()->HasChannel("EchoPeer")) {
+            MyMemoryBlock none;
+            Pipe::Instance()->Send("EchoPeer", "QUIT", none);
+            RunUntil([] { return !Pipe::Instance()->HasChannel("EchoPeer"); }, 5s);
+        }
+        NxSingleton::DeleteAllSingleton();
+        while (::waitpid(-1, nullptr, 0) > 0) {
+        }
+        Application::Get().ResetQuit();
+        std::error_code ignored;
+        std::filesystem::remove_all(root, ignored);
+    }
+    void Env(const char* name, const std::string& value) {
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>(name, value));
+    }
+    static void Register(const char* key, const char* name, const std::string& value) {
+        RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, name), value);
+    }
+    std::string Log() { return nxtest::ReadFile(LogFile::Instance()->GetFileName()); }
+
+    std::string root, peerExecutable;
+    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
+    std::shared_ptr<RecordingUserInterface> ui = std::make_shared<RecordingUserInterface>();
+    ScopedUserInterface scopedUi{ui};
+};
+
+using Answer = std::pair<std::string, std::string>;
+
+TEST_F(PostOfficeTest, ConnectLevelsUnknownNamesAndTheDefaultHandler) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    EXPECT_FALSE(office->IsLPMServer());
+    EXPECT_TRUE(office->HasApplication("LumaServer"));
+    RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
+    peer.Send("CONNECT", std::string("\x05\x31\x00", 3));  // level 5, then a language code
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!CONNECT", "\x03"));
+    peer.Send("CONNECT", std::string("\x00\x02", 2));  // level 0: the next byte counts
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!CONNECT", "\x02"));
+    EXPECT_EQ(office->GetConnectionCount(), 2);
+    peer.Send("NO_SUCH_MESSAGE", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!NO_SUCH_MESSAGE", "\x01"));
+    peer.Send("ANSWER!NO_SUCH_MESSAGE", "");  // never answered back
+    peer.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    peer.Send("DISCONNECT", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!DISCONNECT", std::string("\x00", 1)));
+    EXPECT_EQ(office->GetConnectionCount(), 1);
+    EXPECT_NE(Log().find("Botschafent Handler (Message nr: GET_DEVICE_TYPE"), std::string::npos);
+}
+
+TEST_F(PostOfficeTest, APeersLockRefusesOthersUntilItUnlocks) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
+    RawPeer other("Other", Pipe::Instance()->GetSocketPath());
+    peer.Send("LOCK", "\x01");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!LOCK", std::string("\x00", 1)));
+    EXPECT_EQ(office->GetLockOwner(), "Peer");
+    EXPECT_EQ(office->GetLockCount(), 1);
+    other.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(other.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x01"));  // locked by Peer
+    peer.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));  // the owner is served
+    {
+        ApplicationLockHolder holder("while locked");
+        EXPECT_FALSE(holder.Lock());
+    }
+    peer.Send("UNLOCK", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!UNLOCK", std::string("\x00", 1)));
+    EXPECT_EQ(office->GetLockOwner(), "0");
+    EXPECT_EQ(ui->Events(), (std::vector<std::string>{"wait 1", "enable 0", "wait 0", "enable 1"}));
+    // UNLOCK without LOCK drives the count below zero and leaves the owner.
+    peer.Send("UNLOCK", "");
+    EXPECT_EQ(peer.Next().first, "ANSWER!UNLOCK");
+    EXPECT_EQ(office->GetLockCount(), -1);
+    EXPECT_EQ(office->GetLockOwner(), "0");
+
+    // The local lock does not nest; the inner holder leaves the outer's lock.
+    {
+        ApplicationLockHolder outer("outer");
+        ASSERT_TRUE(outer.Lock());
+        {
+            ApplicationLockHolder inner("inner");
+            EXPECT_FALSE(inner.Lock());
+        }
+        EXPECT_FALSE(office->LockApplication());
+    }
+    EXPECT_TRUE(office->LockApplication());
+    office->UnlockApplication();
+    std::string log = Log();
+    EXPECT_NE(log.find("Lock fail: String"), std::string::npos);
+    EXPECT_NE(log.find("Lock fail: App already locked"), std::string::npos);
+}
+
+struct BusyHandler {
+    std::vector<std::string>* order;
+    long Handle(void* event) {
+        order->push_back(static_cast<VELTRAEvent*>(event)->GetCommand());
+        // A command arriving while this handler runs waits for a later tick.
+        VELTRAEvent nested("Peer", "IS_READY", MyMemoryBlock());
+        PostOffice::Instance()->CommunicationReceiveFunction(nested);
+        order->push_back(PostOffice::Instance()->GetQueueSize() == 1 ? "queued" : "not queued");
+        return 0;
+    }
+    long Ready(void* event) {
+        order->push_back(static_cast<VELTRAEvent*>(event)->GetCommand());
+        return 0;
+    }
+};
+
+TEST_F(PostOfficeTest, ACommandArrivingWhileAHandlerRunsWaitsForTheNextTick) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
+    std::vector<std::string> order;
+    BusyHandler handler{&order};
+    Link busy = LINK(BusyHandler, &handler, Handle);
+    Link ready = LINK(BusyHandler, &handler, Ready);
+    office->ChangeMessageHdl(IS_APP_READY, busy);
+    Link previous = office->ChangeMessageHdl(IS_READY, ready);
+    EXPECT_FALSE(previous.IsSet());
+    EXPECT_EQ(office->GetMessageHdl(IS_READY), ready);
+    VELTRAEvent first("Peer", "IS_APP_READY", MyMemoryBlock());
+    office->CommunicationReceiveFunction(first);
+    EXPECT_EQ(order, (std::vector<std::string>{"IS_APP_READY", "queued"}));
+    EXPECT_EQ(office->GetQueueSize(), 1u);
+    EXPECT_TRUE(RunUntil([&] { return office->GetQueueSize() == 0; }, 1s));  // the 100 ms tick
+    EXPECT_EQ(order.back(), "IS_READY");
+}
+
+TEST_F(PostOfficeTest, SendAndReceiveStartsThePeerAndGetsItsAnswer) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    MyMemoryBlock request, answer;
+    request << String("hello") << 42;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer, DisEnableWindow));
+    String text;
+    int number = 0;
+    answer >> text >> number;
+    EXPECT_EQ(text, "hello");
+    EXPECT_EQ(number, 42);
+    EXPECT_EQ(ui->Events(), (std::vector<std::string>{"enable 0", "enable 1"}));
+    // Many in a row, each answer to its own request.
+    for (int i = 0; i < 200; ++i) {
+        MyMemoryBlock send, receive;
+        send << i;
+        ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SERIE_NR, send, receive));
+        int back = -1;
+        receive >> back;
+        ASSERT_EQ(back, i);
+    }
+}
+
+TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+    // The peer dies without answering: the wait fails at once.
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer,
+                                        [] { return true; }));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 3s);
+    RunUntil([&] { return !nxbase::IsApplicationRunning(peerExecutable); }, 5s);
+    // The next send starts it again.
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+
+    // A peer that never answers: the keep-waiting function ends the wait ...
+    start = std::chrono::steady_clock::now();
+    auto stopAt = start + 200ms;
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer, [&] {
+        return std::chrono::steady_clock::now() < stopAt;
+    }));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
+    // ... and without one, the time-out of a handler that cannot ask a person.
+    nxtest::ScopedEnv timeout("NXBASE_WAIT_TIMEOUT", "1");
+    start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer));
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, 1s);
+    EXPECT_LT(took, 3s);
+    EXPECT_NE(Log().find("NXBASE_WAIT_TIMEOUT"), std::string::npos);
+    // The loop still serves: another exchange works.
+    EXPECT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+}
+
+TEST_F(PostOfficeTest, TheServerEndsOneSecondAfterItsLastPeerDisconnects) {
+    PostOffice* server = PostOffice::CreatePostOffice("LumaServer");
+    EXPECT_TRUE(server->IsLPMServer());
+    EXPECT_EQ(server->GetAnzahlApp(), 0u);
+    RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
+    peer.Send("CONNECT", "\x02");
+    EXPECT_EQ(peer.Next().second, "\x02");
+    peer.Send("DISCONNECT", "");
+    auto start = std::chrono::steady_clock::now();
+    ASSERT_TRUE(RunUntil([] { return Application::Get().IsQuitting(); }, 3s));
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, 900ms);
+    EXPECT_LT(took, 2s);
+    EXPECT_NE(Log().find("No more connections - Closing application"), std::string::npos);
+}
+
+TEST_F(PostOfficeTest, WithoutAPostOfficeInstanceFailsClearly) {
+    EXPECT_THROW(PostOffice::Instance(), std::logic_error);
+    // A missing server registration ends the set-up.
+    Register("Software\\K-Lume\\LumaServer", "Version", "2.9");
+    EXPECT_THROW(PostOffice::CreatePostOffice("Tester"), std::runtime_error);
+    EXPECT_FALSE(PostOffice::IsInitialized());
+}
+
+}  // namespace
