@@ -9,3 +9,7 @@ target_compile_definitions(pipe_test PRIVATE NXBASE_PIPE_PEER="$<TARGET_FILE:pip
 nxbase_add_test(postoffice_test postoffice_test.cpp)
 add_dependencies(postoffice_test pipe_peer)
 target_compile_definitions(postoffice_test PRIVATE NXBASE_PIPE_PEER="$<TARGET_FILE:pipe_peer>")
+if(NXBASE_BUILD_TOOLS)
+    nxbase_add_test(lumaserver_test lumaserver_test.cpp)
+    add_dependencies(lumaserver_test lumaserver nxmsg)
+endif()

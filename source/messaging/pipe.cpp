@@ -385,6 +385,8 @@ void Pipe::Listen() {
         throw std::runtime_error("Pipe: cannot listen on " + amSocketPath + ": " + error.message());
     }
     ::chmod(amSocketPath.c_str(), 0600);
+    // Started peers must not inherit the listener (they would keep the name alive).
+    ::fcntl(pmListener->acceptor.native_handle(), F_SETFD, FD_CLOEXEC);
     Accept();
 }
 
@@ -410,6 +412,7 @@ void Pipe::Accept() {
 void Pipe::AddChannel(const ChannelPtr& axChannel) {
     boost::system::error_code ignored;
     axChannel->socket.non_blocking(true, ignored);
+    ::fcntl(axChannel->socket.native_handle(), F_SETFD, FD_CLOEXEC);
     amAllChannels.insert(axChannel);
     if (axChannel->identified) {
         auto at = amChannels.find(axChannel->peer);

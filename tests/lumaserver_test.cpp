@@ -1,0 +1,284 @@
+// lumaserver in a child process, reached through the post office of the test
+// process: every message byte for byte, notices to subscribers only, start
+// on demand and the end one second after the last peer, nxmsg, and a soak of
+// four client processes.
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstring>
+#include <filesystem>
+#include <functional>
+#include <sstream>
+#include <thread>
+
+#include "nxbase/pipe.h"
+#include "nxbase/postoffice.h"
+#include "nxbase/registry.h"
+#include "test_util.h"
+#include "toolkit/application.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
+    auto deadline = std::chrono::steady_clock::now() + limit;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        Application::Get().RunOneFor(10ms);
+    }
+    return true;
+}
+
+std::string Hex(const MyMemoryBlock& block) {
+    static const char kDigits[] = "0123456789abcdef";
+    std::string hex;
+    for (long i = 0; i < block.Len(); ++i) {
+        unsigned char c = static_cast<unsigned char>(block.GetDatenZeiger()[i]);
+        hex += kDigits[c >> 4];
+        hex += kDigits[c & 15];
+    }
+    return hex;
+}
+
+std::string HexOf(const std::string& text) {
+    MyMemoryBlock block;
+    block << String(text);
+    return Hex(block);
+}
+
+struct Notices {
+    std::vector<std::pair<std::string, int>> received;
+    long Handle(void* event) {
+        MyMemoryBlock data = static_cast<VELTRAEvent*>(event)->GetData();
+        String id;
+        int index = -1;
+        data >> id >> index;
+        received.emplace_back(id.str(), index);
+        return 0;
+    }
+};
+
+class LumaServerTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        char pattern[] = "/tmp/nxbase-luma-XXXXXX";
+        ASSERT_NE(::mkdtemp(pattern), nullptr);
+        root = pattern;
+        Env("NXBASE_RUNTIME_DIR", root + "/run");
+        Env("USERNAME", "");
+        Env("NXBASE_MACHINE_REGISTRY", root + "/machine.sqlite");
+        Env("NXBASE_USER_REGISTRY", root + "/user.sqlite");
+        Env("NXBASE_LOG_PATH", root + "/log");
+        std::filesystem::create_directories(root + "/bin");
+        std::filesystem::create_directories(root + "/log");
+        // A copy under a name of its own: no other test's server counts as running.
+        serverExecutable = "lumaserver" + std::to_string(::getpid());
+        std::filesystem::copy_file(NXBASE_BINARY_DIR "/tools/lumaserver",
+                                   root + "/bin/" + serverExecutable);
+        ASSERT_EQ(std::system((root + "/bin/" + serverExecutable + " --register >/dev/null").c_str()), 0);
+        Application::Get().ResetQuit();
+    }
+    void TearDown() override {
+        if (PostOffice::IsInitialized() && Pipe::Instance()->HasChannel("LumaServer")) {
+            MyMemoryBlock none;
+            PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);
+        }
+        NxSingleton::DeleteAllSingleton();
+        auto deadline = std::chrono::steady_clock::now() + 5s;
+        while (nxbase::IsApplicationRunning(serverExecutable) &&
+               std::chrono::steady_clock::now() < deadline) {
+            std::this_thread::sleep_for(20ms);
+        }
+        while (::waitpid(-1, nullptr, WNOHANG) > 0) {
+        }
+        std::error_code ignored;
+        std::filesystem::remove_all(root, ignored);
+    }
+    void Env(const char* name, const std::string& value) {
+        env.emplace_back(std::make_unique<nxtest::ScopedEnv>(name, value));
+    }
+    MyMemoryBlock Ask(int message, MyMemoryBlock request = MyMemoryBlock()) {
+        MyMemoryBlock answer;
+        EXPECT_TRUE(PostOffice::Instance()->SendAndReceive("LumaServer", message, request, answer))
+            << nxbase::MessageName(message);
+        return answer;
+    }
+    void Connect() {
+        MyMemoryBlock level;
+        level << static_cast<unsigned char>(2);
+        EXPECT_EQ(Hex(Ask(CONNECT, level)), "02");
+    }
+
+    std::string root, serverExecutable;
+    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
+};
+
+TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    EXPECT_FALSE(nxbase::IsApplicationRunning(serverExecutable));
+    Connect();  // starts the server on demand
+    EXPECT_TRUE(nxbase::IsApplicationRunning(serverExecutable));
+    for (int message : {IS_APP_READY, CANCEL_REQUEST, EXEC_WHITE_MEASUREMENT}) {
+        EXPECT_EQ(Hex(Ask(message)), "00") << nxbase::MessageName(message);
+    }
+    EXPECT_EQ(Hex(Ask(GET_APP_VERSION)), "00" + HexOf("3.0"));
+    EXPECT_EQ(Hex(Ask(GET_SERIE_NR)), "00" + HexOf("EMU-0001"));
+    EXPECT_EQ(Hex(Ask(GET_DEVICE_NAME)), "00" + HexOf("LumaSpectro Emulator"));
+    EXPECT_EQ(Hex(Ask(GET_SW_VERSION)), "00" + HexOf("lumaserver 3.0 (NxBase emulator)"));
+    EXPECT_EQ(Hex(Ask(GET_DEVICE_TYPE)), "000100");
+    EXPECT_EQ(Hex(Ask(SPECTRUM_REQUEST)), "01");  // nothing measured yet
+    EXPECT_EQ(Hex(Ask(MOVE_HOME)), "02");         // not supported
+
+    // The chart's patches in turn, and the first again after the last.
+    std::vector<std::vector<std::string>> chart;
+    for (const std::string& line :
+         nxtest::ReadLines(NXBASE_SOURCE_DIR "/tools/nxcolor/data/colorchecker_babelcolor_average.csv")) {
+        if (line.empty() || line[0] == '#' || !std::isdigit(static_cast<unsigned char>(line[0]))) continue;
+        std::vector<std::string> fields;
+        std::stringstream in(line);
+        for (std::string field; std::getline(in, field, ',');) fields.push_back(field);
+        chart.push_back(fields);
+    }
+    ASSERT_EQ(chart.size(), 24u);
+    for (int i = 0; i < 25; ++i) {
+        MyMemoryBlock measured = Ask(EXEC_MEASUREMENT);
+        signed char status = -1;
+        String id;
+        int index = -1;
+        measured >> status >> id >> index;
+        ASSERT_EQ(status, 0);
+        EXPECT_EQ(index, i % 24);
+        MyMemoryBlock spectrum = Ask(SPECTRUM_REQUEST);
+        String spectrumId;
+        int count = 0;
+        spectrum >> status >> spectrumId >> count;
+        EXPECT_EQ(spectrumId, id);
+        ASSERT_EQ(count, 36);
+        const std::vector<std::string>& row = chart[static_cast<std::size_t>(i % 24)];
+        for (int k = 0; k < 36; ++k) {
+            int value = 0;
+            spectrum >> value;
+            double expected = std::stod(row[row.size() - 36 + static_cast<std::size_t>(k)]);
+            EXPECT_EQ(value, static_cast<int>(std::lround(static_cast<double>(
+                                 static_cast<float>(expected)) * 100000.0)))
+                << i << " " << k;
+        }
+        EXPECT_FALSE(spectrum.ReadPastEnd());
+        EXPECT_EQ(spectrum.Remaining(), 0);
+    }
+    (void)office;
+}
+
+TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPeer) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    Notices notices;
+    Link handler = LINK(Notices, &notices, Handle);
+    office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
+    Connect();
+    EXPECT_EQ(Hex(Ask(EXEC_MEASUREMENT)).substr(0, 2), "00");
+    RunUntil([] { return false; }, 200ms);
+    EXPECT_TRUE(notices.received.empty()) << "a notice before subscribing";
+    EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG)), "00");
+    Ask(EXEC_MEASUREMENT);
+    ASSERT_TRUE(RunUntil([&] { return notices.received.size() == 1; }));
+    EXPECT_EQ(notices.received[0], std::make_pair(std::string("2 light skin"), 1));
+    EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG_AUS)), "00");
+    Ask(EXEC_MEASUREMENT);
+    RunUntil([] { return false; }, 200ms);
+    EXPECT_EQ(notices.received.size(), 1u);
+
+    MyMemoryBlock none;
+    ASSERT_TRUE(office->Send("LumaServer", DISCONNECT, none));
+    auto start = std::chrono::steady_clock::now();
+    ASSERT_TRUE(RunUntil([&] { return !nxbase::IsApplicationRunning(serverExecutable); }, 5s));
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, 900ms);
+    EXPECT_LT(took, 3s);
+}
+
+TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
+    std::string command = root + "/bin/" + serverExecutable + " --trigger-every 50 &";
+    ASSERT_EQ(std::system(command.c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    Notices notices;
+    Link handler = LINK(Notices, &notices, Handle);
+    office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
+    ASSERT_TRUE(RunUntil([&] { return nxbase::IsApplicationRunning(serverExecutable); }));
+    Connect();
+    EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG)), "00");
+    ASSERT_TRUE(RunUntil([&] { return notices.received.size() >= 3; }));
+    // Consecutive patches.
+    EXPECT_EQ((notices.received[1].second - notices.received[0].second + 24) % 24, 1);
+}
+
+TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
+    auto run = [&](const std::string& arguments, int& status) {
+        std::string output;
+        FILE* pipe = ::popen((NXBASE_BINARY_DIR "/tools/nxmsg " + arguments + " 2>&1").c_str(), "r");
+        char buffer[4096];
+        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+        int result = ::pclose(pipe);
+        status = WIFEXITED(result) ? WEXITSTATUS(result) : -1;
+        return output;
+    };
+    int status = -1;
+    EXPECT_EQ(run("--expect str LumaServer GET_DEVICE_NAME", status),
+              "status 0\nbytes  00 4c 75 6d 61 53 70 65 63 74 72 6f 20 45 6d 75 6c 61 74 6f 72 00\n"
+              "values \"LumaSpectro Emulator\"\n");
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(run("--expect s LumaServer 13", status), "status 0\nbytes  00 01 00\nvalues 1\n");
+    run("LumaServer MOVE_HOME b:5 s:49 i:-3 str:x hex:0a0b", status);
+    EXPECT_EQ(status, 1);  // answered with status 2
+    for (const char* usage : {"LumaServer", "LumaServer NO_SUCH", "LumaServer IS_READY q:1",
+                              "LumaServer IS_READY hex:abc", "LumaServer IS_READY b:300"}) {
+        run(usage, status);
+        EXPECT_EQ(status, 2) << usage;
+    }
+    run("--timeout 1 Nobody IS_READY", status);
+    EXPECT_EQ(status, 3);
+}
+
+TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {
+    constexpr int kClients = 4;
+    constexpr int kRounds = 10000;
+    pid_t children[kClients];
+    for (int c = 0; c < kClients; ++c) {
+        children[c] = ::fork();
+        if (children[c] != 0) continue;
+        int failures = 0;
+        try {
+            PostOffice* office = PostOffice::CreatePostOffice(String("Soak" + std::to_string(c)));
+            MyMemoryBlock level, answer;
+            level << static_cast<unsigned char>(2);
+            if (!office->SendAndReceive("LumaServer", CONNECT, level, answer)) ::_exit(90);
+            const int messages[3] = {GET_SERIE_NR, GET_DEVICE_TYPE, GET_APP_VERSION};
+            const char* expected[3] = {"00454d552d3030303100", "000100", "00332e3000"};
+            for (int i = 0; i < kRounds; ++i) {
+                MyMemoryBlock request, reply;
+                request << i;
+                if (!office->SendAndReceive("LumaServer", messages[i % 3], request, reply) ||
+                    Hex(reply) != expected[i % 3]) {
+                    ++failures;
+                }
+            }
+            MyMemoryBlock none;
+            office->Send("LumaServer", DISCONNECT, none);
+            NxSingleton::DeleteAllSingleton();
+        } catch (...) {
+            ::_exit(91);
+        }
+        ::_exit(failures == 0 ? 0 : 1);
+    }
+    for (pid_t child : children) {
+        int status = 0;
+        ::waitpid(child, &status, 0);
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    }
+}
+
+}  // namespace

@@ -1,0 +1,255 @@
+// lumaserver: an emulator of the measuring-device server LumaServer. It
+// answers the post-office messages of a spectrophotometer and measures the
+// patches of a chart (the built-in ColorChecker, or --chart FILE), one per
+// EXEC_MEASUREMENT or per --trigger-every period, and tells subscribed
+// applications that the device was triggered. It ends one second after its
+// last peer disconnects.
+#include <unistd.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <iostream>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "nxbase/logfile.h"
+#include "nxbase/postoffice.h"
+#include "nxbase/registry.h"
+#include "spectra_csv.h"
+#include "toolkit/application.h"
+#include "toolkit/system.h"
+
+namespace {
+
+constexpr const char* kVersion = "3.0";
+constexpr int kExitOk = 0;
+constexpr int kExitUsage = 2;
+constexpr int kExitFailed = 3;
+
+const char kUsage[] =
+    "Usage: lumaserver [--chart FILE] [--trigger-every MS]\n"
+    "       lumaserver --register\n"
+    "Emulates the measuring-device server LumaServer: a spectrophotometer that\n"
+    "measures the patches of a chart in turn. Applications reach it through the\n"
+    "post office under the name \"LumaServer\"; it ends one second after its last\n"
+    "peer disconnects.\n"
+    "\n"
+    "  --chart FILE        the chart's spectra (CSV or CGATS, as nxcolor reads\n"
+    "                      them); default: the built-in ColorChecker\n"
+    "  --trigger-every MS  also measure on its own every MS milliseconds, as a\n"
+    "                      device key would, and notify the subscribers\n"
+    "  --register          write Path, Executable and Version of this program\n"
+    "                      into HKEY_LOCAL_MACHINE\\Software\\K-Lume\\LumaServer\n"
+    "                      (the machine hive: $NXBASE_MACHINE_REGISTRY or\n"
+    "                      /etc/k-lume/registry.sqlite) and exit\n"
+    "  -S, -LNG CODE       accepted as an application starts it\n"
+    "  --version, --help\n";
+
+constexpr signed char kDone = 0;
+constexpr signed char kRefused = 1;
+
+class Server {
+  public:
+    explicit Server(nxcolor::SpectraTable chart) : amChart(std::move(chart)) {
+        PostOffice* office = PostOffice::Instance();
+        Install(office, IS_APP_READY, &Server::StatusOnly);
+        Install(office, CANCEL_REQUEST, &Server::StatusOnly);
+        Install(office, EXEC_WHITE_MEASUREMENT, &Server::StatusOnly);
+        Install(office, GET_APP_VERSION, &Server::Text);
+        Install(office, GET_SW_VERSION, &Server::Text);
+        Install(office, GET_SERIE_NR, &Server::Text);
+        Install(office, GET_DEVICE_NAME, &Server::Text);
+        Install(office, GET_DEVICE_TYPE, &Server::DeviceType);
+        Install(office, EXEC_MEASUREMENT, &Server::Measure);
+        Install(office, SPECTRUM_REQUEST, &Server::Spectrum);
+        Install(office, NOTIFY_MESSUNG, &Server::Subscribe);
+        Install(office, NOTIFY_MESSUNG_AUS, &Server::Unsubscribe);
+        Install(office, DISCONNECT, &Server::Disconnected);
+    }
+
+    long TriggerTick(void*) {
+        MeasureNext();
+        Notify();
+        return 0;
+    }
+
+  private:
+    void Install(PostOffice* office, PO_Botschaften message, long (Server::*handler)(void*)) {
+        Link link(this, handler);
+        office->ChangeMessageHdl(message, link);
+    }
+    static VELTRAEvent& Event(void* p) { return *static_cast<VELTRAEvent*>(p); }
+    static void Reply(void* p, MyMemoryBlock& answer) {
+        PostOffice::Instance()->Answer(&Event(p), answer);
+    }
+
+    long StatusOnly(void* p) {
+        MyMemoryBlock answer;
+        answer << kDone;
+        Reply(p, answer);
+        return 0;
+    }
+    long Text(void* p) {
+        int number = PostOffice::Instance()->NumberOfCommand(Event(p));
+        const char* text = number == GET_APP_VERSION   ? kVersion
+                           : number == GET_SW_VERSION  ? "lumaserver 3.0 (NxBase emulator)"
+                           : number == GET_SERIE_NR    ? "EMU-0001"
+                                                       : "LumaSpectro Emulator";
+        MyMemoryBlock answer;
+        answer << kDone << String(text);
+        Reply(p, answer);
+        return 0;
+    }
+    long DeviceType(void* p) {
+        MyMemoryBlock answer;
+        answer << kDone << static_cast<short>(1);  // a spectrophotometer
+        Reply(p, answer);
+        return 0;
+    }
+    long Measure(void* p) {
+        MeasureNext();
+        MyMemoryBlock answer;
+        answer << kDone << String(CurrentId()) << amLast;
+        Reply(p, answer);
+        Notify();
+        return 0;
+    }
+    long Spectrum(void* p) {
+        MyMemoryBlock answer;
+        if (amLast < 0) {
+            answer << kRefused;
+        } else {
+            const nxcolor::SpectrumRow& row = amChart.rows[static_cast<std::size_t>(amLast)];
+            answer << kDone << String(row.id) << nxcolor::kSpectrumSize;
+            for (float value : row.values) {
+                answer << static_cast<int>(std::lround(static_cast<double>(value) * 100000.0));
+            }
+        }
+        Reply(p, answer);
+        return 0;
+    }
+    long Subscribe(void* p) {
+        amSubscribers.insert(Event(p).GetSender());
+        return StatusOnly(p);
+    }
+    long Unsubscribe(void* p) {
+        amSubscribers.erase(Event(p).GetSender());
+        return StatusOnly(p);
+    }
+    long Disconnected(void* p) {
+        amSubscribers.erase(Event(p).GetSender());
+        return 0;
+    }
+
+    void MeasureNext() {
+        amLast = (amLast + 1) % static_cast<int>(amChart.rows.size());
+        LogFile::WriteToLog(String("Measured patch ") + String(CurrentId()), String("LumaServer"));
+    }
+    std::string CurrentId() const { return amChart.rows[static_cast<std::size_t>(amLast)].id; }
+    void Notify() {
+        for (const std::string& subscriber : std::set<std::string>(amSubscribers)) {
+            MyMemoryBlock notice;
+            notice << String(CurrentId()) << amLast;
+            PostOffice::Instance()->Send(subscriber, MESSUNG_AUSGELOEST, notice);
+        }
+    }
+
+    nxcolor::SpectraTable amChart;
+    int amLast = -1;  // index of the last measured patch
+    std::set<std::string> amSubscribers;
+};
+
+int Register() {
+    std::string executable = toolkit::ExecutableFileName();
+    std::string directory = executable.substr(0, executable.rfind('/'));
+    const char* key = "Software\\K-Lume\\LumaServer";
+    RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, "Path"), directory);
+    RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, "Executable"),
+                                      executable);
+    RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, "Version"), kVersion);
+    std::cout << "Registered " << executable << " as LumaServer " << kVersion << " in "
+              << nxbase::RegistryHiveFile(nxbase::RegistryHive::LocalMachine) << "\n";
+    return kExitOk;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    std::string chartFile;
+    long triggerEvery = 0;
+    for (int i = 1; i < argc; ++i) {
+        std::string argument = argv[i];
+        auto value = [&](const char* what) -> std::string {
+            if (i + 1 >= argc) {
+                std::cerr << "lumaserver: " << argument << " needs " << what << "\n";
+                std::exit(kExitUsage);
+            }
+            return argv[++i];
+        };
+        if (argument == "--help" || argument == "-h") {
+            std::cout << kUsage;
+            return kExitOk;
+        } else if (argument == "--version") {
+            std::cout << "lumaserver " << kVersion << "\n";
+            return kExitOk;
+        } else if (argument == "--register") {
+            try {
+                return Register();
+            } catch (const std::exception& error) {
+                std::cerr << "lumaserver: " << error.what() << "\n";
+                return kExitFailed;
+            }
+        } else if (argument == "--chart") {
+            chartFile = value("a file");
+        } else if (argument == "--trigger-every") {
+            std::string ms = value("milliseconds");
+            char* end = nullptr;
+            triggerEvery = std::strtol(ms.c_str(), &end, 10);
+            if (*end != '\0' || triggerEvery < 1) {
+                std::cerr << "lumaserver: --trigger-every needs a positive number\n";
+                return kExitUsage;
+            }
+        } else if (argument == "-S" || argument == "/WM") {
+        } else if (argument == "-LNG") {
+            value("a country code");
+        } else {
+            std::cerr << "lumaserver: unknown option " << argument << "\n" << kUsage;
+            return kExitUsage;
+        }
+    }
+
+    nxcolor::SpectraTable chart;
+    std::string error;
+    if (chartFile.empty()) {
+        chart = nxcolor::ParseSpectra(nxcolor::EmbeddedChart(), nxcolor::EmbeddedChartName());
+    } else if (!nxcolor::ReadSpectraFile(chartFile, 1.0f, &chart, &error)) {
+        std::cerr << "lumaserver: " << error << "\n";
+        return kExitUsage;
+    }
+    for (const std::string& message : chart.errors) std::cerr << message << "\n";
+    if (chart.rows.empty()) {
+        std::cerr << "lumaserver: the chart holds no spectra\n";
+        return kExitUsage;
+    }
+
+    LogFile::CreateLogFile("lumaserver");
+    try {
+        PostOffice::CreatePostOffice("LumaServer");
+    } catch (const std::exception& failure) {
+        std::cerr << "lumaserver: " << failure.what() << "\n";
+        return kExitFailed;
+    }
+    Server server(std::move(chart));
+    AutoTimer trigger;
+    if (triggerEvery > 0) {
+        trigger.SetTimeout(static_cast<unsigned long>(triggerEvery));
+        trigger.SetTimeoutHdl(LINK(Server, &server, TriggerTick));
+        trigger.Start();
+    }
+    Application::Get().Execute();
+    trigger.Stop();
+    NxSingleton::DeleteAllSingleton();
+    return kExitOk;
+}
