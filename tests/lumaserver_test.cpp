@@ -201,6 +201,29 @@ TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPee
     EXPECT_LT(took, 3s);
 }
 
+TEST_F(LumaServerTest, APeerThatDiesCountsAsDisconnectedAndFreesTheLock) {
+    pid_t child = ::fork();
+    if (child == 0) {
+        PostOffice* office = PostOffice::CreatePostOffice("Crasher");
+        MyMemoryBlock level, lock, answer;
+        level << static_cast<unsigned char>(2);
+        lock << static_cast<unsigned char>(0);
+        bool ok = office->SendAndReceive("LumaServer", CONNECT, level, answer) &&
+                  office->SendAndReceive("LumaServer", LOCK, lock, answer);
+        ::_exit(ok ? 0 : 1);  // no UNLOCK, no DISCONNECT
+    }
+    int status = -1;
+    ::waitpid(child, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    // Nobody else is connected: the server ends about a second later.
+    auto deadline = std::chrono::steady_clock::now() + 5s;
+    while (nxbase::IsApplicationRunning(serverExecutable) &&
+           std::chrono::steady_clock::now() < deadline) {
+        std::this_thread::sleep_for(20ms);
+    }
+    EXPECT_FALSE(nxbase::IsApplicationRunning(serverExecutable));
+}
+
 TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     std::string command = root + "/bin/" + serverExecutable + " --trigger-every 50 &";
     ASSERT_EQ(std::system(command.c_str()), 0);

@@ -126,6 +126,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     void HandleConnect(VELTRAEvent& axEvent);
     void HandleDisconnectInServer(VELTRAEvent& axEvent);
     void ScheduleHandler();
+    void PeerLost(const std::string& asApp);
+    void CloseWhenUnused();
 
     Link amHandlers[ANZAHL_BOTSCHAFTEN];
     PostOfficeApplications amApplications;
@@ -143,6 +145,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     bool amHandlerScheduled = false;
     ReceiveFunction fmReceiveFunction = &PostOffice::DummyReceiveFunction;
     std::set<std::string> amLostPeers;  // channels lost since a wait began
+    std::map<std::string, int> amConnectedPeers;  // CONNECTs not yet matched, per peer
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
 
     static PostOffice* smInstance;

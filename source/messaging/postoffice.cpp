@@ -78,7 +78,7 @@ PostOffice::PostOffice(const String& asAppName)
     if (Language::IsInitialized()) pipe->SetCountryCode(Language::Instance()->GetCountryCode());
     std::weak_ptr<bool> alive = amAlive;
     pipe->SetChannelLostFunction([this, alive](const std::string& asApp) {
-        if (alive.lock()) amLostPeers.insert(asApp);
+        if (alive.lock()) PeerLost(asApp);
     });
     amTimer.SetTimeout(kTickMs);
     amTimer.SetTimeoutHdl(LINK(PostOffice, this, TimerCallback));
@@ -162,7 +162,10 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         HandleConnect(axEvent);
         return;
     }
-    if (number == DISCONNECT) --amConnectionCount;
+    if (number == DISCONNECT) {
+        --amConnectionCount;
+        if (--amConnectedPeers[sender.str()] <= 0) amConnectedPeers.erase(sender.str());
+    }
     if (!CheckLock(sender)) {
         Log("Check lock failed");
         AnswerStatus(axEvent, 1);
@@ -198,6 +201,8 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
 
 void PostOffice::HandleConnect(VELTRAEvent& axEvent) {
     ++amConnectionCount;
+    ++amConnectedPeers[axEvent.GetSender()];
+    amQuitTimer.Stop();  // a server about to close keeps running for its new peer
     Log(String("Connect received from ") + String(axEvent.GetSender()) + " (" +
         Number(amConnectionCount) + " connections)");
     MyMemoryBlock data = axEvent.GetData();
@@ -218,7 +223,35 @@ void PostOffice::HandleConnect(VELTRAEvent& axEvent) {
 
 void PostOffice::HandleDisconnectInServer(VELTRAEvent& axEvent) {
     amHandlers[DISCONNECT].Call(&axEvent);
-    if (amConnectionCount >= 1) return;
+    CloseWhenUnused();
+}
+
+// A peer that dies without DISCONNECT (killed, crashed) would hold its
+// connection and its lock for ever: its lost channel counts as both.
+void PostOffice::PeerLost(const std::string& asApp) {
+    amLostPeers.insert(asApp);
+    if (amLockOwner == String(asApp)) {
+        Log(String("Lock owner lost: ") + String(asApp));
+        amLockCount = 0;
+        amLockOwner = "0";
+        Application::Get().Wait(false);
+        UserInterface::Current()->EnableTopWindow(true);
+    }
+    auto connected = amConnectedPeers.find(asApp);
+    if (connected == amConnectedPeers.end()) return;
+    amConnectionCount -= connected->second;
+    amConnectedPeers.erase(connected);
+    Log(String("Connection lost to ") + String(asApp) + " (" + Number(amConnectionCount) +
+        " connections)");
+    if (IsLPMServer()) {
+        VELTRAEvent event(asApp, nxbase::MessageName(DISCONNECT), MyMemoryBlock());
+        amHandlers[DISCONNECT].Call(&event);
+        CloseWhenUnused();
+    }
+}
+
+void PostOffice::CloseWhenUnused() {
+    if (amConnectionCount >= 1 || amQuitTimer.IsActive()) return;
     Log("No more connections - Closing application");
     // The answer to the last peer goes out while the second passes.
     struct Quitter {

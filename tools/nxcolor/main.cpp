@@ -11,6 +11,7 @@
 #include "klume/cmetry/repository.h"
 #include "nxbase/colorvector.h"
 #include "nxbase/progress.h"
+#include "measure.h"
 #include "report.h"
 #include "screen.h"
 #include "spectra_csv.h"
@@ -60,6 +61,9 @@ const char kUsage[] =
     "      --icc-profile FILE  use this ICC display profile for --rgb and --report\n"
     "      --report FILE.svg   also draw the chart: a swatch per sample in its\n"
     "                          screen colour, with its id, Lab and reflectance curve\n"
+    "      --measure N         measure N patches through the measuring-device\n"
+    "                          server LumaServer (started from the registry when\n"
+    "                          needed, locked for the run) instead of reading FILE\n"
     "      --list-illuminants  print the built-in illuminant names and exit\n"
     "  -h, --help              print this text and exit\n"
     "\n"
@@ -84,6 +88,7 @@ struct Options {
     std::string svgReport;
     bool listIlluminants = false;
     bool help = false;
+    int measure = 0;  // patches to measure through LumaServer; 0: read a file
 };
 
 int UsageError(const std::string& message) {
@@ -151,6 +156,15 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
         } else if (arg == "--report") {
             if (!take(&options->svgReport) || options->svgReport.empty())
                 return arg + " needs a file name";
+        } else if (arg == "--measure") {
+            std::string text;
+            if (!take(&text)) return arg + " needs a number of patches";
+            int n = 0;
+            const auto r = std::from_chars(text.data(), text.data() + text.size(), n);
+            if (r.ec != std::errc() || r.ptr != text.data() + text.size() || n < 1 || n > 100000) {
+                return "--measure needs a number of patches from 1 to 100000, not \"" + text + "\"";
+            }
+            options->measure = n;
         } else if (arg == "--list-illuminants" && !hasValue) {
             options->listIlluminants = true;
         } else {
@@ -198,7 +212,19 @@ int main(int argc, char** argv) {
 
     nxcolor::SpectraTable table;
     std::string source;
-    if (options.file.empty()) {
+    if (options.measure > 0) {
+        if (!options.file.empty()) return UsageError("--measure takes no input file");
+        source = "LumaServer";
+        nxbase::TerminalProgressListener measuring("measuring");
+        measuring.SetTotal(static_cast<std::uint64_t>(options.measure), "patches");
+        std::string error;
+        if (!nxcolor::MeasureThroughServer(options.measure, &table, &error, &measuring)) {
+            std::cerr << "nxcolor: " << error << '\n';
+            if (table.rows.empty()) return kExitUsage;
+            table.errors.push_back(source + ": measuring stopped after " +
+                                   std::to_string(table.rows.size()) + " patches");
+        }
+    } else if (options.file.empty()) {
         source = nxcolor::EmbeddedChartName();
         table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), source, options.scale);
     } else {
