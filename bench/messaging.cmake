@@ -1,2 +1,2 @@
 # Benchmarks: the message transport.
-nxbase_add_bench(pipe_bench pipe_bench.cpp)
+nxbase_add_bench(messaging_bench messaging_bench.cpp)

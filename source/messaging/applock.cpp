@@ -2,11 +2,26 @@
 
 #include "nxbase/logfile.h"
 #include "nxbase/postoffice.h"
+#include "messaging_log.h"
 
-ApplicationLockHolder::ApplicationLockHolder(const std::string& asName)
-    : amName(asName),
-      pmLog(std::make_shared<AutoLog>(String("ApplicationLockHolder ") + String(asName),
-                                      String("ApplicationLock"))) {}
+namespace {
+
+void LockLog(const char* asText) {
+    if (nxbase::detail::ApplicationLockLogged()) {
+        LogFile::WriteToLog(String(asText), String("ApplicationLock"));
+    }
+}
+
+}  // namespace
+
+ApplicationLockHolder::ApplicationLockHolder(const std::string& asName) : amName(asName) {
+    // The scoped entry exists only while its key is on: the handler takes a
+    // holder for every command.
+    if (nxbase::detail::ApplicationLockLogged()) {
+        pmLog = std::make_shared<AutoLog>(String("ApplicationLockHolder ") + String(asName),
+                                          String("ApplicationLock"));
+    }
+}
 
 ApplicationLockHolder::~ApplicationLockHolder() {
     if (amLocked && PostOffice::IsInitialized()) PostOffice::Instance()->UnlockApplication();
@@ -14,27 +29,27 @@ ApplicationLockHolder::~ApplicationLockHolder() {
 
 bool ApplicationLockHolder::Lock() {
     amLocked = PostOffice::Instance()->LockApplication() != 0;
-    if (amLocked) pmLog->Log(String("Locked"));
+    if (amLocked && pmLog) pmLog->Log(String("Locked"));
     return amLocked;
 }
 
 unsigned char PostOffice::LockApplication() {
-    LogFile::WriteToLog(String("LockApplication"), String("ApplicationLock"));
+    LockLog("LockApplication");
     if (amLockOwner != "0") {
-        LogFile::WriteToLog(String("Lock fail: String"), String("ApplicationLock"));
+        LockLog("Lock fail: String");
         return false;
     }
     if (amLocalLock == 1) {
-        LogFile::WriteToLog(String("Lock fail: App already locked"), String("ApplicationLock"));
+        LockLog("Lock fail: App already locked");
         return false;
     }
-    LogFile::WriteToLog(String("Locked"), String("ApplicationLock"));
+    LockLog("Locked");
     amLocalLock = 1;
     return true;
 }
 
 void PostOffice::UnlockApplication() {
-    LogFile::WriteToLog(String("Unlocked"), String("ApplicationLock"));
+    LockLog("Unlocked");
     amLocalLock = 0;
 }
 

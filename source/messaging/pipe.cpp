@@ -21,6 +21,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "messaging_log.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/mymemblo.h"
 #include "nxbase/poapps.h"
@@ -510,7 +511,9 @@ void Pipe::HandleBody(const ChannelPtr& axChannel, const std::string& asBody) {
     MyMemoryBlock block(static_cast<long>(data.size()));
     std::string decoded = nxbase::DecodeBytes(data.data(), data.size());
     block.Put(decoded.data(), static_cast<long>(decoded.size()));
-    nxbase::Log("Pipe::PollForData <- " + sender + " " + command);
+    if (nxbase::detail::CommunicationLogged()) {
+        nxbase::Log("Pipe::PollForData <- " + sender + " " + command);
+    }
     VELTRAEvent event(sender, command, block);
     if (fmReceiveFunction != nullptr) fmReceiveFunction(event);
 }
@@ -521,7 +524,27 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
         Close(axChannel, "peer does not read (outgoing queue full)");
         return false;
     }
-    axChannel->outgoing += asFrame;
+    if (axChannel->outgoing.empty()) {
+        // The usual case: the socket takes the whole frame at once, no copy.
+        std::size_t done = 0;
+        int fd = axChannel->socket.native_handle();
+        while (done < asFrame.size()) {
+            std::size_t piece = std::min(nxbase::kWriteBlockSize, asFrame.size() - done);
+            ssize_t n = ::send(fd, asFrame.data() + done, piece, MSG_DONTWAIT | MSG_NOSIGNAL);
+            if (n > 0) {
+                done += static_cast<std::size_t>(n);
+                continue;
+            }
+            if (n < 0 && errno == EINTR) continue;
+            if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
+            Close(axChannel, std::string("write failed: ") + std::strerror(errno));
+            return false;
+        }
+        if (done == asFrame.size()) return true;
+        axChannel->outgoing.assign(asFrame, done, std::string::npos);
+    } else {
+        axChannel->outgoing += asFrame;
+    }
     FlushOutgoing(axChannel);
     return !axChannel->closed;
 }
@@ -637,7 +660,7 @@ Pipe::ChannelPtr Pipe::OpenOrStart(const std::string& asApp) {
 
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 const MyMemoryBlock& axEncodedData) {
-    nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
+    if (nxbase::detail::CommunicationLogged()) nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
     ChannelPtr channel;
     auto at = amChannels.find(asApp);
     if (at != amChannels.end() && !at->second->closed) {
@@ -646,8 +669,19 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
         channel = OpenOrStart(asApp);
     }
     if (!channel) return false;
-    std::string data(axEncodedData.GetDatenZeiger(), static_cast<std::size_t>(axEncodedData.Len()));
-    return Write(channel, nxbase::EncodeFrame(nxbase::MessageBody(amOwnName, asCommand, data)));
+    // The frame built in one piece: length, sender, 0, command, 0, data.
+    std::size_t dataSize = static_cast<std::size_t>(axEncodedData.Len());
+    std::uint32_t length =
+        static_cast<std::uint32_t>(amOwnName.size() + asCommand.size() + 2 + dataSize);
+    std::string frame;
+    frame.reserve(4 + length);
+    for (int i = 0; i < 4; ++i) frame += static_cast<char>((length >> (8 * i)) & 0xFF);
+    frame += amOwnName;
+    frame += '\0';
+    frame += asCommand;
+    frame += '\0';
+    frame.append(axEncodedData.GetDatenZeiger(), dataSize);
+    return Write(channel, frame);
 }
 
 bool Pipe::HasChannel(const std::string& asApp) const {
@@ -656,7 +690,7 @@ bool Pipe::HasChannel(const std::string& asApp) const {
 }
 
 void Pipe::Trace(const char* asWhat) {
-    if (!LogFile::Instance()->IsLogOptionEnabled(String("CommLog"))) return;
+    if (!nxbase::detail::CommLogTraced()) return;
     auto ticks = std::chrono::steady_clock::now().time_since_epoch().count();
     std::ofstream trace(nxbase::CommLogPath(), std::ios::app);
     trace << asWhat << ticks << "\n";

@@ -2,6 +2,7 @@
 
 #include <boost/asio/post.hpp>
 #include <cstdlib>
+#include <optional>
 #include <stdexcept>
 
 #include "nxbase/applock.h"
@@ -9,6 +10,7 @@
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/text.h"
+#include "messaging_log.h"
 #include "toolkit/userinterface.h"
 
 PostOffice* PostOffice::smInstance = nullptr;
@@ -25,6 +27,12 @@ constexpr int kDefaultWaitTimeoutSeconds = 30;
 void Log(const String& asText) {
     LogFile::WriteToLog(asText, String(kLogKey));
 }
+
+// Log lines under "Communication" are built only when the key is on.
+#define NX_COMM_LOG(text)                                          \
+    do {                                                           \
+        if (nxbase::detail::CommunicationLogged()) Log(text);      \
+    } while (false)
 
 String Number(long alValue) {
     return String::CreateFromInt(alValue);
@@ -70,7 +78,7 @@ PostOffice::PostOffice(const String& asAppName)
       amFlags(-2, ANZAHL_BOTSCHAFTEN),
       amOwnName(asAppName),
       amLockOwner("0") {
-    Log("SetupPostOffice");
+    NX_COMM_LOG("SetupPostOffice");
     Pipe* pipe = Pipe::CreatePipe(asAppName.str());
     smInstance = this;
     pipe->SetReceiveFunction(&PostOffice::TransportReceive);
@@ -115,7 +123,7 @@ void PostOffice::Decode(MyMemoryBlock& axBlock) {
 }
 
 Link PostOffice::ChangeMessageHdl(unsigned int alMessage, Link& axHandler, unsigned char) {
-    Log(String("Set MessageHdl: ") + Number(static_cast<long>(alMessage)));
+    NX_COMM_LOG(String("Set MessageHdl: ") + Number(static_cast<long>(alMessage)));
     if (alMessage >= ANZAHL_BOTSCHAFTEN) return Link();
     Link previous = amHandlers[alMessage];
     amHandlers[alMessage] = axHandler;
@@ -136,8 +144,11 @@ ReceiveFunction PostOffice::ChangeReceiveFunction(ReceiveFunction fFunction) {
 
 void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
     int number = NumberOfCommand(axEvent);
-    AutoLog scope(String("PostOffice CommunicationReceive (Message Nr: ") + Number(number),
-                  String(kLogKey));
+    std::optional<AutoLog> scope;
+    if (nxbase::detail::CommunicationLogged()) {
+        scope.emplace(String("PostOffice CommunicationReceive (Message Nr: ") + Number(number),
+                      String(kLogKey));
+    }
     fmReceiveFunction(axEvent);
     MyMemoryBlock data = axEvent.GetData();
     const String sender(axEvent.GetSender());
@@ -145,16 +156,16 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         // An unknown answer is dropped: answering it would start an endless
         // exchange of answers to answers between two post offices.
         if (axEvent.GetCommand().rfind(kAnswerPrefix, 0) == 0) {
-            Log(String("Unknown answer dropped: ") + String(axEvent.GetCommand()));
+            NX_COMM_LOG(String("Unknown answer dropped: ") + String(axEvent.GetCommand()));
             return;
         }
         AnswerStatus(axEvent, 1);
         return;
     }
     if (number >= kAnswerOffset) {
-        Log(String("Answer received: ") + Number(number));
+        NX_COMM_LOG(String("Answer received: ") + Number(number));
         amAnswers[number].push_back(data);
-        Log(String("MessageQueue - Insert message") + ", Queue size: " +
+        NX_COMM_LOG(String("MessageQueue - Insert message") + ", Queue size: " +
             Number(static_cast<long>(amAnswers[number].size())));
         return;
     }
@@ -167,7 +178,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         if (--amConnectedPeers[sender.str()] <= 0) amConnectedPeers.erase(sender.str());
     }
     if (!CheckLock(sender)) {
-        Log("Check lock failed");
+        NX_COMM_LOG("Check lock failed");
         AnswerStatus(axEvent, 1);
         return;
     }
@@ -182,7 +193,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         ++amLockCount;
     }
     if (number == DISCONNECT) {
-        Log(String("Disconnect received from ") + sender + " (" + Number(amConnectionCount) +
+        NX_COMM_LOG(String("Disconnect received from ") + sender + " (" + Number(amConnectionCount) +
             " connections)");
         if (IsLPMServer()) {
             HandleDisconnectInServer(axEvent);
@@ -194,7 +205,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         UserInterface::Current()->EnableTopWindow(true);
         amLockOwner = "0";
     }
-    Log("Command received");
+    NX_COMM_LOG("Command received");
     amCommandQueue.push_back(axEvent);
     BotschaftenHandler();
 }
@@ -203,7 +214,7 @@ void PostOffice::HandleConnect(VELTRAEvent& axEvent) {
     ++amConnectionCount;
     ++amConnectedPeers[axEvent.GetSender()];
     amQuitTimer.Stop();  // a server about to close keeps running for its new peer
-    Log(String("Connect received from ") + String(axEvent.GetSender()) + " (" +
+    NX_COMM_LOG(String("Connect received from ") + String(axEvent.GetSender()) + " (" +
         Number(amConnectionCount) + " connections)");
     MyMemoryBlock data = axEvent.GetData();
     unsigned char level = 0;
@@ -231,7 +242,7 @@ void PostOffice::HandleDisconnectInServer(VELTRAEvent& axEvent) {
 void PostOffice::PeerLost(const std::string& asApp) {
     amLostPeers.insert(asApp);
     if (amLockOwner == String(asApp)) {
-        Log(String("Lock owner lost: ") + String(asApp));
+        NX_COMM_LOG(String("Lock owner lost: ") + String(asApp));
         amLockCount = 0;
         amLockOwner = "0";
         Application::Get().Wait(false);
@@ -241,7 +252,7 @@ void PostOffice::PeerLost(const std::string& asApp) {
     if (connected == amConnectedPeers.end()) return;
     amConnectionCount -= connected->second;
     amConnectedPeers.erase(connected);
-    Log(String("Connection lost to ") + String(asApp) + " (" + Number(amConnectionCount) +
+    NX_COMM_LOG(String("Connection lost to ") + String(asApp) + " (" + Number(amConnectionCount) +
         " connections)");
     if (IsLPMServer()) {
         VELTRAEvent event(asApp, nxbase::MessageName(DISCONNECT), MyMemoryBlock());
@@ -252,7 +263,7 @@ void PostOffice::PeerLost(const std::string& asApp) {
 
 void PostOffice::CloseWhenUnused() {
     if (amConnectionCount >= 1 || amQuitTimer.IsActive()) return;
-    Log("No more connections - Closing application");
+    NX_COMM_LOG("No more connections - Closing application");
     // The answer to the last peer goes out while the second passes.
     struct Quitter {
         long Quit(void*) {
@@ -285,9 +296,12 @@ void PostOffice::ScheduleHandler() {
 
 void PostOffice::BotschaftenHandler() {
     if (amCommandQueue.empty()) return;
-    AutoLog scope(String("Botschafent Handler (Message nr: ") +
-                      String(amCommandQueue.front().GetCommand()),
-                  String(kLogKey));
+    std::optional<AutoLog> scope;
+    if (nxbase::detail::CommunicationLogged()) {
+        scope.emplace(String("Botschafent Handler (Message nr: ") +
+                          String(amCommandQueue.front().GetCommand()),
+                      String(kLogKey));
+    }
     ApplicationLockHolder lock("Botschaften handler");
     bool locked = lock.Lock();
     if (amHandlerBusy) return;
@@ -298,7 +312,7 @@ void PostOffice::BotschaftenHandler() {
          --count) {
         VELTRAEvent event = amCommandQueue.front();
         amCommandQueue.pop_front();
-        Log(String("Botschaften Handler - Handling Message: ") + String(event.GetCommand()));
+        NX_COMM_LOG(String("Botschaften Handler - Handling Message: ") + String(event.GetCommand()));
         amHandlerBusy = true;
         int number = NumberOfCommand(event);
         Link handler = amHandlers[number];
@@ -313,9 +327,9 @@ long PostOffice::DefaultHdl(void* pEvent) {
     int number = NumberOfCommand(*event);
     signed char status = 0;
     if (number >= 0 && number <= UNLOCK) {
-        Log(String("Default Hdl - Message Nr: ") + Number(number));
+        NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number));
     } else {
-        Log(String("Default Hdl - Message Nr: ") + Number(number) + " not supported");
+        NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number) + " not supported");
         status = 2;
     }
     MyMemoryBlock answer;
@@ -335,7 +349,7 @@ void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
 // ---- sending ----
 
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
-    Log(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
+    NX_COMM_LOG(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
     String command = String(kAnswerPrefix) + String(pCommand->GetCommand());
     MyMemoryBlock copy = axData;
     return Send(pCommand->GetSender(), command, copy);
@@ -361,14 +375,14 @@ unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMe
     Encode(encoded);
     for (int retries = 0;;) {
         if (TryOnce(asApp, command, encoded)) {
-            Log(String("Sent: ") + String(command));
+            NX_COMM_LOG(String("Sent: ") + String(command));
             return true;
         }
         ++retries;
         for (int i = 0; i < 10; ++i) Application::Get().Reschedule();
         Application::Get().RunOneFor(std::chrono::milliseconds(1));
-        Log("*** Send failed ***");
-        Log(String("Retry ") + Number(retries));
+        NX_COMM_LOG("*** Send failed ***");
+        NX_COMM_LOG(String("Retry ") + Number(retries));
         if (LogFile::Instance()->IsLogOptionEnabled(String("Acoustic"))) {
             UserInterface::Current()->Beep(5000, 200);
             UserInterface::Current()->Beep(1000, 200);
@@ -382,17 +396,20 @@ bool PostOffice::TakeAnswer(int alNumber, MyMemoryBlock& axReceive) {
     auto at = amAnswers.find(alNumber);
     if (at == amAnswers.end() || at->second.empty()) return false;
     axReceive = at->second.front();
-    Log("MessageQueue - Get data from message");
+    NX_COMM_LOG("MessageQueue - Get data from message");
     at->second.pop_front();
     if (at->second.empty()) amAnswers.erase(at);
-    Log("MessageQueue - Erased message");
+    NX_COMM_LOG("MessageQueue - Erased message");
     return true;
 }
 
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
                                          boost::function<bool()> fKeepWaiting, DisEnable axMode) {
-    AutoLog scope(String("SendAndReceive (") + Number(alMessage), String(kLogKey));
+    std::optional<AutoLog> scope;
+    if (nxbase::detail::CommunicationLogged()) {
+        scope.emplace(String("SendAndReceive (") + Number(alMessage), String(kLogKey));
+    }
     auto ui = UserInterface::Current();
     bool touchWindow = axMode != DisEnableNone && ui->HasTopWindow();
     bool wasEnabled = touchWindow && ui->IsTopWindowEnabled();
@@ -403,9 +420,12 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     String command = Number(alMessage);
     bool answered = false;
     if (!Send(asApp, command, axSend)) {
-        Log("SendAndReceive, Send failed");
+        NX_COMM_LOG("SendAndReceive, Send failed");
     } else {
-        AutoLog waiting(String("WaitForAnswer"), String(kLogKey));
+        std::optional<AutoLog> waiting;
+        if (nxbase::detail::CommunicationLogged()) {
+            waiting.emplace(String("WaitForAnswer"), String(kLogKey));
+        }
         while (true) {
             if (TakeAnswer(answerNumber, axReceive)) {
                 answered = true;
@@ -415,7 +435,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
             if (fKeepWaiting && !fKeepWaiting()) break;
             Application::Get().RunOneFor(kLongestPause);
         }
-        Log(answered ? String("Answer received: ") + Number(alMessage)
+        NX_COMM_LOG(answered ? String("Answer received: ") + Number(alMessage)
                      : String("SendAndReceive, Abort"));
     }
     if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
@@ -428,14 +448,17 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     auto start = std::chrono::steady_clock::now();
     auto limit = std::chrono::seconds(WaitTimeoutSeconds());
     bool toServer = PostOfficeApplications::IsServerName(asApp);
-    if (!toServer) Log("Set callback function");
+    if (!toServer) NX_COMM_LOG("Set callback function");
     bool dialogOpen = false;
     boost::function<bool()> keepWaiting = [&]() {
         auto ui = UserInterface::Current();
         auto elapsed = std::chrono::steady_clock::now() - start;
         if (!ui->IsInteractive() && elapsed > limit) {
-            Log(String("SendAndReceive: no answer from ") + String(asApp) + " within " +
-                Number(static_cast<long>(limit.count())) + " s (NXBASE_WAIT_TIMEOUT), aborted");
+            // Always written: a wait given up for want of a person must show.
+            LogFile::WriteToLog(String("SendAndReceive: no answer from ") + String(asApp) +
+                                    " within " + Number(static_cast<long>(limit.count())) +
+                                    " s (NXBASE_WAIT_TIMEOUT), aborted",
+                                String());
             return false;
         }
         if (toServer || elapsed < kAbortDialogAfter) return true;
