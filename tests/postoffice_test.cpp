@@ -14,6 +14,7 @@
 #include <thread>
 
 #include "nxbase/applock.h"
+#include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/registry.h"
@@ -134,9 +135,14 @@ TEST_F(PostOfficeTest, ConnectLevelsUnknownNamesAndTheDefaultHandler) {
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     EXPECT_FALSE(office->IsLPMServer());
     EXPECT_TRUE(office->HasApplication("LumaServer"));
+    nxtest::WriteFile(root + "/Texte1.lng", "");
+    nxtest::WriteFile(root + "/Texte49.lng", "");
+    Language::CreateLanguage(nullptr, FileLanguageAccessChecker(String(root + "/Texte")));
+    Language::Instance()->SetLanguageByCountryCode(static_cast<LanguageCode>(1));
     RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
-    peer.Send("CONNECT", std::string("\x05\x31\x00", 3));  // level 5, then a language code
+    peer.Send("CONNECT", std::string("\x05\x31\x00", 3));  // level 5, then the code 49
     EXPECT_EQ(peer.Next(), Answer("ANSWER!CONNECT", "\x03"));
+    EXPECT_EQ(Language::Instance()->GetCountryCode(), 49);
     peer.Send("CONNECT", std::string("\x00\x02", 2));  // level 0: the next byte counts
     EXPECT_EQ(peer.Next(), Answer("ANSWER!CONNECT", "\x02"));
     EXPECT_EQ(office->GetConnectionCount(), 2);

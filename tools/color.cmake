@@ -14,22 +14,9 @@ add_library(nxcolor_core STATIC
     nxcolor/measure.cpp
     nxcolor/report.cpp
     nxcolor/screen.cpp
-    nxcolor/spectra_cgats.cpp
-    nxcolor/spectra_csv.cpp
     ${CMAKE_CURRENT_BINARY_DIR}/generated/nxcolor_embedded_chart.cpp)
 target_include_directories(nxcolor_core PUBLIC ${CMAKE_CURRENT_SOURCE_DIR}/nxcolor)
 target_link_libraries(nxcolor_core PUBLIC nxbase)
-
-# CGATS input goes through LittleCMS's parser (Debian: liblcms2-dev); without
-# it nxcolor reads CSV only and says so for CGATS files.
-pkg_check_modules(LCMS2 IMPORTED_TARGET lcms2)
-if(LCMS2_FOUND)
-    target_link_libraries(nxcolor_core PRIVATE PkgConfig::LCMS2)
-    target_compile_definitions(nxcolor_core PRIVATE NXCOLOR_HAVE_LCMS2=1)
-else()
-    message(STATUS "nxcolor: LittleCMS (lcms2) not found, CGATS input disabled")
-    target_compile_definitions(nxcolor_core PRIVATE NXCOLOR_HAVE_LCMS2=0)
-endif()
 
 add_executable(nxcolor nxcolor/main.cpp)
 target_link_libraries(nxcolor PRIVATE nxcolor_core)

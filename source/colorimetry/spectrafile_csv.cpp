@@ -1,11 +1,11 @@
-// CSV spectra for nxcolor; see spectra_csv.h for the format.
-#include "spectra_csv.h"
+// CSV spectra; see nxbase/spectrafile.h for the format.
+#include "nxbase/spectrafile.h"
 
 #include <cctype>
 #include <charconv>
 #include <cmath>
 
-namespace nxcolor {
+namespace nxbase {
 namespace {
 
 std::string_view Trim(std::string_view s) {
@@ -229,4 +229,4 @@ SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, f
     return table;
 }
 
-}  // namespace nxcolor
+}  // namespace nxbase

@@ -10,13 +10,11 @@
 #include <string>
 #include <vector>
 
-#include "spectra_csv.h"
+#include "nxbase/spectrafile.h"
 
-#if NXCOLOR_HAVE_LCMS2
 #include <lcms2.h>
-#endif
 
-namespace nxcolor {
+namespace nxbase {
 namespace {
 
 // The line of each data set, counting one set per non-blank, non-comment
@@ -45,8 +43,6 @@ std::vector<int> DataLines(std::string_view text) {
     }
     return lines;
 }
-
-#if NXCOLOR_HAVE_LCMS2
 
 // LittleCMS words syntax errors "<file>: Line <n>, <what>" (no file name for
 // text in memory); they become "<source>:<n>: <what>".
@@ -98,7 +94,6 @@ private:
     cmsHANDLE amHandle = nullptr;
 };
 
-#endif  // NXCOLOR_HAVE_LCMS2
 
 }  // namespace
 
@@ -108,7 +103,6 @@ bool LooksLikeCgats(std::string_view text) {
 
 SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source, float scale) {
     SpectraTable table;
-#if NXCOLOR_HAVE_LCMS2
     Cgats cgats;
     if (!cgats.Load(text)) {
         table.errors.push_back(LocateError(source, cgats.FirstError()));
@@ -181,12 +175,6 @@ SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
         }
         if (good) table.rows.push_back(std::move(row));
     }
-#else
-    (void)text;
-    (void)scale;
-    table.errors.push_back(source + ": CGATS input needs LittleCMS, which this nxcolor was built without");
-    table.unusable = true;
-#endif
     return table;
 }
 
@@ -220,4 +208,4 @@ bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, 
     return true;
 }
 
-}  // namespace nxcolor
+}  // namespace nxbase
