@@ -18,6 +18,7 @@
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
+#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/application.h"
 
@@ -25,14 +26,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-    auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!done()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
-        Application::Get().RunOneFor(10ms);
-    }
-    return true;
-}
+using nxtest::RunUntil;
 
 std::string Hex(const MyMemoryBlock& block) {
     static const char kDigits[] = "0123456789abcdef";
@@ -66,20 +60,9 @@ struct Notices {
 class LumaServerTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        char pattern[] = "/tmp/nxbase-luma-XXXXXX";
-        ASSERT_NE(::mkdtemp(pattern), nullptr);
-        root = pattern;
-        Env("NXBASE_RUNTIME_DIR", root + "/run");
-        Env("USERNAME", "");
-        Env("NXBASE_MACHINE_REGISTRY", root + "/machine.sqlite");
-        Env("NXBASE_USER_REGISTRY", root + "/user.sqlite");
-        Env("NXBASE_LOG_PATH", root + "/log");
-        std::filesystem::create_directories(root + "/bin");
-        std::filesystem::create_directories(root + "/log");
-        // A copy under a name of its own: no other test's server counts as running.
-        serverExecutable = "lumaserver" + std::to_string(::getpid());
-        std::filesystem::copy_file(NXBASE_BINARY_DIR "/tools/lumaserver",
-                                   root + "/bin/" + serverExecutable);
+        root = sandbox.root();
+        std::string server = sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "lumaserver");
+        serverExecutable = server.substr(server.rfind('/') + 1);
         ASSERT_EQ(std::system((root + "/bin/" + serverExecutable + " --register >/dev/null").c_str()), 0);
         Application::Get().ResetQuit();
     }
@@ -96,11 +79,6 @@ class LumaServerTest : public ::testing::Test {
         }
         while (::waitpid(-1, nullptr, WNOHANG) > 0) {
         }
-        std::error_code ignored;
-        std::filesystem::remove_all(root, ignored);
-    }
-    void Env(const char* name, const std::string& value) {
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>(name, value));
     }
     MyMemoryBlock Ask(int message, MyMemoryBlock request = MyMemoryBlock()) {
         MyMemoryBlock answer;
@@ -114,8 +92,8 @@ class LumaServerTest : public ::testing::Test {
         EXPECT_EQ(Hex(Ask(CONNECT, level)), "02");
     }
 
+    nxtest::MessagingSandbox sandbox{"luma"};
     std::string root, serverExecutable;
-    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
 };
 
 TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {

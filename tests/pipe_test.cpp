@@ -19,6 +19,7 @@
 #include "nxbase/msgcat.h"
 #include "nxbase/poapps.h"
 #include "nxbase/registry.h"
+#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/application.h"
 
@@ -53,14 +54,7 @@ MyMemoryBlock BlockOf(const std::string& bytes) {
     return block;
 }
 
-bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-    auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!done()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
-        Application::Get().RunOneFor(20ms);
-    }
-    return true;
-}
+using nxtest::RunUntil;
 
 TEST(PipeWire, FramesAndTheHandshakeByteForByte) {
     std::string stuffed = nxbase::EncodeBytes("\x00\x01\x02", 3);
@@ -111,32 +105,11 @@ TEST(PipeWire, TheFrameReaderTakesBytesInAnyPiecesAndRefusesHugeLengths) {
 class PipeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        char pattern[] = "/tmp/nxbase-pipe-XXXXXX";  // short: socket paths are limited
-        ASSERT_NE(::mkdtemp(pattern), nullptr);
-        root = pattern;
-        runtime = root + "/run";
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_RUNTIME_DIR", runtime));
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("USERNAME", ""));
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_MACHINE_REGISTRY",
-                                                             root + "/machine.sqlite"));
-        env.emplace_back(
-            std::make_unique<nxtest::ScopedEnv>("NXBASE_USER_REGISTRY", root + "/user.sqlite"));
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>("NXBASE_LOG_PATH", root + "/log"));
-        // The peer under a name of its own, so that no other test's peer counts as running.
-        std::filesystem::create_directories(root + "/bin");
-        peerProgram = root + "/bin/echopeer" + std::to_string(::getpid());
-        std::filesystem::copy_file(NXBASE_PIPE_PEER, peerProgram);
-        RegistryHandler::AddRegistryEntry(
-            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Path"), "/none");
-        RegistryHandler::AddRegistryEntry(
-            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Executable"),
-            "/none/lumaserver");
-        RegistryHandler::AddRegistryEntry(
-            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\LumaServer", "Version"), "3.0");
-        RegistryHandler::AddRegistryEntry(
-            RegistryEntry(HKEY_LOCAL_MACHINE, "Software\\K-Lume\\ChromaLink\\Applications",
-                          "EchoPeer"),
-            peerProgram);
+        root = sandbox.root();
+        runtime = sandbox.runtime();
+        peerProgram = sandbox.CopyProgram(NXBASE_PIPE_PEER, "echopeer");
+        sandbox.RegisterAbsentServer();
+        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peerProgram);
         applications = std::make_unique<PostOfficeApplications>("PipeTestClient");
         pipe = Pipe::CreatePipe("PipeTestClient");
         pipe->SetReceiveFunction(Record);
@@ -156,8 +129,6 @@ class PipeTest : public ::testing::Test {
         for (int i = 0; i < 100 && ::waitpid(-1, nullptr, WNOHANG) >= 0; ++i) {
             std::this_thread::sleep_for(20ms);
         }
-        std::error_code ignored;
-        std::filesystem::remove_all(root, ignored);
     }
 
     // Sends `data` as GET_DEVICE_NAME to the echo peer and waits for the echo.
@@ -188,8 +159,8 @@ class PipeTest : public ::testing::Test {
         return fd;
     }
 
+    nxtest::MessagingSandbox sandbox{"pipe"};
     std::string root, runtime, peerProgram;
-    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
     std::unique_ptr<PostOfficeApplications> applications;
     Pipe* pipe = nullptr;
 };

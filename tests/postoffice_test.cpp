@@ -18,6 +18,7 @@
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/registry.h"
+#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/userinterface.h"
 
@@ -25,14 +26,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-bool RunUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-    auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!done()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
-        Application::Get().RunOneFor(10ms);
-    }
-    return true;
-}
+using nxtest::RunUntil;
 
 // A peer speaking the wire protocol by hand on a connection to the post office.
 class RawPeer {
@@ -83,23 +77,12 @@ class RawPeer {
 class PostOfficeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        char pattern[] = "/tmp/nxbase-po-XXXXXX";
-        ASSERT_NE(::mkdtemp(pattern), nullptr);
-        root = pattern;
-        Env("NXBASE_RUNTIME_DIR", root + "/run");
-        Env("USERNAME", "");
-        Env("NXBASE_MACHINE_REGISTRY", root + "/machine.sqlite");
-        Env("NXBASE_USER_REGISTRY", root + "/user.sqlite");
-        Env("NXBASE_LOG_PATH", root + "/log");
-        Env("NXBASE_LOG_OPTIONS", "Communication,ApplicationLock");
-        std::filesystem::create_directories(root + "/bin");
-        peerExecutable = "popeer" + std::to_string(::getpid());
-        std::filesystem::copy_file(NXBASE_PIPE_PEER, root + "/bin/" + peerExecutable);
-        Register("Software\\K-Lume\\LumaServer", "Path", "/none");
-        Register("Software\\K-Lume\\LumaServer", "Executable", "/none/lumaserver");
-        Register("Software\\K-Lume\\LumaServer", "Version", "3.0");
-        Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer",
-                 root + "/bin/" + peerExecutable);
+        root = sandbox.root();
+        sandbox.Env("NXBASE_LOG_OPTIONS", "Communication,ApplicationLock");
+        std::string peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "popeer");
+        peerExecutable = peer.substr(peer.rfind('/') + 1);
+        sandbox.RegisterAbsentServer();
+        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peer);
         Application::Get().ResetQuit();
     }
     void TearDown() override {
@@ -112,19 +95,11 @@ class PostOfficeTest : public ::testing::Test {
         while (::waitpid(-1, nullptr, 0) > 0) {
         }
         Application::Get().ResetQuit();
-        std::error_code ignored;
-        std::filesystem::remove_all(root, ignored);
-    }
-    void Env(const char* name, const std::string& value) {
-        env.emplace_back(std::make_unique<nxtest::ScopedEnv>(name, value));
-    }
-    static void Register(const char* key, const char* name, const std::string& value) {
-        RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, name), value);
     }
     std::string Log() { return nxtest::ReadFile(LogFile::Instance()->GetFileName()); }
 
+    nxtest::MessagingSandbox sandbox{"po"};
     std::string root, peerExecutable;
-    std::vector<std::unique_ptr<nxtest::ScopedEnv>> env;
     std::shared_ptr<RecordingUserInterface> ui = std::make_shared<RecordingUserInterface>();
     ScopedUserInterface scopedUi{ui};
 };
@@ -308,7 +283,7 @@ TEST_F(PostOfficeTest, TheServerEndsOneSecondAfterItsLastPeerDisconnects) {
 TEST_F(PostOfficeTest, WithoutAPostOfficeInstanceFailsClearly) {
     EXPECT_THROW(PostOffice::Instance(), std::logic_error);
     // A missing server registration ends the set-up.
-    Register("Software\\K-Lume\\LumaServer", "Version", "2.9");
+    sandbox.Register("Software\\K-Lume\\LumaServer", "Version", "2.9");
     EXPECT_THROW(PostOffice::CreatePostOffice("Tester"), std::runtime_error);
     EXPECT_FALSE(PostOffice::IsInitialized());
 }

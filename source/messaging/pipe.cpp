@@ -113,6 +113,24 @@ bool WriteBlocking(int fd, const std::string& asBytes) {
     return true;
 }
 
+// Writes `bytes` from `done` on, in pieces, without blocking, until the
+// socket is full; false (errno set) when the connection failed.
+bool SendPieces(int fd, const std::string& bytes, std::size_t& done) {
+    while (done < bytes.size()) {
+        std::size_t piece = std::min(kWriteBlockSize, bytes.size() - done);
+        ssize_t n = ::send(fd, bytes.data() + done, piece, MSG_DONTWAIT | MSG_NOSIGNAL);
+        if (n > 0) {
+            done += static_cast<std::size_t>(n);
+            continue;
+        }
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return true;
+        if (n == 0) errno = EPIPE;
+        return false;
+    }
+    return true;
+}
+
 // Reads one frame from a blocking descriptor within the time-out.
 bool ReadFrameBlocking(int fd, std::string& asBody) {
     FrameReader reader;
@@ -527,16 +545,7 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     if (axChannel->outgoing.empty()) {
         // The usual case: the socket takes the whole frame at once, no copy.
         std::size_t done = 0;
-        int fd = axChannel->socket.native_handle();
-        while (done < asFrame.size()) {
-            std::size_t piece = std::min(nxbase::kWriteBlockSize, asFrame.size() - done);
-            ssize_t n = ::send(fd, asFrame.data() + done, piece, MSG_DONTWAIT | MSG_NOSIGNAL);
-            if (n > 0) {
-                done += static_cast<std::size_t>(n);
-                continue;
-            }
-            if (n < 0 && errno == EINTR) continue;
-            if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
+        if (!nxbase::SendPieces(axChannel->socket.native_handle(), asFrame, done)) {
             Close(axChannel, std::string("write failed: ") + std::strerror(errno));
             return false;
         }
@@ -550,18 +559,9 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
 }
 
 void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
-    int fd = axChannel->socket.native_handle();
-    std::size_t done = 0;
     std::string& out = axChannel->outgoing;
-    while (done < out.size()) {
-        std::size_t piece = std::min(nxbase::kWriteBlockSize, out.size() - done);
-        ssize_t n = ::send(fd, out.data() + done, piece, MSG_DONTWAIT | MSG_NOSIGNAL);
-        if (n > 0) {
-            done += static_cast<std::size_t>(n);
-            continue;
-        }
-        if (n < 0 && errno == EINTR) continue;
-        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
+    std::size_t done = 0;
+    if (!nxbase::SendPieces(axChannel->socket.native_handle(), out, done)) {
         out.erase(0, done);
         Close(axChannel, std::string("write failed: ") + std::strerror(errno));
         return;

@@ -1,0 +1,89 @@
+// Shared pieces of the messaging tests: a private sandbox (runtime directory,
+// registry hives, log) per test, a copy of a peer program under a name of its
+// own, and running the event loop until something happened.
+#ifndef NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
+#define NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
+
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "nxbase/registry.h"
+#include "test_util.h"
+#include "toolkit/application.h"
+
+namespace nxtest {
+
+// Runs the loop until `done` or `limit`; false on the time-out.
+inline bool RunUntil(const std::function<bool()>& done,
+                     std::chrono::milliseconds limit = std::chrono::seconds(10)) {
+    auto deadline = std::chrono::steady_clock::now() + limit;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        Application::Get().RunOneFor(std::chrono::milliseconds(10));
+    }
+    return true;
+}
+
+// A directory under /tmp (short: socket paths are limited to 108 bytes) that
+// holds the runtime directory, both hives and the log, with the environment
+// pointing there; removed at the end. LumaServer is registered at a path
+// that does not exist, so that post offices can be set up.
+class MessagingSandbox {
+  public:
+    explicit MessagingSandbox(const char* tag) {
+        std::string pattern = std::string("/tmp/nxbase-") + tag + "-XXXXXX";
+        std::vector<char> buffer(pattern.begin(), pattern.end());
+        buffer.push_back('\0');
+        root_ = ::mkdtemp(buffer.data()) ? buffer.data() : pattern;
+        Env("NXBASE_RUNTIME_DIR", runtime());
+        Env("USERNAME", "");
+        Env("NXBASE_MACHINE_REGISTRY", root_ + "/machine.sqlite");
+        Env("NXBASE_USER_REGISTRY", root_ + "/user.sqlite");
+        Env("NXBASE_LOG_PATH", root_ + "/log");
+        std::filesystem::create_directories(root_ + "/bin");
+        std::filesystem::create_directories(root_ + "/log");
+    }
+    ~MessagingSandbox() {
+        env_.clear();
+        std::error_code ignored;
+        std::filesystem::remove_all(root_, ignored);
+    }
+    MessagingSandbox(const MessagingSandbox&) = delete;
+    MessagingSandbox& operator=(const MessagingSandbox&) = delete;
+
+    const std::string& root() const { return root_; }
+    std::string runtime() const { return root_ + "/run"; }
+
+    void Env(const char* name, const std::string& value) {
+        env_.emplace_back(std::make_unique<ScopedEnv>(name, value));
+    }
+    static void Register(const char* key, const char* name, const std::string& value) {
+        RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, name), value);
+    }
+    void RegisterAbsentServer() {
+        Register("Software\\K-Lume\\LumaServer", "Path", "/none");
+        Register("Software\\K-Lume\\LumaServer", "Executable", "/none/lumaserver");
+        Register("Software\\K-Lume\\LumaServer", "Version", "3.0");
+    }
+    // Copies `program` into bin/ as <base><pid>: a name no other test's
+    // process has, since "is it running" looks at executable names.
+    std::string CopyProgram(const std::string& program, const std::string& base) {
+        std::string copy = root_ + "/bin/" + base + std::to_string(::getpid());
+        std::filesystem::copy_file(program, copy);
+        return copy;
+    }
+
+  private:
+    std::string root_;
+    std::vector<std::unique_ptr<ScopedEnv>> env_;
+};
+
+}  // namespace nxtest
+
+#endif  // NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
