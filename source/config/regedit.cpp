@@ -38,24 +38,6 @@ std::string Excerpt(std::string_view asText) {
 
 // ---- the text's encoding ----
 
-void AppendUtf8(std::string& axOut, char32_t alCode) {
-    if (alCode < 0x80) {
-        axOut += static_cast<char>(alCode);
-    } else if (alCode < 0x800) {
-        axOut += static_cast<char>(0xC0 | (alCode >> 6));
-        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
-    } else if (alCode < 0x10000) {
-        axOut += static_cast<char>(0xE0 | (alCode >> 12));
-        axOut += static_cast<char>(0x80 | ((alCode >> 6) & 0x3F));
-        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
-    } else {
-        axOut += static_cast<char>(0xF0 | (alCode >> 18));
-        axOut += static_cast<char>(0x80 | ((alCode >> 12) & 0x3F));
-        axOut += static_cast<char>(0x80 | ((alCode >> 6) & 0x3F));
-        axOut += static_cast<char>(0x80 | (alCode & 0x3F));
-    }
-}
-
 // UTF-16LE bytes (an odd last byte ignored) as UTF-8; a lone surrogate
 // becomes U+FFFD.
 std::string Utf16LeToUtf8(std::string_view asBytes) {
@@ -75,7 +57,7 @@ std::string Utf16LeToUtf8(std::string_view asBytes) {
             }
         }
         if (code >= 0xD800 && code <= 0xDFFF) code = 0xFFFD;
-        AppendUtf8(out, code);
+        toolkit::AppendUtf8(out, code);
     }
     return out;
 }

@@ -102,6 +102,9 @@ NXBASE_EXPORT std::ostream& operator<<(std::ostream& out, const String& text);
 
 namespace toolkit {
 
+// Appends the UTF-8 bytes of the code point `code` (up to U+10FFFF).
+NXBASE_EXPORT void AppendUtf8(std::string& out, char32_t code);
+
 // Windows-1252 (the ANSI code page of String) to UTF-8. Every byte has a
 // character: the five bytes the code page leaves undefined become U+0081,
 // U+008D, U+008F, U+0090 and U+009D, so that Utf8ToWindows1252 gives back
