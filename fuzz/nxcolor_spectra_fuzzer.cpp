@@ -6,13 +6,13 @@
 #include <cstdint>
 #include <string_view>
 
-#include "spectra_csv.h"
+#include "nxbase/spectrafile.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const std::string_view text(reinterpret_cast<const char*>(data), size);
-    const nxcolor::SpectraTable table = nxcolor::ParseSpectra(text, "fuzz");
+    const nxbase::SpectraTable table = nxbase::ParseSpectra(text, "fuzz");
     if (table.unusable && !table.rows.empty()) __builtin_trap();
-    for (const nxcolor::SpectrumRow& row : table.rows) {
+    for (const nxbase::SpectrumRow& row : table.rows) {
         if (row.id.empty() || row.line < 0) __builtin_trap();
         for (float v : row.values) {
             if (!std::isfinite(v)) __builtin_trap();

@@ -228,6 +228,17 @@ TEST(LChVector, HuesLieInZeroExclusiveToThreeSixtyInclusive) {
     EXPECT_NEAR(hue(1.0f, 0.01f), 0.573, 1e-3);
 }
 
+TEST(LABVector, ValuesEnteredWhileDin99IsCurrentAreCielab) {
+    LabTypeGuard guard;
+    LABVector::SetColorSpaceType(LAB_DIN99);
+    const LABVector entered(50, 10, 20, D50Condition());
+    EXPECT_EQ(entered.GetLabVectorColorSpace(), LAB_CIE1976);
+    const XYZVector xyz(entered);
+    EXPECT_NEAR(xyz[0], 19.70, 0.01);
+    EXPECT_NEAR(xyz[1], 18.42, 0.01);
+    EXPECT_NEAR(xyz[2], 8.51, 0.01);
+}
+
 TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
     LabTypeGuard guard;
     // DIN 6176 evaluated in double from the same inputs (pi = 3.1415926).

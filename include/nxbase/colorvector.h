@@ -109,7 +109,8 @@ class LChVector;
 class NXBASE_EXPORT LABVector : public ColorVector {
 public:
     LABVector() = default;
-    // Stored as given; the type is the current process-wide type.
+    // Stored as given, as CIE 1976 values: only vectors computed from
+    // tristimulus values take the process-wide type.
     LABVector(float axL, float axa, float axb, const MeasuringCondition& axCondition);
     // With the current filter of the CMetry facade. Allocates nothing.
     explicit LABVector(const ReflectanceSpectrum& axSpectrum);

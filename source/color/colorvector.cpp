@@ -281,9 +281,10 @@ XYZVector::XYZVector(const CMetryFilter& axFilter, const ReflectanceSpectrum& ax
     for (float& v : amV) v = v / sumY * 100.0f;
 }
 
+// The components are taken as CIELAB whatever the vector's type: convert a
+// DIN99 vector with GetCIELab() first.
 XYZVector::XYZVector(const LABVector& axLab) : ColorVector(axLab.GetMeasuringCondition()) {
-    float lab[3] = {axLab[0], axLab[1], axLab[2]};
-    if (axLab.GetLabVectorColorSpace() == LAB_DIN99) Din99Inverse(axLab.getV(), lab);
+    const float lab[3] = {axLab[0], axLab[1], axLab[2]};
     const MeasuringCondition& condition = axLab.GetMeasuringCondition();
     float sums[3];
     WeightSums(FilterFor(condition.GetIllum(), condition.GetObserver()), sums);
@@ -313,7 +314,7 @@ xyYVector::xyYVector(const XYZVector& axXYZ) : ColorVector(axXYZ.GetMeasuringCon
 // --- LABVector ---------------------------------------------------------------
 
 LABVector::LABVector(float axL, float axa, float axb, const MeasuringCondition& axCondition)
-    : ColorVector(axL, axa, axb, axCondition), amType(GetColorSpaceType()) {}
+    : ColorVector(axL, axa, axb, axCondition), amType(LAB_CIE1976) {}
 
 LABVector::LABVector(const ReflectanceSpectrum& axSpectrum) : LABVector(CurrentFilter(), axSpectrum) {}
 
