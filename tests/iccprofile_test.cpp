@@ -90,6 +90,19 @@ TEST_F(IccTest, LoadsAnRgbProfileAndConvertsLabToDisplayRgb) {
     double outside[3] = {50, 200, -200};
     ASSERT_TRUE(engine->LabToRGB(outside, rgb));
     for (double v : rgb) EXPECT_TRUE(v >= 0.0 && v <= 1.0) << v;
+
+    // A spectrum's screen colour uses the vector's own condition: changing
+    // the facade's current condition does not change it.
+    std::vector<float> values(36);
+    for (int i = 0; i < 36; ++i) values[i] = 0.2f + 0.6f * static_cast<float>(i) / 35.0f;
+    const ReflectanceSpectrum orange(values, PhysicalConditions());
+    const RGBVector before(orange);
+    const MeasuringCondition saved = CMetry::Instance()->GetMeasuringConditions();
+    CMetry::Instance()->SetMeasuringConditions(
+        MeasuringCondition(IllumClass("A"), ObserverClass(OBSERVER_10DEG), PhysicalConditions()));
+    const RGBVector after(orange);
+    CMetry::Instance()->SetMeasuringConditions(saved);
+    for (int i = 0; i < 3; ++i) EXPECT_EQ(before[i], after[i]) << i;
 }
 
 TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
@@ -132,6 +145,7 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         EXPECT_GT(converted[0], 0.0f);
         ICCEngine* engine = ICCEngine::Instance();
         EXPECT_FALSE(ICCProfile::ProfileValid()) << path;
+        EXPECT_FALSE(ICCProfile::ProfileEnabled()) << "a profile that cannot be loaded: " << path;
         EXPECT_NE(engine->GetProblem().find(problem), std::string::npos)
             << path << ": " << engine->GetProblem();
         double in[3] = {50, 0, 0}, out[3] = {-1, -1, -1};

@@ -183,13 +183,12 @@ void RGBVector::Init() {
 }
 
 void RGBVector::ReflectanceSpectrumToRGB(const ReflectanceSpectrum& axSpectrum,
-                                         const CMetryFilter& axFilter, bool axRGBFilter) {
+                                         const CMetryFilter& axFilter, bool /*axRGBFilter*/) {
     Init();
     if (ICCEngine::Instance()->IsActive()) {
-        LABVector lab = axRGBFilter
-                            ? LABVector(axSpectrum, CMetry::Instance()->GetMeasuringConditions())
-                            : LABVector(axFilter, axSpectrum);
-        amCondition = lab.GetMeasuringCondition();
+        // Lab under the vector's own condition (the RGB filter's, or the
+        // given filter's), not under whatever the facade has current.
+        const LABVector lab(axSpectrum, amCondition);
         if (ProfiledLabToRGB(lab.GetCIELab())) return;
     }
     // XYZ on 0..100: X_i = 100 (W_i . R) / sum(W_1).

@@ -104,9 +104,11 @@ void ICCEngine::Load() {
     if (amEnabled) LoadProfile();  // never touch the profile while switched off
 }
 
+// An engine whose profile cannot be loaded is disabled.
 void ICCEngine::SetEnabled(bool axEnabled) {
     amEnabled = axEnabled;
     if (axEnabled && !amProfileTried) LoadProfile();
+    if (amTransform == nullptr) amEnabled = false;
 }
 
 void ICCEngine::LoadProfile() {
@@ -151,6 +153,7 @@ void ICCEngine::LoadProfile() {
         if (display != nullptr) cmsCloseProfile(display);
     }
     if (amTransform == nullptr) {
+        amEnabled = false;
         LogFile::WriteToLog(String("ICC profile not used, colours from the built-in formulas: " +
                                    amProblem),
                             String());

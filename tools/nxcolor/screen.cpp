@@ -159,7 +159,8 @@ std::string SetUpScreenColors(const std::string& profilePath) {
         UserConfig::CreateUserConfig(String("nxcolor"), String(), String());
     }
     ICCEngine* engine = ICCEngine::CreateICCEngine();
-    if (engine->IsEnabled() && !engine->ProfileOK())
+    // A profile was asked for (the engine tried it) but cannot be used.
+    if (!engine->ProfileOK() && !engine->GetProblem().empty())
         return "ICC profile not used (" + engine->GetProblem() + "); sRGB formulas instead";
     return "";
 }
