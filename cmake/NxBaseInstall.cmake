@@ -19,5 +19,8 @@ write_basic_package_version_file(${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake
 install(FILES ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake
     ${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake DESTINATION ${NXBASE_CMAKE_DIR})
 
+# From <prefix>/<libdir>/pkgconfig back to <prefix>: one ".." per component.
+file(RELATIVE_PATH NXBASE_PC_TO_PREFIX
+    /nxbase-prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /nxbase-prefix)
 configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
 install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)

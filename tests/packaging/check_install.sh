@@ -18,9 +18,23 @@ LD_LIBRARY_PATH="$work/prefix/lib:$work/prefix/lib/x86_64-linux-gnu" NXBASE_LOG_
     "$work/consumer/consumer"
 grep -q "consumer started" "$work/log.txt"
 
-libdir=$(ls -d "$work"/prefix/lib*/pkgconfig | head -n 1)
-flags=$(PKG_CONFIG_PATH="$libdir" pkg-config --define-prefix --cflags --libs nxbase)
-c++ -std=c++17 $cxx_flags "$source_dir/examples/consumer/main.cpp" $flags -o "$work/consumer-pc"
-LD_LIBRARY_PATH="$(dirname "$libdir")" NXBASE_LOG_PATH="$work/log2.txt" "$work/consumer-pc"
+# The .pc file finds its prefix from where it lies (no --define-prefix).
+pcdir=$(dirname "$(find "$work/prefix" -name nxbase.pc | head -n 1)")
+flags=$(PKG_CONFIG_PATH="$pcdir" pkg-config --cflags --libs nxbase)
+case "$flags" in *"$work/prefix"*) ;; *) echo "pkg-config points elsewhere: $flags"; exit 1 ;; esac
+libdir=$(PKG_CONFIG_PATH="$pcdir" pkg-config --variable=libdir nxbase)
+c++ -std=c++17 $cxx_flags "$source_dir/examples/consumer/main.cpp" $flags \
+    -Wl,-rpath,"$libdir" -o "$work/consumer-pc"
+NXBASE_LOG_PATH="$work/log2.txt" "$work/consumer-pc"
 grep -q "consumer started" "$work/log2.txt"
+
+# The installed programs start without any library path from the environment.
+if [ -x "$work/prefix/bin/nxreg" ]; then
+    env -u LD_LIBRARY_PATH NXBASE_MACHINE_REGISTRY="$work/m.sqlite" \
+        NXBASE_USER_REGISTRY="$work/u.sqlite" NXBASE_LOG_PATH="$work" \
+        "$work/prefix/bin/nxreg" files > /dev/null
+    env -u LD_LIBRARY_PATH NXBASE_LOG_PATH="$work" "$work/prefix/bin/nxcolor" --list-illuminants \
+        | grep -q D65
+    env -u LD_LIBRARY_PATH NXBASE_LOG_PATH="$work" "$work/prefix/bin/lumaserver" --version > /dev/null
+fi
 echo "installed package works with find_package and pkg-config"
