@@ -46,6 +46,9 @@ class MessagingSandbox {
         Env("NXBASE_MACHINE_REGISTRY", root_ + "/machine.sqlite");
         Env("NXBASE_USER_REGISTRY", root_ + "/user.sqlite");
         Env("NXBASE_LOG_PATH", root_ + "/log");
+        // Never the user's session bus: tests that use D-Bus start their own.
+        Env("DBUS_SESSION_BUS_ADDRESS", "");
+        Env("XDG_RUNTIME_DIR", "");
         std::filesystem::create_directories(root_ + "/bin");
         std::filesystem::create_directories(root_ + "/log");
     }

@@ -24,6 +24,7 @@
 #include "nxbase/export.h"
 #include "nxbase/veltraevent.h"
 
+class DDE;
 class MyMemoryBlock;
 class PostOfficeApplication;
 class PostOfficeApplications;
@@ -94,7 +95,8 @@ class NXBASE_EXPORT Pipe {
     // Closes every channel and the listener.
     static void DeletePipe();
 
-    void SetReceiveFunction(ReceiveFunction fFunction) { fmReceiveFunction = fFunction; }
+    // The receive function of both transports, the sockets' and DDE's.
+    void SetReceiveFunction(ReceiveFunction fFunction);
     ReceiveFunction GetReceiveFunction() const { return fmReceiveFunction; }
     // Called on the loop with the peer's name when a channel to it is lost.
     void SetChannelLostFunction(std::function<void(const std::string&)> fFunction) {
@@ -102,11 +104,12 @@ class NXBASE_EXPORT Pipe {
     }
     // The applications that may be started when they do not run (kept by the
     // caller, usually the post office); null: none.
-    void SetApplications(const PostOfficeApplications* pApplications) {
-        pmApplications = pApplications;
-    }
+    void SetApplications(const PostOfficeApplications* pApplications);
     // The country code given to started applications.
-    void SetCountryCode(int alCode) { amCountryCode = alCode; }
+    void SetCountryCode(int alCode);
+    // Whether pipes created from now on listen on their request socket
+    // (default yes); a process that is to be reached by DDE only says no.
+    static void SetSocketListening(bool abListen);
 
     // Frames and writes one message to `asApp`, opening the channel first and
     // starting the application when it is registered but not running.
@@ -139,6 +142,8 @@ class NXBASE_EXPORT Pipe {
     void FlushOutgoing(const ChannelPtr& axChannel);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
+    bool SendByDde(const std::string& asApp, const std::string& asCommand,
+                   const MyMemoryBlock& axEncodedData);
     std::string OwnRequestText() const;
 
     std::string amOwnName;
@@ -152,6 +157,7 @@ class NXBASE_EXPORT Pipe {
     std::unique_ptr<Listener> pmListener;
     std::map<std::string, ChannelPtr> amChannels;  // by peer name
     std::set<ChannelPtr> amAllChannels;            // every open connection
+    std::unique_ptr<DDE> pmDDE;                    // the older transport, for peers on the bus
 };
 
 #endif  // NXBASE_PIPE_H_

@@ -20,6 +20,7 @@
 #include <stdexcept>
 #include <vector>
 
+#include "nxbase/dde.h"
 #include "nxbase/logfile.h"
 #include "messaging_log.h"
 #include "nxbase/msgcat.h"
@@ -58,6 +59,7 @@ constexpr auto kStartWait = std::chrono::seconds(10);
 constexpr std::size_t kReadChunk = 64 * 1024;
 
 Pipe* gPipe = nullptr;
+bool gListen = true;
 
 void Log(const std::string& asText) {
     LogFile::WriteToLog(String(asText), String(kLogKey));
@@ -328,13 +330,33 @@ Pipe* Pipe::CreatePipe(const std::string& asOwnAppName) {
     DeletePipe();
     auto* pipe = new Pipe(asOwnAppName);
     try {
-        pipe->Listen();
+        if (nxbase::gListen) pipe->Listen();
     } catch (...) {
         delete pipe;
         throw;
     }
+    pipe->pmDDE = std::make_unique<DDE>(asOwnAppName);
     nxbase::gPipe = pipe;
     return pipe;
+}
+
+void Pipe::SetSocketListening(bool abListen) {
+    nxbase::gListen = abListen;
+}
+
+void Pipe::SetReceiveFunction(ReceiveFunction fFunction) {
+    fmReceiveFunction = fFunction;
+    if (pmDDE) pmDDE->SetReceiveFunction(fFunction);
+}
+
+void Pipe::SetApplications(const PostOfficeApplications* pApplications) {
+    pmApplications = pApplications;
+    if (pmDDE) pmDDE->SetApplications(pApplications);
+}
+
+void Pipe::SetCountryCode(int alCode) {
+    amCountryCode = alCode;
+    if (pmDDE) pmDDE->SetCountryCode(alCode);
 }
 
 Pipe* Pipe::Instance() {
@@ -350,6 +372,7 @@ Pipe::Pipe(const std::string& asOwnAppName)
     : amOwnName(asOwnAppName), amProcessId(std::to_string(::getpid())) {}
 
 Pipe::~Pipe() {
+    pmDDE.reset();
     for (const ChannelPtr& channel : std::set<ChannelPtr>(amAllChannels)) {
         channel->closed = true;
         boost::system::error_code ignored;
@@ -652,6 +675,10 @@ Pipe::ChannelPtr Pipe::OpenOrStart(const std::string& asApp) {
                 until - std::chrono::steady_clock::now()));
         }
         if (ChannelPtr channel = OpenChannel(asApp)) return channel;
+        // A peer reached by DDE only shows up on the bus instead.
+        if (pmDDE && pmDDE->IsActive() && pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str())) {
+            return nullptr;
+        }
         pause = std::min(pause * 2, std::chrono::milliseconds(200));
     }
     nxbase::Log("Pipe: " + asApp + " did not open its socket in time");
@@ -661,14 +688,22 @@ Pipe::ChannelPtr Pipe::OpenOrStart(const std::string& asApp) {
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 const MyMemoryBlock& axEncodedData) {
     if (nxbase::detail::CommunicationLogged()) nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
+    // A process reached by DDE only also sends by DDE.
+    if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
+        return SendByDde(asApp, asCommand, axEncodedData);
+    }
     ChannelPtr channel;
     auto at = amChannels.find(asApp);
     if (at != amChannels.end() && !at->second->closed) {
         channel = at->second;
-    } else {
+    } else if (!(channel = OpenChannel(asApp)) && pmDDE && pmDDE->IsActive() &&
+               pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str())) {
+        // No request socket, but the application owns its topic on the bus.
+        return SendByDde(asApp, asCommand, axEncodedData);
+    } else if (!channel) {
         channel = OpenOrStart(asApp);
     }
-    if (!channel) return false;
+    if (!channel) return SendByDde(asApp, asCommand, axEncodedData);
     // The frame built in one piece: length, sender, 0, command, 0, data.
     std::size_t dataSize = static_cast<std::size_t>(axEncodedData.Len());
     std::uint32_t length =
@@ -682,6 +717,14 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
     frame += '\0';
     frame.append(axEncodedData.GetDatenZeiger(), dataSize);
     return Write(channel, frame);
+}
+
+bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
+                     const MyMemoryBlock& axEncodedData) {
+    if (!pmDDE || !pmDDE->IsActive()) return false;
+    return pmDDE->Send(asApp, asCommand,
+                       std::string(axEncodedData.GetDatenZeiger(),
+                                   static_cast<std::size_t>(axEncodedData.Len())));
 }
 
 bool Pipe::HasChannel(const std::string& asApp) const {

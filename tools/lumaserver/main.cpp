@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
 #include "spectra_csv.h"
@@ -40,6 +41,8 @@ const char kUsage[] =
     "                      them); default: the built-in ColorChecker\n"
     "  --trigger-every MS  also measure on its own every MS milliseconds, as a\n"
     "                      device key would, and notify the subscribers\n"
+    "  --dde-only          be reachable only by DDE on the D-Bus session bus (no\n"
+    "                      request socket), as an older server\n"
     "  --register          write Path, Executable and Version of this program\n"
     "                      into HKEY_LOCAL_MACHINE\\Software\\K-Lume\\LumaServer\n"
     "                      (the machine hive: $NXBASE_MACHINE_REGISTRY or\n"
@@ -211,6 +214,8 @@ int main(int argc, char** argv) {
                 std::cerr << "lumaserver: --trigger-every needs a positive number\n";
                 return kExitUsage;
             }
+        } else if (argument == "--dde-only") {
+            Pipe::SetSocketListening(false);
         } else if (argument == "-S" || argument == "/WM") {
         } else if (argument == "-LNG") {
             value("a country code");

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "toolkit/application.h"
 
@@ -37,6 +38,7 @@ const char kUsage[] =
     "  --expect TYPES   decode the answer after its status byte, e.g.\n"
     "                   --expect str,i   (types b, s, i, str)\n"
     "  --send           send without waiting for an answer\n"
+    "  --dde            talk through DDE on the D-Bus session bus only\n"
     "  --listen NAME    run a post office named NAME that prints every command\n"
     "                   and answers with the default handler; Ctrl-C ends it\n"
     "  --timeout S      give up waiting after S seconds (default 30)\n"
@@ -216,6 +218,8 @@ int main(int argc, char** argv) {
                 expect = value();
             } else if (a == "--listen") {
                 listen = value();
+            } else if (a == "--dde") {
+                Pipe::SetSocketListening(false);
             } else if (a == "--send") {
                 wait = false;
             } else if (a == "--timeout") {

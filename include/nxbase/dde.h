@@ -1,0 +1,94 @@
+// DDE is the older transport for post-office messages, on the D-Bus session
+// bus. Every process may own two well-known names for its topics, the plain
+// application name and the name + "_" + process id:
+//
+//   com.klume.VELTRAApplication.<topic>      (characters other than letters,
+//                                             digits, "_" and "-" become "_")
+//
+// and serves one object, /com/klume/VELTRAApplication, with the interface
+// com.klume.VELTRAApplication:
+//   Connect(s service, s topic) -> b     accepted only for "VELTRAApplication"
+//                                        and one of the receiver's own topics
+//   Disconnect(s service, s topic)
+//   Poke(s topic, s item, ay data) -> b  item: the command; data: the
+//                                        sender, ":", the encoded data block;
+//                                        sent without waiting for the reply
+//                                        (answers come back as pokes)
+//   Execute(s topic, ay data) -> b       at most 500 bytes go to the execute function
+// The bus connection is driven by the application's event loop (its file
+// descriptor and time-out), never by a thread of its own, and received pokes
+// reach the receive function on that loop, after the bus dispatch returned.
+#ifndef NXBASE_DDE_H_
+#define NXBASE_DDE_H_
+
+#include <deque>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "nxbase/export.h"
+#include "nxbase/veltraevent.h"
+
+class PostOfficeApplications;
+
+namespace nxbase {
+inline constexpr const char* kDdeService = "VELTRAApplication";
+inline constexpr const char* kDdeBusPrefix = "com.klume.VELTRAApplication.";
+inline constexpr const char* kDdeObjectPath = "/com/klume/VELTRAApplication";
+inline constexpr const char* kDdeInterface = "com.klume.VELTRAApplication";
+// The bus name of a topic.
+NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
+}  // namespace nxbase
+
+class NXBASE_EXPORT DDE {
+  public:
+    // The process's one DDE object (a second is an assertion, "pThis == 0").
+    // Without a session bus the object exists but is off (logged); a bus that
+    // is there but refuses the connection shows the error box "DDE-Server
+    // kann nicht initialisiert werden." and quits the application.
+    explicit DDE(const std::string& asOwnAppName);
+    ~DDE();
+    DDE(const DDE&) = delete;
+    DDE& operator=(const DDE&) = delete;
+
+    static DDE* Instance();
+    bool IsActive() const;
+
+    void SetReceiveFunction(ReceiveFunction fFunction) { fmReceiveFunction = fFunction; }
+    void SetExecuteFunction(std::function<void(const std::string&)> fFunction) {
+        fmExecute = std::move(fFunction);
+    }
+    // Applications that may be started when their topic is not on the bus.
+    void SetApplications(const PostOfficeApplications* pApplications) {
+        pmApplications = pApplications;
+    }
+    void SetCountryCode(int alCode) { amCountryCode = alCode; }
+
+    // Pokes `asCommand` with the encoded block to the application `asApp`,
+    // starting it first when it is known but not on the bus.
+    bool Send(const std::string& asApp, const std::string& asCommand,
+              const std::string& asEncodedData);
+    // Whether a server for the service and topic is on the bus (its topic's
+    // bus name has an owner; only that server can own it).
+    bool IsAppRunning(const char* aService, const char* aTopic);
+    // Hands the oldest received poke to the receive function.
+    static void UserEvent(unsigned long alId, void* pData);
+
+  private:
+    struct Bus;
+    void Arm();
+    void Process();
+    bool Connect(const std::string& asTopic);
+    void OnPoke(const std::string& asItem, const std::string& asData);
+
+    std::string amOwnName;
+    std::unique_ptr<Bus> pmBus;
+    std::deque<VELTRAEvent> amEvents;
+    ReceiveFunction fmReceiveFunction = nullptr;
+    std::function<void(const std::string&)> fmExecute;
+    const PostOfficeApplications* pmApplications = nullptr;
+    int amCountryCode = 1;
+    std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
+};
+
+#endif  // NXBASE_DDE_H_

@@ -1,0 +1,307 @@
+#include "nxbase/dde.h"
+
+#include <unistd.h>
+
+#include <boost/asio/posix/stream_descriptor.hpp>
+#include <boost/asio/post.hpp>
+#include <boost/asio/steady_timer.hpp>
+#include <chrono>
+#include <cstdlib>
+#include <ctime>
+#include <sdbus-c++/sdbus-c++.h>
+
+#include "messaging_log.h"
+#include "nxbase/check.h"
+#include "nxbase/logfile.h"
+#include "nxbase/msgcat.h"
+#include "nxbase/pipe.h"
+#include "nxbase/poapps.h"
+#include "toolkit/application.h"
+#include "toolkit/userinterface.h"
+
+namespace nxbase {
+
+std::string DdeBusName(const std::string& asTopic) {
+    std::string element;
+    for (char c : asTopic) {
+        bool allowed = (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') ||
+                       c == '_' || c == '-';
+        element += allowed ? c : '_';
+    }
+    if (element.empty() || (element[0] >= '0' && element[0] <= '9')) element.insert(0, "_");
+    return kDdeBusPrefix + element;
+}
+
+}  // namespace nxbase
+
+namespace {
+
+constexpr const char* kLogKey = "Communication";
+constexpr std::size_t kMaxExecuteBytes = 500;
+constexpr auto kCallTimeout = std::chrono::seconds(5);
+constexpr auto kStartWait = std::chrono::seconds(10);
+
+DDE* gThis = nullptr;
+
+void Log(const std::string& asText) {
+    LogFile::WriteToLog(String(asText), String(kLogKey));
+}
+
+bool SessionBusConfigured() {
+    const char* address = std::getenv("DBUS_SESSION_BUS_ADDRESS");
+    if (address && *address) return true;
+    const char* runtime = std::getenv("XDG_RUNTIME_DIR");
+    return runtime && *runtime && ::access((std::string(runtime) + "/bus").c_str(), F_OK) == 0;
+}
+
+}  // namespace
+
+struct DDE::Bus {
+    std::unique_ptr<sdbus::IConnection> connection;
+    std::unique_ptr<sdbus::IObject> object;
+    std::string topics[2];
+    std::unique_ptr<boost::asio::posix::stream_descriptor> descriptor;
+    std::unique_ptr<boost::asio::steady_timer> timer;
+    bool waiting = false;
+    ~Bus() {
+        if (descriptor) descriptor->release();  // the connection owns the descriptor
+    }
+};
+
+DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
+    NX_ASSERT(gThis == 0);  // one per process
+    gThis = this;
+    if (!SessionBusConfigured()) {
+        Log("DDE is off: no session bus");
+        return;
+    }
+    try {
+        auto bus = std::make_unique<Bus>();
+        bus->connection = sdbus::createSessionBusConnection();
+        bus->topics[0] = amOwnName + "_" + std::to_string(::getpid());
+        bus->topics[1] = amOwnName;
+        for (const std::string& topic : bus->topics) {
+            bus->connection->requestName(nxbase::DdeBusName(topic));
+        }
+        bus->object = sdbus::createObject(*bus->connection, nxbase::kDdeObjectPath);
+        std::weak_ptr<bool> alive = amAlive;
+        auto ownTopic = [this](const std::string& service, const std::string& topic) {
+            return service == nxbase::kDdeService &&
+                   (topic == pmBus->topics[0] || topic == pmBus->topics[1]);
+        };
+        bus->object->registerMethod("Connect")
+            .onInterface(nxbase::kDdeInterface)
+            .implementedAs([ownTopic](const std::string& service, const std::string& topic) {
+                Log("DDE Callback function (CONNECT)");
+                bool accepted = ownTopic(service, topic);
+                if (accepted) Log("DDE Callback function (CONNECT_CONFIRM)");
+                return accepted;
+            });
+        bus->object->registerMethod("Disconnect")
+            .onInterface(nxbase::kDdeInterface)
+            .implementedAs([](const std::string&, const std::string&) {
+                Log("DDE Callback function (DISCONNECT)");
+            });
+        bus->object->registerMethod("Poke")
+            .onInterface(nxbase::kDdeInterface)
+            .implementedAs([this, ownTopic](const std::string& topic, const std::string& item,
+                                            const std::vector<std::uint8_t>& data) {
+                Log("DDE Callback function (POKE)");
+                if (!ownTopic(nxbase::kDdeService, topic)) return false;
+                OnPoke(item, std::string(data.begin(), data.end()));
+                return true;
+            });
+        bus->object->registerMethod("Execute")
+            .onInterface(nxbase::kDdeInterface)
+            .implementedAs([this, ownTopic](const std::string& topic,
+                                            const std::vector<std::uint8_t>& data) {
+                Log("DDE Callback function (EXECUTE)");
+                if (!ownTopic(nxbase::kDdeService, topic) || !fmExecute) return false;
+                std::size_t size = std::min(data.size(), kMaxExecuteBytes);
+                std::string text(data.begin(), data.begin() + static_cast<long>(size));
+                boost::asio::post(Application::Get().GetContext(),
+                                  [this, text] { fmExecute(text); });
+                return true;
+            });
+        bus->object->finishRegistration();
+        pmBus = std::move(bus);
+        Arm();
+    } catch (const sdbus::Error& error) {
+        pmBus.reset();
+        Log(std::string("DDE: ") + error.getName() + ": " + error.getMessage());
+        UserInterface::Current()->ErrorBox("DDE-Server kann nicht initialisiert werden.");
+        Application::Get().Quit();
+    }
+}
+
+DDE::~DDE() {
+    *amAlive = false;
+    if (pmBus) {
+        try {
+            for (const std::string& topic : pmBus->topics) {
+                pmBus->connection->releaseName(nxbase::DdeBusName(topic));
+            }
+        } catch (const sdbus::Error& error) {
+            Log("DDEUninitialize - failed!!!");
+            Log(std::string("DDE LastError:") + error.getMessage());
+        }
+    }
+    pmBus.reset();
+    if (gThis == this) gThis = nullptr;
+}
+
+DDE* DDE::Instance() {
+    return gThis;
+}
+
+bool DDE::IsActive() const {
+    return pmBus != nullptr;
+}
+
+// Waits on the loop for the connection's descriptor or its time-out.
+void DDE::Arm() {
+    if (!pmBus || pmBus->waiting) return;
+    auto& context = Application::Get().GetContext();
+    sdbus::IConnection::PollData poll = pmBus->connection->getEventLoopPollData();
+    if (!pmBus->descriptor) {
+        pmBus->descriptor = std::make_unique<boost::asio::posix::stream_descriptor>(context, poll.fd);
+        pmBus->timer = std::make_unique<boost::asio::steady_timer>(context);
+    }
+    std::weak_ptr<bool> alive = amAlive;
+    pmBus->waiting = true;
+    pmBus->descriptor->async_wait(boost::asio::posix::stream_descriptor::wait_read,
+                                  [this, alive](const boost::system::error_code& error) {
+                                      if (!alive.lock() || error) return;
+                                      pmBus->waiting = false;
+                                      pmBus->timer->cancel();
+                                      Process();
+                                  });
+    if (poll.timeout_usec != UINT64_MAX) {
+        timespec now{};
+        ::clock_gettime(CLOCK_MONOTONIC, &now);
+        std::uint64_t nowUsec = static_cast<std::uint64_t>(now.tv_sec) * 1000000u +
+                                static_cast<std::uint64_t>(now.tv_nsec) / 1000u;
+        auto wait = std::chrono::microseconds(poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0);
+        pmBus->timer->expires_after(wait);
+        pmBus->timer->async_wait([this, alive](const boost::system::error_code& error) {
+            if (!alive.lock() || error) return;
+            pmBus->descriptor->cancel();
+            pmBus->waiting = false;
+            Process();
+        });
+    }
+}
+
+void DDE::Process() {
+    if (!pmBus) return;
+    while (pmBus->connection->processPendingRequest()) {
+    }
+    Arm();
+}
+
+void DDE::OnPoke(const std::string& asItem, const std::string& asData) {
+    std::size_t colon = asData.find(':');
+    std::string sender = colon == std::string::npos ? std::string() : asData.substr(0, colon);
+    std::string encoded = colon == std::string::npos ? asData : asData.substr(colon + 1);
+    std::string decoded = nxbase::DecodeBytes(encoded.data(), encoded.size());
+    MyMemoryBlock block(static_cast<long>(decoded.size()));
+    block.Put(decoded.data(), static_cast<long>(decoded.size()));
+    amEvents.emplace_back(sender, asItem, block);
+    // Handled once the bus dispatch has returned: a handler may wait for an
+    // answer, which needs the bus again.
+    Log(Application::Get().IsInExecute() ? "DDE - PostUserEvent" : "DDE - ExecuteUserEvent");
+    std::weak_ptr<bool> alive = amAlive;
+    boost::asio::post(Application::Get().GetContext(), [alive] {
+        if (alive.lock()) UserEvent(1234, nullptr);
+    });
+}
+
+void DDE::UserEvent(unsigned long, void*) {
+    if (gThis == nullptr || gThis->amEvents.empty()) return;
+    Log("DDE - UserEvent (in Queue:" + std::to_string(gThis->amEvents.size()) + ")");
+    VELTRAEvent event = gThis->amEvents.front();
+    gThis->amEvents.pop_front();
+    NX_ASSERT(gThis->fmReceiveFunction != 0);
+    if (gThis->fmReceiveFunction) gThis->fmReceiveFunction(event);
+}
+
+// Whether the topic's bus name has an owner, asked of the bus itself: a
+// method call to the peer could cross one of the peer's own calls to us, and
+// two processes each waiting for the other would stall until the time-out.
+bool DDE::Connect(const std::string& asTopic) {
+    try {
+        auto bus = sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus",
+                                      "/org/freedesktop/DBus");
+        bool owned = false;
+        bus->callMethod("NameHasOwner")
+            .onInterface("org.freedesktop.DBus")
+            .withTimeout(kCallTimeout)
+            .withArguments(nxbase::DdeBusName(asTopic))
+            .storeResultsTo(owned);
+        return owned;
+    } catch (const sdbus::Error&) {
+        return false;
+    }
+}
+
+bool DDE::IsAppRunning(const char* aService, const char* aTopic) {
+    NX_ASSERT(aService != 0);
+    NX_ASSERT(aTopic != 0);
+    if (!pmBus || aService == nullptr || aTopic == nullptr) return false;
+    Log("DDE: IsAppRunning");
+    if (std::string(aService) != nxbase::kDdeService || !Connect(aTopic)) return false;
+    Log("DDE: IsAppRunning - Disconnect");
+    return true;
+}
+
+bool DDE::Send(const std::string& asApp, const std::string& asCommand,
+               const std::string& asEncodedData) {
+    Log("DDE - Send");
+    if (!pmBus) return false;
+    if (!Connect(asApp)) {
+        if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
+            Log("DDE send abort: HasApplication == 0");
+            return false;
+        }
+        Log("DDE: WinExec");
+        if (nxbase::StartApplication(pmApplications->GetApplicationInfo(asApp), amCountryCode) < 0) {
+            Log("DDE send abort: cannot start " + asApp);
+            return false;
+        }
+        auto deadline = std::chrono::steady_clock::now() + kStartWait;
+        bool connected = false;
+        while (!connected && std::chrono::steady_clock::now() < deadline) {
+            Application::Get().RunOneFor(std::chrono::milliseconds(50));
+            connected = Connect(asApp);
+        }
+        if (!connected) {
+            Log("DDE send abort: ConversationHandle:0, Topic:" + asApp + ", Service:" +
+                nxbase::kDdeService);
+            return false;
+        }
+    }
+    std::string payload = amOwnName + ":" + asEncodedData;
+    std::vector<std::uint8_t> bytes(payload.begin(), payload.end());
+    try {
+        Log("Sending");
+        auto proxy = sdbus::createProxy(*pmBus->connection, nxbase::DdeBusName(asApp),
+                                        nxbase::kDdeObjectPath);
+        // One way, as the sockets carry it: an answer comes as a poke of its own.
+        proxy->callMethod("Poke")
+            .onInterface(nxbase::kDdeInterface)
+            .withArguments(asApp, asCommand, bytes)
+            .dontExpectReply();
+        Log("Sent (Result:1)");
+        // Messages read while the bus was busy with this call are dispatched next.
+        std::weak_ptr<bool> alive = amAlive;
+        boost::asio::post(Application::Get().GetContext(), [this, alive] {
+            if (alive.lock()) Process();
+        });
+        return true;
+    } catch (const sdbus::Error& error) {
+        Log("DDE send abort: ConversationHandle:1, Topic:" + asApp + ", Service:" +
+            nxbase::kDdeService);
+        Log(std::string("DDE: Last error (DdeGetLastError):") + error.getMessage());
+        return false;
+    }
+}

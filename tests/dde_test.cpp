@@ -1,0 +1,138 @@
+// DDE on a private D-Bus session bus that the test starts: pokes between two
+// processes with their data intact, connects to foreign topics refused, the
+// transports' choice of DDE for a peer without a request socket, and a peer
+// that dies.
+#include "nxbase/dde.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <thread>
+
+#include "messaging_test_util.h"
+#include "nxbase/msgcat.h"
+#include "nxbase/pipe.h"
+#include "nxbase/postoffice.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using nxtest::RunUntil;
+
+std::vector<VELTRAEvent> gReceived;
+void Record(VELTRAEvent& event) {
+    gReceived.push_back(event);
+}
+
+std::string Shell(const std::string& command) {
+    std::string output;
+    FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
+    char buffer[4096];
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+    ::pclose(pipe);
+    return output;
+}
+
+class DdeTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        if (::access("/usr/bin/dbus-daemon", X_OK) != 0) GTEST_SKIP() << "no dbus-daemon";
+        // A private bus, never the user's.
+        std::string address = "unix:path=" + sandbox.root() + "/bus";
+        daemon = ::fork();
+        if (daemon == 0) {
+            ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork",
+                    ("--address=" + address).c_str(), nullptr);
+            ::_exit(127);
+        }
+        sandbox.Env("DBUS_SESSION_BUS_ADDRESS", address);
+        ASSERT_TRUE(RunUntil([&] { return std::filesystem::exists(sandbox.root() + "/bus"); }, 5s));
+        sandbox.RegisterAbsentServer();
+        peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "ddepeer");
+        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peer);
+        server = sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "ddeserver");
+        gReceived.clear();
+        Application::Get().ResetQuit();
+    }
+    void TearDown() override {
+        NxSingleton::DeleteAllSingleton();
+        Pipe::DeletePipe();
+        Pipe::SetSocketListening(true);
+        for (const std::string& program : {peer, server}) {
+            if (!program.empty()) Shell("pkill -f " + program);
+        }
+        while (::waitpid(-1, nullptr, WNOHANG) > 0) {
+        }
+        if (daemon > 0) {
+            ::kill(daemon, SIGTERM);
+            ::waitpid(daemon, nullptr, 0);
+        }
+    }
+    std::string Exe(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+    nxtest::MessagingSandbox sandbox{"dde"};
+    pid_t daemon = -1;
+    std::string peer, server;
+};
+
+TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
+    // This process is reached by DDE only; the peer is started on demand.
+    Pipe::SetSocketListening(false);
+    Pipe* pipe = Pipe::CreatePipe("DdeTester");
+    PostOfficeApplications applications("DdeTester");
+    pipe->SetApplications(&applications);
+    pipe->SetReceiveFunction(Record);
+    DDE* dde = DDE::Instance();
+    ASSERT_TRUE(dde->IsActive());
+    EXPECT_FALSE(pipe->IsListening());
+    EXPECT_FALSE(dde->IsAppRunning(nxbase::kDdeService, "EchoPeer"));
+
+    std::string data("\x00\x01\x02\x01\x0A:x\x00", 8);
+    MyMemoryBlock block(8);
+    block.Put(data.data(), 8);
+    nxbase::EncodeBlock(block);
+    ASSERT_TRUE(pipe->Send("EchoPeer", "GET_DEVICE_NAME", block));
+    EXPECT_TRUE(dde->IsAppRunning(nxbase::kDdeService, "EchoPeer"));
+    ASSERT_TRUE(RunUntil([] { return !gReceived.empty(); }));
+    EXPECT_EQ(gReceived[0].GetSender(), "EchoPeer");
+    EXPECT_EQ(gReceived[0].GetCommand(), "ANSWER!GET_DEVICE_NAME");
+    EXPECT_EQ(std::string(gReceived[0].GetData().GetDatenZeiger(),
+                          static_cast<std::size_t>(gReceived[0].GetData().Len())),
+              data);
+
+    // Connects only for the service and one of the receiver's own topics.
+    std::string call = "dbus-send --session --print-reply --dest=" +
+                       nxbase::DdeBusName("EchoPeer") + " " + nxbase::kDdeObjectPath + " " +
+                       nxbase::kDdeInterface + ".Connect string:VELTRAApplication string:";
+    EXPECT_NE(Shell(call + "EchoPeer").find("boolean true"), std::string::npos);
+    EXPECT_NE(Shell(call + "SomeoneElse").find("boolean false"), std::string::npos);
+    EXPECT_FALSE(dde->IsAppRunning(nxbase::kDdeService, "SomeoneElse"));
+    EXPECT_FALSE(dde->IsAppRunning("OtherService", "EchoPeer"));
+}
+
+TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSend) {
+    ASSERT_EQ(std::system((server + " --dde-only &").c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");  // with its socket
+    ASSERT_TRUE(RunUntil([&] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }));
+    EXPECT_FALSE(std::filesystem::exists(sandbox.runtime() + "/PipeRequest-LumaServer"));
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                       [] { return true; }));
+    MyMemoryBlock expected;
+    expected << static_cast<signed char>(0) << String("LumaSpectro Emulator");
+    EXPECT_EQ(std::string(answer.GetDatenZeiger(), static_cast<std::size_t>(answer.Len())),
+              std::string(expected.GetDatenZeiger(), static_cast<std::size_t>(expected.Len())));
+
+    // Killed: the next send fails (its registered path does not exist), and
+    // the loop goes on.
+    Shell("pkill -9 -f " + server);
+    ASSERT_TRUE(RunUntil([&] { return !nxbase::IsApplicationRunning(Exe(server)); }, 5s));
+    MyMemoryBlock none;
+    EXPECT_FALSE(office->Send("LumaServer", IS_APP_READY, none));
+    EXPECT_TRUE(RunUntil([] { return true; }));
+}
+
+}  // namespace
