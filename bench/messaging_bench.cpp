@@ -137,6 +137,8 @@ struct Scratch {
         ::setenv("NXBASE_MACHINE_REGISTRY", (directory + "/machine.sqlite").c_str(), 1);
         ::setenv("NXBASE_USER_REGISTRY", (directory + "/user.sqlite").c_str(), 1);
         ::unsetenv("USERNAME");
+        ::unsetenv("DBUS_SESSION_BUS_ADDRESS");  // never the user's bus
+        ::setenv("XDG_RUNTIME_DIR", "", 1);
         const char* key = "Software\\K-Lume\\LumaServer";
         RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, "Path"), "/none");
         RegistryHandler::AddRegistryEntry(RegistryEntry(HKEY_LOCAL_MACHINE, key, "Executable"),
@@ -186,6 +188,36 @@ void PostOfficeRoundTrip(benchmark::State& state, bool pinned) {
     NxSingleton::DeleteAllSingleton();
     StopPeer(peer);
     PinToOneCpu(false);
+}
+
+// SendAndReceive to the same server reached by DDE on a private D-Bus bus.
+void DdeRoundTrip(benchmark::State& state) {
+    Scratch scratch;
+    std::string address = "unix:path=" + scratch.directory + "/bus";
+    pid_t daemon = ::fork();
+    if (daemon == 0) {
+        ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork",
+                ("--address=" + address).c_str(), nullptr);
+        ::_exit(127);
+    }
+    for (int i = 0; i < 500 && !std::filesystem::exists(scratch.directory + "/bus"); ++i) ::usleep(10000);
+    ::setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
+    pid_t peer = StartPeer("server-dde");
+    PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
+    MyMemoryBlock request, answer;
+    request.Put(Payload().data(), static_cast<long>(Payload().size()));
+    for (int i = 0; i < 500 && !office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                                       [] { return true; }); ++i) {
+        ::usleep(10000);
+    }
+    for (auto _ : state) {
+        office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [] { return true; });
+    }
+    NxSingleton::DeleteAllSingleton();
+    StopPeer(peer);
+    ::kill(daemon, SIGTERM);
+    ::waitpid(daemon, nullptr, 0);
+    ::unsetenv("DBUS_SESSION_BUS_ADDRESS");
 }
 
 // One-way sends into a peer that drops them.
@@ -254,6 +286,11 @@ void BM_PostOfficeSendAndReceive_Unpinned(benchmark::State& state) {
     PostOfficeRoundTrip(state, false);
 }
 
+void BM_PostOfficeSendAndReceive_OverSockets(benchmark::State& state) {
+    PostOfficeRoundTrip(state, false);
+}
+void BM_PostOfficeSendAndReceive_OverDBus(benchmark::State& state) { DdeRoundTrip(state); }
+
 void BM_RawSocketWrites_OneWay_Unpinned(benchmark::State& state) {
     RawWrites(state, false, RequestFrame());
 }
@@ -268,6 +305,8 @@ BENCHMARK(BM_PostOfficeSendAndReceive_Pinned)->UseRealTime();
 BENCHMARK(BM_RawSocketPingPong_PostOfficeFrames_Unpinned)->UseRealTime();
 BENCHMARK(BM_PostOfficeSendAndReceive_Unpinned)->UseRealTime();
 BENCHMARK(BM_RawSocketWrites_OneWay_Unpinned)->UseRealTime();
+BENCHMARK(BM_PostOfficeSendAndReceive_OverSockets)->UseRealTime();
+BENCHMARK(BM_PostOfficeSendAndReceive_OverDBus)->UseRealTime();
 BENCHMARK(BM_PostOfficeSend_OneWay_Unpinned)->UseRealTime();
 
 }  // namespace
@@ -276,7 +315,8 @@ void Ignore(VELTRAEvent&) {}
 
 int RunPeer(const std::string& mode) {
     ::signal(SIGTERM, [](int) { Application::Get().Quit(); });
-    if (mode == "server") {
+    if (mode == "server" || mode == "server-dde") {
+        if (mode == "server-dde") Pipe::SetSocketListening(false);
         PostOffice::CreatePostOffice("LumaServer");  // answers with its default handler
     } else {
         Pipe* pipe = Pipe::CreatePipe(mode == "sink" ? "BenchSink" : kPeerName);
