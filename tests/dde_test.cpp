@@ -111,6 +111,20 @@ TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
     EXPECT_NE(Shell(call + "SomeoneElse").find("boolean false"), std::string::npos);
     EXPECT_FALSE(dde->IsAppRunning(nxbase::kDdeService, "SomeoneElse"));
     EXPECT_FALSE(dde->IsAppRunning("OtherService", "EchoPeer"));
+
+    // Execute hands at most 500 bytes to the execute function, on the loop.
+    std::string executed;
+    dde->SetExecuteFunction([&](const std::string& text) { executed = text; });
+    std::string bytes;
+    for (int i = 0; i < 600; ++i) bytes += (i ? ",0x" : "0x") + std::string(i % 2 ? "41" : "42");
+    std::string execute = "dbus-send --session --print-reply --dest=" +
+                          nxbase::DdeBusName("DdeTester") + " " + nxbase::kDdeObjectPath + " " +
+                          nxbase::kDdeInterface + ".Execute string:DdeTester array:byte:" + bytes +
+                          " > /dev/null 2>&1 &";
+    ASSERT_EQ(std::system(execute.c_str()), 0);
+    ASSERT_TRUE(RunUntil([&] { return !executed.empty(); }));
+    EXPECT_EQ(executed.size(), 500u);
+    EXPECT_EQ(executed.substr(0, 4), "BABA");
 }
 
 TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSend) {
