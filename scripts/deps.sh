@@ -7,7 +7,7 @@ packages=(
     build-essential cmake ninja-build pkg-config git python3
     libboost-dev libboost-regex-dev
     libsimpleini-dev libsqlite3-dev liblcms2-dev libpng-dev
-    libsdbus-c++-dev dbus-daemon dbus-bin
+    libsdbus-c++-dev dbus-daemon dbus-bin procps
     libgtest-dev libgmock-dev libbenchmark-dev
 )
 
