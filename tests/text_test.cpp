@@ -121,6 +121,11 @@ TEST_F(TextTest, Utf8MarkerBeforeTheFirstGroupConvertsToWindows1252) {
     std::string ansi = Write("ansi.lng", "{G}\n[Gr\xFC\xDF" "e]\n");
     ASSERT_TRUE(Text::LoadText(String(ansi)));
     EXPECT_EQ(Text::GetText("G", 0).str(), "Gr\xFC\xDF" "e") << "ANSI files are taken as they are";
+    EXPECT_EQ(Text::GetTextUtf8("G", 0), "Gr\xC3\xBC\xC3\x9F" "e") << "the same text for GTK or Qt";
+    std::string everyByte;
+    for (int byte = 1; byte < 256; ++byte) everyByte += static_cast<char>(byte);
+    EXPECT_EQ(nxbase::detail::Utf8ToAnsi(nxbase::detail::AnsiToUtf8(everyByte)), everyByte);
+    EXPECT_EQ(nxbase::detail::AnsiToUtf8("\x80"), "\xE2\x82\xAC");
 
     EXPECT_EQ(nxbase::detail::Utf8ToAnsi("\xF0\x9F\x98\x80!"), "?!");
     EXPECT_EQ(nxbase::detail::Utf8ToAnsi("\xC0\xAF"), "??") << "overlong forms are malformed";

@@ -149,6 +149,7 @@ class NXBASE_EXPORT Pipe {
     std::string amOwnName;
     std::string amProcessId;
     std::string amSocketPath;
+    int amLockFd = -1;  // held while this process owns its name
     ReceiveFunction fmReceiveFunction = nullptr;
     std::function<void(const std::string&)> fmChannelLost;
     const PostOfficeApplications* pmApplications = nullptr;

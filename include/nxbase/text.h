@@ -34,6 +34,8 @@ class NXBASE_EXPORT Text {
 
     // The text, or "" (with a log line) when the group or the index is missing.
     static String GetText(const String& asGroup, unsigned long alIndex);
+    // The same text in UTF-8, for user interfaces drawn with GTK or Qt.
+    static std::string GetTextUtf8(const String& asGroup, unsigned long alIndex);
     // The number of texts of the group, 0 for an unknown group.
     static unsigned long GetEntryCount(const String& asGroup);
     // Returns its argument unchanged.
@@ -88,6 +90,9 @@ NXBASE_EXPORT std::string LoadErrorMessage(int language, const std::string& file
 // UTF-8 to the ANSI code page (Windows-1252); every character the code page
 // cannot hold and every malformed byte becomes "?".
 NXBASE_EXPORT std::string Utf8ToAnsi(std::string_view utf8);
+// The reverse: ANSI (Windows-1252) text in UTF-8; every byte has a character,
+// so Utf8ToAnsi(AnsiToUtf8(x)) == x.
+NXBASE_EXPORT std::string AnsiToUtf8(std::string_view ansi);
 
 }  // namespace nxbase::detail
 

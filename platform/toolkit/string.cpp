@@ -230,6 +230,20 @@ std::size_t DecodeUtf8(std::string_view text, std::size_t at, char32_t& code) {
     return overlong || surrogate || code > 0x10FFFF ? 0 : length;
 }
 
+// The bytes one "?" stands for at a malformed sequence: a lead byte with the
+// continuation bytes that follow it (a sequence cut short counts once), or
+// a single stray byte.
+std::size_t MalformedLength(std::string_view text, std::size_t at) {
+    unsigned char lead = static_cast<unsigned char>(text[at]);
+    std::size_t expected = lead < 0xC2 ? 1 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 1;
+    std::size_t length = 1;
+    while (length < expected && at + length < text.size() &&
+           (static_cast<unsigned char>(text[at + length]) & 0xC0) == 0x80) {
+        ++length;
+    }
+    return length;
+}
+
 }  // namespace
 
 void AppendUtf8(std::string& out, char32_t code) {
@@ -273,7 +287,7 @@ std::string Utf8ToWindows1252(std::string_view utf8) {
         char32_t code = 0;
         std::size_t length = DecodeUtf8(utf8, at, code);
         out += length == 0 ? '?' : ByteFor(code);
-        at += length == 0 ? 1 : length;
+        at += length == 0 ? MalformedLength(utf8, at) : length;
     }
     return out;
 }

@@ -5,6 +5,7 @@
 #include <spawn.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/file.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -385,6 +386,7 @@ Pipe::~Pipe() {
         pmListener->acceptor.close(ignored);
         if (!amSocketPath.empty()) ::unlink(amSocketPath.c_str());
     }
+    if (amLockFd >= 0) ::close(amLockFd);  // the name is free again
 }
 
 std::string Pipe::OwnRequestText() const {
@@ -407,11 +409,17 @@ void Pipe::Listen() {
     if (!nxbase::FillSocketAddress(amSocketPath, address)) {
         throw std::runtime_error("Pipe: socket path too long: " + amSocketPath);
     }
-    // A live listener means the application runs already; a stale socket
-    // (nobody accepts) is replaced.
-    int probe = nxbase::ConnectTo(amSocketPath);
-    if (probe >= 0) {
-        ::close(probe);
+    // The listener holds a lock on <socket>.lock for its lifetime: of two
+    // processes starting at once only one gets the name, and a socket left by
+    // a process that died (nobody holds the lock) is replaced.
+    std::string lockPath = amSocketPath + ".lock";
+    amLockFd = ::open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+    if (amLockFd < 0) {
+        throw std::runtime_error("Pipe: cannot open " + lockPath + ": " + std::strerror(errno));
+    }
+    if (::flock(amLockFd, LOCK_EX | LOCK_NB) != 0) {
+        ::close(amLockFd);
+        amLockFd = -1;
         throw std::runtime_error("Pipe: " + amOwnName + " is running already (" + amSocketPath +
                                  ")");
     }

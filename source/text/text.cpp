@@ -1,6 +1,7 @@
 // Text files and text groups: the process-wide text table, its parser and
 // the two error reporters.
 #include "nxbase/text.h"
+#include "toolkit/string.h"
 
 #include <boost/regex.hpp>
 #include <clocale>
@@ -99,6 +100,8 @@ std::string TextFilePrefix(const String& base) {
 }
 
 std::string Utf8ToAnsi(std::string_view utf8) { return Utf8ToWindows1252(utf8); }
+
+std::string AnsiToUtf8(std::string_view ansi) { return toolkit::Windows1252ToUtf8(ansi); }
 
 void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
     Log("Parse text file: " + Quoted(fileName));
@@ -217,6 +220,10 @@ String Text::GetText(const String& asGroup, unsigned long alIndex) {
         return String();
     }
     return String(group->second[alIndex]);
+}
+
+std::string Text::GetTextUtf8(const String& asGroup, unsigned long alIndex) {
+    return toolkit::Windows1252ToUtf8(GetText(asGroup, alIndex).str());
 }
 
 unsigned long Text::GetEntryCount(const String& asGroup) {

@@ -47,7 +47,8 @@ const char kUsage[] =
     "                      into HKEY_LOCAL_MACHINE\\Software\\K-Lume\\LumaServer\n"
     "                      (the machine hive: $NXBASE_MACHINE_REGISTRY or\n"
     "                      /etc/k-lume/registry.sqlite) and exit\n"
-    "  -S, -LNG CODE       accepted as an application starts it\n"
+    "  -S, -LNG CODE       as an application starts it: with -S the server also\n"
+    "                      ends when no peer connected for 30 s\n"
     "  --version, --help\n";
 
 constexpr signed char kDone = 0;
@@ -70,6 +71,19 @@ class Server {
         Install(office, NOTIFY_MESSUNG, &Server::Subscribe);
         Install(office, NOTIFY_MESSUNG_AUS, &Server::Unsubscribe);
         Install(office, DISCONNECT, &Server::Disconnected);
+    }
+
+    // Started on demand (-S) but no peer for a while: the peer that started
+    // it is gone, so nobody will disconnect and end it.
+    long IdleTick(void*) {
+        bool idle = PostOffice::Instance()->GetConnectionCount() <= 0 &&
+                    Pipe::Instance()->ChannelCount() == 0;
+        amIdleSeconds = idle ? amIdleSeconds + 1 : 0;
+        if (amIdleSeconds >= kIdleSeconds) {
+            LogFile::WriteToLog(String("No peer since the start - Closing application"), String());
+            Application::Get().Quit();
+        }
+        return 0;
     }
 
     long TriggerTick(void*) {
@@ -159,7 +173,9 @@ class Server {
         }
     }
 
+    static constexpr int kIdleSeconds = 30;
     nxcolor::SpectraTable amChart;
+    int amIdleSeconds = 0;
     int amLast = -1;  // index of the last measured patch
     std::set<std::string> amSubscribers;
 };
@@ -182,6 +198,7 @@ int Register() {
 int main(int argc, char** argv) {
     std::string chartFile;
     long triggerEvery = 0;
+    bool startedOnDemand = false;
     for (int i = 1; i < argc; ++i) {
         std::string argument = argv[i];
         auto value = [&](const char* what) -> std::string {
@@ -216,7 +233,9 @@ int main(int argc, char** argv) {
             }
         } else if (argument == "--dde-only") {
             Pipe::SetSocketListening(false);
-        } else if (argument == "-S" || argument == "/WM") {
+        } else if (argument == "-S") {
+            startedOnDemand = true;
+        } else if (argument == "/WM") {
         } else if (argument == "-LNG") {
             value("a country code");
         } else {
@@ -253,7 +272,14 @@ int main(int argc, char** argv) {
         trigger.SetTimeoutHdl(LINK(Server, &server, TriggerTick));
         trigger.Start();
     }
+    AutoTimer idle;
+    if (startedOnDemand) {
+        idle.SetTimeout(1000);
+        idle.SetTimeoutHdl(LINK(Server, &server, IdleTick));
+        idle.Start();
+    }
     Application::Get().Execute();
+    idle.Stop();
     trigger.Stop();
     NxSingleton::DeleteAllSingleton();
     return kExitOk;
