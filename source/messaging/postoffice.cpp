@@ -150,7 +150,6 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
                       String(kLogKey));
     }
     fmReceiveFunction(axEvent);
-    MyMemoryBlock data = axEvent.GetData();
     const String sender(axEvent.GetSender());
     if (number == -1) {
         // An unknown answer is dropped: answering it would start an endless
@@ -164,7 +163,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
     }
     if (number >= kAnswerOffset) {
         NX_COMM_LOG(String("Answer received: ") + Number(number));
-        amAnswers[number].push_back(data);
+        amAnswers[number].push_back(axEvent.GetData());
         NX_COMM_LOG(String("MessageQueue - Insert message") + ", Queue size: " +
             Number(static_cast<long>(amAnswers[number].size())));
         return;
@@ -184,6 +183,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
     }
     if (number == LOCK) {
         amLockOwner = sender;
+        MyMemoryBlock data = axEvent.GetData();
         unsigned char waiting = 0;
         data >> waiting;
         if (waiting != 0) {
@@ -310,7 +310,7 @@ void PostOffice::BotschaftenHandler() {
     // handler runs waits for the next tick.
     for (std::size_t count = amCommandQueue.size(); count > 0 && !amCommandQueue.empty();
          --count) {
-        VELTRAEvent event = amCommandQueue.front();
+        VELTRAEvent event = std::move(amCommandQueue.front());
         amCommandQueue.pop_front();
         NX_COMM_LOG(String("Botschaften Handler - Handling Message: ") + String(event.GetCommand()));
         amHandlerBusy = true;
