@@ -99,6 +99,12 @@ TEST(ProgressListenerRange, BadRangesRaiseTheAssertionsInOrderAndStayUsable) {
     ProgressListenerRange reversed(parent, 0.7, 0.6);
     EXPECT_EQ(AssertionConditions(*ui), (std::vector<std::string>{"amStart <= amEnd"}));
     ui->Clear();
+    // Going on after the failed check keeps the range as given.
+    EXPECT_EQ(reversed.GetRunRange(), std::make_pair(0.7, 0.6));
+    // Resetting a range resets it alone: the parent is not told anything.
+    std::size_t shown = parent.values.size();
+    reversed.ResetProgress();
+    EXPECT_EQ(parent.values.size(), shown);
 
     ProgressListenerRange outside(parent, 1.5, -0.1);
     EXPECT_EQ(AssertionConditions(*ui),

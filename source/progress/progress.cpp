@@ -38,14 +38,6 @@ void CheckProgress(double axProgress) {
         Check::AssertFailed("axProgress >= 0.0 && axProgress <= 1.0", kSource, __LINE__);
 }
 
-// A range the user chose to go on with after a failed check: clamped to 0..1
-// with the end not before the start.
-std::pair<double, double> ValidRange(double start, double end) {
-    start = Clamp01(start);
-    end = std::max(start, Clamp01(end));
-    return {start, end};
-}
-
 // Terminal seam: the only operating-system calls of the progress family.
 namespace term {
 
@@ -168,12 +160,12 @@ ProgressListenerRange::ProgressListenerRange(ProgressListener& axParent, double 
     SetChecked(axStart, axEnd);
 }
 
+// A range that failed its check is stored as given once the user chose to go on.
 void ProgressListenerRange::SetChecked(double axStart, double axEnd) {
     CheckRange(axStart, axEnd);
-    auto range = ValidRange(axStart, axEnd);
     std::lock_guard<std::mutex> lock(amMutex);
-    amStart = range.first;
-    amEnd = range.second;
+    amStart = axStart;
+    amEnd = axEnd;
 }
 
 void ProgressListenerRange::UpdateRunRange(double axStart, double axEnd) {
@@ -200,9 +192,9 @@ double ProgressListenerRange::Map(double axProgress) const {
     return amStart + Clamp01(axProgress) * (amEnd - amStart);
 }
 
+// Resets this listener's own state only; the parent keeps what it shows.
 void ProgressListenerRange::ResetProgress() {
     ProgressListener::ResetProgress();
-    amParent.DisplayProgress(Map(0.0));
 }
 
 void ProgressListenerRange::DisplayProgress(double axProgress) {
@@ -228,7 +220,7 @@ bool ProgressListenerRange::IsAborted() const {
 
 WaitVisualizerRunRange::WaitVisualizerRunRange(double axStart, double axEnd) {
     CheckRange(axStart, axEnd);
-    auto range = ValidRange(axStart, axEnd);
+    std::pair<double, double> range{axStart, axEnd};  // as given, also after a failed check
     amStart = range.first;
     amEnd = range.second;
     RunRangeStack& stack = Stack();
@@ -250,7 +242,7 @@ WaitVisualizerRunRange::~WaitVisualizerRunRange() {
 
 void WaitVisualizerRunRange::SetRunRange(double axStart, double axEnd) {
     CheckRange(axStart, axEnd);
-    auto range = ValidRange(axStart, axEnd);
+    std::pair<double, double> range{axStart, axEnd};
     RunRangeStack& stack = Stack();
     std::lock_guard<std::mutex> lock(stack.mutex);
     amStart = range.first;
