@@ -144,6 +144,10 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
     // the loop goes on.
     Shell("pkill -9 -f " + server);
     ASSERT_TRUE(RunUntil([&] { return !nxbase::IsApplicationRunning(Exe(server)); }, 5s));
+    // Pokes are one way: the bus must have seen the death (the name freed)
+    // before a send can know.
+    ASSERT_TRUE(RunUntil(
+        [] { return !DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }, 5s));
     MyMemoryBlock none;
     EXPECT_FALSE(office->Send("LumaServer", IS_APP_READY, none));
     EXPECT_TRUE(RunUntil([] { return true; }));
