@@ -1,20 +1,40 @@
-// Reading reflectance spectra from CSV or CGATS text: optional
-// id fields and 36 reflectance factors, 380..730 nm in 10 nm steps, per
-// spectrum.
+// Reading reflectance spectra of any wavelength grid from CSV or CGATS text,
+// and bringing them onto the library's 36-point grid (380..730 nm, 10 nm).
 //
-// CSV format: fields separated by ","; double quotes around a field are removed
-// ("" inside stands for one quote); blank lines and lines starting with "#"
-// are skipped; CR LF line ends and a UTF-8 byte order mark are accepted.
-// Numbers are read with "." as decimal separator whatever the locale. An
-// optional header is the first line whose last field is not a number; its
-// spectral columns are the trailing fields that name a wavelength ("r380",
-// "380", "nm380", "SPEC_380", "SPECTRAL_NM380") and must be exactly 380..730 nm in
-// 10 nm steps. Without a header the last 36 fields of each row are the values
+// CSV: fields separated by ","; double quotes around a field are removed ("" inside
+// stands for one quote); blank lines and lines starting with "#" are skipped;
+// CR LF line ends and a UTF-8 byte order mark are accepted. Numbers use "." as
+// decimal separator whatever the locale. An optional header is the first
+// content line that ends in wavelength names ("r380", "380", "nm380",
+// "SPEC_380", "SPECTRAL_NM380", "SPECTRAL_NM_380", "380nm"); its trailing
+// wavelength fields must increase and give the grid; fields before them are
+// ids (the first one the sample id, the second its name). A header of bare
+// numbers ("id,380,390,...") is recognised by its increasing whole numbers from
+// 200 to 2600. Without a header the last 36 fields of each row are 380..730 nm
 // and the fields before them the id.
+//
+// CGATS (CGATS.17 / IT8.7 / ArgyllCMS .ti3 and .sp), read with LittleCMS's
+// parser: the spectral fields of the data format in any of the spellings above
+// (ArgyllCMS "SPEC_nnn", X-Rite "nmnnn", LittleCMS "SPECTRAL_NM_nnn"); with
+// SPECTRAL_BANDS, SPECTRAL_START_NM and SPECTRAL_END_NM the grid is taken from
+// those (exact for fractional steps). SAMPLE_ID and SAMPLE_NAME are kept apart.
+//
+// Scale: percent when the caller says so, when the file says so
+// (SPECTRAL_NORM gives the value that stands for 1.0; an ArgyllCMS "CTI3" file
+// holds percent), or when any value is above 1.5; fractions otherwise. After
+// scaling, a spectrum with a value above kMaxPlausibleReflectance or below
+// -kMaxPlausibleReflectance, or with every value zero, is implausible: it is
+// reported with its line and left out, rather than turned into an L* of 300.
+//
+// No function here throws on any input or crashes on arbitrary bytes; input is
+// bounded (see the limits below) so that endless or binary input ends in an
+// error, not in exhausted memory.
 #ifndef NXBASE_SPECTRAFILE_H_
 #define NXBASE_SPECTRAFILE_H_
 
 #include <array>
+#include <cstddef>
+#include <iosfwd>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -26,57 +46,146 @@ namespace nxbase {
 constexpr int kSpectrumSize = 36;
 constexpr int kFirstWavelength = 380;
 constexpr int kWavelengthStep = 10;
-// Longest line accepted; longer lines are reported and skipped.
+// Longest line accepted; a longer one ends the reading with an error.
 constexpr std::size_t kMaxLineLength = 64 * 1024;
 // Most id fields a row may have before its values.
 constexpr std::size_t kMaxIdFields = 16;
+// Most spectra read from one input; the rest is reported and not read.
+constexpr std::size_t kMaxSamples = 4'000'000;
+// Largest CGATS text (the parser needs it whole).
+constexpr std::size_t kMaxCgatsBytes = 512u << 20;
+// Most wavelengths on one grid.
+constexpr std::size_t kMaxBands = 4096;
+// Error messages kept per input; further ones are counted.
+constexpr std::size_t kMaxErrorMessages = 200;
+// A reflectance factor further from 0 than this is taken for a wrong scale.
+constexpr double kMaxPlausibleReflectance = 2.0;
+
+enum class SpectralScale {
+    kAuto,      // as the file says, else percent when a value exceeds 1.5
+    kFraction,  // reflectance factors, white = 1
+    kPercent    // percentages, white = 100
+};
+
+// One spectrum as the file gives it, on the file's own grid.
+struct NXBASE_EXPORT SpectralSample {
+    std::string id;    // SAMPLE_ID or the first id field; the row number if none
+    std::string name;  // SAMPLE_NAME or the further id fields joined by " "
+    std::vector<float> values;  // one per wavelength of the set, scaled to white = 1
+    int line = 0;               // 1-based line in the source; 0 unknown
+};
+
+struct NXBASE_EXPORT SpectralSet {
+    std::vector<double> wavelengths;  // increasing, nm
+    std::vector<SpectralSample> samples;
+    // One message per rejected row or header, "<source>:<line>: <what>".
+    std::vector<std::string> errors;
+    std::size_t suppressedErrors = 0;  // errors beyond kMaxErrorMessages
+    // Remarks that are not errors, e.g. how the scale was chosen.
+    std::vector<std::string> notes;
+    bool unusable = false;   // nothing could be read (no grid, a file the parser rejects)
+    bool percent = false;    // the values were read as percentages
+    std::string format;      // "CSV" or "CGATS"
+
+    bool HasErrors() const { return !errors.empty() || suppressedErrors > 0; }
+};
+
+struct NXBASE_EXPORT SpectralReadOptions {
+    SpectralScale scale = SpectralScale::kAuto;
+    std::size_t maxSamples = kMaxSamples;
+};
+
+// Parses text already in memory; `source` names it in the messages.
+NXBASE_EXPORT SpectralSet ReadSpectralText(std::string_view text, const std::string& source,
+                                           const SpectralReadOptions& axOptions = {});
+// Reads a stream: CSV line by line (memory bounded by the samples kept), CGATS
+// whole up to kMaxCgatsBytes. Binary data (a NUL byte) ends it as unusable.
+NXBASE_EXPORT SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source,
+                                             const SpectralReadOptions& axOptions = {});
+// A file by name ("-" is standard input). False, with the reason in *pError,
+// when the file cannot be opened or read.
+NXBASE_EXPORT bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
+                                    SpectralSet* pSet, std::string* pError);
+
+// True when `text` has a CGATS data format section.
+NXBASE_EXPORT bool LooksLikeCgats(std::string_view text);
+
+// ---- The 36-point grid ----------------------------------------------------
 
 struct NXBASE_EXPORT SpectrumRow {
-    std::string id;                         // id fields joined by " "; the row number if none
+    std::string id;    // id and name joined by " "
     std::array<float, kSpectrumSize> values{};
-    int line = 0;                           // 1-based line in the source; 0 unknown
+    int line = 0;      // 1-based line in the source; 0 unknown
+    std::string sampleId;
+    std::string sampleName;
 };
 
 struct NXBASE_EXPORT SpectraTable {
     std::vector<SpectrumRow> rows;
-    // One message per rejected row or header, "<source>:<line>: <what>".
     std::vector<std::string> errors;
-    // Nothing could be read: a header or data format with a grid other than
-    // 380..730/10 nm, or a CGATS file its parser rejects.
+    std::vector<std::string> notes;
     bool unusable = false;
+    bool percent = false;
+    // The grid the spectra were read on, and how they were brought onto
+    // 380..730/10 nm ("as read", "Sprague", "linear").
+    std::vector<double> sourceWavelengths;
+    std::string resampling;
 };
 
-// Parses `text`; `source` names it in the messages. Each bad row is reported
-// and skipped; the others are kept. `scale` divides every value (100 for
-// percentages). Never throws on any input.
-NXBASE_EXPORT SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, float scale = 1.0f);
+// The samples of a set on the 36-point grid (see nxbase/resample.h); a set on
+// 380..730/10 nm is copied bit for bit.
+NXBASE_EXPORT SpectraTable ToStandardGrid(const SpectralSet& axSet);
 
-// CGATS (CGATS.17 / IT8.7 text as measurement software writes it), read with
-// LittleCMS's parser: the spectral fields of the data format ("SPECTRAL_NM380",
-// "SPEC_380", "nm380", "R380"; see detail::WavelengthOf) must
-// be exactly 380..730 nm in 10 nm steps, in any order; the id is SAMPLE_ID,
-// SAMPLE_NAME or the set number. A value that is not a number is reported with
-// the line of its set (sets counted one per line after BEGIN_DATA) and the set
-// skipped; a file the parser rejects is one error with its message.
-NXBASE_EXPORT SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source, float scale = 1.0f);
-// True when `text` has a CGATS data format section.
-NXBASE_EXPORT bool LooksLikeCgats(std::string_view text);
-// CGATS when LooksLikeCgats, CSV otherwise.
-NXBASE_EXPORT SpectraTable ParseSpectra(std::string_view text, const std::string& source, float scale = 1.0f);
-
-// Reads and parses a file ("-" is standard input) as ParseSpectra does. False,
-// with the reason in *error, when the file cannot be read.
-NXBASE_EXPORT bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, std::string* error);
+// Reading and resampling in one call.
+NXBASE_EXPORT SpectraTable ParseSpectra(std::string_view text, const std::string& source,
+                                        const SpectralReadOptions& axOptions = {});
+NXBASE_EXPORT SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source,
+                                           const SpectralReadOptions& axOptions = {});
+NXBASE_EXPORT SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
+                                             const SpectralReadOptions& axOptions = {});
+NXBASE_EXPORT bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
+                                   SpectraTable* pTable, std::string* pError);
 
 namespace detail {
 // A finite decimal number ("." separator, optional leading "+"), whole field.
 NXBASE_EXPORT bool ParseNumber(std::string_view text, double* value);
 // The wavelength a spectral column name gives: digits after one of the
-// prefixes SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or none (any case),
-// optionally followed by "nm" ("r380", "SPECTRAL_NM380", "380nm"); else -1.
+// prefixes SPECTRAL_NM_, SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or none
+// (any case), optionally followed by "nm" ("r380", "SPECTRAL_NM380", "380nm");
+// else -1.
 NXBASE_EXPORT int WavelengthOf(std::string_view field);
 // A field as shown in messages: at most 40 bytes, control bytes as "?".
 std::string Shown(std::string_view field);
+
+// Shared by the CSV and CGATS readers: records an error within the bound.
+void AddError(SpectralSet* pSet, std::string message);
+// Applies the scale (auto detection included) and drops implausible
+// spectra; `rawScaled` says the values were already divided while parsing.
+void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
+                 const std::string& axNormReason, const std::string& source);
+SpectralSet ReadCsvText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions);
+SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions);
+
+// Builds a CSV set line by line.
+class NXBASE_EXPORT CsvSpectraParser {
+public:
+    CsvSpectraParser(const std::string& source, const SpectralReadOptions& axOptions, SpectralSet* pSet);
+    // False once reading should stop (limit reached, unusable header).
+    bool Line(std::string_view line, int number);
+    void Finish();
+
+private:
+    void Header(const std::vector<std::string>& fields, int line);
+    void Row(const std::vector<std::string>& fields, int line);
+    void Error(int line, const std::string& what);
+
+    std::string amSource;
+    SpectralReadOptions amOptions;
+    SpectralSet* pSet;
+    bool amSeenContent = false;
+    int amIdFields = -1;  // from the header; -1 without one
+    bool amStopped = false;
+};
 }  // namespace detail
 
 }  // namespace nxbase

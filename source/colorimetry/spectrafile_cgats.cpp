@@ -1,5 +1,4 @@
-// CGATS spectra for nxcolor (through LittleCMS's CGATS/IT8 parser), the choice
-// between CGATS and CSV, and reading files.
+// CGATS spectra through LittleCMS's CGATS/IT8 parser.
 #include <algorithm>
 #include <cmath>
 #include <filesystem>
@@ -95,117 +94,152 @@ private:
 };
 
 
-}  // namespace
-
-bool LooksLikeCgats(std::string_view text) {
-    return text.find("BEGIN_DATA_FORMAT") != std::string_view::npos;
+// A property as a number, or 0 when it is absent or not a number.
+double NumericProperty(cmsHANDLE it8, const char* name) {
+    const char* text = cmsIT8GetProperty(it8, name);
+    double value = 0.0;
+    if (!text || !detail::ParseNumber(text, &value)) return 0.0;
+    return value;
 }
 
-SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source, float scale) {
-    SpectraTable table;
+// The spectral fields of the data format, sorted by wavelength: (nm, field).
+std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* idField, int* nameField) {
+    std::vector<std::pair<int, int>> spectral;
+    for (int f = 0; f < fields && names; ++f) {
+        const std::string name = names[f] ? names[f] : "";
+        if (name == "SAMPLE_ID") {
+            *idField = f;
+        } else if (name == "SAMPLE_NAME") {
+            *nameField = f;
+        } else if (detail::WavelengthOf(name) >= 0) {
+            spectral.emplace_back(detail::WavelengthOf(name), f);
+        }
+    }
+    std::sort(spectral.begin(), spectral.end());
+    return spectral;
+}
+
+// The grid: from SPECTRAL_BANDS/START/END when they agree with the fields
+// (exact for fractional steps), else from the field names.
+std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spectral, SpectralSet* set) {
+    if (spectral.size() < 3) return spectral.empty() ? "spectral fields missing" : "fewer than 3 spectral fields";
+    if (spectral.size() > kMaxBands) return "more than " + std::to_string(kMaxBands) + " spectral fields";
+    for (std::size_t i = 1; i < spectral.size(); ++i) {
+        if (spectral[i].first == spectral[i - 1].first) {
+            return "two spectral fields for " + std::to_string(spectral[i].first) + " nm";
+        }
+    }
+    const double bands = NumericProperty(it8, "SPECTRAL_BANDS");
+    const double start = NumericProperty(it8, "SPECTRAL_START_NM");
+    const double end = NumericProperty(it8, "SPECTRAL_END_NM");
+    const bool declared = bands == static_cast<double>(spectral.size()) && start > 0.0 && end > start &&
+                          std::fabs(start - spectral.front().first) < 1.0 &&
+                          std::fabs(end - spectral.back().first) < 1.0;
+    for (std::size_t i = 0; i < spectral.size(); ++i) {
+        set->wavelengths.push_back(declared ? start + (end - start) * static_cast<double>(i) / (bands - 1.0)
+                                            : spectral[i].first);
+    }
+    return "";
+}
+
+}  // namespace
+
+namespace detail {
+
+SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+    SpectralSet set;
+    set.format = "CGATS";
     Cgats cgats;
     if (!cgats.Load(text)) {
-        table.errors.push_back(LocateError(source, cgats.FirstError()));
-        table.unusable = true;  // nothing usable
-        return table;
+        AddError(&set, LocateError(source, cgats.FirstError()));
+        set.unusable = true;
+        return set;
     }
     cmsHANDLE it8 = cgats.Handle();
     char** names = nullptr;
     const int fields = cmsIT8EnumDataFormat(it8, &names);
     int idField = -1;
     int nameField = -1;
-    std::vector<std::pair<int, int>> spectral;  // (wavelength, field)
-    for (int f = 0; f < fields && names; ++f) {
-        const std::string name = names[f] ? names[f] : "";
-        if (name == "SAMPLE_ID") {
-            idField = f;
-        } else if (name == "SAMPLE_NAME") {
-            nameField = f;
-        } else if (detail::WavelengthOf(name) >= 0) {
-            spectral.emplace_back(detail::WavelengthOf(name), f);
+    const std::vector<std::pair<int, int>> spectral = SpectralFields(names, fields, &idField, &nameField);
+    const std::string gridProblem = TakeGrid(it8, spectral, &set);
+    if (!gridProblem.empty()) {
+        std::string what = source + ": " + gridProblem;
+        if (spectral.size() >= 2) {
+            what += " (" + std::to_string(spectral.front().first) + ".." + std::to_string(spectral.back().first) +
+                    " nm)";
         }
+        AddError(&set, what);
+        set.unusable = true;
+        set.wavelengths.clear();
+        return set;
     }
-    std::sort(spectral.begin(), spectral.end());
-    bool grid = spectral.size() == static_cast<std::size_t>(kSpectrumSize);
-    for (std::size_t i = 0; grid && i < spectral.size(); ++i) {
-        grid = spectral[i].first == kFirstWavelength + kWavelengthStep * static_cast<int>(i);
+
+    // The file's own scale: SPECTRAL_NORM is the value that stands for 1.0;
+    // ArgyllCMS measurement files (CTI3) hold percentages.
+    double fileNorm = NumericProperty(it8, "SPECTRAL_NORM");
+    std::string normReason = fileNorm > 0.0 ? "SPECTRAL_NORM " + std::to_string(fileNorm) : "";
+    const char* sheet = cmsIT8GetSheetType(it8);
+    if (fileNorm <= 0.0 && sheet && std::string(sheet).rfind("CTI3", 0) == 0) {
+        fileNorm = 100.0;
+        normReason = "an ArgyllCMS CTI3 file";
     }
-    if (!grid) {
-        std::string what = source + ": spectral fields ";
-        if (spectral.empty()) {
-            what += "missing";
-        } else {
-            what += std::to_string(spectral.front().first) + ".." +
-                    std::to_string(spectral.back().first) + " nm (" +
-                    std::to_string(spectral.size()) + " fields)";
-        }
-        table.errors.push_back(what + "; nxcolor needs 36 fields, 380..730 nm in 10 nm steps");
-        table.unusable = true;
-        return table;
-    }
+    double divisor = fileNorm > 0.0 ? fileNorm : 1.0;
+    if (axOptions.scale == SpectralScale::kPercent) divisor = 100.0;
+    if (axOptions.scale == SpectralScale::kFraction) divisor = 1.0;
+
     const std::vector<int> lines = DataLines(text);
-    const double sets = cmsIT8GetPropertyDbl(it8, "NUMBER_OF_SETS");
-    const int count = sets > 0 && sets < 1e8 ? static_cast<int>(sets) : 0;
-    for (int set = 0; set < count; ++set) {
-        SpectrumRow row;
-        row.line = set < static_cast<int>(lines.size()) ? lines[set] : 0;
+    const char* setsText = cmsIT8GetProperty(it8, "NUMBER_OF_SETS");
+    double sets = 0.0;
+    if (!setsText || !ParseNumber(setsText, &sets) || sets < 0 || sets != std::floor(sets)) {
+        AddError(&set, source + ": NUMBER_OF_SETS \"" + Shown(setsText ? setsText : "") +
+                           "\" is not a number of sets");
+        set.unusable = true;
+        return set;
+    }
+    const std::size_t count = static_cast<std::size_t>(std::min(sets, 1e9));
+    for (std::size_t s = 0; s < count; ++s) {
+        const int row = static_cast<int>(s);
+        SpectralSample sample;
+        sample.line = s < lines.size() ? lines[s] : 0;
         const std::string where =
-            source + ":" + (row.line ? std::to_string(row.line) : "set " + std::to_string(set + 1));
-        const char* id = idField >= 0 ? cmsIT8GetDataRowCol(it8, set, idField) : nullptr;
-        const char* name = nameField >= 0 ? cmsIT8GetDataRowCol(it8, set, nameField) : nullptr;
-        if (id && *id) row.id = id;
-        if (name && *name) row.id += (row.id.empty() ? "" : " ") + std::string(name);
-        if (row.id.empty()) row.id = std::to_string(set + 1);
+            source + ":" + (sample.line ? std::to_string(sample.line) : "set " + std::to_string(s + 1));
+        if (set.samples.size() >= axOptions.maxSamples) {
+            AddError(&set, where + ": more than " + std::to_string(axOptions.maxSamples) +
+                               " spectra; the rest is not read");
+            break;
+        }
+        const char* id = idField >= 0 ? cmsIT8GetDataRowCol(it8, row, idField) : nullptr;
+        const char* name = nameField >= 0 ? cmsIT8GetDataRowCol(it8, row, nameField) : nullptr;
+        if (id) sample.id = id;
+        if (name) sample.name = name;
+        if (sample.id.empty() && sample.name.empty()) sample.id = std::to_string(s + 1);
+        sample.values.resize(spectral.size());
         bool good = true;
-        for (int k = 0; k < kSpectrumSize && good; ++k) {
-            const char* value = cmsIT8GetDataRowCol(it8, set, spectral[k].second);
+        for (std::size_t k = 0; k < spectral.size() && good; ++k) {
+            const char* value = cmsIT8GetDataRowCol(it8, row, spectral[k].second);
             double number = 0.0;
-            if (!value || !detail::ParseNumber(value, &number)) {
-                table.errors.push_back(where + ": " + names[spectral[k].second] + ": \"" +
-                                       detail::Shown(value ? value : "") + "\" is not a number");
+            const std::string field = names[spectral[k].second];
+            if (!value || !ParseNumber(value, &number)) {
+                AddError(&set, where + ": " + field + ": \"" + Shown(value ? value : "") + "\" is not a number");
                 good = false;
                 break;
             }
-            row.values[k] = static_cast<float>(number / scale);
-            if (!std::isfinite(row.values[k])) {
-                table.errors.push_back(where + ": " + names[spectral[k].second] + ": \"" +
-                                       detail::Shown(value) + "\" is out of range");
+            sample.values[k] = static_cast<float>(number / divisor);
+            if (!std::isfinite(sample.values[k])) {
+                AddError(&set, where + ": " + field + ": \"" + Shown(value) + "\" is out of range");
                 good = false;
             }
         }
-        if (good) table.rows.push_back(std::move(row));
+        if (good) set.samples.push_back(std::move(sample));
     }
-    return table;
+    const SpectralReadOptions known = {fileNorm > 0.0 && axOptions.scale == SpectralScale::kAuto
+                                           ? (fileNorm == 1.0 ? SpectralScale::kFraction : SpectralScale::kPercent)
+                                           : axOptions.scale,
+                                       axOptions.maxSamples};
+    FinishScale(&set, known, fileNorm, normReason, source);
+    return set;
 }
 
-SpectraTable ParseSpectra(std::string_view text, const std::string& source, float scale) {
-    return LooksLikeCgats(text) ? ParseSpectraCgats(text, source, scale)
-                                : ParseSpectraCsv(text, source, scale);
-}
-
-bool ReadSpectraFile(const std::string& path, float scale, SpectraTable* table, std::string* error) {
-    std::string text;
-    if (path == "-") {
-        text.assign(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
-    } else {
-        std::error_code ignored;
-        if (std::filesystem::is_directory(path, ignored)) {
-            *error = path + ": is a directory";
-            return false;
-        }
-        std::ifstream in(path, std::ios::binary);
-        if (!in) {
-            *error = path + ": cannot open the file";
-            return false;
-        }
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-        if (in.bad()) {
-            *error = path + ": read error";
-            return false;
-        }
-    }
-    *table = ParseSpectra(text, path == "-" ? "<stdin>" : path, scale);
-    return true;
-}
+}  // namespace detail
 
 }  // namespace nxbase

@@ -58,7 +58,7 @@ bool ParseNumber(std::string_view text, double* value) {
 
 int WavelengthOf(std::string_view field) {
     // Known prefixes, longest first; compared without ASCII case.
-    static const char* const kPrefixes[] = {"SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
+    static const char* const kPrefixes[] = {"SPECTRAL_NM_", "SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
     auto upper = [](char c) { return static_cast<char>(std::toupper(static_cast<unsigned char>(c))); };
     for (const char* prefix : kPrefixes) {
         const std::string_view p(prefix);
@@ -88,16 +88,44 @@ std::string Shown(std::string_view field) {
 
 }  // namespace detail
 
+
 namespace {
 
 using detail::ParseNumber;
 using detail::Shown;
 using detail::WavelengthOf;
 
-// A header ends in a field that is not a number, and either names a
-// wavelength there or has mostly text fields; a data row with one bad value
-// at its end is not taken for one.
+constexpr int kLowestWavelength = 200;
+constexpr int kHighestWavelength = 2600;
+constexpr std::size_t kMinBands = 3;
+
+bool IsWholeWavelength(const std::string& field, int* nm) {
+    double value = 0.0;
+    if (!ParseNumber(field, &value) || field.find_first_of(".eE") != std::string::npos) return false;
+    if (value < kLowestWavelength || value > kHighestWavelength) return false;
+    *nm = static_cast<int>(value);
+    return true;
+}
+
+// Trailing fields that are increasing whole numbers from 200 to 2600 nm: a
+// header such as "id,380,390,...". Percent or fraction data never looks so.
+std::size_t NumericHeaderColumns(const std::vector<std::string>& fields) {
+    std::size_t count = 0;
+    int next = kHighestWavelength + 1;
+    for (std::size_t i = fields.size(); i > 0; --i) {
+        int nm = 0;
+        if (!IsWholeWavelength(fields[i - 1], &nm) || nm >= next) break;
+        next = nm;
+        ++count;
+    }
+    return count >= kMinBands ? count : 0;
+}
+
+// A header ends in a field that is not a number and either names a
+// wavelength there or has mostly text fields (a data row with one bad value
+// at its end is not taken for one), or ends in a numeric wavelength list.
 bool LooksLikeHeader(const std::vector<std::string>& fields) {
+    if (NumericHeaderColumns(fields) > 0) return true;
     double value = 0.0;
     if (ParseNumber(fields.back(), &value)) return false;
     if (WavelengthOf(fields.back()) >= 0) return true;
@@ -106,127 +134,155 @@ bool LooksLikeHeader(const std::vector<std::string>& fields) {
     return 2 * numbers < fields.size();
 }
 
-class Parser {
-public:
-    Parser(const std::string& source, float scale, SpectraTable* table)
-        : amSource(source), amScale(scale), pTable(table) {}
-
-    void Line(std::string_view line, int number) {
-        if (number == 1 && line.substr(0, 3) == "\xEF\xBB\xBF") line.remove_prefix(3);
-        const std::string_view content = Trim(line);
-        if (content.empty() || content.front() == '#') return;
-        if (line.size() > kMaxLineLength) {
-            Error(number, "line longer than " + std::to_string(kMaxLineLength) + " bytes");
-            return;
-        }
-        const std::vector<std::string> fields = SplitFields(line);
-        if (!amSeenContent) {
-            amSeenContent = true;
-            if (LooksLikeHeader(fields)) {
-                Header(fields, number);
-                return;
-            }
-        }
-        if (pTable->unusable) return;
-        Row(fields, number);
-    }
-
-private:
-    void Error(int line, const std::string& what) {
-        pTable->errors.push_back(amSource + ":" + std::to_string(line) + ": " + what);
-    }
-
-    void Header(const std::vector<std::string>& fields, int line) {
-        // The spectral columns: the trailing fields that name a wavelength.
-        std::size_t first = fields.size();
-        while (first > 0 && WavelengthOf(fields[first - 1]) >= 0) --first;
-        const std::size_t count = fields.size() - first;
-        bool grid = count == static_cast<std::size_t>(kSpectrumSize);
-        for (std::size_t i = 0; grid && i < count; ++i) {
-            grid = WavelengthOf(fields[first + i]) ==
-                   kFirstWavelength + kWavelengthStep * static_cast<int>(i);
-        }
-        if (!grid) {
-            std::string what = "spectral columns ";
-            if (count == 0) {
-                what += "missing";
-            } else {
-                what += std::to_string(WavelengthOf(fields[first])) + ".." +
-                        std::to_string(WavelengthOf(fields.back())) + " nm (" +
-                        std::to_string(count) + " columns)";
-            }
-            Error(line, what + "; nxcolor needs 36 columns, 380..730 nm in 10 nm steps");
-            pTable->unusable = true;
-            return;
-        }
-        amIdFields = static_cast<int>(first);
-    }
-
-    void Row(const std::vector<std::string>& fields, int line) {
-        const std::size_t expected = amIdFields >= 0 ? amIdFields + kSpectrumSize : 0;
-        if (expected != 0 && fields.size() != expected) {
-            Error(line, std::to_string(fields.size()) + " fields, expected " + std::to_string(expected));
-            return;
-        }
-        if (fields.size() < static_cast<std::size_t>(kSpectrumSize)) {
-            Error(line, std::to_string(fields.size()) + " fields, expected at least 36 values");
-            return;
-        }
-        const std::size_t ids = fields.size() - kSpectrumSize;
-        if (ids > kMaxIdFields) {
-            Error(line, std::to_string(fields.size()) + " fields: more than " +
-                            std::to_string(kMaxIdFields) + " before the 36 values");
-            return;
-        }
-        SpectrumRow row;
-        row.line = line;
-        for (std::size_t i = 0; i < ids; ++i) {
-            if (i > 0) row.id += ' ';
-            row.id += fields[i];
-        }
-        if (row.id.empty()) row.id = std::to_string(pTable->rows.size() + 1);
-        for (int k = 0; k < kSpectrumSize; ++k) {
-            double value = 0.0;
-            const std::string& field = fields[ids + k];
-            if (!ParseNumber(field, &value)) {
-                Error(line, "field " + std::to_string(ids + k + 1) + " (" +
-                                std::to_string(kFirstWavelength + kWavelengthStep * k) + " nm): \"" +
-                                Shown(field) + "\" is not a number");
-                return;
-            }
-            const float scaled = static_cast<float>(value / amScale);
-            if (!std::isfinite(scaled)) {
-                Error(line, "field " + std::to_string(ids + k + 1) + " (" +
-                                std::to_string(kFirstWavelength + kWavelengthStep * k) + " nm): \"" +
-                                Shown(field) + "\" is out of range");
-                return;
-            }
-            row.values[k] = scaled;
-        }
-        pTable->rows.push_back(std::move(row));
-    }
-
-    std::string amSource;
-    float amScale;
-    SpectraTable* pTable;
-    bool amSeenContent = false;
-    int amIdFields = -1;  // from the header; -1 without one
-};
+std::vector<double> StandardGrid() {
+    std::vector<double> grid(kSpectrumSize);
+    for (int i = 0; i < kSpectrumSize; ++i) grid[i] = kFirstWavelength + kWavelengthStep * i;
+    return grid;
+}
 
 }  // namespace
 
-SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, float scale) {
-    SpectraTable table;
-    Parser parser(source, scale, &table);
+namespace detail {
+
+CsvSpectraParser::CsvSpectraParser(const std::string& source, const SpectralReadOptions& axOptions,
+                                   SpectralSet* pSetArg)
+    : amSource(source), amOptions(axOptions), pSet(pSetArg) {
+    pSet->format = "CSV";
+}
+
+bool CsvSpectraParser::Line(std::string_view line, int number) {
+    if (amStopped) return false;
+    if (number == 1 && line.substr(0, 3) == "\xEF\xBB\xBF") line.remove_prefix(3);
+    const std::string_view content = Trim(line);
+    if (content.empty() || content.front() == '#') return true;
+    if (line.size() > kMaxLineLength) {
+        Error(number, "line longer than " + std::to_string(kMaxLineLength) + " bytes; not read further");
+        amStopped = true;
+        return false;
+    }
+    const std::vector<std::string> fields = SplitFields(line);
+    if (!amSeenContent) {
+        amSeenContent = true;
+        if (LooksLikeHeader(fields)) {
+            Header(fields, number);
+            return !amStopped;
+        }
+    }
+    Row(fields, number);
+    return !amStopped;
+}
+
+void CsvSpectraParser::Finish() {
+    if (pSet->wavelengths.empty() && !pSet->unusable) pSet->wavelengths = StandardGrid();
+}
+
+void CsvSpectraParser::Error(int line, const std::string& what) {
+    AddError(pSet, amSource + ":" + std::to_string(line) + ": " + what);
+}
+
+void CsvSpectraParser::Header(const std::vector<std::string>& fields, int line) {
+    std::size_t count = NumericHeaderColumns(fields);
+    if (count == 0) {
+        while (count < fields.size() && WavelengthOf(fields[fields.size() - 1 - count]) >= 0) ++count;
+    }
+    const std::size_t first = fields.size() - count;
+    std::vector<double> grid;
+    for (std::size_t i = first; i < fields.size(); ++i) grid.push_back(WavelengthOf(fields[i]));
+    std::string problem;
+    if (count < kMinBands) {
+        problem = count == 0 ? "spectral columns missing" : "fewer than 3 spectral columns";
+    } else if (count > kMaxBands) {
+        problem = "more than " + std::to_string(kMaxBands) + " spectral columns";
+    } else if (first > kMaxIdFields) {
+        problem = "more than " + std::to_string(kMaxIdFields) + " id columns";
+    } else {
+        for (std::size_t i = 0; i < grid.size() && problem.empty(); ++i) {
+            if (grid[i] < kLowestWavelength || grid[i] > kHighestWavelength) {
+                problem = "column \"" + Shown(fields[first + i]) + "\" is not a wavelength from 200 to 2600 nm";
+            } else if (i > 0 && grid[i] <= grid[i - 1]) {
+                problem = "wavelengths do not increase at column \"" + Shown(fields[first + i]) + "\"";
+            }
+        }
+    }
+    if (!problem.empty()) {
+        Error(line, problem);
+        pSet->unusable = true;
+        amStopped = true;
+        return;
+    }
+    pSet->wavelengths = std::move(grid);
+    amIdFields = static_cast<int>(first);
+}
+
+void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
+    if (pSet->wavelengths.empty()) pSet->wavelengths = StandardGrid();
+    const std::size_t bands = pSet->wavelengths.size();
+    const std::size_t expected = amIdFields >= 0 ? amIdFields + bands : 0;
+    if (expected != 0 && fields.size() != expected) {
+        Error(line, std::to_string(fields.size()) + " fields, expected " + std::to_string(expected));
+        return;
+    }
+    if (fields.size() < bands) {
+        Error(line, std::to_string(fields.size()) + " fields, expected at least " + std::to_string(bands) +
+                        " values");
+        return;
+    }
+    const std::size_t ids = fields.size() - bands;
+    if (ids > kMaxIdFields) {
+        Error(line, std::to_string(fields.size()) + " fields: more than " + std::to_string(kMaxIdFields) +
+                        " before the " + std::to_string(bands) + " values");
+        return;
+    }
+    if (pSet->samples.size() >= amOptions.maxSamples) {
+        Error(line, "more than " + std::to_string(amOptions.maxSamples) + " spectra; the rest is not read");
+        amStopped = true;
+        return;
+    }
+    SpectralSample sample;
+    sample.line = line;
+    if (ids > 0) sample.id = fields[0];
+    for (std::size_t i = 1; i < ids; ++i) {
+        if (i > 1) sample.name += ' ';
+        sample.name += fields[i];
+    }
+    if (sample.id.empty() && sample.name.empty()) sample.id = std::to_string(pSet->samples.size() + 1);
+    const double divisor = amOptions.scale == SpectralScale::kPercent ? 100.0 : 1.0;
+    sample.values.resize(bands);
+    for (std::size_t k = 0; k < bands; ++k) {
+        double value = 0.0;
+        const std::string& field = fields[ids + k];
+        const std::string where = "field " + std::to_string(ids + k + 1) + " (" +
+                                  std::to_string(static_cast<int>(pSet->wavelengths[k])) + " nm): \"" +
+                                  Shown(field) + "\"";
+        if (!ParseNumber(field, &value)) {
+            Error(line, where + " is not a number");
+            return;
+        }
+        const float scaled = static_cast<float>(value / divisor);
+        if (!std::isfinite(scaled)) {
+            Error(line, where + " is out of range");
+            return;
+        }
+        sample.values[k] = scaled;
+    }
+    pSet->samples.push_back(std::move(sample));
+}
+
+SpectralSet ReadCsvText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+    SpectralSet set;
+    CsvSpectraParser parser(source, axOptions, &set);
     int number = 0;
     while (!text.empty()) {
         const std::size_t end = text.find('\n');
-        const std::string_view line = text.substr(0, end);
-        parser.Line(line, ++number);
+        if (!parser.Line(text.substr(0, end), ++number)) break;
         if (end == std::string_view::npos) break;
         text.remove_prefix(end + 1);
     }
-    return table;
+    parser.Finish();
+    FinishScale(&set, axOptions, 0.0, "", source);
+    return set;
 }
+
+}  // namespace detail
 
 }  // namespace nxbase

@@ -80,7 +80,7 @@ struct Options {
     std::string format = "table";
     std::string density;  // empty: no density columns
     int precision = 4;
-    float scale = 1.0f;
+    nxbase::SpectralReadOptions read;
     bool xyy = false;
     bool din99 = false;
     bool rgb = false;
@@ -143,7 +143,9 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             }
             options->precision = n;
         } else if (arg == "--percent" && !hasValue) {
-            options->scale = 100.0f;
+            options->read.scale = nxbase::SpectralScale::kPercent;
+        } else if (arg == "--fraction" && !hasValue) {
+            options->read.scale = nxbase::SpectralScale::kFraction;
         } else if (arg == "--xyy" && !hasValue) {
             options->xyy = true;
         } else if (arg == "--din99" && !hasValue) {
@@ -226,11 +228,11 @@ int main(int argc, char** argv) {
         }
     } else if (options.file.empty()) {
         source = nxcolor::EmbeddedChartName();
-        table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), source, options.scale);
+        table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), source, options.read);
     } else {
         source = options.file == "-" ? "<stdin>" : options.file;
         std::string error;
-        if (!nxcolor::ReadSpectraFile(options.file, options.scale, &table, &error)) {
+        if (!nxcolor::ReadSpectraFile(options.file, options.read, &table, &error)) {
             std::cerr << "nxcolor: " << error << '\n';
             return kExitUsage;
         }

@@ -1,0 +1,253 @@
+// Spectral input common to CSV and CGATS: the scale, plausibility, bounded
+// reading of streams and files, and the 36-point grid.
+#include "nxbase/spectrafile.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <memory>
+#include <new>
+
+#include "nxbase/resample.h"
+
+namespace nxbase {
+namespace {
+
+constexpr double kPercentThreshold = 1.5;  // above it, auto-detection reads percent
+constexpr std::size_t kReadChunk = 64 * 1024;
+constexpr std::size_t kSniffBytes = 1 << 20;  // looked at to tell CGATS from CSV
+
+std::string Where(const std::string& source, int line) {
+    return source + ":" + (line > 0 ? std::to_string(line) : std::string("?"));
+}
+
+// A spectrum far outside reflectance, or all zero, comes from a wrong scale
+// or a broken measurement; it would print as nonsense colour.
+std::string Implausible(const SpectralSample& sample) {
+    bool allZero = true;
+    for (const float v : sample.values) {
+        if (std::fabs(v) > kMaxPlausibleReflectance) {
+            return "value " + std::to_string(v) + " is not a reflectance factor (scale wrong? see --percent)";
+        }
+        allZero = allZero && v == 0.0f;
+    }
+    return allZero ? "every value is zero" : "";
+}
+
+}  // namespace
+
+namespace detail {
+
+void AddError(SpectralSet* pSet, std::string message) {
+    if (pSet->errors.size() < kMaxErrorMessages) {
+        pSet->errors.push_back(std::move(message));
+    } else {
+        ++pSet->suppressedErrors;
+    }
+}
+
+void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
+                 const std::string& axNormReason, const std::string& source) {
+    if (axOptions.scale == SpectralScale::kPercent) {
+        pSet->percent = true;
+        if (axFileNorm > 0.0) pSet->notes.push_back(source + ": values read as " + axNormReason);
+    } else if (axOptions.scale == SpectralScale::kAuto) {
+        float largest = 0.0f;
+        for (const SpectralSample& sample : pSet->samples) {
+            for (const float v : sample.values) largest = std::max(largest, v);
+        }
+        if (largest > kPercentThreshold) {
+            pSet->percent = true;
+            for (SpectralSample& sample : pSet->samples) {
+                for (float& v : sample.values) v = static_cast<float>(static_cast<double>(v) / 100.0);
+            }
+            pSet->notes.push_back(source + ": values read as percentages (largest " + std::to_string(largest) +
+                                  " is above 1.5); --fraction reads them as they stand");
+        }
+    }
+    std::vector<SpectralSample> kept;
+    kept.reserve(pSet->samples.size());
+    for (SpectralSample& sample : pSet->samples) {
+        const std::string problem = Implausible(sample);
+        if (problem.empty()) {
+            kept.push_back(std::move(sample));
+        } else {
+            AddError(pSet, Where(source, sample.line) + ": " + problem);
+        }
+    }
+    pSet->samples = std::move(kept);
+}
+
+}  // namespace detail
+
+bool LooksLikeCgats(std::string_view text) {
+    return text.find("BEGIN_DATA_FORMAT") != std::string_view::npos;
+}
+
+SpectralSet ReadSpectralText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+    const std::size_t nul = text.find('\0');
+    if (nul != std::string_view::npos) {
+        SpectralSet set;
+        detail::AddError(&set, source + ": binary data (a NUL byte at offset " + std::to_string(nul) +
+                                   "), not a text file");
+        set.unusable = true;
+        return set;
+    }
+    return LooksLikeCgats(text) ? detail::ReadCgatsText(text, source, axOptions)
+                                : detail::ReadCsvText(text, source, axOptions);
+}
+
+namespace {
+
+// Reads up to `limit` more bytes into *text; false on a stream error.
+bool ReadMore(std::istream& in, std::string* text, std::size_t limit) {
+    char buffer[kReadChunk];
+    while (limit > 0 && in) {
+        in.read(buffer, static_cast<std::streamsize>(std::min(limit, sizeof buffer)));
+        const std::size_t got = static_cast<std::size_t>(in.gcount());
+        text->append(buffer, got);
+        limit -= got;
+        if (got == 0) break;
+    }
+    return !in.bad();
+}
+
+SpectralSet Unusable(const std::string& message) {
+    SpectralSet set;
+    detail::AddError(&set, message);
+    set.unusable = true;
+    return set;
+}
+
+// CSV from a stream, a line at a time; `text` holds what was read ahead.
+SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& source,
+                      const SpectralReadOptions& axOptions) {
+    SpectralSet set;
+    detail::CsvSpectraParser parser(source, axOptions, &set);
+    int number = 0;
+    std::size_t start = 0;
+    bool more = true;
+    while (true) {
+        const std::size_t end = text.find('\n', start);
+        if (end == std::string::npos) {
+            text.erase(0, start);
+            start = 0;
+            if (text.find('\0') != std::string::npos) {
+                return Unusable(source + ":" + std::to_string(number + 1) + ": binary data (a NUL byte), not a text file");
+            }
+            if (!more || text.size() > kMaxLineLength) {
+                if (!text.empty()) parser.Line(text, ++number);
+                break;
+            }
+            const std::size_t before = text.size();
+            if (!ReadMore(in, &text, kReadChunk)) {
+                detail::AddError(&set, source + ": read error after line " + std::to_string(number));
+                break;
+            }
+            more = text.size() > before;
+            continue;
+        }
+        const std::string_view line(text.data() + start, end - start);
+        if (line.find('\0') != std::string_view::npos) {
+            return Unusable(source + ":" + std::to_string(number + 1) + ": binary data (a NUL byte), not a text file");
+        }
+        if (!parser.Line(line, ++number)) break;
+        start = end + 1;
+    }
+    parser.Finish();
+    detail::FinishScale(&set, axOptions, 0.0, "", source);
+    return set;
+}
+
+}  // namespace
+
+SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source, const SpectralReadOptions& axOptions) {
+    try {
+        std::string head;
+        if (!ReadMore(axInput, &head, kSniffBytes)) return Unusable(source + ": read error");
+        if (!LooksLikeCgats(head)) return StreamCsv(axInput, std::move(head), source, axOptions);
+        if (!ReadMore(axInput, &head, kMaxCgatsBytes - head.size())) return Unusable(source + ": read error");
+        if (head.size() >= kMaxCgatsBytes && axInput.peek() != std::char_traits<char>::eof()) {
+            return Unusable(source + ": CGATS text larger than " + std::to_string(kMaxCgatsBytes >> 20) + " MiB");
+        }
+        return ReadSpectralText(head, source, axOptions);
+    } catch (const std::bad_alloc&) {
+        return Unusable(source + ": out of memory while reading");
+    }
+}
+
+bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions, SpectralSet* pSet,
+                      std::string* pError) {
+    if (path == "-") {
+        *pSet = ReadSpectralStream(std::cin, "<stdin>", axOptions);
+        return true;
+    }
+    std::error_code ignored;
+    if (std::filesystem::is_directory(path, ignored)) {
+        *pError = path + ": is a directory";
+        return false;
+    }
+    std::ifstream in(path, std::ios::binary);
+    if (!in) {
+        *pError = path + ": cannot open the file";
+        return false;
+    }
+    *pSet = ReadSpectralStream(in, path, axOptions);
+    return true;
+}
+
+SpectraTable ToStandardGrid(const SpectralSet& axSet) {
+    SpectraTable table;
+    table.errors = axSet.errors;
+    if (axSet.suppressedErrors > 0) {
+        table.errors.push_back(std::to_string(axSet.suppressedErrors) + " more errors not shown");
+    }
+    table.notes = axSet.notes;
+    table.unusable = axSet.unusable;
+    table.percent = axSet.percent;
+    table.sourceWavelengths = axSet.wavelengths;
+    if (axSet.unusable || axSet.wavelengths.size() < 2) {
+        table.unusable = true;
+        return table;
+    }
+    const SpectralResampler resampler(axSet.wavelengths);
+    table.resampling = resampler.MethodName();
+    table.rows.reserve(axSet.samples.size());
+    for (const SpectralSample& sample : axSet.samples) {
+        SpectrumRow row;
+        row.sampleId = sample.id;
+        row.sampleName = sample.name;
+        row.id = sample.id.empty() ? sample.name
+                                   : (sample.name.empty() ? sample.id : sample.id + " " + sample.name);
+        row.line = sample.line;
+        resampler.Resample(sample.values.data(), row.values.data());
+        table.rows.push_back(std::move(row));
+    }
+    return table;
+}
+
+SpectraTable ParseSpectra(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+    return ToStandardGrid(ReadSpectralText(text, source, axOptions));
+}
+
+SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+    return ToStandardGrid(detail::ReadCsvText(text, source, axOptions));
+}
+
+SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
+                               const SpectralReadOptions& axOptions) {
+    return ToStandardGrid(detail::ReadCgatsText(text, source, axOptions));
+}
+
+bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions, SpectraTable* pTable,
+                     std::string* pError) {
+    SpectralSet set;
+    if (!ReadSpectralFile(path, axOptions, &set, pError)) return false;
+    *pTable = ToStandardGrid(set);
+    return true;
+}
+
+}  // namespace nxbase
