@@ -2,6 +2,9 @@
 #include <gtest/gtest.h>
 
 #include <cstdio>
+#include <filesystem>
+
+#include <lcms2.h>
 #include <algorithm>
 #include <fstream>
 #include <sstream>
@@ -63,12 +66,21 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     // finds the data format (colour fields, no spectral ones).
     std::ostringstream cgats;
     nxcolor::Writers().at("cgats")(report, cgats);
-    EXPECT_NE(cgats.str().find("SAMPLE_ID XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
+    EXPECT_NE(cgats.str().find("SAMPLE_ID SAMPLE_NAME XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
               std::string::npos);
     const auto back = nxcolor::ParseSpectra(cgats.str(), "out.cgats");
     ASSERT_EQ(back.errors.size(), 1u);
     EXPECT_EQ(back.errors[0].rfind("out.cgats: spectral fields missing", 0), 0u) << back.errors[0];
     EXPECT_EQ(nxcolor::FormatNumber(-0.00001f, 2), "0.00");
+    // A spectrum that reached the report without the reader's checks and
+    // gives infinite XYZ is left out with its line.
+    nxcolor::SpectraTable wild = table;
+    wild.rows[1].values.fill(3e38f);
+    wild.rows[1].line = 7;
+    const nxcolor::Report checked = nxcolor::Evaluate(wild, "w.csv", condition, {"xyz", "xyy"}, 3);
+    EXPECT_EQ(checked.rows.size(), 23u);
+    ASSERT_EQ(checked.errors.size(), 1u);
+    EXPECT_EQ(checked.errors[0], "w.csv:7: X is inf; the spectrum is left out");
     EXPECT_EQ(nxcolor::FormatNumber(-1.5f, 1), "-1.5");
 }
 
@@ -120,6 +132,124 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);
     EXPECT_NE(out.find("\n1 dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"),
               std::string::npos) << out.substr(0, 200);
+}
+
+TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
+    nxtest::TempDir dir;
+    const std::string rows = dir.File("rows.csv");
+    std::ofstream(rows) << Header() << "\n1,huge," << Values(1e30f) << "\n2,black," << Values(0.0f) << "\n3,tiny,"
+                        << Values(0.5f, 35) << ",1e-45" << "\n4,ok," << Values(0.5f) << "\n";
+    std::string out;
+    std::string err;
+    EXPECT_EQ(RunNxcolor(rows + " --fraction --xyy -f csv", &out, &err), 1);
+    EXPECT_NE(err.find(rows + ":2: value"), std::string::npos) << err;
+    EXPECT_NE(err.find(rows + ":3: every value is zero"), std::string::npos) << err;
+    EXPECT_EQ(out.find("inf"), std::string::npos) << out;
+    EXPECT_EQ(out.find("nan"), std::string::npos) << out;
+    EXPECT_NE(out.find("\n4 ok,"), std::string::npos) << out;
+
+    // An installed illuminant of absurd power is normalised like any other:
+    // finite colours, no inf or nan.
+    const std::string data = dir.File("data");
+    std::filesystem::create_directories(data + "/illuminants");
+    {
+        std::ofstream table(data + "/illuminants/HOT.csv");
+        table << "wavelength,value\n";
+        for (int nm = 300; nm <= 830; nm += 5) table << nm << ",3e38\n";
+    }
+    EXPECT_EQ(RunNxcolor("NXBASE_DATA_DIR=" + data + " -f csv", &out, &err), 2) << "an option is not a file";
+    const std::string program = std::string("NXBASE_DATA_DIR=") + data + " " + NXCOLOR_PATH;
+    const std::string command = program + " -i HOT -f csv >" + dir.File("o") + " 2>" + dir.File("e");
+    const int status = std::system(command.c_str());
+    EXPECT_EQ(WEXITSTATUS(status), 0) << nxtest::ReadFile(dir.File("e"));
+    EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("inf"), std::string::npos);
+    EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("nan"), std::string::npos);
+    EXPECT_EQ(std::system((program + " --list-illuminants | grep -qx 'HOT (installed)'").c_str()), 0);
+    // The same table named by its path.
+    std::string byPath;
+    EXPECT_EQ(RunNxcolor("-i " + data + "/illuminants/HOT.csv -f csv", &byPath, &err), 0) << err;
+    EXPECT_EQ(byPath, nxtest::ReadFile(dir.File("o")));
+
+    // Binary and endless input end in a clear error, not in exhausted memory.
+    EXPECT_EQ(RunNxcolor("/dev/zero", &out, &err), 2);
+    EXPECT_NE(err.find("binary data"), std::string::npos) << err;
+    EXPECT_EQ(RunNxcolor("--icc-profile " + dir.File("missing.icc") + " --rgb", &out, &err), 2);
+    EXPECT_EQ(RunNxcolor("--icc-profile " + dir.File("missing.icc"), &out, &err), 2);
+    EXPECT_EQ(RunNxcolor("-i D42", &out, &err), 2);
+    EXPECT_EQ(err.find("D42"), err.rfind("D42")) << "the reason once: " << err;
+}
+
+TEST(NxcolorProgram, ReadsOtherGridsScalesAndNames) {
+    std::string out;
+    std::string err;
+    const std::string five = std::string(NXBASE_TEST_DATA_DIR) + "/spectra/colorchecker_5nm_percent.csv";
+    ASSERT_EQ(RunNxcolor(five + " -f csv -p 2 -i d50 -v", &out, &err), 0) << err;
+    EXPECT_NE(out.find("\n1 dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos) << out;
+    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent"), std::string::npos) << err;
+    std::string f2, fl2;
+    ASSERT_EQ(RunNxcolor("-i f2 -f csv", &f2, &err), 0) << err;
+    ASSERT_EQ(RunNxcolor("-i FL2 -f csv", &fl2, &err), 0) << err;
+    EXPECT_EQ(f2, fl2);
+    ASSERT_EQ(RunNxcolor("--version", &out, &err), 0);
+    EXPECT_EQ(out.rfind("nxcolor (NxBase) ", 0), 0u);
+}
+
+TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
+    nxtest::TempDir dir;
+    const std::string written = dir.File("chart.ti3");
+    std::string out;
+    std::string err;
+    ASSERT_EQ(RunNxcolor("-f cgats --keep-spectra -d 'Status T' -i D65 > " + written + "; cat " + written, &out,
+                         &err),
+              0)
+        << err;
+    EXPECT_NE(out.find("\nCREATED \""), std::string::npos);
+    EXPECT_NE(out.find("\nWEIGHTING_FUNCTION \"ILLUMINANT, D65\"\n"), std::string::npos);
+    EXPECT_NE(out.find("\nDENSITY_STANDARD \"Status T\"\n"), std::string::npos);
+    // LittleCMS reads it: ids and names apart, spectra to 6 decimals.
+    cmsHANDLE it8 = cmsIT8LoadFromFile(nullptr, written.c_str());
+    ASSERT_NE(it8, nullptr);
+    EXPECT_EQ(cmsIT8GetPropertyDbl(it8, "NUMBER_OF_SETS"), 24.0);
+    EXPECT_STREQ(cmsIT8GetData(it8, "1", "SAMPLE_NAME"), "dark skin");
+    EXPECT_EQ(cmsIT8GetDataDbl(it8, "1", "SPEC_380"), 0.055);
+    EXPECT_EQ(cmsIT8GetDataDbl(it8, "24", "SPEC_730"), 0.033);
+    cmsIT8Free(it8);
+    // And the library's reader gives the same spectra and ids back.
+    nxbase::SpectraTable back;
+    std::string error;
+    ASSERT_TRUE(nxbase::ReadSpectraFile(written, {}, &back, &error)) << error;
+    const auto chart = ParseSpectraCsv(nxcolor::EmbeddedChart(), "chart");
+    ASSERT_EQ(back.rows.size(), 24u);
+    for (std::size_t i = 0; i < 24; ++i) {
+        EXPECT_EQ(back.rows[i].id, chart.rows[i].id);
+        EXPECT_EQ(back.rows[i].values, chart.rows[i].values) << i;
+    }
+}
+
+TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
+    nxtest::TempDir dir;
+    const std::string reference = dir.File("ref.csv");
+    const std::string sample = dir.File("sample.csv");
+    std::ofstream(reference) << Header() << "\nA,paper," << Values(0.9f) << "\nB,grey," << Values(0.5f) << "\n";
+    // In another order, one sample darker, and one without a reference.
+    std::ofstream(sample) << Header() << "\nB,grey," << Values(0.45f) << "\nA,paper," << Values(0.9f) << "\nC,x,"
+                          << Values(0.2f) << "\n";
+    std::string out;
+    std::string err;
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " -f csv", &out, &err), 1);
+    EXPECT_NE(out.find("id,dL*,dC*,dH*,dE00\nB grey,-3."), std::string::npos) << out;
+    EXPECT_NE(out.find("\nA paper,0.00,0.00,0.00,0.00\n"), std::string::npos) << out;
+    EXPECT_NE(err.find("sample \"C x\" has no reference"), std::string::npos) << err;
+    EXPECT_NE(err.find("# 2 pairs: mean dE00 "), std::string::npos) << err;
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 1", &out, &err), 3);
+    EXPECT_NE(out.find("# worst: B grey ("), std::string::npos) << out;
+    EXPECT_NE(out.find("# 1 of 2 pairs above the tolerance 1.00"), std::string::npos) << out;
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 5 --de ab", &out, &err), 1);
+    // By order: A against B and B against A.
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --by-order --de cmc -f csv", &out, &err), 1);
+    EXPECT_NE(out.find("id,dL*,dC*,dH*,dE CMC(2:1)\nB grey,-"), std::string::npos) << out;
+    EXPECT_EQ(RunNxcolor("--compare " + reference, &out, &err), 2);
+    EXPECT_EQ(RunNxcolor("--compare --de 77 " + reference + " " + sample, &out, &err), 2);
 }
 
 }  // namespace

@@ -11,6 +11,7 @@ configure_file(nxcolor/embedded_chart.cpp.in ${CMAKE_CURRENT_BINARY_DIR}/generat
 
 # The reader and the report are a library of their own so that tests reach them.
 add_library(nxcolor_core STATIC
+    nxcolor/compare.cpp
     nxcolor/measure.cpp
     nxcolor/report.cpp
     nxcolor/screen.cpp

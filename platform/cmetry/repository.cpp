@@ -1,6 +1,8 @@
 #include "klume/cmetry/repository.h"
 
+#include <algorithm>
 #include <atomic>
+#include <filesystem>
 #include <cctype>
 #include <cstdlib>
 #include <map>
@@ -124,6 +126,9 @@ struct InstalledCache {
     std::mutex mutex;
     std::map<std::string, boost::shared_ptr<IIlluminant>> illuminants;
     std::map<std::string, boost::shared_ptr<IDensityStandard>> standards;
+    // Tables added from a path (AddFile), by the name they were given.
+    std::map<std::string, boost::shared_ptr<IIlluminant>> addedIlluminants;
+    std::map<std::string, boost::shared_ptr<IDensityStandard>> addedStandards;
 };
 
 InstalledCache& GetInstalled() {
@@ -184,6 +189,12 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
     const BuiltIns& b = GetBuiltIns();
     const auto builtIn = b.illuminants.find(name);
     if (builtIn != b.illuminants.end()) return Unowned(builtIn->second);
+    {
+        InstalledCache& cache = GetInstalled();
+        std::lock_guard<std::mutex> lock(cache.mutex);
+        const auto added = cache.addedIlluminants.find(name);
+        if (added != cache.addedIlluminants.end()) return Unowned(added->second);
+    }
     if (!IsSafeFileName(name)) {
         SetError(error, "unknown illuminant \"" + name + "\"");
         return {};
@@ -214,6 +225,36 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
     }
     cache.illuminants[path] = illuminant;
     return Unowned(illuminant);
+}
+
+bool IlluminantRepository::AddFile(const std::string& path, std::string* name, std::string* error) {
+    detail::CsvTable table;
+    if (!LoadTable(path, 2, table, error)) return false;
+    if (table.columns.size() != 2) return SetError(error, path + ": expected the columns wavelength,value");
+    const std::string stem = std::filesystem::path(path).stem().string();
+    std::string message;
+    boost::shared_ptr<IIlluminant> illuminant =
+        MakeIlluminant(stem, "Illuminant " + stem + " (" + path + ")", std::move(table.wavelengths),
+                       std::move(table.values[0]), &message);
+    if (!illuminant) return SetError(error, path + ": " + message);
+    InstalledCache& cache = GetInstalled();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    cache.addedIlluminants[stem] = illuminant;
+    *name = stem;
+    return true;
+}
+
+std::vector<std::string> IlluminantRepository::GetInstalledNames() {
+    std::vector<std::string> names;
+    const std::string dir = DataDirectory();
+    std::error_code ignored;
+    if (dir.empty() || !std::filesystem::is_directory(dir + "/illuminants", ignored)) return names;
+    for (const auto& entry : std::filesystem::directory_iterator(dir + "/illuminants", ignored)) {
+        const std::filesystem::path& file = entry.path();
+        if (file.extension() == ".csv" && IsSafeFileName(file.stem().string())) names.push_back(file.stem().string());
+    }
+    std::sort(names.begin(), names.end());
+    return names;
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
@@ -254,6 +295,12 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
     const BuiltIns& b = GetBuiltIns();
     const auto builtIn = b.standards.find(name);
     if (builtIn != b.standards.end()) return Unowned(builtIn->second);
+    {
+        InstalledCache& cache = GetInstalled();
+        std::lock_guard<std::mutex> lock(cache.mutex);
+        const auto added = cache.addedStandards.find(name);
+        if (added != cache.addedStandards.end()) return Unowned(added->second);
+    }
     if (!IsSafeFileName(name)) {
         SetError(error, "unknown density standard \"" + name + "\"");
         return {};
@@ -281,6 +328,26 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
     }
     cache.standards[path] = standard;
     return Unowned(standard);
+}
+
+bool DensityStandardRepository::AddFile(const std::string& path, std::string* name, std::string* error) {
+    detail::CsvTable table;
+    if (!LoadTable(path, 2, table, error)) return false;
+    std::string stem = std::filesystem::path(path).stem().string();
+    const std::string suffix = "_log10";
+    if (stem.size() > suffix.size() && stem.compare(stem.size() - suffix.size(), suffix.size(), suffix) == 0) {
+        stem.resize(stem.size() - suffix.size());
+    }
+    std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
+    std::string message;
+    boost::shared_ptr<IDensityStandard> standard =
+        detail::MakeDensityStandard(stem, channels, table.wavelengths, table.values, message);
+    if (!standard) return SetError(error, path + ": " + message);
+    InstalledCache& cache = GetInstalled();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    cache.addedStandards[stem] = standard;
+    *name = stem;
+    return true;
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::string& name) {

@@ -62,7 +62,13 @@ std::string LocateError(const std::string& source, const std::string& message) {
 // LittleCMS reports parse errors through a per-context handler.
 void CollectError(cmsContext context, cmsUInt32Number, const char* text) {
     auto* errors = static_cast<std::vector<std::string>*>(cmsGetContextUserData(context));
-    if (errors && text) errors->emplace_back(text);
+    if (!errors || !text) return;
+    std::string message(text);
+    // Messages come with line ends of their own.
+    while (!message.empty() && (message.back() == '\n' || message.back() == '\r' || message.back() == ' ')) {
+        message.pop_back();
+    }
+    errors->push_back(std::move(message));
 }
 
 class Cgats {

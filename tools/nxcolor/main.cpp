@@ -1,6 +1,7 @@
 // nxcolor: colour values of reflectance spectra (XYZ, Lab, LCh, xyY, DIN99,
 // densities) under a chosen illuminant, observer and density standard, from a
 // CSV or CGATS file or the built-in ColorChecker chart.
+#include <cctype>
 #include <charconv>
 #include <cstdio>
 #include <iostream>
@@ -11,6 +12,8 @@
 #include "klume/cmetry/repository.h"
 #include "nxbase/colorvector.h"
 #include "nxbase/progress.h"
+#include "nxbase/version.h"
+#include "compare.h"
 #include "measure.h"
 #include "report.h"
 #include "screen.h"
@@ -22,6 +25,7 @@ namespace {
 constexpr int kExitOk = 0;
 constexpr int kExitRowsRejected = 1;  // some rows bad, the others printed
 constexpr int kExitUsage = 2;         // bad options, unreadable or unusable input
+constexpr int kExitOverTolerance = 3;  // --compare: a pair above --tolerance
 
 constexpr int kMaxPrecision = 9;
 // Inputs from this many spectra on get a progress bar (on a terminal).
@@ -29,31 +33,44 @@ constexpr std::size_t kProgressMinRows = 20000;
 
 const char kUsage[] =
     "Usage: nxcolor [options] [FILE]\n"
+    "       nxcolor --compare [options] REFERENCE SAMPLE\n"
     "Prints the colour values of reflectance spectra: XYZ, CIELAB and LCh, and\n"
-    "optionally xyY, DIN99 and densities, under one illuminant and observer.\n"
+    "optionally xyY, DIN99 and densities, under one illuminant and observer;\n"
+    "or compares samples with their references (--compare).\n"
     "\n"
-    "FILE is CSV: optional id columns, then 36 reflectance factors (0..1) for\n"
-    "380..730 nm in 10 nm steps, one spectrum per line; a header line is\n"
-    "optional and, when present, must name exactly those wavelengths (r380,\n"
-    "380, nm380, SPEC_380, ...). A CGATS file (BEGIN_DATA_FORMAT with\n"
-    "SPECTRAL_NM380..SPECTRAL_NM730 fields, SAMPLE_ID, SAMPLE_NAME) is read too.\n"
+    "FILE is CSV or CGATS, one spectrum per line or set, on any wavelength grid:\n"
+    "  CSV: optional id columns (id, then name), then the values; a header names\n"
+    "    the wavelengths (r380, 380, nm380, SPEC_380, 380nm, ...). Without a\n"
+    "    header the last 36 fields are 380..730 nm in 10 nm steps.\n"
+    "  CGATS (CGATS.17, ArgyllCMS .ti3/.sp, X-Rite, LittleCMS): SAMPLE_ID,\n"
+    "    SAMPLE_NAME and spectral fields SPEC_nnn, nmnnn, SPECTRAL_NM_nnn, ...\n"
+    "Spectra on another grid are brought onto 380..730 nm / 10 nm: the 10 nm\n"
+    "points when the file has them, else Sprague interpolation (equal steps) or\n"
+    "linear (uneven steps), the end values held outside the measured range.\n"
+    "Values are percentages when the file says so (SPECTRAL_NORM, ArgyllCMS\n"
+    "CTI3) or when one exceeds 1.5, else reflectance factors (0..1).\n"
     "\"-\" reads standard input. Without FILE the built-in ColorChecker chart\n"
     "(BabelColor average, 24 patches) is used.\n"
     "\n"
     "Options:\n"
-    "  -i, --illuminant NAME   A, C, D50 (default), D55, D65, D75, E, FL1..FL12,\n"
-    "                          or one installed in $NXBASE_DATA_DIR/illuminants\n"
+    "  -i, --illuminant NAME   A, C, D50 (default), D55, D65, D75, E, FL1..FL12\n"
+    "                          (F1..F12, any case), one installed in\n"
+    "                          $NXBASE_DATA_DIR/illuminants, or a CSV file\n"
+    "                          (wavelength,value) given by its path\n"
     "  -o, --observer 2|10     CIE 1931 2 degree (default) or CIE 1964 10 degree\n"
     "      --xyy               also print chromaticity x, y\n"
     "      --din99             also print DIN99 L99, a99, b99 (DIN 6176)\n"
     "  -d, --density NAME      also print densities D_RED, D_GREEN, D_BLUE of an\n"
     "                          ISO 5-3 standard: \"Status A\", \"Status E\",\n"
-    "                          \"Status M\", \"Status T\", or one installed in\n"
-    "                          $NXBASE_DATA_DIR/density\n"
+    "                          \"Status M\", \"Status T\", one installed in\n"
+    "                          $NXBASE_DATA_DIR/density, or a table by its path\n"
     "  -f, --format table|csv|cgats\n"
     "                          output layout (default table)\n"
-    "  -p, --precision N       decimals, 0..9 (default 4)\n"
+    "      --keep-spectra      with -f cgats: also write the spectra, so that the\n"
+    "                          output is a measurement file (ArgyllCMS SPEC_nnn)\n"
+    "  -p, --precision N       decimals, 0..9 (default 4; 2 with --compare)\n"
     "      --percent           the values are percentages (0..100)\n"
+    "      --fraction          the values are reflectance factors (0..1)\n"
     "      --rgb               also print the screen colour: sRGB R, G, B (0..255)\n"
     "                          and hex, through the ICC display profile when one\n"
     "                          is configured (user configuration nxcolor.ini,\n"
@@ -64,17 +81,38 @@ const char kUsage[] =
     "      --measure N         measure N patches through the measuring-device\n"
     "                          server LumaServer (started from the registry when\n"
     "                          needed, locked for the run) instead of reading FILE\n"
-    "      --list-illuminants  print the built-in illuminant names and exit\n"
+    "      --list-illuminants  print the built-in and installed illuminants and exit\n"
+    "  -v, --verbose           say on standard error how the input was read\n"
+    "      --version           print the version and exit\n"
     "  -h, --help              print this text and exit\n"
     "\n"
+    "Comparing (sample against standard):\n"
+    "      --compare           read REFERENCE and SAMPLE; print per sample dL*, dC*,\n"
+    "                          dH* (sample minus reference) and a colour difference,\n"
+    "                          then mean, max, 95th percentile and the worst samples\n"
+    "      --de 2000|94|94t|cmc|cmc11|ab\n"
+    "                          the colour difference: CIEDE2000 (default), CIE94\n"
+    "                          graphic arts or textiles, CMC(2:1) or (1:1), CIE76\n"
+    "      --by-order          pair the n-th sample with the n-th reference\n"
+    "                          (default: by SAMPLE_ID, or the id column)\n"
+    "      --tolerance X       exit status 3 when a pair's difference exceeds X\n"
+    "\n"
     "Numbers use \".\" as decimal separator in input and output, whatever the\n"
-    "locale. A bad line (short row, text where a number belongs) is reported on\n"
-    "standard error with its file and line; the other spectra are still printed.\n"
+    "locale. A bad line (short row, text where a number belongs, a spectrum that\n"
+    "is no reflectance or gives no finite colour) is reported on standard error\n"
+    "with its file and line; the other spectra are still printed.\n"
     "Exit status: 0 all spectra done, 1 some lines rejected, 2 usage error or\n"
-    "unusable input (unreadable file, wavelength grid other than 380..730 nm).\n";
+    "unusable input, 3 a comparison above its tolerance.\n";
 
 struct Options {
     std::string file;
+    std::string secondFile;  // --compare: the samples
+    bool compare = false;
+    nxcolor::CompareOptions compareOptions;
+    bool precisionGiven = false;
+    bool keepSpectra = false;
+    bool verbose = false;
+    bool version = false;
     std::string illuminant = "D50";
     std::string observer = "2";
     std::string format = "table";
@@ -119,8 +157,13 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             return true;
         };
         if (filesOnly || arg == "-" || arg.empty() || arg[0] != '-') {
-            if (!options->file.empty()) return "more than one input file";
-            options->file = arg;
+            if (options->file.empty()) {
+                options->file = arg;
+            } else if (options->secondFile.empty()) {
+                options->secondFile = arg;
+            } else {
+                return "more than two input files";
+            }
         } else if (arg == "--") {
             filesOnly = true;
         } else if (arg == "-h" || arg == "--help") {
@@ -142,6 +185,7 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
                 return "precision must be 0..9, not \"" + text + "\"";
             }
             options->precision = n;
+            options->precisionGiven = true;
         } else if (arg == "--percent" && !hasValue) {
             options->read.scale = nxbase::SpectralScale::kPercent;
         } else if (arg == "--fraction" && !hasValue) {
@@ -167,6 +211,28 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
                 return "--measure needs a number of patches from 1 to 100000, not \"" + text + "\"";
             }
             options->measure = n;
+        } else if (arg == "--compare" && !hasValue) {
+            options->compare = true;
+        } else if (arg == "--by-order" && !hasValue) {
+            options->compareOptions.byOrder = true;
+        } else if (arg == "--de") {
+            std::string text;
+            if (!take(&text) || !nxbase::ParseDeltaEMethod(text.c_str(), &options->compareOptions.method)) {
+                return "--de needs 2000, 94, 94t, cmc, cmc11 or ab";
+            }
+        } else if (arg == "--tolerance") {
+            std::string text;
+            double x = -1.0;
+            if (!take(&text) || !nxbase::detail::ParseNumber(text, &x) || x < 0.0) {
+                return "--tolerance needs a colour difference of 0 or more, not \"" + text + "\"";
+            }
+            options->compareOptions.tolerance = x;
+        } else if (arg == "--keep-spectra" && !hasValue) {
+            options->keepSpectra = true;
+        } else if ((arg == "-v" || arg == "--verbose") && !hasValue) {
+            options->verbose = true;
+        } else if (arg == "--version" && !hasValue) {
+            options->version = true;
         } else if (arg == "--list-illuminants" && !hasValue) {
             options->listIlluminants = true;
         } else {
@@ -176,41 +242,155 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
     return "";
 }
 
-}  // namespace
+// The canonical name of an illuminant given in any case, or as F1..F12 for
+// FL1..FL12; names of installed illuminants are taken as given.
+std::string CanonicalIlluminant(const std::string& name) {
+    std::string upper;
+    for (char c : name) upper += static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    if (upper.size() >= 2 && upper[0] == 'F' && std::isdigit(static_cast<unsigned char>(upper[1]))) {
+        upper.insert(1, "L");
+    }
+    for (const std::string& builtIn : klume::cmetry::IlluminantRepository::GetNames()) {
+        if (builtIn == upper) return builtIn;
+    }
+    return name;
+}
 
-int main(int argc, char** argv) {
-    Options options;
-    const std::string problem = ParseOptions(argc, argv, &options);
-    if (!problem.empty()) return UsageError(problem);
+bool LooksLikePath(const std::string& name) {
+    return name.find('/') != std::string::npos ||
+           (name.size() > 4 && name.compare(name.size() - 4, 4, ".csv") == 0);
+}
+
+// Resolves -i: a built-in or installed name, or a table by path. "" or the
+// reason it cannot be used.
+std::string ResolveIlluminant(Options* options) {
+    if (LooksLikePath(options->illuminant)) {
+        std::string name;
+        std::string error;
+        if (!klume::cmetry::IlluminantRepository::AddFile(options->illuminant, &name, &error)) return error;
+        options->illuminant = name;
+        return "";
+    }
+    options->illuminant = CanonicalIlluminant(options->illuminant);
+    std::string why;
+    if (!klume::cmetry::IlluminantRepository::Find(options->illuminant, &why)) {
+        return (why.empty() ? "unknown illuminant \"" + options->illuminant + "\"" : why) +
+               "; see --list-illuminants";
+    }
+    return "";
+}
+
+std::string ResolveDensity(Options* options) {
+    if (options->density.empty()) return "";
+    if (LooksLikePath(options->density)) {
+        std::string name;
+        std::string error;
+        if (!klume::cmetry::DensityStandardRepository::AddFile(options->density, &name, &error)) return error;
+        options->density = name;
+        return "";
+    }
+    std::string why;
+    if (!klume::cmetry::DensityStandardRepository::Find(options->density, &why)) {
+        return why.empty() ? "unknown density standard \"" + options->density + "\"" : why;
+    }
+    return "";
+}
+
+// Reads one input; false (after saying why) when it gives nothing usable.
+bool ReadInput(const std::string& file, const Options& options, nxcolor::SpectraTable* table, std::string* source) {
+    std::string error;
+    if (file.empty()) {
+        *source = nxcolor::EmbeddedChartName();
+        *table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), *source, options.read);
+    } else {
+        *source = file == "-" ? "<stdin>" : file;
+        if (!nxcolor::ReadSpectraFile(file, options.read, table, &error)) {
+            std::cerr << "nxcolor: " << error << '\n';
+            return false;
+        }
+    }
+    for (const std::string& message : table->errors) std::cerr << "nxcolor: " << message << '\n';
+    if (options.verbose) {
+        for (const std::string& note : table->notes) std::cerr << "nxcolor: " << note << '\n';
+        if (!table->sourceWavelengths.empty()) {
+            std::cerr << "nxcolor: " << *source << ": " << table->rows.size() << " spectra, "
+                      << table->sourceWavelengths.size() << " wavelengths " << table->sourceWavelengths.front()
+                      << ".." << table->sourceWavelengths.back() << " nm, " << table->resampling << ", "
+                      << (table->percent ? "percent" : "reflectance factors") << '\n';
+        }
+    }
+    if (table->unusable) return false;
+    if (table->rows.empty()) {
+        std::cerr << "nxcolor: " << *source << ": no spectra\n";
+        return false;
+    }
+    return true;
+}
+
+int RunCompare(Options& options, const MeasuringCondition& condition) {
+    if (options.file.empty() || options.secondFile.empty()) {
+        return UsageError("--compare needs a REFERENCE and a SAMPLE file");
+    }
+    nxcolor::SpectraTable reference, sample;
+    std::string referenceName, sampleName;
+    if (!ReadInput(options.file, options, &reference, &referenceName)) return kExitUsage;
+    if (!ReadInput(options.secondFile, options, &sample, &sampleName)) return kExitUsage;
+    options.compareOptions.precision = options.precisionGiven ? options.precision : 2;
+    options.compareOptions.csv = options.format == "csv";
+    if (options.format != "table" && options.format != "csv") return UsageError("--compare writes table or csv");
+    const nxcolor::Comparison comparison = nxcolor::Compare(reference, sample, condition, options.compareOptions);
+    for (const std::string& problem : comparison.problems) std::cerr << "nxcolor: " << problem << '\n';
+    const std::string header = sampleName + " against " + referenceName + ": illuminant " + options.illuminant +
+                               ", observer " + options.observer + "\xC2\xB0, " +
+                               nxbase::DeltaEMethodName(options.compareOptions.method);
+    nxcolor::WriteComparison(comparison, options.compareOptions, header, std::cout);
+    for (const std::string& line : nxcolor::SummaryLines(comparison, options.compareOptions)) {
+        (options.compareOptions.csv ? std::cerr : std::cout) << "# " << line << '\n';
+    }
+    std::cout.flush();
+    if (!std::cout) {
+        std::cerr << "nxcolor: cannot write the output\n";
+        return kExitUsage;
+    }
+    if (comparison.overTolerance > 0) return kExitOverTolerance;
+    const bool rejected = !reference.errors.empty() || !sample.errors.empty() || !comparison.problems.empty();
+    return rejected ? kExitRowsRejected : kExitOk;
+}
+
+int Run(Options& options) {
     if (options.help) {
         std::cout << kUsage;
         return kExitOk;
     }
+    if (options.version) {
+        std::cout << "nxcolor (NxBase) " << nxbase::Version() << '\n';
+        return kExitOk;
+    }
     if (options.listIlluminants) {
-        for (const std::string& name : klume::cmetry::IlluminantRepository::GetNames()) {
-            std::cout << name << '\n';
+        for (const std::string& name : klume::cmetry::IlluminantRepository::GetNames()) std::cout << name << '\n';
+        for (const std::string& name : klume::cmetry::IlluminantRepository::GetInstalledNames()) {
+            std::cout << name << " (installed)\n";
         }
         return kExitOk;
     }
-
-    std::string why;
-    if (!klume::cmetry::IlluminantRepository::Find(options.illuminant, &why)) {
-        return UsageError("unknown illuminant \"" + options.illuminant + "\"" +
-                          (why.empty() ? "" : " (" + why + ")") +
-                          "; see --list-illuminants");
-    }
+    const std::string illuminantProblem = ResolveIlluminant(&options);
+    if (!illuminantProblem.empty()) return UsageError(illuminantProblem);
     const ObserverClass observer{String(options.observer)};
     if (observer.GetObserverType() == OBSERVER_UNKNOWN) {
         return UsageError("unknown observer \"" + options.observer + "\"; use 2 or 10");
     }
-    if (!options.density.empty() &&
-        !klume::cmetry::DensityStandardRepository::Exists(options.density)) {
-        return UsageError("unknown or uninstalled density standard \"" + options.density + "\"");
-    }
+    const std::string densityProblem = ResolveDensity(&options);
+    if (!densityProblem.empty()) return UsageError(densityProblem);
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
         return UsageError("unknown format \"" + options.format + "\"; use table, csv or cgats");
     }
+    if (options.keepSpectra && options.format != "cgats") return UsageError("--keep-spectra needs -f cgats");
+    const MeasuringCondition condition(
+        IllumClass(options.illuminant), observer,
+        options.density.empty() ? DStdClass() : DStdClass(options.density), PhysicalConditions());
+    if (options.compare) return RunCompare(options, condition);
+    if (!options.secondFile.empty()) return UsageError("more than one input file (--compare takes two)");
 
     nxcolor::SpectraTable table;
     std::string source;
@@ -223,30 +403,14 @@ int main(int argc, char** argv) {
         if (!nxcolor::MeasureThroughServer(options.measure, &table, &error, &measuring)) {
             std::cerr << "nxcolor: " << error << '\n';
             if (table.rows.empty()) return kExitUsage;
-            table.errors.push_back(source + ": measuring stopped after " +
-                                   std::to_string(table.rows.size()) + " patches");
+            table.errors.push_back(source + ": measuring stopped after " + std::to_string(table.rows.size()) +
+                                   " patches");
+            std::cerr << "nxcolor: " << table.errors.back() << '\n';
         }
-    } else if (options.file.empty()) {
-        source = nxcolor::EmbeddedChartName();
-        table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), source, options.read);
-    } else {
-        source = options.file == "-" ? "<stdin>" : options.file;
-        std::string error;
-        if (!nxcolor::ReadSpectraFile(options.file, options.read, &table, &error)) {
-            std::cerr << "nxcolor: " << error << '\n';
-            return kExitUsage;
-        }
-    }
-    for (const std::string& error : table.errors) std::cerr << "nxcolor: " << error << '\n';
-    if (table.unusable) return kExitUsage;
-    if (table.rows.empty()) {
-        std::cerr << "nxcolor: " << source << ": no spectra\n";
+    } else if (!ReadInput(options.file, options, &table, &source)) {
         return kExitUsage;
     }
 
-    const MeasuringCondition condition(
-        IllumClass(options.illuminant), observer,
-        options.density.empty() ? DStdClass() : DStdClass(options.density), PhysicalConditions());
     std::vector<std::string> quantities = {"xyz", "lab", "lch"};
     if (options.xyy) quantities.push_back("xyy");
     if (options.din99) quantities.push_back("din99");
@@ -254,7 +418,12 @@ int main(int argc, char** argv) {
     if (options.rgb) quantities.push_back("rgb");
     if (options.rgb || !options.svgReport.empty()) {
         const std::string warning = nxcolor::SetUpScreenColors(options.iccProfile);
+        // A profile asked for on the command line that cannot be used is an
+        // error; one from the configuration falls back to the formulas.
+        if (!warning.empty() && !options.iccProfile.empty()) return UsageError(warning);
         if (!warning.empty()) std::cerr << "nxcolor: " << warning << '\n';
+    } else if (!options.iccProfile.empty()) {
+        return UsageError("--icc-profile needs --rgb or --report");
     }
     // A bar on stderr for large inputs, drawn only when stderr is a terminal.
     std::unique_ptr<nxbase::TerminalProgressListener> bar;
@@ -262,9 +431,12 @@ int main(int argc, char** argv) {
         bar = std::make_unique<nxbase::TerminalProgressListener>("nxcolor");
         bar->SetTotal(table.rows.size(), "spectra");
     }
-    const nxcolor::Report report =
+    nxcolor::Report report =
         nxcolor::Evaluate(table, source, condition, quantities, options.precision, bar.get());
     bar.reset();
+    report.keepSpectra = options.keepSpectra;
+    report.originator = std::string("nxcolor ") + nxbase::Version();
+    for (const std::string& error : report.errors) std::cerr << "nxcolor: " << error << '\n';
     if (!options.svgReport.empty()) {
         std::string error;
         if (!nxcolor::WriteSvgReport(report, condition, options.svgReport, &error)) {
@@ -279,5 +451,19 @@ int main(int argc, char** argv) {
         std::cerr << "nxcolor: cannot write the output\n";
         return kExitUsage;
     }
-    return table.errors.empty() ? kExitOk : kExitRowsRejected;
+    return table.errors.empty() && report.errors.empty() ? kExitOk : kExitRowsRejected;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    Options options;
+    const std::string problem = ParseOptions(argc, argv, &options);
+    if (!problem.empty()) return UsageError(problem);
+    try {
+        return Run(options);
+    } catch (const std::bad_alloc&) {
+        std::cerr << "nxcolor: out of memory; split the input into smaller files\n";
+        return kExitUsage;
+    }
 }

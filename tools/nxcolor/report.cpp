@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <charconv>
 #include <cmath>
+#include <ctime>
 
 namespace nxcolor {
 namespace {
@@ -121,20 +122,53 @@ std::string CgatsString(const std::string& text) {
     return out + "\"";
 }
 
+std::string NowIso8601() {
+    const std::time_t now = std::time(nullptr);
+    std::tm utc{};
+    gmtime_r(&now, &utc);
+    char text[32];
+    std::strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%SZ", &utc);
+    return text;
+}
+
+bool HasDensities(const Report& report) {
+    return std::any_of(report.columns.begin(), report.columns.end(),
+                       [](const Column& c) { return c.name == "D_RED"; });
+}
+
+// CGATS.17 as measurement software writes it: SAMPLE_ID and SAMPLE_NAME,
+// the weighting function, and with keepSpectra the spectra in ArgyllCMS's
+// SPEC_nnn fields with their grid declared, so that the file reads back as
+// a measurement file.
 void WriteCgats(const Report& report, std::ostream& out) {
+    constexpr int kSpectrumDecimals = 6;
+    const bool densities = HasDensities(report);
     out << "CGATS.17\n"
-        << "ORIGINATOR \"nxcolor\"\n"
+        << "ORIGINATOR " << CgatsString(report.originator) << "\n"
+        << "CREATED " << CgatsString(report.created.empty() ? NowIso8601() : report.created) << "\n"
         << "DESCRIPTOR " << CgatsString(report.source) << "\n"
-        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
-        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer) << "\n"
-        << "NUMBER_OF_FIELDS " << report.columns.size() + 1 << "\n"
-        << "BEGIN_DATA_FORMAT\nSAMPLE_ID";
+        << "WEIGHTING_FUNCTION " << CgatsString("ILLUMINANT, " + report.illuminant) << "\n"
+        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer + " degree") << "\n"
+        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n";
+    if (densities) out << "KEYWORD \"DENSITY_STANDARD\"\nDENSITY_STANDARD " << CgatsString(report.densityStandard) << "\n";
+    if (report.keepSpectra) {
+        out << "SPECTRAL_BANDS \"" << kSpectrumSize << "\"\n"
+            << "SPECTRAL_START_NM \"" << kFirstWavelength << "\"\n"
+            << "SPECTRAL_END_NM \"" << kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1) << "\"\n"
+            << "SPECTRAL_NORM \"1.0\"\n";
+    }
+    out << "NUMBER_OF_FIELDS " << report.columns.size() + 2 + (report.keepSpectra ? kSpectrumSize : 0) << "\n"
+        << "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
     for (const Column& c : report.columns) out << ' ' << c.cgats;
+    if (report.keepSpectra) {
+        for (int k = 0; k < kSpectrumSize; ++k) out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
+    }
     out << "\nEND_DATA_FORMAT\n"
         << "NUMBER_OF_SETS " << report.rows.size() << "\n"
         << "BEGIN_DATA\n";
     for (const ReportRow& row : report.rows) {
-        out << CgatsString(row.id);
+        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId) << ' '
+            << CgatsString(row.sampleName);
         for (std::size_t i = 0; i < row.values.size(); ++i) {
             const Column& column = report.columns[i];
             // Text cells (the screen colour's hex code) are quoted strings.
@@ -144,6 +178,9 @@ void WriteCgats(const Report& report, std::ostream& out) {
                 out << ' ' << CgatsString(FormatCell(row.values[i], column));
             }
         }
+        if (report.keepSpectra) {
+            for (const float v : row.spectrum) out << ' ' << FormatNumber(v, kSpectrumDecimals);
+        }
         out << '\n';
     }
     out << "END_DATA\n";
@@ -152,9 +189,7 @@ void WriteCgats(const Report& report, std::ostream& out) {
 void WriteTable(const Report& report, std::ostream& out) {
     out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
         << report.illuminant << ", observer " << report.observer << "\xC2\xB0";
-    const bool densities = std::any_of(report.columns.begin(), report.columns.end(),
-                                       [](const Column& c) { return c.name == "D_RED"; });
-    if (densities) out << ", density " << report.densityStandard;
+    if (HasDensities(report)) out << ", density " << report.densityStandard;
     out << '\n';
     std::size_t idWidth = 2;
     for (const ReportRow& row : report.rows) idWidth = std::max(idWidth, row.id.size());
@@ -221,12 +256,23 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
             progress->DisplayProgress(static_cast<double>(report.rows.size()) / table.rows.size());
         ReportRow row;
         row.id = in.id;
+        row.sampleId = in.sampleId;
+        row.sampleName = in.sampleName;
         row.spectrum = in.values;
         const ReflectanceSpectrum spectrum(in.values.data(), PhysicalConditions());
+        std::string bad;
         for (const Quantity* q : chosen) {
             float values[8] = {};
             q->compute(spectrum, condition, values);
+            for (std::size_t c = 0; c < q->columns.size() && bad.empty() && q->key != "density"; ++c) {
+                if (!std::isfinite(values[c])) bad = q->columns[c].name + " is " + FormatNumber(values[c], 0);
+            }
             row.values.insert(row.values.end(), values, values + q->columns.size());
+        }
+        if (!bad.empty()) {
+            report.errors.push_back(source + ":" + (in.line > 0 ? std::to_string(in.line) : "?") + ": " + bad +
+                                    "; the spectrum is left out");
+            continue;
         }
         report.rows.push_back(std::move(row));
     }

@@ -42,7 +42,9 @@ struct Quantity {
 const std::vector<Quantity>& Quantities();
 
 struct ReportRow {
-    std::string id;
+    std::string id;          // id and name joined
+    std::string sampleId;    // as the input gave them (CGATS SAMPLE_ID, SAMPLE_NAME)
+    std::string sampleName;
     std::array<float, kSpectrumSize> spectrum{};
     std::vector<float> values;  // one per column of the report
 };
@@ -54,10 +56,20 @@ struct Report {
     std::string densityStandard;  // "Status T" (used by the density columns)
     std::vector<Column> columns;
     std::vector<ReportRow> rows;
+    // Rows left out because a value came out infinite or not a number,
+    // "<source>:<line>: <what>".
+    std::vector<std::string> errors;
+    // CGATS: also write the spectra (SPEC_380..SPEC_730), making the output a
+    // measurement file other software reads back.
+    bool keepSpectra = false;
+    std::string created;     // ISO 8601 time of the run; empty: now
+    std::string originator = "nxcolor";
 };
 
 // Computes `quantities` (keys of Quantities(), in that order) for every row,
-// reporting the share of rows done to `progress` when given.
+// reporting the share of rows done to `progress` when given. A row whose
+// values are not all finite (densities aside, which are NaN where nothing is
+// reflected) is left out and named in the report's errors.
 Report Evaluate(const SpectraTable& table, const std::string& source,
                 const MeasuringCondition& condition, const std::vector<std::string>& quantities,
                 int precision, ProgressListener* progress = nullptr);

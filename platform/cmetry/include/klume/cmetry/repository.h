@@ -48,6 +48,12 @@ public:
     static bool Exists(const std::string& name);
     // Names of the built-in illuminants.
     static std::vector<std::string> GetNames();
+    // Names of the illuminants installed in the data directory, sorted.
+    static std::vector<std::string> GetInstalledNames();
+    // Reads an illuminant table (the installed files' format) from `path` and
+    // makes it available for the life of the process under the file's stem,
+    // returned in *name. False with the reason in *error.
+    static bool AddFile(const std::string& path, std::string* name, std::string* error);
 };
 
 class NXBASE_EXPORT ObserverRepository {
@@ -78,6 +84,9 @@ public:
                                                     std::string* error = nullptr);
     // Names of the built-in standards.
     static std::vector<std::string> GetNames();
+    // As IlluminantRepository::AddFile for a density table; a "_log10" ending
+    // of the stem is dropped from the name.
+    static bool AddFile(const std::string& path, std::string* name, std::string* error);
 };
 
 }  // namespace cmetry
