@@ -5,6 +5,8 @@ install(TARGETS nxbase EXPORT NxBaseTargets
     ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR}
     RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
 install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+# Shipped texts, found relative to the installed library (LibraryDataDirectory).
+install(DIRECTORY data/lng DESTINATION ${CMAKE_INSTALL_DATADIR}/nxbase)
 install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 if(EXISTS ${PROJECT_SOURCE_DIR}/platform/cmetry/include/klume)
     install(DIRECTORY platform/cmetry/include/klume DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})

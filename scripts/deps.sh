@@ -8,7 +8,7 @@ packages=(
     libboost-dev libboost-regex-dev
     libsimpleini-dev libsqlite3-dev liblcms2-dev libpng-dev
     libsdbus-c++-dev dbus-daemon dbus-bin procps
-    libgtest-dev libgmock-dev libbenchmark-dev
+    libgtest-dev libgmock-dev libbenchmark-dev help2man
 )
 
 missing=()

@@ -117,6 +117,20 @@ TEST_F(TextTest, Utf8MarkerBeforeTheFirstGroupConvertsToWindows1252) {
     ASSERT_TRUE(Text::LoadText(String(late)));
     EXPECT_EQ(Text::GetText("G", 0).str(), "\xC3\xA4") << "a marker after a group is ignored";
 
+    // The library's own texts need no AppDir.
+    Text::FreeResources();
+    ASSERT_TRUE(Text::LoadLibraryTexts(49));
+    EXPECT_EQ(Text::GetText("FarbTexte", 0).str(), "Schwarz");
+    Text::FreeResources();
+    ASSERT_TRUE(Text::LoadLibraryTexts(77)) << "falls back to English";
+    EXPECT_EQ(Text::GetText("FarbTexte", 0).str(), "black");
+
+    // A second line for a known group opens nothing: a marker below it counts.
+    Text::FreeResources();
+    std::string reopened = Write("reopened.lng", "{G}\n[x]\n{G}\nEncoding=UTF-8\n{H}\n[\xC3\xA4]\n");
+    ASSERT_TRUE(Text::LoadText(String(reopened)));
+    EXPECT_EQ(Text::GetText("H", 0).str(), "\xE4");
+
     Text::FreeResources();
     std::string ansi = Write("ansi.lng", "{G}\n[Gr\xFC\xDF" "e]\n");
     ASSERT_TRUE(Text::LoadText(String(ansi)));

@@ -32,6 +32,12 @@ namespace nxbase {
 // reason on failure, leaving no temporary file behind.
 NXBASE_EXPORT void WriteWholeFile(const std::string& path, std::string_view content);
 
+// The directory of the data files shipped with the library (the texts in
+// "lng/"): <prefix>/share/nxbase beside the installed library, found from
+// where the library is loaded, so that any install prefix works; in a build
+// tree, the sources' data directory. "" when neither exists.
+NXBASE_EXPORT std::string LibraryDataDirectory();
+
 }  // namespace nxbase
 
 #endif  // NXBASE_FILES_H_

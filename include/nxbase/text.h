@@ -27,6 +27,11 @@ class NXBASE_EXPORT Text {
     // kFallbackLanguage is loaded instead. True when either file was read.
     static bool LoadText(const String& asBase, int alLanguage);
 
+    // Loads the library's own texts (colour names, group "FarbTexte"),
+    // NxBase<language>.lng from nxbase::LibraryDataDirectory()/lng, falling
+    // back to kFallbackLanguage; needs no AppDir. True when a file was read.
+    static bool LoadLibraryTexts(int alLanguage);
+
     // Parses the named file into the table. Groups already present keep
     // their texts (the first definition wins), so call FreeResources()
     // before loading another language. False when the file cannot be read.

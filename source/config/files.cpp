@@ -1,5 +1,8 @@
 #include "nxbase/files.h"
 
+#include <dlfcn.h>
+#include <filesystem>
+
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -124,6 +127,18 @@ void WriteWholeFile(const std::string& path, std::string_view content) {
         ::unlink(name.data());
         Fail(path, "write failed", error);
     }
+}
+
+std::string LibraryDataDirectory() {
+    std::error_code ignored;
+    Dl_info info{};
+    if (dladdr(reinterpret_cast<void*>(&LibraryDataDirectory), &info) != 0 && info.dli_fname != nullptr) {
+        const std::filesystem::path library = std::filesystem::weakly_canonical(info.dli_fname, ignored);
+        const std::filesystem::path installed = library.parent_path() / NXBASE_LIBDIR_TO_DATADIR;
+        if (std::filesystem::is_directory(installed, ignored)) return installed.lexically_normal().string();
+    }
+    if (std::filesystem::is_directory(NXBASE_SOURCE_DATA_DIR, ignored)) return NXBASE_SOURCE_DATA_DIR;
+    return "";
 }
 
 }  // namespace nxbase

@@ -1,6 +1,8 @@
 // Text files and text groups: the process-wide text table, its parser and
 // the two error reporters.
 #include "nxbase/text.h"
+
+#include "nxbase/files.h"
 #include "toolkit/string.h"
 
 #include <boost/regex.hpp>
@@ -116,7 +118,6 @@ void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
     // The texts of the current group once it holds one.
     std::vector<std::string>* currentTexts = nullptr;
     LineMatch match;
-    bool groupOpened = false;
     bool utf8 = false;
     std::string capture;
 
@@ -132,7 +133,9 @@ void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
             if (!line.empty() && line.back() == '\r') line.remove_suffix(1);
         }
 
-        if (!groupOpened && !utf8 && HasEncodingMarker(line)) utf8 = true;
+        // The marker counts wherever no group is open: before the first
+        // group line, and after a group line that reopened nothing.
+        if (currentGroup.empty() && !utf8 && HasEncodingMarker(line)) utf8 = true;
         if (logLines) Log(" Read line: " + std::string(line), kLineLogKey);
 
         // Each expression needs its opening bracket: lines without one are
@@ -143,7 +146,6 @@ void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
             currentTexts = nullptr;
             if (table.find(capture) == table.end()) {
                 currentGroup = capture;
-                if (!currentGroup.empty()) groupOpened = true;
             }
         } else if (line.find('[') != std::string_view::npos &&
                    MatchLine(line, TextExpression(), match, capture)) {
@@ -187,6 +189,14 @@ std::string LoadErrorMessage(int language, const std::string& fileName, int code
 }
 
 }  // namespace nxbase::detail
+
+bool Text::LoadLibraryTexts(int alLanguage) {
+    const std::string directory = nxbase::LibraryDataDirectory();
+    if (directory.empty()) return false;
+    const std::string prefix = directory + "/lng/NxBase";
+    return LoadText(String(prefix + std::to_string(alLanguage) + kLngExtension)) ||
+           LoadText(String(prefix + std::to_string(kFallbackLanguage) + kLngExtension));
+}
 
 bool Text::LoadText(const String& asBase, int alLanguage) {
     Store().language = alLanguage;

@@ -36,5 +36,11 @@ if [ -x "$work/prefix/bin/nxreg" ]; then
     env -u LD_LIBRARY_PATH NXBASE_LOG_PATH="$work" "$work/prefix/bin/nxcolor" --list-illuminants \
         | grep -q D65
     env -u LD_LIBRARY_PATH NXBASE_LOG_PATH="$work" "$work/prefix/bin/lumaserver" --version > /dev/null
+    # A manual page per program, when help2man made them.
+    if command -v help2man > /dev/null; then
+        for tool in nxcolor nxreg nxmsg lumaserver; do
+            test -s "$work/prefix/share/man/man1/$tool.1" || { echo "no manual page for $tool"; exit 1; }
+        done
+    fi
 fi
 echo "installed package works with find_package and pkg-config"

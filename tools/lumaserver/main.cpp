@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "nxbase/version.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
@@ -212,7 +213,7 @@ int main(int argc, char** argv) {
             std::cout << kUsage;
             return kExitOk;
         } else if (argument == "--version") {
-            std::cout << "lumaserver " << kVersion << "\n";
+            std::cout << "lumaserver " << kVersion << " (NxBase " << nxbase::Version() << ")\n";
             return kExitOk;
         } else if (argument == "--register") {
             try {

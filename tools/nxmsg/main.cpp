@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+#include "nxbase/version.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "toolkit/application.h"
@@ -210,7 +211,7 @@ int main(int argc, char** argv) {
                 std::cout << kUsage;
                 return kExitOk;
             } else if (a == "--version") {
-                std::cout << "nxmsg 0.1\n";
+                std::cout << "nxmsg (NxBase) " << nxbase::Version() << "\n";
                 return kExitOk;
             } else if (a == "--as") {
                 self = value();

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nxbase/files.h"
+#include "nxbase/version.h"
 #include "nxbase/registry.h"
 
 namespace {
@@ -38,6 +39,7 @@ constexpr const char* kHelp =
     "  log-options ROOT            the log options below ROOT\\Log in the user's hive\n"
     "  files                       the database file of each hive\n"
     "  --help                      this text\n"
+    "  --version                   the version\n"
     "\n"
     "Hive files: HKEY_CURRENT_USER is $NXBASE_USER_REGISTRY, else\n"
     "$XDG_CONFIG_HOME/K-Lume/registry.sqlite; HKEY_LOCAL_MACHINE is\n"
@@ -253,6 +255,10 @@ int CheckedOutput(int alResult) {
 int Run(const std::string& command, const std::vector<std::string>& arguments) {
     if (command == "--help" || command == "-h" || command == "help") {
         std::cout << kHelp;
+        return kOk;
+    }
+    if (command == "--version") {
+        std::cout << "nxreg (NxBase) " << nxbase::Version() << "\n";
         return kOk;
     }
     if (command == "list") return List(arguments);
