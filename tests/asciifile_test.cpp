@@ -160,6 +160,14 @@ TEST_F(ASCIIFileTest, AFailedReaderLeavesTheWholeLineAndSkippingFindsTitles) {
     EXPECT_FALSE(file.GetKeyString(name));
     EXPECT_TRUE(file.AtEnd());
 
+    // "^=" is an escape inside the key, not its end: the key "a^=b" holds a
+    // caret and "=", and the value starts after the plain "=".
+    std::stringstream caret("a^=b=5\n");
+    ASCIIFileImpl keys(&caret, true);
+    EXPECT_FALSE(keys.GetInt("a^", count));
+    ASSERT_TRUE(keys.GetInt("a^=b", count));
+    EXPECT_EQ(count, 5);
+
     // Skipping to a title, and multiline values.
     std::stringstream sections(
         "junk\n[A]\nx\n[B]\nNote=one\nNote=two^Jhalf\nNote=\nOther=1\n[C]\n");
@@ -361,7 +369,7 @@ TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
     for (int i = 0; i < 100; ++i) content += "Value=" + std::to_string(1000 + i) + "\n";
     auto file = ASCIIFile::Get(String(Write("values.dat", content)), true);
     float last = file->GetPercentDone();
-    EXPECT_GE(last, 0.0f);
+    EXPECT_FLOAT_EQ(last, 1.0f / static_cast<float>(content.size())) << "the first line read counts one byte";
     int value = 0;
     while (file->GetInt("Value", value)) {
         float now = file->GetPercentDone();
@@ -403,14 +411,16 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
     }
     EXPECT_FALSE(std::filesystem::exists(sub));
 
-    // The previous file stays whole until the new one is complete, and no
-    // temporary file is left beside it.
+    // Opened, the file exists (empty); after each flush it holds exactly
+    // the lines written so far, and no temporary file is left beside it.
     std::string keep = Write("keep.dat", "Value=1\n");
     {
         ASCIIFileImpl file(String(keep), false);
+        EXPECT_EQ(nxtest::ReadFile(keep), "");
         file.PutInt("Value", 2);
         file.CheckOutError();
-        EXPECT_EQ(nxtest::ReadFile(keep), "Value=1\n");
+        EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\n");
+        file.PutInt("Other", 3);
     }
     std::vector<std::string> left;
     for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
@@ -419,7 +429,22 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
         }
     }
     EXPECT_EQ(left, std::vector<std::string>{"keep.dat"});
-    EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\n");
+    EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\nOther=3\n");
+
+    // A writable file in a directory that takes no new files.
+    std::string closed = dir.File("closed");
+    std::filesystem::create_directory(closed);
+    nxtest::WriteFile(closed + "/data.dat", "old\n");
+    std::filesystem::permissions(closed, std::filesystem::perms::owner_read | std::filesystem::perms::owner_exec);
+    {
+        ASCIIFileImpl file(String(closed + "/data.dat"), false);
+        file.PutInt("Value", 4);
+        file.CheckOutError();
+        EXPECT_FALSE(file.GetError());
+        EXPECT_EQ(nxtest::ReadFile(closed + "/data.dat"), "Value=4\n");
+    }
+    std::filesystem::permissions(closed, std::filesystem::perms::owner_all);
+    EXPECT_EQ(nxtest::ReadFile(closed + "/data.dat"), "Value=4\n");
 }
 
 TEST_F(ASCIIFileTest, ASCIIFile2ReadsButRefusesEveryWrite) {

@@ -163,9 +163,9 @@ ASCIIFileImpl::ASCIIFileImpl(const String& asFileName, bool axForReading, bool a
         amTotalSize = static_cast<std::uint32_t>(std::min<std::uint64_t>(size, 0xFFFFFFFEu));
         amLineFeed = pOwned->HasLineFeed();
         pInput = pOwned->Stream();
+        // Reading the first line counts one byte, as every scanned line does.
         amConsumed = 0;
         ScanLine();
-        amConsumed = 0;
     } else {
         pOwned = nxbase::detail::DataFileStream::OpenForWriting(path);
         pOutput = pOwned->Stream();
@@ -179,7 +179,6 @@ ASCIIFileImpl::ASCIIFileImpl(std::iostream* pStream, bool axForReading, bool axT
     if (axForReading) {
         pInput = pStream;
         ScanLine();
-        amConsumed = 0;
     } else {
         pOutput = pStream;
         amAtEnd = true;
@@ -191,7 +190,7 @@ ASCIIFileImpl::~ASCIIFileImpl() {
     if (!amOwnsStream || !pOwned) return;
     if (pOutput != nullptr) CheckOutError();
     if (!pOwned->Close(!amError) || amError) {
-        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; file not replaced",
+        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; the file keeps what was flushed before",
                             "");
     }
 }

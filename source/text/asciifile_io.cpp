@@ -1,5 +1,7 @@
 #include "asciifile_io.h"
 
+#include "nxbase/files.h"
+
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -57,11 +59,6 @@ std::string ResolvedTarget(const std::string& path) {
         if (::realpath(path.c_str(), resolved) != nullptr) return resolved;
     }
     return path;
-}
-
-std::string TemporaryNameFor(const std::string& target) {
-    static std::atomic<unsigned> counter{0};
-    return target + ".~" + std::to_string(::getpid()) + "-" + std::to_string(++counter);
 }
 
 }  // namespace
@@ -177,27 +174,39 @@ std::unique_ptr<DataFileStream> DataFileStream::OpenForWriting(const std::string
     file->target_ = ResolvedTarget(path);
 
     struct stat info {};
-    bool exists = ::stat(file->target_.c_str(), &info) == 0;
-    int fd;
-    if (exists && !S_ISREG(info.st_mode)) {
-        fd = OpenRetrying(file->target_.c_str(), O_WRONLY | O_TRUNC);
-    } else {
-        file->temporary_ = TemporaryNameFor(file->target_);
-        fd = OpenRetrying(file->temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL, 0666);
-        if (fd < 0) {
-            file->temporary_.clear();
-        } else if (exists) {
-            ::fchmod(fd, info.st_mode & 07777);  // keep the replaced file's permissions
-        }
+    if (::stat(file->target_.c_str(), &info) == 0 && !S_ISREG(info.st_mode)) {
+        const int fd = OpenRetrying(file->target_.c_str(), O_WRONLY | O_TRUNC);
+        file->buffer_ = std::make_unique<DescriptorBuffer>(fd, true);
+        file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
+        if (fd < 0) file->stream_->setstate(std::ios::badbit);
+        return file;
     }
-    file->buffer_ = std::make_unique<DescriptorBuffer>(fd, true);
-    file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
-    if (fd < 0) file->stream_->setstate(std::ios::badbit);
+    file->memory_ = std::make_unique<std::stringstream>(std::ios::out | std::ios::binary);
+    file->stream_ = std::make_unique<std::iostream>(file->memory_->rdbuf());
+    // The file exists from the open on, as callers expect of a file opened
+    // for writing.
+    if (!file->Publish()) file->stream_->setstate(std::ios::badbit);
     return file;
+}
+
+bool DataFileStream::Publish() {
+    stream_->flush();
+    if (stream_->fail()) return false;
+    const std::string content = memory_->str();
+    if (everPublished_ && content.size() == published_) return true;
+    try {
+        nxbase::WriteWholeFile(target_, content);
+    } catch (const std::exception&) {
+        return false;
+    }
+    published_ = content.size();
+    everPublished_ = true;
+    return true;
 }
 
 bool DataFileStream::Flush() {
     if (!writing_ || closed_) return true;
+    if (memory_) return Publish();
     stream_->flush();
     if (stream_->fail() || buffer_->failed() || buffer_->fd() < 0) return false;
     struct stat info {};
@@ -211,14 +220,16 @@ bool DataFileStream::Close(bool commit) {
         buffer_->CloseDescriptor();
         return true;
     }
+    if (memory_) {
+        if (!commit) return true;
+        closed_ = false;
+        const bool ok = Publish();
+        closed_ = true;
+        return ok;
+    }
     stream_->flush();
-    bool ok = commit && !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0;
-    if (ok && !temporary_.empty()) ok = ::fdatasync(buffer_->fd()) == 0;
-    ok = buffer_->CloseDescriptor() && ok;
-    if (temporary_.empty()) return ok || !commit;
-    if (ok) ok = ::rename(temporary_.c_str(), target_.c_str()) == 0;
-    if (!ok) ::unlink(temporary_.c_str());
-    return ok || !commit;
+    const bool ok = commit && !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0;
+    return (buffer_->CloseDescriptor() && ok) || !commit;
 }
 
 }  // namespace nxbase::detail

@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <iosfwd>
 #include <memory>
+#include <sstream>
 #include <string>
 
 namespace nxbase::detail {
@@ -14,9 +15,11 @@ class DescriptorBuffer;
 
 // One data file opened by name, for reading or for writing.
 //
-// Writing goes to a temporary file beside the target ("<name>.~<pid>-<n>")
-// that Close(true) renames over the target once every byte has reached the
-// disk, so that a failed write never leaves a half-written file behind. An
+// Writing a regular file collects the text in memory and publishes it at
+// every Flush and at Close(true) with nxbase::WriteWholeFile: the file exists
+// from the open on, and whenever a caller can look it holds exactly what was
+// written up to the last flush, never a part of a line. A directory that
+// does not take new files is fine when the file itself is writable. An
 // existing target that is not a regular file (a device such as /dev/full, a
 // pipe) is written directly. A symbolic link is followed to its target.
 class DataFileStream {
@@ -42,9 +45,9 @@ public:
     // being written has lost its last name (its directory was removed), so
     // that the data can never be found again.
     bool Flush();
-    // Ends the file. A writer commits (renames its temporary file over the
-    // target) when `commit` and every write succeeded, and otherwise removes
-    // the temporary file. Returns false when a commit was asked for and failed.
+    // Ends the file. A writer publishes what is left when `commit` and every
+    // write succeeded; otherwise the file keeps what the last flush gave it.
+    // Returns false when a commit was asked for and failed.
     bool Close(bool commit);
 
 private:
@@ -56,8 +59,12 @@ private:
     bool lineFeed_ = false;
     bool writing_ = false;
     bool closed_ = false;
+    bool Publish();
+
     std::string target_;
-    std::string temporary_;  // empty when writing directly
+    std::unique_ptr<std::stringstream> memory_;  // null when writing directly
+    std::size_t published_ = 0;                  // bytes of memory_ in the file
+    bool everPublished_ = false;
 };
 
 }  // namespace nxbase::detail
