@@ -40,9 +40,9 @@ double HueDegrees(double b, double a) {
 // T(h) = 1 - 0.17 cos(h - 30°) + 0.24 cos 2h + 0.32 cos(3h + 6°) - 0.20 cos(4h - 63°),
 // from one sine and cosine of h by the multiple-angle formulas.
 double HueWeighting(double axCos, double axSin) {
-    static const double kCos30 = std::cos(30.0 * kDegree), kSin30 = 0.5;
-    static const double kCos6 = std::cos(6.0 * kDegree), kSin6 = std::sin(6.0 * kDegree);
-    static const double kCos63 = std::cos(63.0 * kDegree), kSin63 = std::sin(63.0 * kDegree);
+    constexpr double kCos30 = 0.86602540378443865, kSin30 = 0.5;
+    constexpr double kCos6 = 0.99452189536827333, kSin6 = 0.10452846326765347;
+    constexpr double kCos63 = 0.45399049973954675, kSin63 = 0.89100652418836786;
     const double c = axCos, s = axSin;
     const double cos2 = c * c - s * s, sin2 = 2.0 * s * c;
     const double cos3 = c * (4.0 * c * c - 3.0), sin3 = s * (3.0 - 4.0 * s * s);
@@ -98,7 +98,12 @@ double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double a
     return std::sqrt(tl * tl + tc * tc + HueDifferenceSquared(axReference, axSample, dC) / (sh * sh));
 }
 
-DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& axSample,
+namespace {
+
+// CIEDE2000 through hue angles, step by step as Sharma, Wu and Dalal write
+// it; used where the vector form below has no direction to work with (a
+// neutral colour, or hues exactly opposite).
+DeltaE2000Parts DeltaE2000ByAngles(const LabValue& axReference, const LabValue& axSample,
                                    const DeltaE2000Weights& axWeights) {
     const LabValue& p1 = axReference;
     const LabValue& p2 = axSample;
@@ -150,6 +155,76 @@ DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& 
     const double th = parts.dH / (axWeights.kH * sh);
     const double sum = tl * tl + tc * tc + th * th + rt * tc * th;
     parts.dE = std::sqrt(sum > 0.0 ? sum : 0.0);
+    return parts;
+}
+
+// The weighting and the total from ΔL', ΔC', ΔH' and the mean L', C', hue.
+// `rotation` is the rotation term's -sin(2 Δθ) (without RC).
+double Ciede2000Total(const DeltaE2000Parts& parts, double lMean, double cpMean, double cosHue, double sinHue,
+                      double rotation, const DeltaE2000Weights& axWeights) {
+    const double l50 = (lMean - 50.0) * (lMean - 50.0);
+    const double sl = 1.0 + 0.015 * l50 / std::sqrt(20.0 + l50);
+    const double sc = 1.0 + 0.045 * cpMean;
+    const double sh = 1.0 + 0.015 * cpMean * HueWeighting(cosHue, sinHue);
+    const double cpMean7 = Pow7(cpMean);
+    const double rc = 2.0 * std::sqrt(cpMean7 / (cpMean7 + k25Pow7));
+    const double rt = rotation * rc;
+    const double tl = parts.dL / (axWeights.kL * sl);
+    const double tc = parts.dC / (axWeights.kC * sc);
+    const double th = parts.dH / (axWeights.kH * sh);
+    const double sum = tl * tl + tc * tc + th * th + rt * tc * th;
+    return std::sqrt(sum > 0.0 ? sum : 0.0);
+}
+
+}  // namespace
+
+// The same formula with the hues handled as unit vectors instead of angles:
+// ΔH' = 2 sqrt(C1 C2) sin(Δh/2) is sign(u1 x u2) sqrt(2 (C1 C2 - a1 a2 - b1 b2)),
+// and the mean hue is the direction of u1 + u2 (the bisector of the smaller
+// arc, which is what the angle rules of the formula pick). One atan2 instead
+// of two, and no sine of the hue difference or cosines of the mean hue.
+DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& axSample,
+                                   const DeltaE2000Weights& axWeights) {
+    const LabValue& p1 = axReference;
+    const LabValue& p2 = axSample;
+    const double cMean = 0.5 * (Chroma(p1) + Chroma(p2));
+    const double cMean7 = Pow7(cMean);
+    const double stretch = 1.5 - 0.5 * std::sqrt(cMean7 / (cMean7 + k25Pow7));  // 1 + G
+    const double a1 = stretch * p1.a;
+    const double a2 = stretch * p2.a;
+    const double c1 = std::sqrt(a1 * a1 + p1.b * p1.b);
+    const double c2 = std::sqrt(a2 * a2 + p2.b * p2.b);
+    const double c12 = c1 * c2;
+    const double dot = a1 * a2 + p1.b * p2.b;
+    const double cross = a1 * p2.b - a2 * p1.b;
+    // The bisector u1 + u2, scaled by C1 C2 to avoid two divisions.
+    const double bx = a1 * c2 + a2 * c1;
+    const double by = p1.b * c2 + p2.b * c1;
+    const double bisector = std::sqrt(bx * bx + by * by);
+    if (c12 == 0.0 || cross == 0.0 || !(bisector > 1e-12 * c12)) {
+        return DeltaE2000ByAngles(axReference, axSample, axWeights);
+    }
+    DeltaE2000Parts parts;
+    parts.dL = p2.L - p1.L;
+    parts.dC = c2 - c1;
+    const double chord = 2.0 * (c12 - dot);
+    parts.dH = std::copysign(std::sqrt(chord > 0.0 ? chord : 0.0), cross);
+    const double inverse = 1.0 / bisector;
+    const double cosHue = bx * inverse;
+    const double sinHue = by * inverse;
+    // The rotation term lives around the blue hue 275°: for a mean hue below
+    // 125° it is below 1e-15 and not worth an atan2, exp and sin.
+    constexpr double kCos125 = -0.57357643635104609;
+    double rotation = 0.0;
+    if (!(sinHue >= 0.0 && cosHue > kCos125)) {
+        // The hue's distance from 275°, from the vector rotated by -275°.
+        constexpr double kCos275 = 0.087155742747658166, kSin275 = -0.99619469809174553;
+        constexpr double kRadiansTo25Degrees = 180.0 / kPi / 25.0;
+        const double x =
+            std::atan2(sinHue * kCos275 - cosHue * kSin275, cosHue * kCos275 + sinHue * kSin275) * kRadiansTo25Degrees;
+        rotation = -std::sin(2.0 * 30.0 * std::exp(-x * x) * kDegree);
+    }
+    parts.dE = Ciede2000Total(parts, 0.5 * (p1.L + p2.L), 0.5 * (c1 + c2), cosHue, sinHue, rotation, axWeights);
     return parts;
 }
 
