@@ -244,6 +244,16 @@ bool IlluminantRepository::AddFile(const std::string& path, std::string* name, s
     return true;
 }
 
+std::string IlluminantRepository::CanonicalName(const std::string& name) {
+    std::string upper;
+    for (char c : name) upper += static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    if (upper.size() >= 2 && upper[0] == 'F' && std::isdigit(static_cast<unsigned char>(upper[1]))) {
+        upper.insert(1, "L");
+    }
+    const BuiltIns& b = GetBuiltIns();
+    return b.illuminants.count(upper) != 0 ? upper : name;
+}
+
 std::vector<std::string> IlluminantRepository::GetInstalledNames() {
     std::vector<std::string> names;
     const std::string dir = DataDirectory();

@@ -242,20 +242,6 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
     return "";
 }
 
-// The canonical name of an illuminant given in any case, or as F1..F12 for
-// FL1..FL12; names of installed illuminants are taken as given.
-std::string CanonicalIlluminant(const std::string& name) {
-    std::string upper;
-    for (char c : name) upper += static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
-    if (upper.size() >= 2 && upper[0] == 'F' && std::isdigit(static_cast<unsigned char>(upper[1]))) {
-        upper.insert(1, "L");
-    }
-    for (const std::string& builtIn : klume::cmetry::IlluminantRepository::GetNames()) {
-        if (builtIn == upper) return builtIn;
-    }
-    return name;
-}
-
 bool LooksLikePath(const std::string& name) {
     return name.find('/') != std::string::npos ||
            (name.size() > 4 && name.compare(name.size() - 4, 4, ".csv") == 0);
@@ -271,7 +257,7 @@ std::string ResolveIlluminant(Options* options) {
         options->illuminant = name;
         return "";
     }
-    options->illuminant = CanonicalIlluminant(options->illuminant);
+    options->illuminant = klume::cmetry::IlluminantRepository::CanonicalName(options->illuminant);
     std::string why;
     if (!klume::cmetry::IlluminantRepository::Find(options->illuminant, &why)) {
         return (why.empty() ? "unknown illuminant \"" + options->illuminant + "\"" : why) +

@@ -48,6 +48,9 @@ public:
     static bool Exists(const std::string& name);
     // Names of the built-in illuminants.
     static std::vector<std::string> GetNames();
+    // The built-in name meant by `name` in any letter case, with F1..F12 for
+    // FL1..FL12 ("d65" -> "D65", "f2" -> "FL2"); other names unchanged.
+    static std::string CanonicalName(const std::string& name);
     // Names of the illuminants installed in the data directory, sorted.
     static std::vector<std::string> GetInstalledNames();
     // Reads an illuminant table (the installed files' format) from `path` and
