@@ -9,6 +9,7 @@ packages=(
     libsimpleini-dev libsqlite3-dev liblcms2-dev libpng-dev
     libsdbus-c++-dev dbus-daemon dbus-bin procps
     libgtest-dev libgmock-dev libbenchmark-dev help2man
+    python3-dev pybind11-dev python3-numpy python3-pytest
 )
 
 missing=()

@@ -7,6 +7,6 @@ preset="${1:-default}"
 scripts/deps.sh
 # Tests and tools on explicitly: scripts/demo.sh configures the same build
 # directory without them.
-cmake --preset "$preset" -DNXBASE_BUILD_TESTS=ON -DNXBASE_BUILD_TOOLS=ON -DNXBASE_BUILD_FUZZ=ON -DNXBASE_BUILD_BENCH=ON
+cmake --preset "$preset" -DNXBASE_BUILD_TESTS=ON -DNXBASE_BUILD_TOOLS=ON -DNXBASE_BUILD_FUZZ=ON -DNXBASE_BUILD_BENCH=ON -DNXBASE_BUILD_PYTHON=ON
 cmake --build --preset "$preset" -j "$(nproc)"
 ctest --preset "$preset"

@@ -11,6 +11,8 @@
 #ifndef NXBASE_COLORVECTOR_H_
 #define NXBASE_COLORVECTOR_H_
 
+#include <cstddef>
+
 #include "nxbase/cmetry.h"
 #include "nxbase/export.h"
 #include "toolkit/string.h"
@@ -217,5 +219,11 @@ public:
     dLCHmgVector(float axdL, float axdC, float axdH, const MeasuringCondition& axCondition);
     dLCHmgVector(const LABVector& axA, const LABVector& axB);
 };
+
+namespace nxbase {
+// DIN99 (DIN 6176) L99, a99, b99 of alCount CIE 1976 L, a, b triples, by the
+// transform LABVector applies; pLab and pDin99 may be the same array.
+NXBASE_EXPORT void LabToDin99(const float* pLab, float* pDin99, std::size_t alCount);
+}  // namespace nxbase
 
 #endif  // NXBASE_COLORVECTOR_H_

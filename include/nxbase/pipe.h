@@ -107,6 +107,9 @@ class NXBASE_EXPORT Pipe {
     void SetApplications(const PostOfficeApplications* pApplications);
     // The country code given to started applications.
     void SetCountryCode(int alCode);
+    // Asked while Send waits for a started application to open its socket;
+    // false gives the wait up (empty: wait the full time).
+    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) { fmStartWaitCheck = std::move(fKeepWaiting); }
     // Whether pipes created from now on listen on their request socket
     // (default yes); a process that is to be reached by DDE only says no.
     static void SetSocketListening(bool abListen);
@@ -133,6 +136,7 @@ class NXBASE_EXPORT Pipe {
     void Accept();
     ChannelPtr OpenChannel(const std::string& asApp);
     ChannelPtr OpenOrStart(const std::string& asApp);
+    std::function<bool()> fmStartWaitCheck;
     void AddChannel(const ChannelPtr& axChannel);
     void ArmRead(const ChannelPtr& axChannel);
     void OnReadable(const ChannelPtr& axChannel);

@@ -513,3 +513,15 @@ dLCHmgVector::dLCHmgVector(const LABVector& axA, const LABVector& axB)
     MgToLabMg(mg, labB);
     dLCHVector::Decompose(labA, labB, amV);
 }
+
+namespace nxbase {
+
+void LabToDin99(const float* pLab, float* pDin99, std::size_t alCount) {
+    for (std::size_t i = 0; i < alCount; ++i) {
+        float v[3] = {pLab[3 * i], pLab[3 * i + 1], pLab[3 * i + 2]};
+        Din99Forward(v);
+        for (int c = 0; c < 3; ++c) pDin99[3 * i + c] = v[c];
+    }
+}
+
+}  // namespace nxbase

@@ -683,6 +683,7 @@ Pipe::ChannelPtr Pipe::OpenOrStart(const std::string& asApp) {
                 until - std::chrono::steady_clock::now()));
         }
         if (ChannelPtr channel = OpenChannel(asApp)) return channel;
+        if (fmStartWaitCheck && !fmStartWaitCheck()) return nullptr;
         // A peer reached by DDE only shows up on the bus instead.
         if (pmDDE && pmDDE->IsActive() && pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str())) {
             return nullptr;

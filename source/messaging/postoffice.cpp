@@ -367,12 +367,32 @@ bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
     return pipe != nullptr && pipe->Send(asApp, asCommand, axEncoded);
 }
 
+namespace {
+// The caller's keep-trying function asked while the pipe waits for a peer
+// it started, for the duration of one Send.
+class StartWaitCheck {
+public:
+    explicit StartWaitCheck(const boost::function<bool()>& check) : pPipe(Pipe::Instance()) {
+        if (pPipe && check) pPipe->SetStartWaitCheck([check] { return check(); });
+    }
+    ~StartWaitCheck() {
+        if (pPipe) pPipe->SetStartWaitCheck({});
+    }
+    StartWaitCheck(const StartWaitCheck&) = delete;
+    StartWaitCheck& operator=(const StartWaitCheck&) = delete;
+
+private:
+    Pipe* pPipe;
+};
+}  // namespace
+
 unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
                                boost::function<bool()> fKeepTrying) {
     std::string command = asCommand.str();
     if (asCommand.IsNumeric()) command = nxbase::CommandTextOfNumber(std::atoi(command.c_str()));
     MyMemoryBlock encoded = axData;
     Encode(encoded);
+    const StartWaitCheck startWait(fKeepTrying);
     for (int retries = 0;;) {
         if (TryOnce(asApp, command, encoded)) {
             NX_COMM_LOG(String("Sent: ") + String(command));
@@ -419,7 +439,9 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     amLostPeers.erase(asApp);
     String command = Number(alMessage);
     bool answered = false;
-    if (!Send(asApp, command, axSend)) {
+    // The caller's wish to stop waiting also ends the sending, which may
+    // wait for a peer that was just started.
+    if (!Send(asApp, command, axSend, fKeepWaiting)) {
         NX_COMM_LOG("SendAndReceive, Send failed");
     } else {
         std::optional<AutoLog> waiting;

@@ -43,4 +43,13 @@ if [ -x "$work/prefix/bin/nxreg" ]; then
         done
     fi
 fi
+
+# The Python module, when built, imports from the prefix and finds the
+# installed library by its run path.
+module=$(find "$work/prefix" -name 'nxbase.cpython-*.so' | head -n 1)
+if [ -n "$module" ] && [[ "$cxx_flags" != *sanitize* ]]; then
+    test -f "$(dirname "$module")/nxbase.pyi"
+    env -u LD_LIBRARY_PATH PYTHONPATH="$(dirname "$module")" NXBASE_LOG_PATH="$work" /usr/bin/python3 -c \
+        "import nxbase; assert nxbase.spectra_to_Lab([0.5] * 36).shape == (3,); print('python', nxbase.__version__)"
+fi
 echo "installed package works with find_package and pkg-config"

@@ -1,0 +1,299 @@
+// Colour functions over NumPy arrays, on the library's batch path.
+#include <cmath>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <tuple>
+#include <vector>
+
+#include "common.h"
+#include "klume/cmetry/repository.h"
+#include "nxbase/colorbatch.h"
+#include "nxbase/colorconverter.h"
+#include "nxbase/colordiff.h"
+#include "nxbase/colorvector.h"
+#include "nxbase/meascond.h"
+#include "nxbase/resample.h"
+#include "nxbase/spectrafile.h"
+
+namespace nxpy {
+namespace {
+
+constexpr py::ssize_t kBands = 36;
+// From this many spectra on the work is split over the cores.
+constexpr std::size_t kParallelFrom = 1 << 16;
+
+using FloatArray = py::array_t<float, py::array::c_style | py::array::forcecast>;
+using DoubleArray = py::array_t<double, py::array::c_style | py::array::forcecast>;
+
+std::string ShapeText(const py::array& array) {
+    std::string text = "(";
+    for (py::ssize_t i = 0; i < array.ndim(); ++i) {
+        text += (i ? ", " : "") + std::to_string(array.shape(i));
+    }
+    return text + (array.ndim() == 1 ? ",)" : ")");
+}
+
+// The argument as a C-contiguous float32 array whose last axis has `size`
+// entries (copied only when it is not one already).
+FloatArray AsFloatRows(const py::handle& object, py::ssize_t size, const char* what) {
+    py::array any = py::array::ensure(object);
+    if (!any) throw py::value_error(std::string(what) + " must be an array of numbers");
+    if (any.dtype().kind() != 'f' && any.dtype().kind() != 'i' && any.dtype().kind() != 'u') {
+        throw py::value_error(std::string(what) + " must hold numbers, not dtype " +
+                              py::str(any.dtype()).cast<std::string>());
+    }
+    if (any.ndim() == 0 || any.shape(any.ndim() - 1) != size) {
+        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) + "), got " +
+                              ShapeText(any));
+    }
+    return FloatArray::ensure(any);
+}
+
+DoubleArray AsDoubleRows(const py::handle& object, py::ssize_t size, const char* what) {
+    py::array any = py::array::ensure(object);
+    if (!any || any.ndim() == 0 || any.shape(any.ndim() - 1) != size) {
+        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) + "), got " +
+                              (any ? ShapeText(any) : std::string("no array")));
+    }
+    return DoubleArray::ensure(any);
+}
+
+// The shape of the result: the input's leading axes and `last`.
+std::vector<py::ssize_t> ResultShape(const py::array& input, py::ssize_t last) {
+    std::vector<py::ssize_t> shape(input.shape(), input.shape() + input.ndim() - 1);
+    shape.push_back(last);
+    return shape;
+}
+
+std::string ObserverName(const py::object& observer) {
+    const std::string name = py::str(observer).cast<std::string>();
+    if (name != "2" && name != "10") throw py::value_error("unknown observer \"" + name + "\"; use 2 or 10");
+    return name;
+}
+
+std::string IlluminantName(const std::string& given) {
+    const std::string name = klume::cmetry::IlluminantRepository::CanonicalName(given);
+    std::string why;
+    if (!klume::cmetry::IlluminantRepository::Find(name, &why)) {
+        throw py::value_error(why.empty() ? "unknown illuminant \"" + given + "\"" : why);
+    }
+    return name;
+}
+
+MeasuringCondition Condition(const std::string& illuminant, const py::object& observer,
+                             const std::string& density = "") {
+    const ObserverClass observerClass{String(ObserverName(observer))};
+    return MeasuringCondition(IllumClass(IlluminantName(illuminant)), observerClass,
+                              density.empty() ? DStdClass() : DStdClass(density), PhysicalConditions());
+}
+
+// Batches are kept per illuminant and observer: making one costs about as
+// much as a few hundred spectra.
+std::shared_ptr<const nxbase::ColorBatch> BatchFor(const std::string& illuminant, const py::object& observer) {
+    static std::mutex mutex;
+    static std::map<std::pair<std::string, std::string>, std::shared_ptr<const nxbase::ColorBatch>> batches;
+    const std::string name = IlluminantName(illuminant);
+    const std::string observerName = ObserverName(observer);
+    std::lock_guard<std::mutex> lock(mutex);
+    auto& batch = batches[{name, observerName}];
+    if (!batch) batch = std::make_shared<const nxbase::ColorBatch>(Condition(name, observer));
+    return batch;
+}
+
+enum class Quantity { kXYZ, kLab };
+
+py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
+                             const py::object& observer) {
+    const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
+    const auto batch = BatchFor(illuminant, observer);
+    py::array_t<float> result(ResultShape(input, 3));
+    const std::size_t count = static_cast<std::size_t>(input.size() / kBands);
+    const float* in = input.data();
+    float* out = result.mutable_data();
+    {
+        py::gil_scoped_release unlocked;
+        const bool parallel = count >= kParallelFrom;
+        if (quantity == Quantity::kXYZ) {
+            parallel ? batch->ToXYZParallel(in, count, out) : batch->ToXYZ(in, count, out);
+        } else {
+            parallel ? batch->ToLabParallel(in, count, out) : batch->ToLab(in, count, out);
+        }
+    }
+    return result;
+}
+
+py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer);
+    const MeasuringCondition condition = Condition(illuminant, observer);
+    float* v = lab.mutable_data();
+    const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
+    py::gil_scoped_release unlocked;
+    for (std::size_t i = 0; i < count; ++i, v += 3) {
+        const LChVector lch{LABVector(v[0], v[1], v[2], condition)};
+        v[1] = lch[1];
+        v[2] = lch[2];
+    }
+    return lab;
+}
+
+py::array_t<float> SpectraToDin99(const py::object& spectra, const std::string& illuminant,
+                                  const py::object& observer) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer);
+    float* v = lab.mutable_data();
+    const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
+    py::gil_scoped_release unlocked;
+    nxbase::LabToDin99(v, v, count);
+    return lab;
+}
+
+py::array_t<float> SpectraToDensity(const py::object& spectra, const std::string& standard) {
+    std::string why;
+    if (!klume::cmetry::DensityStandardRepository::Find(standard, &why)) {
+        throw py::value_error(why.empty() ? "unknown density standard \"" + standard + "\"" : why);
+    }
+    const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
+    py::array_t<float> result(ResultShape(input, 3));
+    const DichteFilter filter{DStdClass(standard)};
+    const std::size_t count = static_cast<std::size_t>(input.size() / kBands);
+    const float* in = input.data();
+    float* out = result.mutable_data();
+    py::gil_scoped_release unlocked;
+    for (std::size_t i = 0; i < count; ++i) {
+        const ReflectanceSpectrum spectrum(in + i * kBands, PhysicalConditions());
+        for (unsigned short c = 0; c < 3; ++c) {
+            out[3 * i + c] = std::nanf("");
+            filter.GetDensity(spectrum, c, out[3 * i + c]);
+        }
+    }
+    return result;
+}
+
+py::array_t<float> LabToSRGB(const py::object& lab) {
+    const FloatArray input = AsFloatRows(lab, 3, "lab");
+    py::array_t<float> result(ResultShape(input, 3));
+    const std::size_t count = static_cast<std::size_t>(input.size() / 3);
+    const float* in = input.data();
+    float* out = result.mutable_data();
+    py::gil_scoped_release unlocked;
+    nxbase::LabToScreenRGB(in, out, count);
+    return result;
+}
+
+py::array_t<double> DeltaE(const py::object& reference, const py::object& sample, const std::string& method) {
+    nxbase::DeltaEMethod chosen{};
+    if (!nxbase::ParseDeltaEMethod(method.c_str(), &chosen)) {
+        throw py::value_error("unknown method \"" + method + "\"; use 2000, 94, 94t, cmc, cmc11 or ab");
+    }
+    AsDoubleRows(reference, 3, "lab1");
+    AsDoubleRows(sample, 3, "lab2");
+    // NumPy broadcasting of the leading axes.
+    const py::module_ numpy = py::module_::import("numpy");
+    const py::tuple both = numpy.attr("broadcast_arrays")(py::array::ensure(reference), py::array::ensure(sample));
+    const DoubleArray a = DoubleArray::ensure(both[0]);
+    const DoubleArray b = DoubleArray::ensure(both[1]);
+    py::array_t<double> result(std::vector<py::ssize_t>(a.shape(), a.shape() + a.ndim() - 1));
+    const std::size_t count = static_cast<std::size_t>(a.size() / 3);
+    const double* p = a.data();
+    const double* q = b.data();
+    double* out = result.mutable_data();
+    py::gil_scoped_release unlocked;
+    for (std::size_t i = 0; i < count; ++i) {
+        out[i] = nxbase::DeltaE({p[3 * i], p[3 * i + 1], p[3 * i + 2]}, {q[3 * i], q[3 * i + 1], q[3 * i + 2]}, chosen);
+    }
+    return result;
+}
+
+py::array_t<double> Resample(const py::object& wavelengths, const py::object& values) {
+    const DoubleArray grid = DoubleArray::ensure(py::array::ensure(wavelengths));
+    if (!grid || grid.ndim() != 1) throw py::value_error("wavelengths must be one-dimensional");
+    const DoubleArray input = AsDoubleRows(values, grid.shape(0), "values");
+    const nxbase::SpectralResampler resampler(std::vector<double>(grid.data(), grid.data() + grid.shape(0)));
+    py::array_t<double> result(ResultShape(input, kBands));
+    const std::size_t count = static_cast<std::size_t>(input.size() / grid.shape(0));
+    const double* in = input.data();
+    double* out = result.mutable_data();
+    py::gil_scoped_release unlocked;
+    for (std::size_t i = 0; i < count; ++i) resampler.Resample(in + i * grid.shape(0), out + i * kBands);
+    return result;
+}
+
+py::tuple ReadSpectra(const std::string& path, const std::string& scale) {
+    nxbase::SpectralReadOptions options;
+    if (scale == "percent") {
+        options.scale = nxbase::SpectralScale::kPercent;
+    } else if (scale == "fraction") {
+        options.scale = nxbase::SpectralScale::kFraction;
+    } else if (scale != "auto") {
+        throw py::value_error("scale must be \"auto\", \"percent\" or \"fraction\"");
+    }
+    nxbase::SpectraTable table;
+    std::string error;
+    bool read = false;
+    {
+        py::gil_scoped_release unlocked;
+        read = nxbase::ReadSpectraFile(path, options, &table, &error);
+    }
+    if (!read) throw py::value_error(error);
+    const py::object warn = py::module_::import("warnings").attr("warn");
+    for (const std::string& message : table.errors) warn(message);
+    if (table.unusable) throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
+    py::list ids, names;
+    py::array_t<float> values(std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), kBands});
+    float* out = values.mutable_data();
+    for (const nxbase::SpectrumRow& row : table.rows) {
+        ids.append(row.sampleId.empty() ? row.id : row.sampleId);
+        names.append(row.sampleName);
+        std::copy(row.values.begin(), row.values.end(), out);
+        out += kBands;
+    }
+    return py::make_tuple(ids, names, values);
+}
+
+const char kSpectraDoc[] =
+    "spectra: reflectance factors (white = 1) of shape (..., 36), 380..730 nm in 10 nm steps; "
+    "float32 or float64 (float64 is rounded to float32 first, as the batch path works in single "
+    "precision), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
+    "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
+    "of shape (..., 3). ";
+
+}  // namespace
+
+void RegisterColour(py::module_& m) {
+    const py::object two = py::int_(2);
+    m.def(
+        "spectra_to_XYZ",
+        [](const py::object& s, const std::string& i, const py::object& o) { return SpectraTo(Quantity::kXYZ, s, i, o); },
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+        (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc).c_str());
+    m.def(
+        "spectra_to_Lab",
+        [](const py::object& s, const std::string& i, const py::object& o) { return SpectraTo(Quantity::kLab, s, i, o); },
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+        (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc).c_str());
+    m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+          (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
+    m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
+          py::arg("observer") = two, (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
+    m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status T",
+          "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status A\", \"Status E\", "
+          "\"Status M\", \"Status T\" or an installed standard. NaN where nothing is reflected. float32 (..., 3).");
+    m.def("Lab_to_sRGB", &LabToSRGB, py::arg("lab"),
+          "Screen sRGB components 0..100 of CIE 1976 Lab values of shape (..., 3), by the formula path of "
+          "nxbase::LabToScreenRGB (no ICC profile). float32 (..., 3).");
+    m.def("delta_E", &DeltaE, py::arg("lab1"), py::arg("lab2"), py::arg("method") = "2000",
+          "Colour difference of Lab arrays of shape (..., 3), broadcast against each other; lab1 is the "
+          "reference. method: \"2000\" (CIEDE2000), \"94\" (graphic arts), \"94t\" (textiles), \"cmc\" (2:1), "
+          "\"cmc11\", \"ab\" (CIE76). float64 of the broadcast shape without the last axis.");
+    m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),
+          "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm steps: the "
+          "values themselves where the grid has the wavelength, Sprague interpolation on equal steps, linear "
+          "on uneven ones, end values held outside the range. float64 (..., 36).");
+    m.def("read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto",
+          "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, spectra) "
+          "with spectra float32 of shape (N, 36). Rejected rows become warnings; an unreadable or unusable "
+          "file raises ValueError. scale: \"auto\", \"percent\" or \"fraction\".");
+}
+
+}  // namespace nxpy

@@ -1,0 +1,114 @@
+"""Colour functions: shapes, dtypes, exactness against the C++ paths, errors."""
+import subprocess
+import warnings
+
+import numpy as np
+import pytest
+
+import nxbase
+from conftest import CHART, tool
+
+
+@pytest.fixture(scope="module")
+def chart():
+    ids, names, spectra = nxbase.read_spectra(CHART)
+    assert len(ids) == 24 and spectra.shape == (24, 36) and spectra.dtype == np.float32
+    assert (ids[0], names[0]) == ("1", "dark skin")
+    return spectra
+
+
+def test_shapes_dtypes_and_layouts_give_the_same_numbers(chart):
+    lab = nxbase.spectra_to_Lab(chart)
+    assert lab.shape == (24, 3) and lab.dtype == np.float32
+    assert nxbase.spectra_to_Lab(chart[5]).shape == (3,)
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(chart[5]), lab[5])
+    cube = chart.reshape(2, 3, 4, 36)
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(cube).reshape(24, 3), lab)
+    # Non-contiguous views and Fortran order are copied, not misread.
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(chart[::3]), lab[::3])
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(np.asfortranarray(chart)), lab)
+    padded = np.zeros((24, 72), dtype=np.float32)
+    padded[:, ::2] = chart
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(padded[:, ::2]), lab)
+    # float64 is rounded to float32 first: the same numbers.
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(chart.astype(np.float64)), lab)
+    assert nxbase.spectra_to_Lab(np.zeros((0, 36))).shape == (0, 3)
+    for function in (nxbase.spectra_to_XYZ, nxbase.spectra_to_LCh, nxbase.spectra_to_DIN99,
+                     nxbase.spectra_to_density):
+        assert function(cube).shape == (2, 3, 4, 3)
+
+
+def test_large_arrays_take_the_parallel_path_with_identical_results(chart):
+    many = np.tile(chart, (5000, 1))  # 120 000 spectra
+    lab = nxbase.spectra_to_Lab(many)
+    np.testing.assert_array_equal(lab[-24:], nxbase.spectra_to_Lab(chart))
+    np.testing.assert_array_equal(nxbase.spectra_to_XYZ(many)[:24], nxbase.spectra_to_XYZ(chart))
+
+
+def test_values_agree_with_nxcolor(chart):
+    out = subprocess.run([tool("nxcolor"), "-f", "csv", "-p", "4", "-i", "D65", "-o", "10", "--din99",
+                          "-d", "Status T"], capture_output=True, text=True, check=True).stdout
+    rows = [line.split(",") for line in out.strip().splitlines()[1:]]
+    printed = np.array([[float(v) for v in row[1:]] for row in rows])
+    xyz = nxbase.spectra_to_XYZ(chart, illuminant="d65", observer=10)
+    lab = nxbase.spectra_to_Lab(chart, illuminant="D65", observer="10")
+    lch = nxbase.spectra_to_LCh(chart, illuminant="D65", observer=10)
+    din = nxbase.spectra_to_DIN99(chart, illuminant="D65", observer=10)
+    density = nxbase.spectra_to_density(chart, density_standard="Status T")
+    # XYZ are the very numbers nxcolor's objects compute; Lab and what follows
+    # from it within the batch cube root's few units in the last place.
+    assert [f"{v:.4f}" for v in xyz.ravel()] == [f"{v:.4f}" for v in printed[:, 0:3].ravel()]
+    np.testing.assert_allclose(lab, printed[:, 3:6], atol=1.5e-4)
+    np.testing.assert_allclose(lch[:, 1], printed[:, 6], atol=1.5e-4)
+    # Near-neutral patches turn a last-place difference of a*, b* into
+    # thousandths of a degree of hue.
+    np.testing.assert_allclose(lch[:, 2], printed[:, 7], atol=5e-3)
+    np.testing.assert_allclose(din, printed[:, 8:11], atol=1.5e-4)
+    np.testing.assert_allclose(density, printed[:, 11:14], atol=1.5e-4)
+
+
+def test_differences_resampling_and_screen_colours():
+    pairs = np.loadtxt(CHART.replace("tools/nxcolor/data/colorchecker_babelcolor_average.csv",
+                                     "tests/data/ciede2000_sharma2005.csv"), delimiter=",", skiprows=1)
+    de = nxbase.delta_E(pairs[:, 1:4], pairs[:, 4:7])
+    np.testing.assert_allclose(de, pairs[:, 7], atol=1e-4)
+    # Broadcasting: one reference against many samples.
+    assert nxbase.delta_E([50, 0, 0], pairs[:, 4:7], method="ab").shape == (34,)
+    assert nxbase.delta_E(np.zeros((2, 1, 3)), np.ones((5, 3)), method="cmc").shape == (2, 5)
+    # A 5 nm spectrum holding a line comes back exactly at the 10 nm points.
+    grid = np.arange(380, 731, 5.0)
+    values = 0.2 + 0.001 * (grid - 380)
+    np.testing.assert_allclose(nxbase.resample(grid, np.stack([values, values])),
+                               np.tile(0.2 + 0.01 * np.arange(36), (2, 1)), atol=1e-12)
+    rgb = nxbase.Lab_to_sRGB(np.array([[100, 0, 0], [0, 0, 0]], dtype=np.float32))
+    assert rgb.shape == (2, 3) and rgb[0, 0] > 99 and rgb[1, 0] < 1
+
+
+def test_bad_input_raises_with_the_librarys_words(tmp_path):
+    with pytest.raises(ValueError, match=r"shape \(\.\.\., 36\), got \(3, 35\)"):
+        nxbase.spectra_to_Lab(np.zeros((3, 35)))
+    with pytest.raises(ValueError, match="got \\(\\)"):
+        nxbase.spectra_to_Lab(np.float32(1))
+    with pytest.raises(ValueError, match="numbers"):
+        nxbase.spectra_to_XYZ(np.array([["a"] * 36]))
+    with pytest.raises(ValueError, match="unknown illuminant \"D42\""):
+        nxbase.spectra_to_Lab(np.zeros(36), illuminant="D42")
+    with pytest.raises(ValueError, match="observer"):
+        nxbase.spectra_to_Lab(np.zeros(36), observer=7)
+    with pytest.raises(ValueError, match="density standard"):
+        nxbase.spectra_to_density(np.zeros(36), density_standard="Status Q")
+    with pytest.raises(ValueError, match="unknown method"):
+        nxbase.delta_E([0, 0, 0], [1, 1, 1], method="2001")
+    with pytest.raises(ValueError, match="broadcast"):
+        nxbase.delta_E(np.zeros((2, 3)), np.zeros((3, 3)))
+    with pytest.raises(ValueError, match="increase"):
+        nxbase.resample([500, 490, 510], [0.1, 0.2, 0.3])
+    with pytest.raises(ValueError, match="cannot open"):
+        nxbase.read_spectra(str(tmp_path / "missing.csv"))
+    bad = tmp_path / "bad.csv"
+    bad.write_text("id,r400,r500,r600\nA,0.1,0.2,0.3\nB,0.1,x,0.3\n")
+    with warnings.catch_warnings(record=True) as caught:
+        warnings.simplefilter("always")
+        ids, _, spectra = nxbase.read_spectra(str(bad))
+    assert ids == ["A"] and spectra.shape == (1, 36)
+    assert any("bad.csv:3" in str(w.message) for w in caught)
