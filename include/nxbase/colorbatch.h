@@ -9,9 +9,10 @@
 // LABVector (CIE 1976, type 0) compute from a ReflectanceSpectrum with the same
 // filter: the weighted sums are formed in the same order with the same single
 // precision operations, so XYZ agree bit for bit, and Lab differs only by the
-// cube root, a vectorised approximation agreeing with the objects'
-// pow(t, 0.33333334) to a unit or two in the last place (within 1e-5 of the
-// vector's length).
+// scaling of t (one multiplication by sum_1 / sum_c / 100 instead of two
+// divisions) and the cube root, a vectorised approximation agreeing with the
+// objects' pow(t, 0.33333334) to a unit or two in the last place (within 1e-5
+// of the vector's length).
 #ifndef NXBASE_COLORBATCH_H_
 #define NXBASE_COLORBATCH_H_
 
@@ -32,7 +33,8 @@ struct BatchTables {
     static constexpr int kChunks = 5;
     alignas(32) float chunks[3][kChunks][8] = {};
     float sumY = 0.0f;   // XYZ = S / sumY * 100
-    float sums[3] = {};  // Lab: t = XYZ * sumY / sums[c] / 100
+    float sums[3] = {};
+    float labScale[3] = {};  // Lab: t = XYZ * (sumY / sums[c] / 100)
 };
 }  // namespace detail
 
