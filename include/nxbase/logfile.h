@@ -8,13 +8,15 @@
 #define NXBASE_LOGFILE_H_
 
 #include <atomic>
+#include <mutex>
+#include <unordered_map>
+#include <vector>
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <list>
 #include <map>
 #include <memory>
 #include <set>
-#include <shared_mutex>
 #include <string>
 
 #include "nxbase/export.h"
@@ -96,6 +98,9 @@ class NXBASE_EXPORT LogFile : public LogInterface {
 
   private:
     bool CheckKey(const String& key);
+    // Sets and clears state bits of a key in a new snapshot; returns the
+    // state before.
+    std::uint8_t ChangeKeyState(const std::string& key, std::uint8_t set, std::uint8_t clear);
     void NotifyListeners(const String& text, const String& key);
     void ApplyOptions(const std::map<std::string, std::string>& options);
 
@@ -106,14 +111,19 @@ class NXBASE_EXPORT LogFile : public LogInterface {
     bool unlimited = false;
     std::atomic<bool> withThreadId{false};
     // Available (announced) and enabled keys in one table, so that a line
-    // costs one look-up.
-    std::map<std::string, std::uint8_t, std::less<>> keyStates;
+    // costs one look-up. Readers take the current snapshot without a lock;
+    // a change copies the table under keysMutex and publishes the copy. Old
+    // snapshots are kept until the log goes (keys change a few dozen times in
+    // a program's life), so a reader never holds a freed table.
+    using KeyTable = std::unordered_map<std::string, std::uint8_t>;
+    std::atomic<const KeyTable*> keyStates{nullptr};
+    std::vector<std::unique_ptr<const KeyTable>> keyTables;
     std::list<boost::shared_ptr<LogInterface>> listeners;
     // The restart note, written at the head of the fresh file.
     std::string restartNote;
-    // Guards keyStates; file writes use the named lock "LogWrite", listeners
-    // the named lock "LogListeners".
-    mutable std::shared_mutex keysMutex;
+    // Serialises changes of keyStates; file writes use the named lock
+    // "LogWrite", listeners the named lock "LogListeners".
+    mutable std::mutex keysMutex;
     std::atomic<bool> hasListeners{false};
 };
 

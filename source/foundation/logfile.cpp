@@ -263,18 +263,35 @@ void LogFile::WriteToLog(const String& text, const String& key) {
     log->WriteLog(text, key);
 }
 
+namespace {
+// The state of `key` in a snapshot (null: no table yet), 0 when absent.
+std::uint8_t StateIn(const std::unordered_map<std::string, std::uint8_t>* table, const std::string& key) {
+    if (table == nullptr) return 0;
+    auto at = table->find(key);
+    return at == table->end() ? 0 : at->second;
+}
+}  // namespace
+
 bool LogFile::IsLogOptionEnabled(const String& key) const {
-    std::shared_lock<std::shared_mutex> lock(keysMutex);
-    auto at = keyStates.find(key.str());
-    return at != keyStates.end() && (at->second & kEnabled) != 0;
+    return (StateIn(keyStates.load(std::memory_order_acquire), key.str()) & kEnabled) != 0;
+}
+
+std::uint8_t LogFile::ChangeKeyState(const std::string& key, std::uint8_t set, std::uint8_t clear) {
+    std::lock_guard<std::mutex> lock(keysMutex);
+    const KeyTable* current = keyStates.load(std::memory_order_relaxed);
+    const std::uint8_t before = StateIn(current, key);
+    const std::uint8_t after = static_cast<std::uint8_t>((before | set) & ~clear);
+    if (after != before || current == nullptr || current->find(key) == current->end()) {
+        auto next = std::make_unique<KeyTable>(current ? *current : KeyTable());
+        (*next)[key] = after;
+        keyStates.store(next.get(), std::memory_order_release);
+        keyTables.push_back(std::move(next));
+    }
+    return before;
 }
 
 void LogFile::SetLogOption(const std::string& key, bool enable) {
-    {
-        std::unique_lock<std::shared_mutex> lock(keysMutex);
-        std::uint8_t& state = keyStates[key];
-        state = enable ? (state | kEnabled) : (state & ~kEnabled);
-    }
+    ChangeKeyState(key, enable ? kEnabled : 0, enable ? 0 : kEnabled);
     gOptionsVersion.fetch_add(1, std::memory_order_acq_rel);
     if (key == kUnlimited) {
         CriticalSection section(kLogWrite);
@@ -285,8 +302,9 @@ void LogFile::SetLogOption(const std::string& key, bool enable) {
 
 std::set<std::string> LogFile::GetAvailableLogOptions() const {
     std::set<std::string> keys;
-    std::shared_lock<std::shared_mutex> lock(keysMutex);
-    for (const auto& [key, state] : keyStates) {
+    const KeyTable* table = keyStates.load(std::memory_order_acquire);
+    if (table == nullptr) return keys;
+    for (const auto& [key, state] : *table) {
         if (state & kAvailable) keys.insert(key);
     }
     return keys;
@@ -295,22 +313,11 @@ std::set<std::string> LogFile::GetAvailableLogOptions() const {
 // Returns whether lines under `key` are written; announces a new key once.
 bool LogFile::CheckKey(const String& key) {
     const std::string& name = key.str();
-    {
-        std::shared_lock<std::shared_mutex> lock(keysMutex);
-        auto at = keyStates.find(name);
-        if (at != keyStates.end() && (at->second & kAvailable)) {
-            return name.empty() || (at->second & kEnabled);
-        }
-    }
-    bool announce = false;
-    bool enabled;
-    {
-        std::unique_lock<std::shared_mutex> lock(keysMutex);
-        std::uint8_t& state = keyStates[name];
-        announce = !(state & kAvailable) && !name.empty();
-        state |= kAvailable;
-        enabled = name.empty() || (state & kEnabled);
-    }
+    const std::uint8_t state = StateIn(keyStates.load(std::memory_order_acquire), name);
+    if (state & kAvailable) return name.empty() || (state & kEnabled);
+    const std::uint8_t before = ChangeKeyState(name, kAvailable, 0);
+    const bool announce = !(before & kAvailable) && !name.empty();
+    const bool enabled = name.empty() || (before & kEnabled);
     if (announce) WriteLog(String("# - Available key: ") + key, String("Keys"));
     return enabled;
 }
