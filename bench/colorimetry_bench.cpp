@@ -1,6 +1,12 @@
 // Colorimetry: cost of reaching a pair's weights (the provider's cache) and of
-// summing one spectrum against them.
+// summing one spectrum against them, each next to its plain peer in the same
+// run: a std::map look-up of the same (illuminant, observer) pair, and three
+// scalar 36-term dot products.
 #include <benchmark/benchmark.h>
+
+#include <algorithm>
+#include <map>
+#include <string>
 
 #include "nxbase/cmetry.h"
 
@@ -13,6 +19,17 @@ void BM_ProviderFilterLookup(benchmark::State& state) {
     }
 }
 BENCHMARK(BM_ProviderFilterLookup);
+
+void BM_PairMapLookup_Baseline(benchmark::State& state) {
+    std::map<std::pair<std::string, std::string>, int> pairs;
+    for (const char* illuminant : {"A", "C", "D50", "D55", "D65", "D75", "E", "FL2", "FL7", "FL11"}) {
+        for (const char* observer : {"2", "10"}) pairs[{illuminant, observer}] = 1;
+    }
+    for (auto _ : state) {
+        benchmark::DoNotOptimize(pairs.find({"D50", "2"}));
+    }
+}
+BENCHMARK(BM_PairMapLookup_Baseline);
 
 void BM_CMetryFilterConstruction(benchmark::State& state) {
     const Lichtart illuminant{IllumClass(ILLUM_D50, 0)};
@@ -46,6 +63,26 @@ void BM_Tristimulus(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations());
 }
 BENCHMARK(BM_Tristimulus);
+
+void BM_PlainDotProducts_Baseline(benchmark::State& state) {
+    const CMetryFilter& filter = *CMetry::Instance()->GetLXYZFilter();
+    float weights[3][36];
+    for (unsigned short c = 0; c < 3; ++c) std::copy(filter.GetWeights(c), filter.GetWeights(c) + 36, weights[c]);
+    float spectrum[36];
+    for (int i = 0; i < 36; ++i) spectrum[i] = 0.02f * static_cast<float>(i);
+    float sums[3];
+    for (auto _ : state) {
+        benchmark::DoNotOptimize(spectrum);
+        for (int c = 0; c < 3; ++c) {
+            float sum = 0.0f;
+            for (int i = 0; i < 36; ++i) sum += weights[c][i] * spectrum[i];
+            sums[c] = sum;
+        }
+        benchmark::DoNotOptimize(sums);
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_PlainDotProducts_Baseline);
 
 }  // namespace
 BENCHMARK_MAIN();
