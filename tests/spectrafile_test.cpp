@@ -229,6 +229,7 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     EXPECT_TRUE(broken.unusable);
     ASSERT_EQ(broken.errors.size(), 1u);
     EXPECT_EQ(broken.errors[0].rfind("b:", 0), 0u) << broken.errors[0];
+    EXPECT_NE(broken.errors[0].back(), '\n') << "LittleCMS's own line end is dropped";
 }
 
 TEST(SpectraFile, StreamsAreBoundedAndAgreeWithText) {

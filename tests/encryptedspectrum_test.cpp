@@ -1,0 +1,87 @@
+// Enciphered spectra: exact round trips, and every wrong key or altered byte
+// refused rather than turned into a wrong spectrum.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <limits>
+#include <random>
+#include <stdexcept>
+#include <vector>
+
+#include "nxbase/encryptedspectrum.h"
+
+namespace {
+
+EncryptedSpectralData::Key KeyOf(unsigned char seed) {
+    EncryptedSpectralData::Key key;
+    for (std::size_t i = 0; i < key.size(); ++i) key[i] = static_cast<unsigned char>(seed + 7 * i);
+    return key;
+}
+
+std::vector<double> Spectrum() {
+    std::vector<double> values;
+    for (int i = 0; i < 36; ++i) values.push_back(0.05 + 0.9 * std::sin(i * 0.3) * std::sin(i * 0.3));
+    // Values whose bits must survive: negative zero, a denormal, extremes.
+    values[3] = -0.0;
+    values[4] = std::numeric_limits<double>::denorm_min();
+    values[5] = std::numeric_limits<double>::max();
+    return values;
+}
+
+bool SameBits(const std::vector<double>& a, const std::vector<double>& b) {
+    return a.size() == b.size() && std::memcmp(a.data(), b.data(), a.size() * sizeof(double)) == 0;
+}
+
+TEST(EncryptedSpectralData, RoundTripsBitForBitAndNeverRepeatsItsBytes) {
+    const auto key = KeyOf(1);
+    const EncryptedSpectralData a = EncryptedSpectralData::Encrypt(Spectrum(), key);
+    const EncryptedSpectralData b = EncryptedSpectralData::Encrypt(Spectrum(), key);
+    EXPECT_TRUE(SameBits(a.GetDecryptedSpectrum(key), Spectrum()));
+    EXPECT_NE(a.GetEncryptedData(), b.GetEncryptedData()) << "a fresh nonce each time";
+    EXPECT_EQ(a.GetEncryptedData().size(), 4u + 1u + 12u + 4u + 36u * 8u + 16u);
+    // Stored and read back as bytes.
+    const EncryptedSpectralData stored(a.GetEncryptedData());
+    EXPECT_TRUE(SameBits(stored.GetDecryptedSpectrum(key), Spectrum()));
+    // Empty and large spectra too; too large is refused.
+    EXPECT_TRUE(EncryptedSpectralData::Encrypt({}, key).GetDecryptedSpectrum(key).empty());
+    std::vector<double> big(EncryptedSpectralData::kMaxValues, 0.5);
+    EXPECT_EQ(EncryptedSpectralData::Encrypt(big, key).GetDecryptedSpectrum(key).size(), big.size());
+    big.push_back(0.5);
+    EXPECT_THROW(EncryptedSpectralData::Encrypt(big, key), std::invalid_argument);
+
+    // The process key.
+    EncryptedSpectralData::ClearProcessKey();
+    EXPECT_THROW(a.GetDecryptedSpectrum(), std::logic_error);
+    EncryptedSpectralData::SetProcessKey(key);
+    EXPECT_TRUE(SameBits(a.GetDecryptedSpectrum(), Spectrum()));
+    EncryptedSpectralData::ClearProcessKey();
+}
+
+TEST(EncryptedSpectralData, RefusesWrongKeysAlteredTruncatedAndForeignBytes) {
+    const auto key = KeyOf(1);
+    const std::vector<unsigned char> good = EncryptedSpectralData::Encrypt(Spectrum(), key).GetEncryptedData();
+    EXPECT_THROW(EncryptedSpectralData(good).GetDecryptedSpectrum(KeyOf(2)), std::runtime_error);
+    // Every single bit of the bytes is covered: header, nonce, text and tag.
+    for (std::size_t byte = 0; byte < good.size(); ++byte) {
+        std::vector<unsigned char> bad = good;
+        bad[byte] ^= static_cast<unsigned char>(1u << (byte % 8));
+        EXPECT_THROW(EncryptedSpectralData(bad).GetDecryptedSpectrum(key), std::runtime_error) << "byte " << byte;
+    }
+    for (std::size_t size : {std::size_t{0}, std::size_t{5}, std::size_t{36}, good.size() - 1}) {
+        std::vector<unsigned char> cut(good.begin(), good.begin() + static_cast<long>(size));
+        EXPECT_THROW(EncryptedSpectralData(cut).GetDecryptedSpectrum(key), std::runtime_error) << size;
+    }
+    std::vector<unsigned char> longer = good;
+    longer.push_back(0);
+    EXPECT_THROW(EncryptedSpectralData(longer).GetDecryptedSpectrum(key), std::runtime_error);
+    std::mt19937 random(5);
+    for (int round = 0; round < 200; ++round) {
+        std::vector<unsigned char> junk(random() % 400);
+        for (auto& c : junk) c = static_cast<unsigned char>(random());
+        if (junk.size() > 5) std::memcpy(junk.data(), "NXSP\1", 5);
+        EXPECT_THROW(EncryptedSpectralData(junk).GetDecryptedSpectrum(key), std::runtime_error);
+    }
+}
+
+}  // namespace
