@@ -100,6 +100,21 @@ double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double a
 
 namespace {
 
+// a' and C' of a pair: a' stretches the a axis near neutral so that greys of
+// small chroma weigh as observers see them.
+struct Primed {
+    double a1, a2, c1, c2;
+};
+
+Primed Prime(const LabValue& p1, const LabValue& p2) {
+    const double cMean = 0.5 * (Chroma(p1) + Chroma(p2));
+    const double cMean7 = Pow7(cMean);
+    const double stretch = 1.5 - 0.5 * std::sqrt(cMean7 / (cMean7 + k25Pow7));  // 1 + G
+    const double a1 = stretch * p1.a;
+    const double a2 = stretch * p2.a;
+    return {a1, a2, std::sqrt(a1 * a1 + p1.b * p1.b), std::sqrt(a2 * a2 + p2.b * p2.b)};
+}
+
 // CIEDE2000 through hue angles, step by step as Sharma, Wu and Dalal write
 // it; used where the vector form below has no direction to work with (a
 // neutral colour, or hues exactly opposite).
@@ -107,15 +122,7 @@ DeltaE2000Parts DeltaE2000ByAngles(const LabValue& axReference, const LabValue& 
                                    const DeltaE2000Weights& axWeights) {
     const LabValue& p1 = axReference;
     const LabValue& p2 = axSample;
-    // a' stretches the a axis near neutral so that greys of small chroma
-    // weigh as observers see them.
-    const double cMean = 0.5 * (Chroma(p1) + Chroma(p2));
-    const double cMean7 = Pow7(cMean);
-    const double g = 0.5 * (1.0 - std::sqrt(cMean7 / (cMean7 + k25Pow7)));
-    const double a1 = (1.0 + g) * p1.a;
-    const double a2 = (1.0 + g) * p2.a;
-    const double c1 = std::sqrt(a1 * a1 + p1.b * p1.b);
-    const double c2 = std::sqrt(a2 * a2 + p2.b * p2.b);
+    const auto [a1, a2, c1, c2] = Prime(p1, p2);
     const double h1 = HueDegrees(p1.b, a1);
     const double h2 = HueDegrees(p2.b, a2);
 
@@ -187,13 +194,7 @@ DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& 
                                    const DeltaE2000Weights& axWeights) {
     const LabValue& p1 = axReference;
     const LabValue& p2 = axSample;
-    const double cMean = 0.5 * (Chroma(p1) + Chroma(p2));
-    const double cMean7 = Pow7(cMean);
-    const double stretch = 1.5 - 0.5 * std::sqrt(cMean7 / (cMean7 + k25Pow7));  // 1 + G
-    const double a1 = stretch * p1.a;
-    const double a2 = stretch * p2.a;
-    const double c1 = std::sqrt(a1 * a1 + p1.b * p1.b);
-    const double c2 = std::sqrt(a2 * a2 + p2.b * p2.b);
+    const auto [a1, a2, c1, c2] = Prime(p1, p2);
     const double c12 = c1 * c2;
     const double dot = a1 * a2 + p1.b * p2.b;
     const double cross = a1 * p2.b - a2 * p1.b;
