@@ -321,6 +321,20 @@ TEST(Resample, SpragueFollowsSmoothCurvesAndHoldsEnds) {
     EXPECT_NEAR(result[4], 0.3f, 1e-7);
     EXPECT_EQ(result[35], 0.8f);
 
+    // Many spectra at once give what one at a time gives, for copies and for
+    // interpolation.
+    for (const double step : {5.0, 20.0}) {
+        std::vector<double> fine;
+        for (double nm = 380.0; nm <= 730.0; nm += step) fine.push_back(nm);
+        const nxbase::SpectralResampler many(fine);
+        std::vector<float> in(3 * fine.size());
+        for (std::size_t i = 0; i < in.size(); ++i) in[i] = 0.001f * static_cast<float>(i % 997);
+        std::vector<float> together(3 * 36), single(3 * 36);
+        many.ResampleMany(in.data(), 3, together.data());
+        for (int s = 0; s < 3; ++s) many.Resample(in.data() + s * fine.size(), single.data() + 36 * s);
+        EXPECT_EQ(together, single) << step;
+    }
+
     EXPECT_THROW(nxbase::SpectralResampler({500.0}), std::invalid_argument);
     EXPECT_THROW(nxbase::SpectralResampler({500.0, 490.0, 510.0}), std::invalid_argument);
     EXPECT_THROW(nxbase::SpectralResampler({500.0, NAN}), std::invalid_argument);

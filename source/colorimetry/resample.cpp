@@ -159,6 +159,17 @@ void SpectralResampler::Resample(const double* pIn, double* pOut) const {
 void SpectralResampler::ResampleMany(const float* pIn, std::size_t alCount, float* pOut) const {
     const std::size_t in = amSource.size();
     const std::size_t out = amTaps.size();
+    if (amMethod == Method::kSelection) {
+        // Copies only: one index per target, no weights.
+        std::vector<int> index(out);
+        for (std::size_t t = 0; t < out; ++t) index[t] = amTaps[t].first;
+        for (std::size_t s = 0; s < alCount; ++s) {
+            const float* from = pIn + s * in;
+            float* to = pOut + s * out;
+            for (std::size_t t = 0; t < out; ++t) to[t] = from[index[t]];
+        }
+        return;
+    }
     for (std::size_t s = 0; s < alCount; ++s) Resample(pIn + s * in, pOut + s * out);
 }
 
