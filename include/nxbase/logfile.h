@@ -106,7 +106,6 @@ class NXBASE_EXPORT LogFile : public LogInterface {
 
     std::string fileName = "NxBLog.log";
     bool firstWrite = true;
-    bool secondFlag = false;
     std::uint32_t loggedLines = 0;
     bool unlimited = false;
     std::atomic<bool> withThreadId{false};

@@ -19,7 +19,7 @@
 #include <thread>
 #include <vector>
 
-#if defined(__x86_64__) && defined(__GNUC__)
+#if defined(__x86_64__) && defined(__GNUC__) && !defined(__clang__)
 #include <immintrin.h>
 #endif
 
@@ -276,7 +276,9 @@ void RunCbrt(const float* in, std::size_t count, float* out) {
     }
 }
 
-#if defined(__x86_64__) && defined(__GNUC__)
+// GCC only, as the clones above: Clang refuses the 8-float helpers' vector
+// returns inside a function of another target.
+#if defined(__x86_64__) && defined(__GNUC__) && !defined(__clang__)
 #define NXBASE_BATCH_WIDE 1
 // GCC 12 reports the undefined upper half of _mm512_castps256_ps512 (which
 // the insert overwrites) as maybe uninitialised.

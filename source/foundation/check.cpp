@@ -55,8 +55,9 @@ class LogAndStderrUserInterface : public StderrUserInterface {
 // Replaces the toolkit's bare stderr handler when the library is loaded.
 const bool kDefaultHandlerInstalled = [] {
     auto current = UserInterface::Current();
+    const UserInterface& handler = *current;
     if (dynamic_cast<LogAndStderrUserInterface*>(current.get()) == nullptr &&
-        typeid(*current) == typeid(StderrUserInterface)) {
+        typeid(handler) == typeid(StderrUserInterface)) {
         UserInterface::Install(std::make_shared<LogAndStderrUserInterface>());
     }
     return true;
