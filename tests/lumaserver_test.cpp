@@ -10,6 +10,7 @@
 
 #include <cmath>
 #include <cstring>
+#include <algorithm>
 #include <filesystem>
 #include <functional>
 #include <sstream>
@@ -242,6 +243,23 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     }
     run("--timeout 1 Nobody IS_READY", status);
     EXPECT_EQ(status, 3);
+}
+
+TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
+    // nxcolor starts the registered server on demand, measures three patches
+    // and prints their colours; the server then ends by itself.
+    std::string output;
+    FILE* pipe = ::popen(NXBASE_BINARY_DIR "/tools/nxcolor --measure 3 -f csv -p 2 2>&1", "r");
+    char buffer[4096];
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+    const int result = ::pclose(pipe);
+    ASSERT_TRUE(WIFEXITED(result)) << output;
+    EXPECT_EQ(WEXITSTATUS(result), 0) << output;
+    EXPECT_EQ(std::count(output.begin(), output.end(), '\n'), 4) << output;
+    EXPECT_NE(output.find("id,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
+    // The emulator measures the built-in chart: dark skin's values, to the
+    // 1e-5 the server's integers keep.
+    EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos) << output;
 }
 
 TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {
