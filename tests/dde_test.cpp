@@ -143,7 +143,7 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
     // Killed: the next send fails (its registered path does not exist), and
     // the loop goes on.
     Shell("pkill -9 -f " + server);
-    ASSERT_TRUE(RunUntil([&] { return !nxbase::IsApplicationRunning(Exe(server)); }, 5s));
+    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(Exe(server)); }, 5s));
     // Pokes are one way: the bus must have seen the death (the name freed)
     // before a send can know.
     ASSERT_TRUE(RunUntil(

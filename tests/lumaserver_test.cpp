@@ -74,7 +74,7 @@ class LumaServerTest : public ::testing::Test {
         }
         NxSingleton::DeleteAllSingleton();
         auto deadline = std::chrono::steady_clock::now() + 5s;
-        while (nxbase::IsApplicationRunning(serverExecutable) &&
+        while (nxtest::ProcessRunning(serverExecutable) &&
                std::chrono::steady_clock::now() < deadline) {
             std::this_thread::sleep_for(20ms);
         }
@@ -99,9 +99,9 @@ class LumaServerTest : public ::testing::Test {
 
 TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
-    EXPECT_FALSE(nxbase::IsApplicationRunning(serverExecutable));
+    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
     Connect();  // starts the server on demand
-    EXPECT_TRUE(nxbase::IsApplicationRunning(serverExecutable));
+    EXPECT_TRUE(nxtest::ProcessRunning(serverExecutable));
     for (int message : {IS_APP_READY, CANCEL_REQUEST, EXEC_WHITE_MEASUREMENT}) {
         EXPECT_EQ(Hex(Ask(message)), "00") << nxbase::MessageName(message);
     }
@@ -174,7 +174,7 @@ TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPee
     MyMemoryBlock none;
     ASSERT_TRUE(office->Send("LumaServer", DISCONNECT, none));
     auto start = std::chrono::steady_clock::now();
-    ASSERT_TRUE(RunUntil([&] { return !nxbase::IsApplicationRunning(serverExecutable); }, 5s));
+    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 900ms);
     EXPECT_LT(took, 3s);
@@ -196,11 +196,11 @@ TEST_F(LumaServerTest, APeerThatDiesCountsAsDisconnectedAndFreesTheLock) {
     ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
     // Nobody else is connected: the server ends about a second later.
     auto deadline = std::chrono::steady_clock::now() + 5s;
-    while (nxbase::IsApplicationRunning(serverExecutable) &&
+    while (nxtest::ProcessRunning(serverExecutable) &&
            std::chrono::steady_clock::now() < deadline) {
         std::this_thread::sleep_for(20ms);
     }
-    EXPECT_FALSE(nxbase::IsApplicationRunning(serverExecutable));
+    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
 }
 
 TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
@@ -210,7 +210,7 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     Notices notices;
     Link handler = LINK(Notices, &notices, Handle);
     office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
-    ASSERT_TRUE(RunUntil([&] { return nxbase::IsApplicationRunning(serverExecutable); }));
+    ASSERT_TRUE(RunUntil([&] { return nxtest::ProcessRunning(serverExecutable); }));
     Connect();
     EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG)), "00");
     ASSERT_TRUE(RunUntil([&] { return notices.received.size() >= 3; }));

@@ -4,6 +4,7 @@
 #ifndef NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
 #define NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
 
+#include <dirent.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -28,6 +29,27 @@ inline bool RunUntil(const std::function<bool()>& done,
         Application::Get().RunOneFor(std::chrono::milliseconds(10));
     }
     return true;
+}
+
+// Whether a process runs whose executable has the file name `name`.
+inline bool ProcessRunning(const std::string& name) {
+    DIR* proc = ::opendir("/proc");
+    if (proc == nullptr) return false;
+    bool found = false;
+    char target[4096];
+    while (dirent* entry = ::readdir(proc)) {
+        std::string link = std::string("/proc/") + entry->d_name + "/exe";
+        ssize_t n = ::readlink(link.c_str(), target, sizeof target - 1);
+        if (n <= 0) continue;
+        std::string path(target, static_cast<std::size_t>(n));
+        if (path.size() > 10 && path.compare(path.size() - 10, 10, " (deleted)") == 0) path.resize(path.size() - 10);
+        if (path.substr(path.rfind('/') + 1) == name) {
+            found = true;
+            break;
+        }
+    }
+    ::closedir(proc);
+    return found;
 }
 
 // A directory under /tmp (short: socket paths are limited to 108 bytes) that

@@ -25,7 +25,7 @@ TEST(MessageCatalogue, EveryNameAndItsAnswerMapBackToTheirNumbers) {
         EXPECT_EQ(nxbase::NumberOfCommandText(std::string("ANSWER!") + field), 1000 + n) << field;
         EXPECT_EQ(nxbase::CommandTextOfNumber(1000 + n), std::string("ANSWER!") + field);
     }
-    EXPECT_EQ(PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN][0], '\0');
+    EXPECT_STREQ(PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN], "ANZAHL_BOTSCHAFTEN");
     EXPECT_EQ(nxbase::NumberOfCommandText("CONNECT"), CONNECT);
     EXPECT_EQ(nxbase::NumberOfCommandText("GET_ACTIVE_FILTERS"), 134);
     EXPECT_EQ(nxbase::NumberOfCommandText("MESSUNG_AUSGELOEST"), 43);

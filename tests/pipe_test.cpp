@@ -15,6 +15,7 @@
 #include <functional>
 #include <thread>
 
+#include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/poapps.h"
@@ -114,7 +115,11 @@ class PipeTest : public ::testing::Test {
         pipe = Pipe::CreatePipe("PipeTestClient");
         pipe->SetReceiveFunction(Record);
         pipe->SetApplications(applications.get());
-        pipe->SetCountryCode(49);
+        // Started peers get the current language's country code.
+        nxtest::WriteFile(root + "/Texte1.lng", "");
+        nxtest::WriteFile(root + "/Texte49.lng", "");
+        Language::CreateLanguage(nullptr, FileLanguageAccessChecker(String(root + "/Texte")));
+        Language::Instance()->SetLanguageByCountryCode(static_cast<LanguageCode>(49));
         gReceived.clear();
         Application::Get().ResetQuit();
     }
@@ -126,6 +131,7 @@ class PipeTest : public ::testing::Test {
             RunUntil([&] { return !pipe->HasChannel("EchoPeer"); }, 5s);
         }
         Pipe::DeletePipe();
+        NxSingleton::DeleteAllSingleton();
         for (int i = 0; i < 100 && ::waitpid(-1, nullptr, WNOHANG) >= 0; ++i) {
             std::this_thread::sleep_for(20ms);
         }
@@ -187,7 +193,7 @@ TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
     ASSERT_EQ(started.size(), 2u);
     EXPECT_EQ(started[0], peerProgram + " -S -LNG 49");
     EXPECT_EQ(started[1], root + "/bin");
-    EXPECT_TRUE(nxbase::IsApplicationRunning("echopeer" + std::to_string(::getpid())));
+    EXPECT_TRUE(nxbase::IsApplicationRunning("EchoPeer"));
 
     // A second process under a name that is taken fails to listen and leaves
     // ours alone.
@@ -250,7 +256,7 @@ TEST_F(PipeTest, ALostPeerIsReportedAndTheNextSendStartsItAgain) {
     ASSERT_TRUE(RunUntil([&] { return !lost.empty(); }));
     EXPECT_EQ(lost, std::vector<std::string>{"EchoPeer"});
     EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
-    RunUntil([&] { return !nxbase::IsApplicationRunning("echopeer" + std::to_string(::getpid())); },
+    RunUntil([&] { return !nxbase::IsApplicationRunning("EchoPeer"); },
              5s);
     EXPECT_EQ(RoundTrip("two"), "two");
     // An application nobody registered is not started and the send fails.

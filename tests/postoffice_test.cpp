@@ -241,7 +241,7 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer,
                                         [] { return true; }));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 3s);
-    RunUntil([&] { return !nxbase::IsApplicationRunning(peerExecutable); }, 5s);
+    RunUntil([&] { return !nxtest::ProcessRunning(peerExecutable); }, 5s);
     // The next send starts it again.
     ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
 

@@ -32,6 +32,9 @@ NXBASE_EXPORT void DisplayError(int errNo, const char* module, const char* date,
 
 #define NX_ASSERT(condition) \
     ((condition) ? static_cast<void>(0) : Check::AssertFailed(#condition, __FILE__, __LINE__))
+// The same with the text the report shows instead of the condition's source.
+#define NX_ASSERT_TEXT(condition, text) \
+    ((condition) ? static_cast<void>(0) : Check::AssertFailed((text), __FILE__, __LINE__))
 #define NX_ERROR(message) Check::ErrorReport((message), __FILE__, __LINE__)
 #define NX_DISPLAY_ERROR(errNo) DisplayError((errNo), __FILE__, __DATE__, __TIME__, __LINE__)
 #define NX_CHECK_POINTER(p) Check::POINTER((p), __FILE__, __DATE__, __TIME__, __LINE__)

@@ -62,7 +62,9 @@ class NXBASE_EXPORT DDE {
     void SetApplications(const PostOfficeApplications* pApplications) {
         pmApplications = pApplications;
     }
-    void SetCountryCode(int alCode) { amCountryCode = alCode; }
+    // Asked while Send waits for an application it started (empty: wait
+    // the full time).
+    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) { fmKeepWaiting = std::move(fKeepWaiting); }
 
     // Pokes `asCommand` with the encoded block to the application `asApp`,
     // starting it first when it is known but not on the bus.
@@ -87,7 +89,7 @@ class NXBASE_EXPORT DDE {
     ReceiveFunction fmReceiveFunction = nullptr;
     std::function<void(const std::string&)> fmExecute;
     const PostOfficeApplications* pmApplications = nullptr;
-    int amCountryCode = 1;
+    std::function<bool()> fmKeepWaiting;
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
 };
 

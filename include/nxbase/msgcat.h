@@ -154,7 +154,7 @@ enum PO_Botschaften {
 // Width of one name field of the message table, zero bytes included.
 constexpr int kBotschaftNameWidth = 30;
 // The message table: field n holds the NUL-padded ASCII name of message n;
-// field ANZAHL_BOTSCHAFTEN is empty and never searched.
+// field ANZAHL_BOTSCHAFTEN holds that name and is never searched.
 NXBASE_EXPORT extern const char PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN + 1][kBotschaftNameWidth];
 
 // The answer to message n is numbered kAnswerOffset + n; its command text is
@@ -182,6 +182,12 @@ NXBASE_EXPORT void DecodeBlock(MyMemoryBlock& axBlock);
 // The same on plain bytes.
 NXBASE_EXPORT std::string EncodeBytes(const char* pData, std::size_t alSize);
 NXBASE_EXPORT std::string DecodeBytes(const char* pData, std::size_t alSize);
+// Decodes `alSize` bytes at `pData` in place (decoding never grows them);
+// returns the decoded length.
+NXBASE_EXPORT std::size_t DecodeInPlace(char* pData, std::size_t alSize);
+
+// The status byte that begins every answer block.
+enum AnswerStatus : signed char { kDone = 0, kRefused = 1, kNotSupported = 2 };
 
 }  // namespace nxbase
 

@@ -95,6 +95,9 @@ class NXBASE_EXPORT MyMemoryBlock {
     // remembered positions are at the start, whatever the source's were.
     MyMemoryBlock(const MyMemoryBlock& axOther);
     MyMemoryBlock& operator=(const MyMemoryBlock& axOther);
+    // Takes the other's storage and positions; the other is left empty.
+    MyMemoryBlock(MyMemoryBlock&& axOther) noexcept;
+    MyMemoryBlock& operator=(MyMemoryBlock&& axOther) noexcept;
     ~MyMemoryBlock();
 
     // Appends `alCount` bytes from `p` at the write position, growing the

@@ -2,17 +2,19 @@
 // Unix stream sockets, on the application's event loop.
 //
 // Every process listens on the socket <runtime dir>/<pipe name of
-// "PipeRequest-" + own name>. A sender opens a channel by connecting there,
-// writing the framed request "<own name>_<pid>" and reading the framed reply
-// "DirectPipe-<name>_<pid>"; from then on the connection carries frames both
-// ways. A frame is a 4-byte little-endian length and a body: sender, 0x00,
-// command, 0x00, and the data block byte-stuffed (so without zero bytes).
-// Reception is driven by the sockets' readiness: no reader thread, no
-// polling. Both ends refuse a peer of another user id before reading a byte.
-// Everything here runs on the thread that runs the event loop.
+// "PipeRequest-" + own name> and holds the lock <socket>.lock while it does.
+// A sender opens a channel by connecting there, writing the framed request
+// "<own name>_<pid>" and reading the framed reply "DirectPipe-<name>_<pid>";
+// from then on the connection carries frames both ways (see nxbase/frame.h)
+// and belongs to the peer named in the handshake: a frame on it that claims
+// another sender is dropped. Connecting, the handshake, reading and writing
+// are driven by the loop; nothing here blocks in a system call. Both ends
+// refuse a peer of another user id before reading a byte. Everything here
+// runs on the thread that runs the event loop.
 #ifndef NXBASE_PIPE_H_
 #define NXBASE_PIPE_H_
 
+#include <chrono>
 #include <cstdint>
 #include <deque>
 #include <functional>
@@ -20,63 +22,42 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <thread>
 
 #include "nxbase/export.h"
+#include "nxbase/frame.h"
 #include "nxbase/veltraevent.h"
 
 class DDE;
 class MyMemoryBlock;
-class PostOfficeApplication;
 class PostOfficeApplications;
 
 namespace nxbase {
 
-// Frames longer than this are malformed.
-constexpr std::uint32_t kMaxFrameLength = 64u << 20;
 // Writes go out in pieces of at most this many bytes.
 constexpr std::size_t kWriteBlockSize = 4096;
 // A channel whose peer lets this much pile up unread is closed.
 constexpr std::size_t kMaxQueuedBytes = 64u << 20;
-
-inline constexpr const char* kPipeRequestPrefix = "PipeRequest-";
-inline constexpr const char* kDirectPipePrefix = "DirectPipe-";
+// Partly read frames of all channels together; beyond it the channel with
+// the largest one is closed.
+constexpr std::size_t kMaxPartialBytes = 256u << 20;
+// A connection must finish its handshake within this time.
+constexpr std::chrono::seconds kHandshakeLimit(5);
+// One Send waits at most this long for a peer it started.
+constexpr std::chrono::seconds kStartLimit(10);
 
 // $NXBASE_RUNTIME_DIR, else $XDG_RUNTIME_DIR/k-lume, else /tmp/k-lume-<uid>.
 NXBASE_EXPORT std::string MessagingRuntimeDirectory();
 // `asBase`, or `asBase` + "_" + $USERNAME when that variable is set.
 NXBASE_EXPORT std::string PipeName(const std::string& asBase);
-// The 4-byte little-endian length of `asBody`, then the body.
-NXBASE_EXPORT std::string EncodeFrame(const std::string& asBody);
-// The body of a message frame; `asEncodedData` is already byte-stuffed.
-NXBASE_EXPORT std::string MessageBody(const std::string& asSender, const std::string& asCommand,
-                                      const std::string& asEncodedData);
-// Splits a message body at its first two zero bytes; false when it lacks them.
-NXBASE_EXPORT bool SplitMessageBody(const std::string& asBody, std::string& asSender,
-                                    std::string& asCommand, std::string& asData);
-
-// Collects bytes as they arrive and hands out whole frame bodies.
-class NXBASE_EXPORT FrameReader {
-  public:
-    enum class Result { kFrame, kNeedMore, kMalformed };
-    void Append(const char* pData, std::size_t alSize);
-    // The next body (frames of length 0 are skipped); kMalformed for a length
-    // above kMaxFrameLength, after which the reader stays malformed.
-    Result Next(std::string& asBody);
-    std::size_t Buffered() const { return amBuffer.size() - amStart; }
-
-  private:
-    std::string amBuffer;
-    std::size_t amStart = 0;
-    bool amMalformed = false;
-};
-
-// Whether a process runs whose executable (/proc/<pid>/exe) has the file
-// name `asExecutable`.
-NXBASE_EXPORT bool IsApplicationRunning(const std::string& asExecutable);
-// Starts the application in its directory with the start line: the
-// executable, "/WM" for "KXALWIN", then "-S", "-LNG" and the country code.
-// The process id, or -1 with errno set.
-NXBASE_EXPORT int StartApplication(const PostOfficeApplication& axApplication, int alCountryCode);
+// The request socket of application `asApp` in this user's runtime directory.
+NXBASE_EXPORT std::string RequestSocketPath(const std::string& asApp);
+// Whether application `asApp` runs for this user: a listener holds the lock
+// of its request socket. Processes of other sessions or users never count.
+NXBASE_EXPORT bool IsApplicationRunning(const std::string& asApp);
+// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT
+// (default 30).
+NXBASE_EXPORT int WaitTimeoutSeconds();
 
 namespace detail {
 struct Channel;
@@ -88,8 +69,8 @@ class NXBASE_EXPORT Pipe {
   public:
     // Creates the process's transport and listens on its request socket.
     // Throws std::runtime_error when another live process listens there or
-    // the name does not fit a socket path; a refused runtime directory is
-    // logged and leaves the transport unable to listen or send.
+    // the name does not fit a socket path. A refused runtime directory does
+    // not throw: GetRefusal() says why, and every Send fails with it.
     static Pipe* CreatePipe(const std::string& asOwnAppName);
     static Pipe* Instance();
     // Closes every channel and the listener.
@@ -105,24 +86,56 @@ class NXBASE_EXPORT Pipe {
     // The applications that may be started when they do not run (kept by the
     // caller, usually the post office); null: none.
     void SetApplications(const PostOfficeApplications* pApplications);
-    // The country code given to started applications.
-    void SetCountryCode(int alCode);
-    // Asked while Send waits for a started application to open its socket;
-    // false gives the wait up (empty: wait the full time).
-    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) { fmStartWaitCheck = std::move(fKeepWaiting); }
     // Whether pipes created from now on listen on their request socket
     // (default yes); a process that is to be reached by DDE only says no.
     static void SetSocketListening(bool abListen);
 
+    // One send of the caller, retries included: at most one start of the
+    // peer, at most kStartLimit (or $NXBASE_WAIT_TIMEOUT, if shorter) of
+    // waiting for it, and `fKeepWaiting` (if set) asked at least every 50 ms
+    // while connecting, handshaking or waiting. Sends outside a scope are
+    // each a scope of their own.
+    class NXBASE_EXPORT SendScope {
+      public:
+        SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting);
+        ~SendScope();
+        SendScope(const SendScope&) = delete;
+        SendScope& operator=(const SendScope&) = delete;
+
+      private:
+        friend class Pipe;
+        Pipe* pmPipe;
+        SendScope* pmOuter;
+        std::function<bool()> fmKeepWaiting;
+        std::chrono::steady_clock::time_point amDeadline;
+        bool amStarted = false;
+        int amStartedPid = -1;
+    };
+
     // Frames and writes one message to `asApp`, opening the channel first and
-    // starting the application when it is registered but not running.
+    // starting the application when it is registered but not running (never
+    // for DISCONNECT). False on failure; GetLastError() then says why.
     bool Send(const std::string& asApp, const std::string& asCommand,
               const MyMemoryBlock& axEncodedData);
+    // The same on the connection a received event came in on
+    // (VELTRAEvent::GetChannel()); false when it is closed.
+    bool SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
+                       const MyMemoryBlock& axEncodedData);
+    // Why the last failed send failed.
+    const std::string& GetLastError() const { return amLastError; }
+    // Why this process cannot use sockets (a refused runtime directory);
+    // empty when it can.
+    const std::string& GetRefusal() const { return amRefusal; }
+
     bool HasChannel(const std::string& asApp) const;
     std::size_t ChannelCount() const { return amAllChannels.size(); }
+    // Bytes of partly read frames over all channels.
+    std::size_t PartialBytes() const { return amPartialBytes; }
     const std::string& GetOwnName() const { return amOwnName; }
     const std::string& GetSocketPath() const { return amSocketPath; }
     bool IsListening() const;
+    // Whether the caller runs on the thread that created the transport.
+    bool IsOwnThread() const { return std::this_thread::get_id() == amThread; }
 
     ~Pipe();
     Pipe(const Pipe&) = delete;
@@ -134,35 +147,50 @@ class NXBASE_EXPORT Pipe {
 
     void Listen();
     void Accept();
-    ChannelPtr OpenChannel(const std::string& asApp);
-    ChannelPtr OpenOrStart(const std::string& asApp);
-    std::function<bool()> fmStartWaitCheck;
+    void AcceptFailed(const std::string& asReason);
+    ChannelPtr ChannelTo(const std::string& asApp);
+    ChannelPtr Connect(const std::string& asApp);
+    bool AwaitHandshake(const ChannelPtr& axChannel);
+    bool Reach(const std::string& asApp, const std::string& asCommand, ChannelPtr& axChannel,
+               bool& abByDde);
+    bool Fail(const std::string& asReason);
+    bool KeepWaiting() const;
     void AddChannel(const ChannelPtr& axChannel);
     void ArmRead(const ChannelPtr& axChannel);
     void OnReadable(const ChannelPtr& axChannel);
+    void LimitPartialFrames();
     void Deliver(const ChannelPtr& axChannel);
-    void HandleBody(const ChannelPtr& axChannel, const std::string& asBody);
+    void HandleBody(const ChannelPtr& axChannel, std::string&& asBody);
+    void HandleHandshake(const ChannelPtr& axChannel, const std::string& asBody);
     bool Write(const ChannelPtr& axChannel, const std::string& asFrame);
+    bool WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
+                      const MyMemoryBlock& axEncodedData);
     void FlushOutgoing(const ChannelPtr& axChannel);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
     bool SendByDde(const std::string& asApp, const std::string& asCommand,
                    const MyMemoryBlock& axEncodedData);
+    bool OnDdeBus(const std::string& asApp);
     std::string OwnRequestText() const;
 
     std::string amOwnName;
     std::string amProcessId;
     std::string amSocketPath;
+    std::string amRefusal;
+    std::string amLastError;
+    std::thread::id amThread;
     int amLockFd = -1;  // held while this process owns its name
     ReceiveFunction fmReceiveFunction = nullptr;
     std::function<void(const std::string&)> fmChannelLost;
     const PostOfficeApplications* pmApplications = nullptr;
-    int amCountryCode = 1;
+    SendScope* pmScope = nullptr;
     struct Listener;
     std::unique_ptr<Listener> pmListener;
-    std::map<std::string, ChannelPtr> amChannels;  // by peer name
-    std::set<ChannelPtr> amAllChannels;            // every open connection
-    std::unique_ptr<DDE> pmDDE;                    // the older transport, for peers on the bus
+    std::map<std::string, ChannelPtr> amChannels;         // by peer name
+    std::map<std::uint64_t, ChannelPtr> amAllChannels;    // every open connection, by id
+    std::uint64_t amNextChannelId = 1;
+    std::size_t amPartialBytes = 0;
+    std::unique_ptr<DDE> pmDDE;  // the older transport, for peers on the bus
 };
 
 #endif  // NXBASE_PIPE_H_

@@ -34,6 +34,13 @@ class NXBASE_EXPORT PostOfficeApplication {
     const std::string& GetPath() const { return amPath; }
     // Path, "/" and executable.
     std::string GetExecutableWithPath() const;
+    // The start line: the executable with its path, "/WM" for "KXALWIN",
+    // then "-S", "-LNG" and `alCountryCode`.
+    std::vector<std::string> StartLine(int alCountryCode) const;
+    // Starts the application in its directory with the start line and the
+    // current language's country code (1 without a language): the process
+    // id, or -1 with `asError` set. The process is reaped when it ends.
+    int Start(std::string& asError) const;
 
   private:
     std::string amId;

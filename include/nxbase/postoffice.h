@@ -18,6 +18,8 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <thread>
+#include <utility>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -49,15 +51,17 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // Sends one message (by number or by command text; a numeric text n is
     // the name of message n, or the answer to n - 1000 from 1000 on). The
     // data block is encoded on the way. Four retries, each after letting the
-    // loop run; `keepTrying` returning false stops early. True on success.
+    // loop run; `keepTrying` returning false stops early, and is also asked
+    // while a peer that was started is awaited (one start per Send, at most
+    // 10 s). True on success; GetLastError() says why a send failed.
     unsigned char Send(const std::string& asApp, PO_Botschaften axMessage, MyMemoryBlock& axData,
                        boost::function<bool()> fKeepTrying = boost::function<bool()>());
     unsigned char Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
                        boost::function<bool()> fKeepTrying = boost::function<bool()>());
     // Sends message `alMessage` and waits, with the loop turning, for its
-    // answer, which then replaces `axReceive`. The wait ends without an
-    // answer when `keepWaiting` returns false (asked on every event and at
-    // least every 50 ms) or when the channel to `asApp` is lost.
+    // answer from `asApp`, which then replaces `axReceive`. The wait ends
+    // without an answer when `keepWaiting` returns false (asked on every
+    // event and at least every 50 ms) or when the channel to `asApp` is lost.
     unsigned char SendAndReceive(const std::string& asApp, int alMessage, MyMemoryBlock& axSend,
                                  MyMemoryBlock& axReceive, boost::function<bool()> fKeepWaiting,
                                  DisEnable axMode = DisEnableNone);
@@ -67,15 +71,20 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // (default 30) and logs it.
     unsigned char SendAndReceive(const std::string& asApp, int alMessage, MyMemoryBlock& axSend,
                                  MyMemoryBlock& axReceive, DisEnable axMode = DisEnableNone);
-    // Answers a received command: "ANSWER!" + its name, back to its sender.
+    // Answers a received command: "ANSWER!" + its name, back to its sender
+    // on the connection the command came in on (no retries: a peer that is
+    // gone does not come back on that connection).
     unsigned char Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData);
 
     // The handler of a message number (unset: the default handler answers);
     // handlers get the VELTRAEvent* as their argument.
     Link ChangeMessageHdl(unsigned int alMessage, Link& axHandler, unsigned char = 0);
     Link GetMessageHdl(unsigned int alMessage) const;
-    // A function called with every received event before the post office
-    // handles it (initially DummyReceiveFunction); returns the old one.
+    // The function the transports deliver every received event to. While it
+    // is DummyReceiveFunction (the start) the post office handles events
+    // itself; another function receives them instead and forwards those the
+    // post office is to handle to CommunicationReceiveFunction (one that
+    // does not forward filters). Returns the old one.
     ReceiveFunction ChangeReceiveFunction(ReceiveFunction fFunction);
     static void DummyReceiveFunction(VELTRAEvent&) {}
 
@@ -102,7 +111,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
 
     void BotschaftenHandler();
     long TimerCallback(void*);
-    // The entry through which the transport delivers every received message.
+    // Handles one received message: protocol messages at once, answers for
+    // whoever waits for them, commands into the queue.
     void CommunicationReceiveFunction(VELTRAEvent& axEvent);
     long DefaultHdl(void* pEvent);
 
@@ -113,6 +123,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     int GetConnectionCount() const { return amConnectionCount; }
     std::size_t GetQueueSize() const { return amCommandQueue.size(); }
     bool IsHandlerBusy() const { return amHandlerBusy; }
+    // Why the last Send or SendAndReceive failed.
+    const std::string& GetLastError() const { return amLastError; }
 
   private:
     explicit PostOffice(const String& asAppName);
@@ -121,9 +133,12 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     unsigned char CheckLock(const String& asSender);
     bool TryOnce(const std::string& asApp, const std::string& asCommand,
                  const MyMemoryBlock& axEncoded);
-    bool TakeAnswer(int alNumber, MyMemoryBlock& axReceive);
+    bool OnOwnThread(const char* asCall);
     void AnswerStatus(VELTRAEvent& axEvent, signed char axStatus);
     void HandleConnect(VELTRAEvent& axEvent);
+    void HandleAnswer(VELTRAEvent& axEvent, int alNumber);
+    bool CountDisconnect(const std::string& asSender);
+    void HandleCommand(VELTRAEvent& axEvent);
     void HandleDisconnectInServer(VELTRAEvent& axEvent);
     void ScheduleHandler();
     void PeerLost(const std::string& asApp);
@@ -133,7 +148,14 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     PostOfficeApplications amApplications;
     FlagSet amFlags;
     std::deque<VELTRAEvent> amCommandQueue;
-    std::map<int, std::deque<MyMemoryBlock>> amAnswers;
+    // Answers awaited by SendAndReceive, by peer and answer number: nothing
+    // else is kept.
+    struct AwaitedAnswer {
+        int waiters = 0;
+        bool arrived = false;
+        MyMemoryBlock data;
+    };
+    std::map<std::pair<std::string, int>, AwaitedAnswer> amAnswers;
     AutoTimer amTimer;
     Timer amQuitTimer;
     String amOwnName;
@@ -147,6 +169,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     std::set<std::string> amLostPeers;  // channels lost since a wait began
     std::map<std::string, int> amConnectedPeers;  // CONNECTs not yet matched, per peer
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
+    std::string amLastError;
+    std::thread::id amThread = std::this_thread::get_id();
 
     static PostOffice* smInstance;
 };

@@ -1,9 +1,11 @@
 // What a transport hands to the post office for every received message: who
 // sent it, the command text (a message name, or "ANSWER!" and a name) and the
-// decoded data block.
+// decoded data block, and which connection it came in on, so that the
+// answer goes back the same way.
 #ifndef NXBASE_VELTRAEVENT_H_
 #define NXBASE_VELTRAEVENT_H_
 
+#include <cstdint>
 #include <string>
 
 #include "nxbase/export.h"
@@ -12,18 +14,25 @@
 class NXBASE_EXPORT VELTRAEvent {
   public:
     VELTRAEvent() = default;
-    VELTRAEvent(std::string asSender, std::string asCommand, MyMemoryBlock axData)
-        : amSender(std::move(asSender)), amCommand(std::move(asCommand)), amData(axData) {}
+    VELTRAEvent(std::string asSender, std::string asCommand, MyMemoryBlock axData,
+                std::uint64_t alChannel = 0)
+        : amSender(std::move(asSender)),
+          amCommand(std::move(asCommand)),
+          amData(std::move(axData)),
+          amChannel(alChannel) {}
 
     const std::string& GetSender() const { return amSender; }
     const std::string& GetCommand() const { return amCommand; }
     MyMemoryBlock& GetData() { return amData; }
     const MyMemoryBlock& GetData() const { return amData; }
+    // The socket connection it came in on (0: none, e.g. from DDE).
+    std::uint64_t GetChannel() const { return amChannel; }
 
   private:
     std::string amSender;
     std::string amCommand;
     MyMemoryBlock amData;
+    std::uint64_t amChannel = 0;
 };
 
 // The plain function through which a transport delivers events.

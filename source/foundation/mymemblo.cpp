@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <utility>
 #include <functional>
 #include <istream>
 #include <limits>
@@ -183,6 +184,24 @@ MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     readPastEnd = false;
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
     Put(axOther.data, axOther.length);
+    return *this;
+}
+
+MyMemoryBlock::MyMemoryBlock(MyMemoryBlock&& axOther) noexcept {
+    *this = std::move(axOther);
+}
+
+MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
+    if (this == &axOther) return *this;
+    delete[] data;
+    data = std::exchange(axOther.data, nullptr);
+    getPointer = std::exchange(axOther.getPointer, nullptr);
+    putPointer = std::exchange(axOther.putPointer, nullptr);
+    rememberedRead = std::exchange(axOther.rememberedRead, nullptr);
+    rememberedWrite = std::exchange(axOther.rememberedWrite, nullptr);
+    length = std::exchange(axOther.length, 0);
+    capacity = std::exchange(axOther.capacity, 0);
+    readPastEnd = std::exchange(axOther.readPastEnd, false);
     return *this;
 }
 

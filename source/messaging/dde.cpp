@@ -17,6 +17,7 @@
 #include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
+#include "toolkit/process.h"
 #include "toolkit/userinterface.h"
 
 namespace nxbase {
@@ -39,9 +40,8 @@ namespace {
 constexpr const char* kLogKey = "Communication";
 constexpr std::size_t kMaxExecuteBytes = 500;
 constexpr auto kCallTimeout = std::chrono::seconds(5);
-constexpr auto kStartWait = std::chrono::seconds(10);
 
-DDE* gThis = nullptr;
+DDE* pThis = nullptr;
 
 void Log(const std::string& asText) {
     LogFile::WriteToLog(String(asText), String(kLogKey));
@@ -69,8 +69,8 @@ struct DDE::Bus {
 };
 
 DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
-    NX_ASSERT(gThis == 0);  // one per process
-    gThis = this;
+    NX_ASSERT(pThis == 0);  // one per process
+    pThis = this;
     if (!SessionBusConfigured()) {
         Log("DDE is off: no session bus");
         return;
@@ -147,11 +147,11 @@ DDE::~DDE() {
         }
     }
     pmBus.reset();
-    if (gThis == this) gThis = nullptr;
+    if (pThis == this) pThis = nullptr;
 }
 
 DDE* DDE::Instance() {
-    return gThis;
+    return pThis;
 }
 
 bool DDE::IsActive() const {
@@ -217,12 +217,12 @@ void DDE::OnPoke(const std::string& asItem, const std::string& asData) {
 }
 
 void DDE::UserEvent(unsigned long, void*) {
-    if (gThis == nullptr || gThis->amEvents.empty()) return;
-    Log("DDE - UserEvent (in Queue:" + std::to_string(gThis->amEvents.size()) + ")");
-    VELTRAEvent event = gThis->amEvents.front();
-    gThis->amEvents.pop_front();
-    NX_ASSERT(gThis->fmReceiveFunction != 0);
-    if (gThis->fmReceiveFunction) gThis->fmReceiveFunction(event);
+    if (pThis == nullptr || pThis->amEvents.empty()) return;
+    Log("DDE - UserEvent (in Queue:" + std::to_string(pThis->amEvents.size()) + ")");
+    VELTRAEvent event = pThis->amEvents.front();
+    pThis->amEvents.pop_front();
+    NX_ASSERT_TEXT(pThis->fmReceiveFunction != 0, "pThis->pReceiveFunction != 0");
+    if (pThis->fmReceiveFunction) pThis->fmReceiveFunction(event);
 }
 
 // Whether the topic's bus name has an owner, asked of the bus itself: a
@@ -264,19 +264,20 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
             return false;
         }
         Log("DDE: WinExec");
-        if (nxbase::StartApplication(pmApplications->GetApplicationInfo(asApp), amCountryCode) < 0) {
-            Log("DDE send abort: cannot start " + asApp);
+        std::string error;
+        int pid = pmApplications->GetApplicationInfo(asApp).Start(error);
+        if (pid < 0) {
+            Log("DDE send abort: " + error);
             return false;
         }
-        auto deadline = std::chrono::steady_clock::now() + kStartWait;
-        bool connected = false;
-        while (!connected && std::chrono::steady_clock::now() < deadline) {
-            Application::Get().RunOneFor(std::chrono::milliseconds(50));
-            connected = Connect(asApp);
-        }
-        if (!connected) {
+        std::string why;
+        auto deadline = std::chrono::steady_clock::now() +
+                        std::min<std::chrono::seconds>(nxbase::kStartLimit,
+                                                       std::chrono::seconds(nxbase::WaitTimeoutSeconds()));
+        if (toolkit::WaitForStartedProcess(pid, [&] { return Connect(asApp); }, fmKeepWaiting, deadline,
+                                           why) != toolkit::StartWait::kReady) {
             Log("DDE send abort: ConversationHandle:0, Topic:" + asApp + ", Service:" +
-                nxbase::kDdeService);
+                nxbase::kDdeService + " (" + why + ")");
             return false;
         }
     }

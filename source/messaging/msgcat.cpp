@@ -138,7 +138,7 @@ const char PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN + 1][kBotschaftNameWidth] = {
     "ENABLE_MULTI_MEASUREMENT",
     "DISABLE_MULTI_MEASUREMENT",
     "GET_ACTIVE_FILTERS",
-    "",
+    "ANZAHL_BOTSCHAFTEN",
 };
 
 namespace nxbase {
@@ -193,18 +193,21 @@ std::string EncodeBytes(const char* pData, std::size_t alSize) {
 }
 
 std::string DecodeBytes(const char* pData, std::size_t alSize) {
-    std::string out;
-    out.reserve(alSize);
+    std::string out(pData, alSize);
+    out.resize(DecodeInPlace(out.data(), out.size()));
+    return out;
+}
+
+std::size_t DecodeInPlace(char* pData, std::size_t alSize) {
+    std::size_t out = 0;
     for (std::size_t i = 0; i < alSize; ++i) {
         char c = pData[i];
-        if (c != '\x01') {
-            out += c;
-            continue;
+        if (c == '\x01') {
+            // A lone 0x01 at the end has no second byte and gives 0x01.
+            c = i + 1 < alSize && pData[i + 1] == '\x0A' ? '\x00' : '\x01';
+            if (i + 1 < alSize) ++i;
         }
-        // A lone 0x01 at the end has no second byte and gives 0x01.
-        bool zero = i + 1 < alSize && pData[i + 1] == '\x0A';
-        out += zero ? '\x00' : '\x01';
-        if (i + 1 < alSize) ++i;
+        pData[out++] = c;
     }
     return out;
 }

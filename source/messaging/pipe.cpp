@@ -1,36 +1,30 @@
 #include "nxbase/pipe.h"
 
 #include <fcntl.h>
-#include <poll.h>
-#include <spawn.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/file.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <boost/asio/local/stream_protocol.hpp>
+#include <boost/asio/steady_timer.hpp>
 #include <cerrno>
-#include <chrono>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <dirent.h>
 #include <fstream>
+#include <optional>
 #include <stdexcept>
-#include <vector>
 
+#include "messaging_log.h"
+#include "nxbase/check.h"
 #include "nxbase/dde.h"
 #include "nxbase/logfile.h"
-#include "messaging_log.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/mymemblo.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
+#include "toolkit/process.h"
 #include "toolkit/system.h"
-
-extern char** environ;
+#include "toolkit/unixsocket.h"
 
 namespace nxbase {
 
@@ -38,10 +32,14 @@ namespace detail {
 
 // One connection to a peer, in both directions.
 struct Channel {
-    explicit Channel(boost::asio::io_context& context) : socket(context) {}
+    enum class Stage { kAwaitingRequest, kAwaitingReply, kOpen };
+    Channel(boost::asio::io_context& context, std::uint64_t alId)
+        : socket(context), timer(context), id(alId) {}
     boost::asio::local::stream_protocol::socket socket;
-    std::string peer;             // the peer's application name, once known
-    bool identified = false;      // the request or the reply has been seen
+    boost::asio::steady_timer timer;  // the handshake's time limit
+    std::uint64_t id;
+    Stage stage = Stage::kAwaitingRequest;
+    std::string peer;  // the peer's application name, once known
     bool closed = false;
     FrameReader reader;
     std::deque<std::string> pending;  // bodies read, not yet delivered
@@ -54,10 +52,16 @@ struct Channel {
 namespace {
 
 using Socket = boost::asio::local::stream_protocol::socket;
+using Stage = detail::Channel::Stage;
 constexpr const char* kLogKey = "Communication";
-constexpr int kReplyTimeoutMs = 5000;
-constexpr auto kStartWait = std::chrono::seconds(10);
 constexpr std::size_t kReadChunk = 64 * 1024;
+constexpr int kReadsPerTurn = 16;
+constexpr int kListenBacklog = 64;
+constexpr auto kLongestPause = std::chrono::milliseconds(50);
+constexpr auto kFirstAcceptPause = std::chrono::milliseconds(100);
+constexpr auto kLongestAcceptPause = std::chrono::milliseconds(1000);
+constexpr int kDefaultWaitTimeoutSeconds = 30;
+const std::string kDisconnect = "DISCONNECT";
 
 Pipe* gPipe = nullptr;
 bool gListen = true;
@@ -66,101 +70,9 @@ void Log(const std::string& asText) {
     LogFile::WriteToLog(String(asText), String(kLogKey));
 }
 
-// The peer's user id is ours: checked before a byte is read or written.
-bool PeerIsSameUser(int fd, std::string& asWhy) {
-    ucred credentials{};
-    socklen_t length = sizeof credentials;
-    if (::getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &length) != 0) {
-        asWhy = std::string("no peer credentials: ") + std::strerror(errno);
-        return false;
-    }
-    if (credentials.uid != ::geteuid()) {
-        asWhy = "peer of user id " + std::to_string(credentials.uid) + " (process " +
-                std::to_string(credentials.pid) + ")";
-        return false;
-    }
-    return true;
-}
-
-bool FillSocketAddress(const std::string& asPath, sockaddr_un& axAddress) {
-    std::memset(&axAddress, 0, sizeof axAddress);
-    axAddress.sun_family = AF_UNIX;
-    if (asPath.size() >= sizeof axAddress.sun_path) return false;
-    std::memcpy(axAddress.sun_path, asPath.c_str(), asPath.size() + 1);
-    return true;
-}
-
-// A blocking connect to a listening socket; -1 when nobody accepts there.
-int ConnectTo(const std::string& asPath) {
-    sockaddr_un address{};
-    if (!FillSocketAddress(asPath, address)) return -1;
-    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0) return -1;
-    if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
-        ::close(fd);
-        return -1;
-    }
-    return fd;
-}
-
-// Writes all bytes of a blocking descriptor in pieces; false on failure.
-bool WriteBlocking(int fd, const std::string& asBytes) {
-    std::size_t done = 0;
-    while (done < asBytes.size()) {
-        std::size_t piece = std::min(kWriteBlockSize, asBytes.size() - done);
-        ssize_t n = ::send(fd, asBytes.data() + done, piece, MSG_NOSIGNAL);
-        if (n < 0 && errno == EINTR) continue;
-        if (n < 0) return false;
-        done += static_cast<std::size_t>(n);
-    }
-    return true;
-}
-
-// Writes `bytes` from `done` on, in pieces, without blocking, until the
-// socket is full; false (errno set) when the connection failed.
-bool SendPieces(int fd, const std::string& bytes, std::size_t& done) {
-    while (done < bytes.size()) {
-        std::size_t piece = std::min(kWriteBlockSize, bytes.size() - done);
-        ssize_t n = ::send(fd, bytes.data() + done, piece, MSG_DONTWAIT | MSG_NOSIGNAL);
-        if (n > 0) {
-            done += static_cast<std::size_t>(n);
-            continue;
-        }
-        if (n < 0 && errno == EINTR) continue;
-        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return true;
-        if (n == 0) errno = EPIPE;
-        return false;
-    }
-    return true;
-}
-
-// Reads one frame from a blocking descriptor within the time-out.
-bool ReadFrameBlocking(int fd, std::string& asBody) {
-    FrameReader reader;
-    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(kReplyTimeoutMs);
-    char buffer[512];
-    while (true) {
-        FrameReader::Result result = reader.Next(asBody);
-        if (result == FrameReader::Result::kFrame) return true;
-        if (result == FrameReader::Result::kMalformed) return false;
-        auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            deadline - std::chrono::steady_clock::now());
-        if (left.count() <= 0) return false;
-        pollfd waiting{fd, POLLIN, 0};
-        int ready = ::poll(&waiting, 1, static_cast<int>(left.count()));
-        if (ready < 0 && errno == EINTR) continue;
-        if (ready <= 0) return false;
-        ssize_t n = ::recv(fd, buffer, sizeof buffer, 0);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        reader.Append(buffer, static_cast<std::size_t>(n));
-    }
-}
-
-// The name part of a request text "<name>_<pid>".
-std::string NameOfRequest(const std::string& asRequest) {
-    std::size_t underscore = asRequest.rfind('_');
-    return underscore == std::string::npos ? asRequest : asRequest.substr(0, underscore);
+// Written whatever the log options: a failure the user must be able to find.
+void LogAlways(const std::string& asText) {
+    LogFile::WriteToLog(String(asText), String());
 }
 
 std::string CommLogPath() {
@@ -169,23 +81,11 @@ std::string CommLogPath() {
     return (slash == std::string::npos ? std::string(".") : log.substr(0, slash)) + "/CommLog.log";
 }
 
-// Children started by this process; collected so that they leave no zombies.
-std::vector<pid_t>& StartedChildren() {
-    static std::vector<pid_t> children;
-    return children;
-}
-
-void ReapStartedChildren() {
-    auto& children = StartedChildren();
-    for (auto at = children.begin(); at != children.end();) {
-        int status = 0;
-        at = ::waitpid(*at, &status, WNOHANG) == 0 ? at + 1 : children.erase(at);
-    }
+bool StartsWith(const std::string& asText, const char* asPrefix) {
+    return asText.compare(0, std::strlen(asPrefix), asPrefix) == 0;
 }
 
 }  // namespace
-
-// ---- frames ----
 
 std::string MessagingRuntimeDirectory() {
     if (const char* own = std::getenv("NXBASE_RUNTIME_DIR"); own && *own) return own;
@@ -200,132 +100,38 @@ std::string PipeName(const std::string& asBase) {
     return user && *user ? asBase + "_" + user : asBase;
 }
 
-std::string EncodeFrame(const std::string& asBody) {
-    std::uint32_t length = static_cast<std::uint32_t>(asBody.size());
-    std::string frame;
-    frame.reserve(4 + asBody.size());
-    for (int i = 0; i < 4; ++i) frame += static_cast<char>((length >> (8 * i)) & 0xFF);
-    frame += asBody;
-    return frame;
+std::string RequestSocketPath(const std::string& asApp) {
+    return MessagingRuntimeDirectory() + "/" + PipeName(kPipeRequestPrefix + asApp);
 }
 
-std::string MessageBody(const std::string& asSender, const std::string& asCommand,
-                        const std::string& asEncodedData) {
-    std::string body;
-    body.reserve(asSender.size() + asCommand.size() + asEncodedData.size() + 2);
-    body += asSender;
-    body += '\0';
-    body += asCommand;
-    body += '\0';
-    body += asEncodedData;
-    return body;
+bool IsApplicationRunning(const std::string& asApp) {
+    return toolkit::Sockets().IsNameLocked(RequestSocketPath(asApp) + ".lock");
 }
 
-bool SplitMessageBody(const std::string& asBody, std::string& asSender, std::string& asCommand,
-                      std::string& asData) {
-    std::size_t first = asBody.find('\0');
-    if (first == std::string::npos) return false;
-    std::size_t second = asBody.find('\0', first + 1);
-    if (second == std::string::npos) return false;
-    asSender = asBody.substr(0, first);
-    asCommand = asBody.substr(first + 1, second - first - 1);
-    asData = asBody.substr(second + 1);
-    return true;
-}
-
-void FrameReader::Append(const char* pData, std::size_t alSize) {
-    if (amStart > 0 && amStart == amBuffer.size()) {
-        amBuffer.clear();
-        amStart = 0;
-    }
-    amBuffer.append(pData, alSize);
-}
-
-FrameReader::Result FrameReader::Next(std::string& asBody) {
-    while (!amMalformed) {
-        if (Buffered() < 4) return Result::kNeedMore;
-        const unsigned char* head = reinterpret_cast<const unsigned char*>(amBuffer.data() + amStart);
-        std::uint32_t length = head[0] | (head[1] << 8) | (head[2] << 16) |
-                               (static_cast<std::uint32_t>(head[3]) << 24);
-        if (length > kMaxFrameLength) {
-            amMalformed = true;
-            break;
-        }
-        if (Buffered() < 4 + static_cast<std::size_t>(length)) return Result::kNeedMore;
-        asBody.assign(amBuffer, amStart + 4, length);
-        amStart += 4 + length;
-        // Keep the buffer from growing without bound behind the read position.
-        if (amStart > (1u << 20) && amStart * 2 > amBuffer.size()) {
-            amBuffer.erase(0, amStart);
-            amStart = 0;
-        }
-        if (length == 0) continue;  // consumed, never delivered
-        return Result::kFrame;
-    }
-    return Result::kMalformed;
-}
-
-// ---- peers' processes ----
-
-bool IsApplicationRunning(const std::string& asExecutable) {
-    DIR* proc = ::opendir("/proc");
-    if (proc == nullptr) return false;
-    bool found = false;
-    char target[4096];
-    while (dirent* entry = ::readdir(proc)) {
-        if (entry->d_name[0] < '0' || entry->d_name[0] > '9') continue;
-        std::string link = std::string("/proc/") + entry->d_name + "/exe";
-        ssize_t n = ::readlink(link.c_str(), target, sizeof target - 1);
-        if (n <= 0) continue;
-        std::string path(target, static_cast<std::size_t>(n));
-        const std::string deleted = " (deleted)";
-        if (path.size() > deleted.size() &&
-            path.compare(path.size() - deleted.size(), deleted.size(), deleted) == 0) {
-            path.erase(path.size() - deleted.size());
-        }
-        if (path.substr(path.rfind('/') + 1) == asExecutable) {
-            found = true;
-            break;
-        }
-    }
-    ::closedir(proc);
-    return found;
-}
-
-int StartApplication(const PostOfficeApplication& axApplication, int alCountryCode) {
-    std::string program = axApplication.GetExecutableWithPath();
-    std::vector<std::string> arguments{program};
-    if (axApplication.GetExecutable() == "KXALWIN") arguments.push_back("/WM");
-    arguments.push_back("-S");
-    arguments.push_back("-LNG");
-    arguments.push_back(std::to_string(alCountryCode));
-    std::vector<char*> argv;
-    for (std::string& argument : arguments) argv.push_back(argument.data());
-    argv.push_back(nullptr);
-
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addchdir_np(&actions, axApplication.GetPath().c_str());
-    pid_t pid = -1;
-    int result = ::posix_spawn(&pid, program.c_str(), &actions, nullptr, argv.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    if (result != 0) {
-        errno = result;
-        return -1;
-    }
-    StartedChildren().push_back(pid);
-    return pid;
+int WaitTimeoutSeconds() {
+    const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
+    if (text == nullptr || *text == '\0') return kDefaultWaitTimeoutSeconds;
+    char* end = nullptr;
+    long seconds = std::strtol(text, &end, 10);
+    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds)
+                                                          : kDefaultWaitTimeoutSeconds;
 }
 
 }  // namespace nxbase
 
-using nxbase::FrameReader;
 using nxbase::detail::Channel;
+using nxbase::Stage;
+using nxbase::FrameReader;
+using nxbase::StartsWith;
 
 struct Pipe::Listener {
-    explicit Listener(boost::asio::io_context& context) : acceptor(context) {}
+    explicit Listener(boost::asio::io_context& context) : acceptor(context), pause(context) {}
     boost::asio::local::stream_protocol::acceptor acceptor;
+    boost::asio::steady_timer pause;  // after a failed accept
+    std::chrono::milliseconds nextPause = nxbase::kFirstAcceptPause;
 };
+
+// ---- creation ----
 
 Pipe* Pipe::CreatePipe(const std::string& asOwnAppName) {
     DeletePipe();
@@ -355,11 +161,6 @@ void Pipe::SetApplications(const PostOfficeApplications* pApplications) {
     if (pmDDE) pmDDE->SetApplications(pApplications);
 }
 
-void Pipe::SetCountryCode(int alCode) {
-    amCountryCode = alCode;
-    if (pmDDE) pmDDE->SetCountryCode(alCode);
-}
-
 Pipe* Pipe::Instance() {
     return nxbase::gPipe;
 }
@@ -370,23 +171,28 @@ void Pipe::DeletePipe() {
 }
 
 Pipe::Pipe(const std::string& asOwnAppName)
-    : amOwnName(asOwnAppName), amProcessId(std::to_string(::getpid())) {}
+    : amOwnName(asOwnAppName),
+      amProcessId(std::to_string(::getpid())),
+      amThread(std::this_thread::get_id()) {}
 
 Pipe::~Pipe() {
     pmDDE.reset();
-    for (const ChannelPtr& channel : std::set<ChannelPtr>(amAllChannels)) {
+    for (const auto& [id, channel] : std::map<std::uint64_t, ChannelPtr>(amAllChannels)) {
         channel->closed = true;
         boost::system::error_code ignored;
+        channel->timer.cancel();
         channel->socket.close(ignored);
     }
     amAllChannels.clear();
     amChannels.clear();
     if (pmListener) {
         boost::system::error_code ignored;
+        pmListener->pause.cancel();
         pmListener->acceptor.close(ignored);
-        if (!amSocketPath.empty()) ::unlink(amSocketPath.c_str());
+        ::unlink(amSocketPath.c_str());
     }
-    if (amLockFd >= 0) ::close(amLockFd);  // the name is free again
+    // The name is free again, and its lock file gone with it.
+    toolkit::Sockets().UnlockName(amLockFd, amSocketPath + ".lock");
 }
 
 std::string Pipe::OwnRequestText() const {
@@ -401,27 +207,22 @@ void Pipe::Listen() {
     std::string directory = nxbase::MessagingRuntimeDirectory();
     std::string refusal = toolkit::EnsurePrivateDirectory(directory);
     if (!refusal.empty()) {
-        nxbase::Log("Pipe: runtime directory refused: " + refusal);
+        amRefusal = "runtime directory refused: " + refusal;
+        nxbase::LogAlways("Pipe: " + amRefusal);
         return;
     }
     amSocketPath = directory + "/" + nxbase::PipeName(nxbase::kPipeRequestPrefix + amOwnName);
-    sockaddr_un address{};
-    if (!nxbase::FillSocketAddress(amSocketPath, address)) {
+    if (amSocketPath.size() >= sizeof(sockaddr_un::sun_path)) {
         throw std::runtime_error("Pipe: socket path too long: " + amSocketPath);
     }
-    // The listener holds a lock on <socket>.lock for its lifetime: of two
+    // The lock on <socket>.lock is held for the listener's lifetime: of two
     // processes starting at once only one gets the name, and a socket left by
     // a process that died (nobody holds the lock) is replaced.
-    std::string lockPath = amSocketPath + ".lock";
-    amLockFd = ::open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+    std::string why;
+    amLockFd = toolkit::Sockets().LockName(amSocketPath + ".lock", why);
     if (amLockFd < 0) {
-        throw std::runtime_error("Pipe: cannot open " + lockPath + ": " + std::strerror(errno));
-    }
-    if (::flock(amLockFd, LOCK_EX | LOCK_NB) != 0) {
-        ::close(amLockFd);
-        amLockFd = -1;
-        throw std::runtime_error("Pipe: " + amOwnName + " is running already (" + amSocketPath +
-                                 ")");
+        throw std::runtime_error("Pipe: " + amOwnName + " " +
+                                 (why == "running already" ? why + " (" + amSocketPath + ")" : why));
     }
     ::unlink(amSocketPath.c_str());
     auto& context = Application::Get().GetContext();
@@ -430,7 +231,7 @@ void Pipe::Listen() {
     boost::asio::local::stream_protocol::endpoint endpoint(amSocketPath);
     pmListener->acceptor.open(endpoint.protocol(), error);
     if (!error) pmListener->acceptor.bind(endpoint, error);
-    if (!error) pmListener->acceptor.listen(64, error);
+    if (!error) pmListener->acceptor.listen(nxbase::kListenBacklog, error);
     if (error) {
         throw std::runtime_error("Pipe: cannot listen on " + amSocketPath + ": " + error.message());
     }
@@ -440,37 +241,61 @@ void Pipe::Listen() {
     Accept();
 }
 
+// ---- accepting ----
+
 void Pipe::Accept() {
-    auto channel = std::make_shared<Channel>(Application::Get().GetContext());
+    auto channel = std::make_shared<Channel>(Application::Get().GetContext(), amNextChannelId++);
     pmListener->acceptor.async_accept(channel->socket, [this, channel](
                                                            const boost::system::error_code& error) {
         if (error == boost::asio::error::operation_aborted) return;
-        if (!error) {
-            std::string why;
-            if (nxbase::PeerIsSameUser(channel->socket.native_handle(), why)) {
-                AddChannel(channel);
-            } else {
-                nxbase::Log("Pipe: connection refused: " + why);
-                boost::system::error_code ignored;
-                channel->socket.close(ignored);
-            }
+        if (error) {
+            AcceptFailed(error.message());
+            return;
         }
-        if (pmListener && pmListener->acceptor.is_open()) Accept();
+        pmListener->nextPause = nxbase::kFirstAcceptPause;
+        std::string why;
+        if (toolkit::Sockets().PeerIsSameUser(channel->socket.native_handle(), why)) {
+            AddChannel(channel);
+        } else {
+            nxbase::Log("Pipe: connection refused: " + why);
+            boost::system::error_code ignored;
+            channel->socket.close(ignored);
+        }
+        if (IsListening()) Accept();
+    });
+}
+
+// Out of descriptors (or another failure that would repeat at once): the
+// connection stays queued; try again after a pause that grows to a second.
+void Pipe::AcceptFailed(const std::string& asReason) {
+    Listener& listener = *pmListener;
+    nxbase::LogAlways("Pipe: accepting a connection failed (" + asReason + "); next try in " +
+                      std::to_string(listener.nextPause.count()) + " ms");
+    listener.pause.expires_after(listener.nextPause);
+    listener.nextPause = std::min(listener.nextPause * 2, nxbase::kLongestAcceptPause);
+    listener.pause.async_wait([this](const boost::system::error_code& error) {
+        if (!error && IsListening()) Accept();
     });
 }
 
 void Pipe::AddChannel(const ChannelPtr& axChannel) {
     boost::system::error_code ignored;
     axChannel->socket.non_blocking(true, ignored);
-    ::fcntl(axChannel->socket.native_handle(), F_SETFD, FD_CLOEXEC);
-    amAllChannels.insert(axChannel);
-    if (axChannel->identified) {
-        auto at = amChannels.find(axChannel->peer);
-        if (at != amChannels.end() && at->second != axChannel) Close(at->second, "replaced");
-        amChannels[axChannel->peer] = axChannel;
+    amAllChannels[axChannel->id] = axChannel;
+    if (axChannel->stage == Stage::kAwaitingRequest) {
+        // A connection that never says who it is must not hold a descriptor for ever.
+        std::weak_ptr<Channel> weak = axChannel;
+        axChannel->timer.expires_after(nxbase::kHandshakeLimit);
+        axChannel->timer.async_wait([this, weak](const boost::system::error_code& error) {
+            ChannelPtr channel = weak.lock();
+            if (error || !channel || channel->stage == Stage::kOpen) return;
+            Close(channel, "no handshake within 5 s");
+        });
     }
     ArmRead(axChannel);
 }
+
+// ---- reading ----
 
 void Pipe::ArmRead(const ChannelPtr& axChannel) {
     axChannel->socket.async_wait(nxbase::Socket::wait_read,
@@ -487,17 +312,21 @@ void Pipe::ArmRead(const ChannelPtr& axChannel) {
 void Pipe::OnReadable(const ChannelPtr& axChannel) {
     char buffer[nxbase::kReadChunk];
     int fd = axChannel->socket.native_handle();
+    std::size_t before = axChannel->reader.Buffered();
     // Take what is there now; the next readiness brings the rest.
-    for (int round = 0; round < 16; ++round) {
-        ssize_t n = ::recv(fd, buffer, sizeof buffer, MSG_DONTWAIT);
+    for (int round = 0; round < nxbase::kReadsPerTurn; ++round) {
+        ssize_t n = toolkit::Sockets().Receive(fd, buffer, sizeof buffer);
         if (n > 0) {
             axChannel->reader.Append(buffer, static_cast<std::size_t>(n));
             if (static_cast<std::size_t>(n) < sizeof buffer) break;
             continue;
         }
-        if (n < 0 && errno == EINTR) continue;
         if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
-        Close(axChannel, n == 0 ? "end of file" : std::strerror(errno));
+        if (n == 0 && axChannel->reader.Buffered() > 0) {
+            Close(axChannel, "malformed frame (end of file inside a frame)");
+        } else {
+            Close(axChannel, n == 0 ? "end of file" : std::strerror(errno));
+        }
         return;
     }
     std::string body;
@@ -510,10 +339,27 @@ void Pipe::OnReadable(const ChannelPtr& axChannel) {
         }
         axChannel->pending.push_back(std::move(body));
     }
+    amPartialBytes = amPartialBytes + axChannel->reader.Buffered() - before;
+    LimitPartialFrames();
+    if (axChannel->closed) return;
     // Read on before delivering: a handler that waits for an answer on this
     // channel must be able to receive it.
     ArmRead(axChannel);
     Deliver(axChannel);
+}
+
+// Many peers each holding most of a large frame would add up without bound.
+void Pipe::LimitPartialFrames() {
+    while (amPartialBytes > nxbase::kMaxPartialBytes) {
+        ChannelPtr largest;
+        for (const auto& [id, channel] : amAllChannels) {
+            if (!largest || channel->reader.Buffered() > largest->reader.Buffered()) largest = channel;
+        }
+        if (!largest) return;
+        Close(largest, "partly read frames of all channels above " +
+                           std::to_string(nxbase::kMaxPartialBytes >> 20) + " MiB; this one holds " +
+                           std::to_string(largest->reader.Buffered()) + " bytes");
+    }
 }
 
 void Pipe::Deliver(const ChannelPtr& axChannel) {
@@ -523,49 +369,81 @@ void Pipe::Deliver(const ChannelPtr& axChannel) {
         std::string body = std::move(axChannel->pending.front());
         axChannel->pending.pop_front();
         Trace("ZQ Pipe::FileIOCompletionRoutine Start:");
-        HandleBody(axChannel, body);
+        HandleBody(axChannel, std::move(body));
         Trace("ZQ Pipe::FileIOCompletionRoutine End:   ");
     }
 }
 
-void Pipe::HandleBody(const ChannelPtr& axChannel, const std::string& asBody) {
-    const std::string prefix = nxbase::kPipeRequestPrefix;
-    if (!axChannel->identified || asBody.compare(0, prefix.size(), prefix) == 0) {
-        // A connection request: on a new connection the body is the request
-        // text; on an existing one it carries the prefix and re-labels it.
-        std::string request =
-            asBody.compare(0, prefix.size(), prefix) == 0 ? asBody.substr(prefix.size()) : asBody;
-        if (request.empty() || request.find('\0') != std::string::npos) {
-            Close(axChannel, "malformed connection request");
+void Pipe::HandleHandshake(const ChannelPtr& axChannel, const std::string& asBody) {
+    std::string peer;
+    if (axChannel->stage == Stage::kAwaitingReply) {
+        // Our request was answered: the peer must be the one we called.
+        if (!StartsWith(asBody, nxbase::kDirectPipePrefix) ||
+            !nxbase::SplitRequest(asBody.substr(std::strlen(nxbase::kDirectPipePrefix)), peer) ||
+            peer != axChannel->peer) {
+            Close(axChannel, "refused connection reply");
             return;
         }
-        std::string peer = nxbase::NameOfRequest(request);
-        if (axChannel->identified && axChannel->peer != peer) {
-            auto at = amChannels.find(axChannel->peer);
-            if (at != amChannels.end() && at->second == axChannel) amChannels.erase(at);
-        }
-        axChannel->peer = peer;
-        axChannel->identified = true;
-        auto at = amChannels.find(peer);
-        if (at != amChannels.end() && at->second != axChannel) Close(at->second, "replaced");
-        amChannels[peer] = axChannel;
-        Write(axChannel, nxbase::EncodeFrame(nxbase::kDirectPipePrefix + OwnRequestText()));
+        axChannel->stage = Stage::kOpen;
         return;
     }
-    std::string sender, command, data;
-    if (!nxbase::SplitMessageBody(asBody, sender, command, data)) {
+    // A connection request: on a new connection the body is the request
+    // text; on an existing one it carries the prefix and re-labels it.
+    std::string request = StartsWith(asBody, nxbase::kPipeRequestPrefix)
+                              ? asBody.substr(std::strlen(nxbase::kPipeRequestPrefix))
+                              : asBody;
+    if (!nxbase::SplitRequest(request, peer)) {
+        Close(axChannel, "malformed connection request");
+        return;
+    }
+    if (axChannel->stage == Stage::kOpen && axChannel->peer != peer) {
+        auto at = amChannels.find(axChannel->peer);
+        if (at != amChannels.end() && at->second == axChannel) amChannels.erase(at);
+    }
+    axChannel->peer = peer;
+    axChannel->stage = Stage::kOpen;
+    axChannel->timer.cancel();
+    auto at = amChannels.find(peer);
+    if (at != amChannels.end() && at->second != axChannel) Close(at->second, "replaced");
+    amChannels[peer] = axChannel;
+    Write(axChannel, nxbase::EncodeFrame(nxbase::kDirectPipePrefix + OwnRequestText()));
+}
+
+void Pipe::HandleBody(const ChannelPtr& axChannel, std::string&& asBody) {
+    if (axChannel->stage != Stage::kOpen || StartsWith(asBody, nxbase::kPipeRequestPrefix)) {
+        HandleHandshake(axChannel, asBody);
+        return;
+    }
+    std::size_t first = asBody.find('\0');
+    std::size_t second = first == std::string::npos ? first : asBody.find('\0', first + 1);
+    if (second == std::string::npos) {
         Close(axChannel, "malformed frame (no sender and command)");
         return;
     }
-    MyMemoryBlock block(static_cast<long>(data.size()));
-    std::string decoded = nxbase::DecodeBytes(data.data(), data.size());
-    block.Put(decoded.data(), static_cast<long>(decoded.size()));
+    std::string sender = asBody.substr(0, first);
+    std::string command = asBody.substr(first + 1, second - first - 1);
+    if (sender != axChannel->peer) {
+        // Answers go back on the channel, so a false name could only be used
+        // to make us call (or answer) somebody else.
+        nxbase::LogAlways("Pipe: frame from " + axChannel->peer + " claims to come from " + sender +
+                          "; dropped");
+        return;
+    }
+    // The data is decoded in place and copied once into its block; the body
+    // is freed before the event is handled, so a frame is never held twice.
+    char* data = asBody.data() + second + 1;
+    std::size_t size = nxbase::DecodeInPlace(data, asBody.size() - second - 1);
+    MyMemoryBlock block(static_cast<long>(size));
+    block.Put(data, static_cast<long>(size));
+    std::string().swap(asBody);
     if (nxbase::detail::CommunicationLogged()) {
         nxbase::Log("Pipe::PollForData <- " + sender + " " + command);
     }
-    VELTRAEvent event(sender, command, block);
+    VELTRAEvent event(std::move(sender), std::move(command), std::move(block), axChannel->id);
     if (fmReceiveFunction != nullptr) fmReceiveFunction(event);
 }
+
+// ---- writing ----
 
 bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     if (axChannel->closed) return false;
@@ -573,28 +451,49 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
         Close(axChannel, "peer does not read (outgoing queue full)");
         return false;
     }
-    if (axChannel->outgoing.empty()) {
-        // The usual case: the socket takes the whole frame at once, no copy.
-        std::size_t done = 0;
-        if (!nxbase::SendPieces(axChannel->socket.native_handle(), asFrame, done)) {
-            Close(axChannel, std::string("write failed: ") + std::strerror(errno));
-            return false;
-        }
-        if (done == asFrame.size()) return true;
-        axChannel->outgoing.assign(asFrame, done, std::string::npos);
-    } else {
+    if (!axChannel->outgoing.empty()) {
         axChannel->outgoing += asFrame;
+        return true;  // goes out behind what waits, when the socket is writable
     }
+    // The usual case: the socket takes the whole frame at once, no copy.
+    std::size_t done = 0;
+    int fd = axChannel->socket.native_handle();
+    while (done < asFrame.size()) {
+        std::size_t piece = std::min(nxbase::kWriteBlockSize, asFrame.size() - done);
+        ssize_t n = toolkit::Sockets().Send(fd, asFrame.data() + done, piece);
+        if (n > 0) {
+            done += static_cast<std::size_t>(n);
+            continue;
+        }
+        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
+        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
+        return false;
+    }
+    if (done == asFrame.size()) return true;
+    axChannel->outgoing.assign(asFrame, done, std::string::npos);
     FlushOutgoing(axChannel);
     return !axChannel->closed;
+}
+
+bool Pipe::WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
+                        const MyMemoryBlock& axEncodedData) {
+    return Write(axChannel, nxbase::MessageFrame(amOwnName, asCommand, axEncodedData.GetDatenZeiger(),
+                                                 static_cast<std::size_t>(axEncodedData.Len())));
 }
 
 void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
     std::string& out = axChannel->outgoing;
     std::size_t done = 0;
-    if (!nxbase::SendPieces(axChannel->socket.native_handle(), out, done)) {
-        out.erase(0, done);
-        Close(axChannel, std::string("write failed: ") + std::strerror(errno));
+    int fd = axChannel->socket.native_handle();
+    while (done < out.size()) {
+        std::size_t piece = std::min(nxbase::kWriteBlockSize, out.size() - done);
+        ssize_t n = toolkit::Sockets().Send(fd, out.data() + done, piece);
+        if (n > 0) {
+            done += static_cast<std::size_t>(n);
+            continue;
+        }
+        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
+        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
         return;
     }
     out.erase(0, done);
@@ -619,36 +518,65 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
     nxbase::Log("Pipe: channel " + (axChannel->peer.empty() ? std::string("(unknown)")
                                                             : axChannel->peer) +
                 " closed: " + asReason);
+    amPartialBytes -= std::min(amPartialBytes, axChannel->reader.Buffered());
     boost::system::error_code ignored;
+    axChannel->timer.cancel();
     axChannel->socket.close(ignored);
-    amAllChannels.erase(axChannel);
+    amAllChannels.erase(axChannel->id);
     bool current = false;
     auto at = amChannels.find(axChannel->peer);
     if (at != amChannels.end() && at->second == axChannel) {
         amChannels.erase(at);
-        current = true;
+        current = axChannel->stage == Stage::kOpen;
     }
-    nxbase::ReapStartedChildren();
+    toolkit::ReapStartedProcesses();
     if (current && fmChannelLost) fmChannelLost(axChannel->peer);
 }
 
-Pipe::ChannelPtr Pipe::OpenChannel(const std::string& asApp) {
-    if (amSocketPath.empty()) return nullptr;  // no usable runtime directory
-    std::string directory = amSocketPath.substr(0, amSocketPath.rfind('/'));
-    std::string path = directory + "/" + nxbase::PipeName(nxbase::kPipeRequestPrefix + asApp);
-    int fd = nxbase::ConnectTo(path);
+// ---- opening channels and starting peers ----
+
+Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting)
+    : pmPipe(pPipe), pmOuter(pPipe ? pPipe->pmScope : nullptr), fmKeepWaiting(std::move(fKeepWaiting)) {
+    auto limit = std::min<std::chrono::seconds>(nxbase::kStartLimit,
+                                                std::chrono::seconds(nxbase::WaitTimeoutSeconds()));
+    amDeadline = std::chrono::steady_clock::now() + limit;
+    if (pmPipe) pmPipe->pmScope = this;
+}
+
+Pipe::SendScope::~SendScope() {
+    if (pmPipe) pmPipe->pmScope = pmOuter;
+}
+
+bool Pipe::KeepWaiting() const {
+    return pmScope == nullptr || !pmScope->fmKeepWaiting || pmScope->fmKeepWaiting();
+}
+
+bool Pipe::Fail(const std::string& asReason) {
+    amLastError = asReason;
+    nxbase::Log("Pipe: " + asReason);
+    return false;
+}
+
+Pipe::ChannelPtr Pipe::ChannelTo(const std::string& asApp) {
+    auto at = amChannels.find(asApp);
+    if (at == amChannels.end() || at->second->closed) return nullptr;
+    ChannelPtr channel = at->second;
+    // Another send may be opening it further up the stack.
+    return channel->stage == Stage::kOpen || AwaitHandshake(channel) ? channel : nullptr;
+}
+
+// Connects without blocking and writes the request; the reply comes through
+// the loop. Null when nobody accepts.
+Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
+    int fd = toolkit::Sockets().Connect(nxbase::RequestSocketPath(asApp));
     if (fd < 0) return nullptr;
-    std::string why, reply;
-    bool ok = nxbase::PeerIsSameUser(fd, why);
-    if (!ok) nxbase::Log("Pipe: refused to talk to " + asApp + ": " + why);
-    ok = ok && nxbase::WriteBlocking(fd, nxbase::EncodeFrame(OwnRequestText())) &&
-         nxbase::ReadFrameBlocking(fd, reply) &&
-         reply.compare(0, std::strlen(nxbase::kDirectPipePrefix), nxbase::kDirectPipePrefix) == 0;
-    if (!ok) {
+    std::string why;
+    if (!toolkit::Sockets().PeerIsSameUser(fd, why)) {
         ::close(fd);
+        Fail("refused to talk to " + asApp + ": " + why);
         return nullptr;
     }
-    auto channel = std::make_shared<Channel>(Application::Get().GetContext());
+    auto channel = std::make_shared<Channel>(Application::Get().GetContext(), amNextChannelId++);
     boost::system::error_code error;
     channel->socket.assign(boost::asio::local::stream_protocol(), fd, error);
     if (error) {
@@ -656,76 +584,104 @@ Pipe::ChannelPtr Pipe::OpenChannel(const std::string& asApp) {
         return nullptr;
     }
     channel->peer = asApp;
-    channel->identified = true;
+    channel->stage = Stage::kAwaitingReply;
+    auto at = amChannels.find(asApp);
+    if (at != amChannels.end()) Close(at->second, "replaced");
+    amChannels[asApp] = channel;
     AddChannel(channel);
-    return channel;
+    if (!Write(channel, nxbase::EncodeFrame(OwnRequestText()))) return nullptr;
+    return AwaitHandshake(channel) ? channel : nullptr;
 }
 
-Pipe::ChannelPtr Pipe::OpenOrStart(const std::string& asApp) {
-    if (ChannelPtr channel = OpenChannel(asApp)) return channel;
-    if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) return nullptr;
+// Runs the loop until the reply came, asking the caller at least every 50 ms.
+bool Pipe::AwaitHandshake(const ChannelPtr& axChannel) {
+    auto deadline = std::chrono::steady_clock::now() + nxbase::kHandshakeLimit;
+    if (pmScope != nullptr) deadline = std::min(deadline, pmScope->amDeadline);
+    while (!axChannel->closed && axChannel->stage != Stage::kOpen) {
+        auto now = std::chrono::steady_clock::now();
+        if (now >= deadline) {
+            Close(axChannel, "no reply to the connection request in time");
+            break;
+        }
+        if (!KeepWaiting()) {
+            Close(axChannel, "the wait for the connection reply was given up");
+            break;
+        }
+        Application::Get().RunOneFor(std::min(
+            nxbase::kLongestPause,
+            std::chrono::duration_cast<std::chrono::milliseconds>(deadline - now) + std::chrono::milliseconds(1)));
+    }
+    if (axChannel->stage == Stage::kOpen && !axChannel->closed) return true;
+    return Fail("no channel to " + axChannel->peer + ": it did not answer the connection request");
+}
+
+bool Pipe::OnDdeBus(const std::string& asApp) {
+    return pmDDE && pmDDE->IsActive() && pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str());
+}
+
+// Finds a way to `asApp`: a channel, or its topic on the bus, starting the
+// application (once per scope) when it is registered and not running.
+bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, ChannelPtr& axChannel,
+                 bool& abByDde) {
+    if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
+    if ((abByDde = OnDdeBus(asApp))) return true;
+    if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
+        return Fail(asApp + " is not running and not registered");
+    }
+    if (asCommand == nxbase::kDisconnect) return Fail(asApp + " is not running (nothing to disconnect)");
+    if (!amRefusal.empty() && !(pmDDE && pmDDE->IsActive())) return Fail(amRefusal);
+    SendScope& scope = *pmScope;
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
-    if (!nxbase::IsApplicationRunning(application.GetExecutable())) {
+    if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
+        scope.amStarted = true;
         nxbase::Log("Pipe: starting " + application.GetExecutableWithPath());
-        if (nxbase::StartApplication(application, amCountryCode) < 0) {
-            nxbase::Log("Pipe: cannot start " + application.GetExecutableWithPath() + ": " +
-                        std::strerror(errno));
-            return nullptr;
-        }
+        std::string error;
+        scope.amStartedPid = application.Start(error);
+        if (scope.amStartedPid < 0) return Fail(error);
     }
-    // Wait for its request socket with a growing pause, the loop turning.
-    auto deadline = std::chrono::steady_clock::now() + nxbase::kStartWait;
-    std::chrono::milliseconds pause(2);
-    while (std::chrono::steady_clock::now() < deadline) {
-        auto until = std::chrono::steady_clock::now() + pause;
-        while (std::chrono::steady_clock::now() < until) {
-            Application::Get().RunOneFor(std::chrono::duration_cast<std::chrono::milliseconds>(
-                until - std::chrono::steady_clock::now()));
-        }
-        if (ChannelPtr channel = OpenChannel(asApp)) return channel;
-        if (fmStartWaitCheck && !fmStartWaitCheck()) return nullptr;
-        // A peer reached by DDE only shows up on the bus instead.
-        if (pmDDE && pmDDE->IsActive() && pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str())) {
-            return nullptr;
-        }
-        pause = std::min(pause * 2, std::chrono::milliseconds(200));
-    }
-    nxbase::Log("Pipe: " + asApp + " did not open its socket in time");
-    return nullptr;
+    std::string why;
+    auto ready = [&] {
+        if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
+        return (abByDde = OnDdeBus(asApp));
+    };
+    auto keepWaiting = [this] { return KeepWaiting(); };
+    toolkit::StartWait result = toolkit::WaitForStartedProcess(scope.amStartedPid, ready, keepWaiting,
+                                                               scope.amDeadline, why);
+    if (result == toolkit::StartWait::kReady) return true;
+    return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() + "): " + why);
 }
 
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 const MyMemoryBlock& axEncodedData) {
+    NX_ASSERT(IsOwnThread());
+    if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
     if (nxbase::detail::CommunicationLogged()) nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
-        return SendByDde(asApp, asCommand, axEncodedData);
+        return SendByDde(asApp, asCommand, axEncodedData) || Fail("DDE send to " + asApp + " failed");
     }
-    ChannelPtr channel;
-    auto at = amChannels.find(asApp);
-    if (at != amChannels.end() && !at->second->closed) {
-        channel = at->second;
-    } else if (!(channel = OpenChannel(asApp)) && pmDDE && pmDDE->IsActive() &&
-               pmDDE->IsAppRunning(nxbase::kDdeService, asApp.c_str())) {
-        // No request socket, but the application owns its topic on the bus.
-        return SendByDde(asApp, asCommand, axEncodedData);
-    } else if (!channel) {
-        channel = OpenOrStart(asApp);
+    std::optional<SendScope> own;
+    if (pmScope == nullptr) own.emplace(this, nullptr);
+    ChannelPtr channel = ChannelTo(asApp);
+    bool byDde = false;
+    if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
+    if (byDde) return SendByDde(asApp, asCommand, axEncodedData) || Fail("DDE send to " + asApp + " failed");
+    return WriteMessage(channel, asCommand, axEncodedData) ||
+           Fail("writing to " + asApp + " failed; the channel is closed");
+}
+
+bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
+                         const MyMemoryBlock& axEncodedData) {
+    NX_ASSERT(IsOwnThread());
+    auto at = amAllChannels.find(alChannel);
+    if (at == amAllChannels.end() || at->second->closed || at->second->stage != Stage::kOpen) {
+        return Fail("the channel the command came in on is closed");
     }
-    if (!channel) return SendByDde(asApp, asCommand, axEncodedData);
-    // The frame built in one piece: length, sender, 0, command, 0, data.
-    std::size_t dataSize = static_cast<std::size_t>(axEncodedData.Len());
-    std::uint32_t length =
-        static_cast<std::uint32_t>(amOwnName.size() + asCommand.size() + 2 + dataSize);
-    std::string frame;
-    frame.reserve(4 + length);
-    for (int i = 0; i < 4; ++i) frame += static_cast<char>((length >> (8 * i)) & 0xFF);
-    frame += amOwnName;
-    frame += '\0';
-    frame += asCommand;
-    frame += '\0';
-    frame.append(axEncodedData.GetDatenZeiger(), dataSize);
-    return Write(channel, frame);
+    if (nxbase::detail::CommunicationLogged()) {
+        nxbase::Log("Pipe::Send -> " + at->second->peer + " " + asCommand);
+    }
+    return WriteMessage(at->second, asCommand, axEncodedData) ||
+           Fail("writing to " + at->second->peer + " failed; the channel is closed");
 }
 
 bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
@@ -738,7 +694,7 @@ bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
 
 bool Pipe::HasChannel(const std::string& asApp) const {
     auto at = amChannels.find(asApp);
-    return at != amChannels.end() && !at->second->closed;
+    return at != amChannels.end() && !at->second->closed && at->second->stage == Stage::kOpen;
 }
 
 void Pipe::Trace(const char* asWhat) {

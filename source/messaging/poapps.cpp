@@ -7,8 +7,10 @@
 #include <cstdlib>
 #include <stdexcept>
 
+#include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/registry.h"
+#include "toolkit/process.h"
 
 namespace {
 
@@ -54,6 +56,20 @@ PostOfficeApplication::PostOfficeApplication(const std::string& asId, const std:
 
 std::string PostOfficeApplication::GetExecutableWithPath() const {
     return amPath + "/" + amExecutable;
+}
+
+std::vector<std::string> PostOfficeApplication::StartLine(int alCountryCode) const {
+    std::vector<std::string> line{GetExecutableWithPath()};
+    if (amExecutable == "KXALWIN") line.push_back("/WM");
+    line.push_back("-S");
+    line.push_back("-LNG");
+    line.push_back(std::to_string(alCountryCode));
+    return line;
+}
+
+int PostOfficeApplication::Start(std::string& asError) const {
+    int country = Language::IsInitialized() ? static_cast<int>(Language::Instance()->GetCountryCode()) : 1;
+    return toolkit::SpawnProcess(StartLine(country), amPath, asError);
 }
 
 PostOfficeApplications::PostOfficeApplications(const std::string& asOwnAppName) {

@@ -6,11 +6,14 @@
 #include <stdexcept>
 
 #include "nxbase/applock.h"
+#include "nxbase/check.h"
+#include "nxbase/dde.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/text.h"
 #include "messaging_log.h"
+#include "toolkit/process.h"
 #include "toolkit/userinterface.h"
 
 PostOffice* PostOffice::smInstance = nullptr;
@@ -22,7 +25,6 @@ constexpr unsigned long kTickMs = 100;
 constexpr int kMaxRetries = 4;
 constexpr auto kLongestPause = std::chrono::milliseconds(50);
 constexpr auto kAbortDialogAfter = std::chrono::milliseconds(6000);
-constexpr int kDefaultWaitTimeoutSeconds = 30;
 
 void Log(const String& asText) {
     LogFile::WriteToLog(asText, String(kLogKey));
@@ -36,16 +38,6 @@ void Log(const String& asText) {
 
 String Number(long alValue) {
     return String::CreateFromInt(alValue);
-}
-
-// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT.
-int WaitTimeoutSeconds() {
-    const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
-    if (text == nullptr || *text == '\0') return kDefaultWaitTimeoutSeconds;
-    char* end = nullptr;
-    long seconds = std::strtol(text, &end, 10);
-    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds)
-                                                          : kDefaultWaitTimeoutSeconds;
 }
 
 String TextOr(const char* asGroup, unsigned long alIndex, const char* asFallback) {
@@ -83,7 +75,6 @@ PostOffice::PostOffice(const String& asAppName)
     smInstance = this;
     pipe->SetReceiveFunction(&PostOffice::TransportReceive);
     pipe->SetApplications(&amApplications);
-    if (Language::IsInitialized()) pipe->SetCountryCode(Language::Instance()->GetCountryCode());
     std::weak_ptr<bool> alive = amAlive;
     pipe->SetChannelLostFunction([this, alive](const std::string& asApp) {
         if (alive.lock()) PeerLost(asApp);
@@ -102,8 +93,15 @@ PostOffice::~PostOffice() {
     if (smInstance == this) smInstance = nullptr;
 }
 
+// The transports deliver here: to the installed receive function, or to the
+// post office itself while none is installed.
 void PostOffice::TransportReceive(VELTRAEvent& axEvent) {
-    if (smInstance != nullptr) smInstance->CommunicationReceiveFunction(axEvent);
+    if (smInstance == nullptr) return;
+    if (smInstance->fmReceiveFunction == &PostOffice::DummyReceiveFunction) {
+        smInstance->CommunicationReceiveFunction(axEvent);
+    } else {
+        smInstance->fmReceiveFunction(axEvent);
+    }
 }
 
 bool PostOffice::IsLPMServer() const {
@@ -149,8 +147,6 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         scope.emplace(String("PostOffice CommunicationReceive (Message Nr: ") + Number(number),
                       String(kLogKey));
     }
-    fmReceiveFunction(axEvent);
-    const String sender(axEvent.GetSender());
     if (number == -1) {
         // An unknown answer is dropped: answering it would start an endless
         // exchange of answers to answers between two post offices.
@@ -158,27 +154,58 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
             NX_COMM_LOG(String("Unknown answer dropped: ") + String(axEvent.GetCommand()));
             return;
         }
-        AnswerStatus(axEvent, 1);
+        AnswerStatus(axEvent, nxbase::kRefused);
         return;
     }
     if (number >= kAnswerOffset) {
-        NX_COMM_LOG(String("Answer received: ") + Number(number));
-        amAnswers[number].push_back(axEvent.GetData());
-        NX_COMM_LOG(String("MessageQueue - Insert message") + ", Queue size: " +
-            Number(static_cast<long>(amAnswers[number].size())));
+        HandleAnswer(axEvent, number);
         return;
     }
     if (number == CONNECT) {
         HandleConnect(axEvent);
         return;
     }
-    if (number == DISCONNECT) {
-        --amConnectionCount;
-        if (--amConnectedPeers[sender.str()] <= 0) amConnectedPeers.erase(sender.str());
+    if (number == DISCONNECT && !CountDisconnect(axEvent.GetSender()) && IsLPMServer()) return;
+    HandleCommand(axEvent);
+}
+
+// An answer counts only for a SendAndReceive waiting for it from its sender;
+// anything else would pile up for ever.
+void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
+    NX_COMM_LOG(String("Answer received: ") + Number(alNumber));
+    auto at = amAnswers.find({axEvent.GetSender(), alNumber});
+    if (at == amAnswers.end() || at->second.waiters == 0 || at->second.arrived) {
+        LogFile::WriteToLog(String("Answer nobody waits for dropped: ") + String(axEvent.GetCommand()) +
+                                " from " + String(axEvent.GetSender()),
+                            String(kLogKey));
+        return;
     }
+    at->second.data = std::move(axEvent.GetData());
+    at->second.arrived = true;
+    NX_COMM_LOG(String("MessageQueue - Insert message") + ", Queue size: 1");
+}
+
+// Counts a DISCONNECT against its sender's CONNECTs; false (logged) for one
+// that has none outstanding, which then changes nothing.
+bool PostOffice::CountDisconnect(const std::string& asSender) {
+    auto at = amConnectedPeers.find(asSender);
+    if (at == amConnectedPeers.end()) {
+        LogFile::WriteToLog(String("Disconnect from ") + String(asSender) +
+                                " ignored: it has no connection",
+                            String(kLogKey));
+        return false;
+    }
+    --amConnectionCount;
+    if (--at->second <= 0) amConnectedPeers.erase(at);
+    return true;
+}
+
+void PostOffice::HandleCommand(VELTRAEvent& axEvent) {
+    int number = NumberOfCommand(axEvent);
+    const String sender(axEvent.GetSender());
     if (!CheckLock(sender)) {
         NX_COMM_LOG("Check lock failed");
-        AnswerStatus(axEvent, 1);
+        AnswerStatus(axEvent, nxbase::kRefused);
         return;
     }
     if (number == LOCK) {
@@ -206,7 +233,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
         amLockOwner = "0";
     }
     NX_COMM_LOG("Command received");
-    amCommandQueue.push_back(axEvent);
+    amCommandQueue.push_back(std::move(axEvent));
     BotschaftenHandler();
 }
 
@@ -279,6 +306,7 @@ void PostOffice::CloseWhenUnused() {
 // ---- handling queued commands ----
 
 long PostOffice::TimerCallback(void*) {
+    toolkit::ReapStartedProcesses();
     ScheduleHandler();
     return 0;
 }
@@ -305,13 +333,19 @@ void PostOffice::BotschaftenHandler() {
     ApplicationLockHolder lock("Botschaften handler");
     bool locked = lock.Lock();
     if (amHandlerBusy) return;
-    if (!locked && String(amCommandQueue.front().GetSender()) != amLockOwner) return;
     // Only what was queued before this pass: a command that arrives while a
-    // handler runs waits for the next tick.
+    // handler runs waits for the next tick. While a peer holds the lock its
+    // commands are handled wherever they stand, so that it can finish its
+    // conversation; the others keep their places until UNLOCK.
+    std::deque<VELTRAEvent> waiting;
     for (std::size_t count = amCommandQueue.size(); count > 0 && !amCommandQueue.empty();
          --count) {
         VELTRAEvent event = std::move(amCommandQueue.front());
         amCommandQueue.pop_front();
+        if (!locked && String(event.GetSender()) != amLockOwner) {
+            waiting.push_back(std::move(event));
+            continue;
+        }
         NX_COMM_LOG(String("Botschaften Handler - Handling Message: ") + String(event.GetCommand()));
         amHandlerBusy = true;
         int number = NumberOfCommand(event);
@@ -320,17 +354,21 @@ void PostOffice::BotschaftenHandler() {
         handler.Call(&event);
         amHandlerBusy = false;
     }
+    while (!waiting.empty()) {
+        amCommandQueue.push_front(std::move(waiting.back()));
+        waiting.pop_back();
+    }
 }
 
 long PostOffice::DefaultHdl(void* pEvent) {
     auto* event = static_cast<VELTRAEvent*>(pEvent);
     int number = NumberOfCommand(*event);
-    signed char status = 0;
+    signed char status = nxbase::kDone;
     if (number >= 0 && number <= UNLOCK) {
         NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number));
     } else {
         NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number) + " not supported");
-        status = 2;
+        status = nxbase::kNotSupported;
     }
     MyMemoryBlock answer;
     answer << status;
@@ -351,8 +389,31 @@ void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     NX_COMM_LOG(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
     String command = String(kAnswerPrefix) + String(pCommand->GetCommand());
-    MyMemoryBlock copy = axData;
-    return Send(pCommand->GetSender(), command, copy);
+    if (pCommand->GetChannel() == 0) {
+        MyMemoryBlock copy = axData;
+        return Send(pCommand->GetSender(), command, copy);
+    }
+    if (!OnOwnThread("Answer")) return false;
+    MyMemoryBlock encoded = axData;
+    Encode(encoded);
+    Pipe* pipe = Pipe::Instance();
+    if (pipe != nullptr && pipe->SendOnChannel(pCommand->GetChannel(), command.str(), encoded)) {
+        NX_COMM_LOG(String("Sent: ") + command);
+        return true;
+    }
+    amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
+    LogFile::WriteToLog(String("Answer to ") + String(pCommand->GetSender()) + " failed: " +
+                            String(amLastError),
+                        String(kLogKey));
+    return false;
+}
+
+// Messaging belongs to the thread that runs the event loop.
+bool PostOffice::OnOwnThread(const char* asCall) {
+    if (std::this_thread::get_id() == amThread) return true;
+    NX_ASSERT_TEXT(false, "PostOffice used from another thread than its event loop's");
+    amLastError = std::string(asCall) + " called from another thread than the event loop's";
+    return false;
 }
 
 unsigned char PostOffice::Send(const std::string& asApp, PO_Botschaften axMessage,
@@ -364,38 +425,28 @@ unsigned char PostOffice::Send(const std::string& asApp, PO_Botschaften axMessag
 bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
                          const MyMemoryBlock& axEncoded) {
     Pipe* pipe = Pipe::Instance();
-    return pipe != nullptr && pipe->Send(asApp, asCommand, axEncoded);
+    if (pipe != nullptr && pipe->Send(asApp, asCommand, axEncoded)) return true;
+    amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
+    return false;
 }
-
-namespace {
-// The caller's keep-trying function asked while the pipe waits for a peer
-// it started, for the duration of one Send.
-class StartWaitCheck {
-public:
-    explicit StartWaitCheck(const boost::function<bool()>& check) : pPipe(Pipe::Instance()) {
-        if (pPipe && check) pPipe->SetStartWaitCheck([check] { return check(); });
-    }
-    ~StartWaitCheck() {
-        if (pPipe) pPipe->SetStartWaitCheck({});
-    }
-    StartWaitCheck(const StartWaitCheck&) = delete;
-    StartWaitCheck& operator=(const StartWaitCheck&) = delete;
-
-private:
-    Pipe* pPipe;
-};
-}  // namespace
 
 unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
                                boost::function<bool()> fKeepTrying) {
+    if (!OnOwnThread("Send")) return false;
     std::string command = asCommand.str();
     if (asCommand.IsNumeric()) command = nxbase::CommandTextOfNumber(std::atoi(command.c_str()));
     MyMemoryBlock encoded = axData;
     Encode(encoded);
-    const StartWaitCheck startWait(fKeepTrying);
+    // One start of the peer and one bounded wait for it, retries included.
+    std::function<bool()> keepTrying;
+    if (fKeepTrying) keepTrying = [fKeepTrying] { return fKeepTrying(); };
+    Pipe::SendScope scope(Pipe::Instance(), keepTrying);
+    DDE* dde = DDE::Instance();
+    if (dde != nullptr) dde->SetStartWaitCheck(keepTrying);
     for (int retries = 0;;) {
         if (TryOnce(asApp, command, encoded)) {
             NX_COMM_LOG(String("Sent: ") + String(command));
+            if (dde != nullptr) dde->SetStartWaitCheck({});
             return true;
         }
         ++retries;
@@ -407,20 +458,14 @@ unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMe
             UserInterface::Current()->Beep(5000, 200);
             UserInterface::Current()->Beep(1000, 200);
         }
-        if (retries > kMaxRetries) return false;
-        if (fKeepTrying && !fKeepTrying()) return false;
+        if (retries > kMaxRetries || (fKeepTrying && !fKeepTrying())) {
+            LogFile::WriteToLog(String("Send ") + String(command) + " to " + String(asApp) +
+                                    " failed: " + String(amLastError),
+                                String(kLogKey));
+            if (dde != nullptr) dde->SetStartWaitCheck({});
+            return false;
+        }
     }
-}
-
-bool PostOffice::TakeAnswer(int alNumber, MyMemoryBlock& axReceive) {
-    auto at = amAnswers.find(alNumber);
-    if (at == amAnswers.end() || at->second.empty()) return false;
-    axReceive = at->second.front();
-    NX_COMM_LOG("MessageQueue - Get data from message");
-    at->second.pop_front();
-    if (at->second.empty()) amAnswers.erase(at);
-    NX_COMM_LOG("MessageQueue - Erased message");
-    return true;
 }
 
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
@@ -434,8 +479,14 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     bool touchWindow = axMode != DisEnableNone && ui->HasTopWindow();
     bool wasEnabled = touchWindow && ui->IsTopWindowEnabled();
     if (touchWindow) ui->EnableTopWindow(false);
-    int answerNumber = kAnswerOffset + alMessage;
-    amAnswers.erase(answerNumber);  // a late answer to an abandoned wait is stale
+    if (!OnOwnThread("SendAndReceive")) {
+        if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
+        return false;
+    }
+    // Registered before sending: the answer may come while the send waits.
+    const std::pair<std::string, int> key(asApp, kAnswerOffset + alMessage);
+    AwaitedAnswer& awaited = amAnswers[key];
+    ++awaited.waiters;
     amLostPeers.erase(asApp);
     String command = Number(alMessage);
     bool answered = false;
@@ -449,17 +500,28 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
             waiting.emplace(String("WaitForAnswer"), String(kLogKey));
         }
         while (true) {
-            if (TakeAnswer(answerNumber, axReceive)) {
+            if (awaited.arrived) {
+                axReceive = std::move(awaited.data);
+                awaited.arrived = false;
+                NX_COMM_LOG("MessageQueue - Get data from message");
+                NX_COMM_LOG("MessageQueue - Erased message");
                 answered = true;
                 break;
             }
-            if (amLostPeers.count(asApp) > 0) break;  // the peer is gone
-            if (fKeepWaiting && !fKeepWaiting()) break;
+            if (amLostPeers.count(asApp) > 0) {
+                amLastError = "the channel to " + asApp + " was lost";
+                break;
+            }
+            if (fKeepWaiting && !fKeepWaiting()) {
+                amLastError = "no answer from " + asApp + "; the wait was given up";
+                break;
+            }
             Application::Get().RunOneFor(kLongestPause);
         }
         NX_COMM_LOG(answered ? String("Answer received: ") + Number(alMessage)
                      : String("SendAndReceive, Abort"));
     }
+    if (--awaited.waiters == 0) amAnswers.erase(key);
     if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
     return answered;
 }
@@ -468,7 +530,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
                                          DisEnable axMode) {
     auto start = std::chrono::steady_clock::now();
-    auto limit = std::chrono::seconds(WaitTimeoutSeconds());
+    auto limit = std::chrono::seconds(nxbase::WaitTimeoutSeconds());
     bool toServer = PostOfficeApplications::IsServerName(asApp);
     if (!toServer) NX_COMM_LOG("Set callback function");
     bool dialogOpen = false;

@@ -1,0 +1,133 @@
+#include "toolkit/process.h"
+
+#include <spawn.h>
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <map>
+
+#include "toolkit/application.h"
+
+extern char** environ;
+
+namespace toolkit {
+
+namespace {
+
+// Started processes still running (value empty) or ended (how).
+std::map<pid_t, std::string>& Started() {
+    static std::map<pid_t, std::string> started;
+    return started;
+}
+
+std::string DescribeStatus(int status) {
+    if (WIFEXITED(status)) return "exited with status " + std::to_string(WEXITSTATUS(status));
+    if (WIFSIGNALED(status)) return "killed by signal " + std::to_string(WTERMSIG(status));
+    return "ended";
+}
+
+// Ended processes are remembered for a while so that a waiter can say how
+// they ended; the oldest are forgotten first.
+constexpr std::size_t kEndedKept = 64;
+
+void Forget() {
+    auto& started = Started();
+    std::size_t ended = 0;
+    for (const auto& entry : started) ended += entry.second.empty() ? 0 : 1;
+    for (auto at = started.begin(); ended > kEndedKept && at != started.end();) {
+        if (at->second.empty()) {
+            ++at;
+            continue;
+        }
+        at = started.erase(at);
+        --ended;
+    }
+}
+
+}  // namespace
+
+pid_t SpawnProcess(const std::vector<std::string>& arguments, const std::string& directory,
+                   std::string& error) {
+    if (arguments.empty()) {
+        error = "nothing to start";
+        return -1;
+    }
+    std::vector<std::string> copies(arguments);
+    std::vector<char*> argv;
+    for (std::string& argument : copies) argv.push_back(argument.data());
+    argv.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    if (!directory.empty()) posix_spawn_file_actions_addchdir_np(&actions, directory.c_str());
+    pid_t pid = -1;
+    int result = ::posix_spawn(&pid, copies[0].c_str(), &actions, nullptr, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    if (result != 0) {
+        error = "cannot start " + copies[0] + ": " + std::strerror(result);
+        return -1;
+    }
+    ReapStartedProcesses();
+    Started()[pid] = std::string();
+    return pid;
+}
+
+void ReapStartedProcesses() {
+    for (auto& [pid, how] : Started()) {
+        if (!how.empty()) continue;
+        int status = 0;
+        pid_t result = ::waitpid(pid, &status, WNOHANG);
+        if (result == pid) how = DescribeStatus(status);
+        if (result < 0 && errno == ECHILD) how = "ended";
+    }
+    Forget();
+}
+
+bool StartedProcessEnded(pid_t pid, std::string& status) {
+    ReapStartedProcesses();
+    auto at = Started().find(pid);
+    if (at == Started().end()) {
+        status = "ended";
+        return true;
+    }
+    status = at->second;
+    return !status.empty();
+}
+
+StartWait WaitForStartedProcess(pid_t pid, const std::function<bool()>& ready,
+                                const std::function<bool()>& keepWaiting,
+                                std::chrono::steady_clock::time_point deadline, std::string& why) {
+    using namespace std::chrono;
+    constexpr milliseconds kLongestPause(50);
+    milliseconds pause(2);
+    auto nextTry = steady_clock::now();
+    while (true) {
+        auto now = steady_clock::now();
+        if (now >= nextTry) {
+            if (ready()) return StartWait::kReady;
+            nextTry = now + pause;
+            pause = std::min(pause * 2, kLongestPause);
+        }
+        std::string status;
+        if (pid > 0 && StartedProcessEnded(pid, status)) {
+            // It may have handed over to a process that is now reachable.
+            if (ready()) return StartWait::kReady;
+            why = "it " + status;
+            return StartWait::kExited;
+        }
+        if (keepWaiting && !keepWaiting()) {
+            why = "the wait was given up";
+            return StartWait::kGivenUp;
+        }
+        if (now >= deadline) {
+            why = "it did not become reachable in time";
+            return StartWait::kTimedOut;
+        }
+        auto until = std::min({nextTry, deadline, now + kLongestPause});
+        auto left = duration_cast<milliseconds>(until - now) + milliseconds(1);
+        Application::Get().RunOneFor(left);
+    }
+}
+
+}  // namespace toolkit
