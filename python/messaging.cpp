@@ -124,8 +124,8 @@ public:
         }
         waiter.RaiseIfInterrupted();
         if (!sent) {
-            throw std::runtime_error("no answer from " + target + " to " + nxbase::MessageName(number) + " within " +
-                                     std::to_string(timeout) + " s");
+            throw std::runtime_error("no answer from " + target + " to " + nxbase::MessageName(number) + ": " +
+                                     pOffice->GetLastError());
         }
         const char* data = answer.GetDatenZeiger();
         const long length = answer.Len();

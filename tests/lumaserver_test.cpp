@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <cmath>
+#include <fstream>
 #include <cstring>
 #include <algorithm>
 #include <filesystem>
@@ -16,6 +17,7 @@
 #include <sstream>
 #include <thread>
 
+#include "nxbase/lumaclient.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
@@ -216,6 +218,15 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     ASSERT_TRUE(RunUntil([&] { return notices.received.size() >= 3; }));
     // Consecutive patches.
     EXPECT_EQ((notices.received[1].second - notices.received[0].second + 24) % 24, 1);
+    // A measurement by the same application connects and disconnects once:
+    // the subscriber's own CONNECT keeps the server and its notices.
+    std::vector<nxbase::MeasuredSpectrum> measured;
+    std::string error;
+    ASSERT_TRUE(nxbase::MeasureWithLumaServer(*office, 1, &measured, &error)) << error;
+    std::size_t before = notices.received.size();
+    RunUntil([] { return false; }, 1500ms);
+    EXPECT_TRUE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_GT(notices.received.size(), before + 5);
 }
 
 TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
@@ -260,6 +271,154 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
     // The emulator measures the built-in chart: dark skin's values, to the
     // 1e-5 the server's integers keep.
     EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos) << output;
+}
+
+// The server's highest resident memory so far, in KiB.
+long HighWaterKiB(pid_t pid) {
+    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+    for (std::string line; std::getline(status, line);) {
+        if (line.rfind("VmHWM:", 0) == 0) return std::stol(line.substr(6));
+    }
+    return -1;
+}
+
+// A blocking client on the server's socket, handshake done.
+int RawClient(const std::string& name) {
+    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
+    if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return -1;
+    std::string request = nxbase::EncodeFrame(name + "_1");
+    if (::send(fd, request.data(), request.size(), MSG_NOSIGNAL) < 0) return -1;
+    char reply[256];
+    if (::recv(fd, reply, sizeof reply, 0) <= 4) return -1;
+    return fd;
+}
+
+bool SendAll(int fd, const std::string& bytes) {
+    for (std::size_t done = 0; done < bytes.size();) {
+        ssize_t n = ::send(fd, bytes.data() + done, bytes.size() - done, MSG_NOSIGNAL);
+        if (n <= 0) return false;
+        done += static_cast<std::size_t>(n);
+    }
+    return true;
+}
+
+TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) {
+    pid_t server = ::fork();
+    if (server == 0) {
+        std::string program = root + "/bin/" + serverExecutable;
+        ::execl(program.c_str(), program.c_str(), nullptr);
+        ::_exit(127);
+    }
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    long base = HighWaterKiB(server);
+    // One legal message just under the limit, with no byte to stuff.
+    int client = RawClient("Large");
+    ASSERT_GE(client, 0);
+    std::string body = nxbase::MessageBody("Large", "GET_DEVICE_TYPE", std::string(nxbase::kMaxFrameLength - 32, 'a'));
+    ASSERT_TRUE(SendAll(client, nxbase::EncodeFrame(body)));
+    body.clear();
+    body.shrink_to_fit();
+    char answer[64];
+    ASSERT_GT(::recv(client, answer, sizeof answer, 0), 4);
+    ::close(client);
+    long once = HighWaterKiB(server) - base;
+    EXPECT_LT(once, 160 * 1024) << "KiB for one 64 MiB message";
+
+    // Eight peers each stop inside a 64 MiB frame after 63 MiB: the server
+    // closes channels rather than hold all of it, and serves the others.
+    std::vector<pid_t> peers;
+    for (int i = 0; i < 8; ++i) {
+        pid_t peer = ::fork();
+        if (peer == 0) {
+            int fd = RawClient("Partial" + std::to_string(i));
+            std::string head = nxbase::EncodeFrame(std::string()).substr(0, 0);
+            std::uint32_t length = nxbase::kMaxFrameLength;
+            head.append(reinterpret_cast<const char*>(&length), 4);  // little-endian host
+            bool sent = fd >= 0 && SendAll(fd, head) && SendAll(fd, std::string(63u << 20, 'p'));
+            char byte;
+            while (sent && ::recv(fd, &byte, 1, 0) > 0) {
+            }
+            ::_exit(0);  // closed by the server
+        }
+        peers.push_back(peer);
+    }
+    std::size_t ended = 0;
+    RunUntil([&] {
+        for (pid_t& peer : peers) {
+            if (peer > 0 && ::waitpid(peer, nullptr, WNOHANG) == peer) {
+                peer = -1;
+                ++ended;
+            }
+        }
+        return ended >= 4;
+    }, 30s);
+    EXPECT_GE(ended, 4u);
+    EXPECT_LT(HighWaterKiB(server) - base, 400 * 1024) << "KiB with eight partial frames";
+    int other = RawClient("Other");
+    ASSERT_GE(other, 0);
+    auto start = std::chrono::steady_clock::now();
+    ASSERT_TRUE(SendAll(other, nxbase::EncodeFrame(nxbase::MessageBody("Other", "GET_DEVICE_TYPE", ""))));
+    EXPECT_GT(::recv(other, answer, sizeof answer, 0), 4);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
+    ::close(other);
+    for (pid_t peer : peers) {
+        if (peer > 0) ::kill(peer, SIGKILL), ::waitpid(peer, nullptr, 0);
+    }
+    ::kill(server, SIGTERM);
+    ::waitpid(server, nullptr, 0);
+}
+
+TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePerSend) {
+    // A process of the server's name elsewhere does not count as the server.
+    std::filesystem::create_directories(root + "/decoy");
+    std::filesystem::copy_file("/bin/sleep", root + "/decoy/" + serverExecutable);
+    pid_t decoy = ::fork();
+    if (decoy == 0) {
+        std::string program = root + "/decoy/" + serverExecutable;
+        ::execl(program.c_str(), program.c_str(), "30", nullptr);
+        ::_exit(127);
+    }
+    PostOffice::CreatePostOffice("Tester");
+    Connect();
+    EXPECT_TRUE(nxbase::IsApplicationRunning("LumaServer"));
+    MyMemoryBlock none;
+    PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);
+    ASSERT_TRUE(RunUntil([] { return !nxbase::IsApplicationRunning("LumaServer"); }, 5s));
+    ::kill(decoy, SIGKILL);
+    ::waitpid(decoy, nullptr, 0);
+    // DISCONNECT never starts a server.
+    EXPECT_FALSE(PostOffice::Instance()->Send("LumaServer", DISCONNECT, none));
+    EXPECT_FALSE(nxbase::IsApplicationRunning("LumaServer"));
+
+    // A wrapper script as the registered executable is started once.
+    auto reRegister = [&](const std::string& script) {
+        std::string path = root + "/bin/wrapper.sh";
+        nxtest::WriteFile(path, "#!/bin/sh\necho started >> " + root + "/starts\n" + script + "\n");
+        ::chmod(path.c_str(), 0755);
+        sandbox.Register("Software\\K-Lume\\LumaServer", "Executable", path);
+        NxSingleton::DeleteAllSingleton();
+        PostOffice::CreatePostOffice("Tester");
+    };
+    reRegister("exec " + root + "/bin/" + serverExecutable + " \"$@\"");
+    Connect();
+    EXPECT_EQ(nxtest::ReadLines(root + "/starts").size(), 1u);
+    PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);
+    ASSERT_TRUE(RunUntil([] { return !nxbase::IsApplicationRunning("LumaServer"); }, 5s));
+
+    // One that ends at once fails the send at once, and says how it ended.
+    std::filesystem::remove(root + "/starts");
+    reRegister("exit 3");
+    auto start = std::chrono::steady_clock::now();
+    MyMemoryBlock level, answer;
+    level << static_cast<unsigned char>(2);
+    EXPECT_FALSE(PostOffice::Instance()->SendAndReceive("LumaServer", CONNECT, level, answer));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 2s);
+    EXPECT_NE(PostOffice::Instance()->GetLastError().find("exited with status 3"), std::string::npos)
+        << PostOffice::Instance()->GetLastError();
+    EXPECT_EQ(nxtest::ReadLines(root + "/starts").size(), 1u);
 }
 
 TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {

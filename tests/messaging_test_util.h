@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstdlib>
 #include <filesystem>
 #include <functional>
 #include <memory>
@@ -31,11 +32,11 @@ inline bool RunUntil(const std::function<bool()>& done,
     return true;
 }
 
-// Whether a process runs whose executable has the file name `name`.
-inline bool ProcessRunning(const std::string& name) {
+// The id of a process whose executable has the file name `name`, or 0.
+inline pid_t FindProcess(const std::string& name) {
     DIR* proc = ::opendir("/proc");
-    if (proc == nullptr) return false;
-    bool found = false;
+    if (proc == nullptr) return 0;
+    pid_t found = 0;
     char target[4096];
     while (dirent* entry = ::readdir(proc)) {
         std::string link = std::string("/proc/") + entry->d_name + "/exe";
@@ -44,12 +45,16 @@ inline bool ProcessRunning(const std::string& name) {
         std::string path(target, static_cast<std::size_t>(n));
         if (path.size() > 10 && path.compare(path.size() - 10, 10, " (deleted)") == 0) path.resize(path.size() - 10);
         if (path.substr(path.rfind('/') + 1) == name) {
-            found = true;
+            found = static_cast<pid_t>(std::atoi(entry->d_name));
             break;
         }
     }
     ::closedir(proc);
     return found;
+}
+
+inline bool ProcessRunning(const std::string& name) {
+    return FindProcess(name) != 0;
 }
 
 // A directory under /tmp (short: socket paths are limited to 108 bytes) that

@@ -264,6 +264,74 @@ TEST_F(PipeTest, ALostPeerIsReportedAndTheNextSendStartsItAgain) {
     pipe->SetChannelLostFunction(nullptr);
 }
 
+TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
+    // Silent, or a request without a process id: closed, the silent one after 5 s.
+    std::size_t channels = pipe->ChannelCount();
+    auto connect = [&] {
+        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
+        EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        return fd;
+    };
+    int silent = connect();
+    int nameless = connect();
+    std::string request = nxbase::EncodeFrame("NoProcessId");
+    ASSERT_EQ(::write(nameless, request.data(), request.size()), static_cast<ssize_t>(request.size()));
+    ASSERT_TRUE(RunUntil([&] { return pipe->ChannelCount() == channels + 1; }, 2s));
+    auto start = std::chrono::steady_clock::now();
+    ASSERT_TRUE(RunUntil([&] { return pipe->ChannelCount() == channels; }, 8s));
+    EXPECT_GE(std::chrono::steady_clock::now() - start, 4s);
+    ::close(silent);
+    ::close(nameless);
+
+    // A peer stopped before it could answer the handshake: the caller's
+    // keep-waiting function ends the wait when it says so, not the transport.
+    ASSERT_EQ(RoundTrip("start it"), "start it");
+    pid_t peer = nxtest::FindProcess(peerProgram.substr(peerProgram.rfind('/') + 1));
+    ASSERT_GT(peer, 0);
+    ASSERT_EQ(::kill(peer, SIGSTOP), 0);
+    Pipe::DeletePipe();  // a fresh transport must open a new channel
+    pipe = Pipe::CreatePipe("PipeTestClient");
+    pipe->SetApplications(applications.get());
+    start = std::chrono::steady_clock::now();
+    {
+        Pipe::SendScope scope(pipe, [&] { return std::chrono::steady_clock::now() - start < 3s; });
+        MyMemoryBlock none;
+        EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
+    }
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, 2900ms);
+    EXPECT_LT(took, 3500ms);
+    EXPECT_NE(pipe->GetLastError().find("EchoPeer"), std::string::npos) << pipe->GetLastError();
+    ::kill(peer, SIGCONT);
+    pipe->SetReceiveFunction(Record);
+    EXPECT_EQ(RoundTrip("goes on"), "goes on");
+}
+
+TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {
+    Pipe::DeletePipe();
+    ASSERT_EQ(::chmod(runtime.c_str(), 0755), 0);
+    pipe = Pipe::CreatePipe("PipeTestClient");
+    EXPECT_FALSE(pipe->IsListening());
+    EXPECT_NE(pipe->GetRefusal().find("open to other users"), std::string::npos) << pipe->GetRefusal();
+    MyMemoryBlock none;
+    EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
+    EXPECT_NE(pipe->GetLastError().find("runtime directory refused"), std::string::npos)
+        << pipe->GetLastError();
+    // The server says so and ends instead of running without a socket.
+    if (::access(NXBASE_BINARY_DIR "/tools/lumaserver", X_OK) != 0) return;  // tools not built
+    std::string server = NXBASE_BINARY_DIR "/tools/lumaserver 2>&1";
+    FILE* output = ::popen(server.c_str(), "r");
+    char buffer[512] = {};
+    std::size_t n = std::fread(buffer, 1, sizeof buffer - 1, output);
+    int status = ::pclose(output);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) != 0);
+    EXPECT_NE(std::string(buffer, n).find("open to other users"), std::string::npos) << buffer;
+    ::chmod(runtime.c_str(), 0700);
+}
+
 TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     if (::geteuid() != 0) GTEST_SKIP() << "needs root to act as another user";
     // Let user 65534 reach the socket, so that only the credential check stands.

@@ -11,6 +11,7 @@
 #include <cstring>
 #include <filesystem>
 #include <functional>
+#include <fstream>
 #include <thread>
 
 #include "nxbase/applock.h"
@@ -42,9 +43,11 @@ class RawPeer {
     }
     ~RawPeer() { ::close(fd_); }
 
-    void Send(const std::string& command, const std::string& data) {
+    void Send(const std::string& command, const std::string& data) { SendAs(name_, command, data); }
+    // A frame whose sender field names `sender`, whoever this peer is.
+    void SendAs(const std::string& sender, const std::string& command, const std::string& data) {
         std::string stuffed = nxbase::EncodeBytes(data.data(), data.size());
-        Write(nxbase::EncodeFrame(nxbase::MessageBody(name_, command, stuffed)));
+        Write(nxbase::EncodeFrame(nxbase::MessageBody(sender, command, stuffed)));
     }
     // The next frame's command and decoded data, the loop running meanwhile;
     // "<none>" when nothing came within the time.
@@ -262,6 +265,149 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     EXPECT_NE(Log().find("NXBASE_WAIT_TIMEOUT"), std::string::npos);
     // The loop still serves: another exchange works.
     EXPECT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+}
+
+TEST_F(PostOfficeTest, OneMisbehavingPeerNeitherEndsTheServerNorSpeaksForAnother) {
+    PostOffice* server = PostOffice::CreatePostOffice("LumaServer");
+    const std::string path = Pipe::Instance()->GetSocketPath();
+    RawPeer good("Good", path);
+    good.Send("CONNECT", "\x02");
+    ASSERT_EQ(good.Next().second, "\x02");
+    {
+        RawPeer bad("Bad", path);
+        bad.Send("DISCONNECT", "");  // never connected
+        bad.Send("CONNECT", "\x02");
+        EXPECT_EQ(bad.Next().second, "\x02");
+        bad.Send("DISCONNECT", "");
+        bad.Send("DISCONNECT", "");  // a second one from the same peer
+        // Frames claiming to come from another application, the server
+        // itself included, are dropped unanswered and open no channel.
+        bad.SendAs("Good", "GET_DEVICE_TYPE", "");
+        bad.SendAs("LumaServer", "GET_DEVICE_TYPE", "");
+        auto start = std::chrono::steady_clock::now();
+        good.Send("GET_DEVICE_TYPE", "");
+        EXPECT_EQ(good.Next(1s), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+        EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
+        EXPECT_EQ(good.Next(300ms).first, "<none>");  // one answer, not one per claim
+        EXPECT_EQ(bad.Next(300ms).first, "<none>");
+    }
+    // The bad peer's channel is gone too; only Good's CONNECT counts.
+    RunUntil([] { return false; }, 1500ms);
+    EXPECT_FALSE(Application::Get().IsQuitting());
+    EXPECT_EQ(server->GetConnectionCount(), 1);
+    EXPECT_NE(Log().find("claims to come from LumaServer"), std::string::npos);
+    EXPECT_NE(Log().find("Disconnect from Bad ignored"), std::string::npos);
+    good.Send("DISCONNECT", "");
+    EXPECT_TRUE(RunUntil([] { return Application::Get().IsQuitting(); }, 3s));
+}
+
+struct StallingHandler {
+    // Runs the loop until two more commands are queued, as a handler that
+    // waits for a peer does.
+    long Handle(void* event) {
+        RunUntil([] { return PostOffice::Instance()->GetQueueSize() >= 2; }, 3s);
+        MyMemoryBlock answer;
+        answer << static_cast<signed char>(nxbase::kDone);
+        PostOffice::Instance()->Answer(static_cast<VELTRAEvent*>(event), answer);
+        return 0;
+    }
+};
+
+TEST_F(PostOfficeTest, TheLockOwnersCommandsPassThoseQueuedBeforeThem) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    const std::string path = Pipe::Instance()->GetSocketPath();
+    StallingHandler stalling;
+    Link handler = LINK(StallingHandler, &stalling, Handle);
+    office->ChangeMessageHdl(IS_APP_READY, handler);
+    RawPeer busy("Busy", path), other("Other", path), locker("Locker", path);
+    busy.Send("IS_APP_READY", "");
+    other.Send("GET_DEVICE_TYPE", "");  // queued while the handler runs
+    locker.Send("LOCK", std::string("\x00", 1));  // queued behind it
+    EXPECT_EQ(busy.Next().first, "ANSWER!IS_APP_READY");
+    EXPECT_EQ(locker.Next(1s), Answer("ANSWER!LOCK", std::string("\x00", 1)));
+    EXPECT_EQ(other.Next(300ms).first, "<none>");  // waits for UNLOCK, in its place
+    locker.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(locker.Next(1s), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    locker.Send("UNLOCK", "");
+    EXPECT_EQ(locker.Next(1s).first, "ANSWER!UNLOCK");
+    EXPECT_EQ(other.Next(1s), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    EXPECT_EQ(office->GetQueueSize(), 0u);
+}
+
+long ResidentKiB() {
+    std::ifstream status("/proc/self/status");
+    for (std::string line; std::getline(status, line);) {
+        if (line.rfind("VmRSS:", 0) == 0) return std::stol(line.substr(6));
+    }
+    return -1;
+}
+
+TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    const std::string path = Pipe::Instance()->GetSocketPath();
+    RawPeer asked("Asked", path), other("Other", path);
+    int calls = 0;
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("Asked", GET_APP_VERSION, request, answer, [&] {
+        if (++calls == 1) other.Send("ANSWER!GET_APP_VERSION", "wrong peer");
+        if (calls == 3) {
+            EXPECT_EQ(asked.Next().first, "GET_APP_VERSION");
+            asked.Send("ANSWER!GET_APP_VERSION", "right peer");
+        }
+        return calls < 100;
+    }));
+    EXPECT_EQ(std::string(answer.GetDatenZeiger(), static_cast<std::size_t>(answer.Len())),
+              "right peer");
+    EXPECT_NE(Log().find("Answer nobody waits for dropped: ANSWER!GET_APP_VERSION from Other"),
+              std::string::npos);
+
+    // A flood of answers nobody asked for is dropped, not stored.
+    long before = ResidentKiB();
+    pid_t flooder = ::fork();
+    if (flooder == 0) {
+        RawPeer raw("Flooder", path);
+        for (int i = 0; i < 20000; ++i) raw.Send("ANSWER!GET_APP_VERSION", std::string(4096, 'a'));
+        ::_exit(0);
+    }
+    int status = 0;
+    ASSERT_TRUE(RunUntil([&] { return ::waitpid(flooder, &status, WNOHANG) == flooder; }, 20s));
+    RunUntil([] { return !Pipe::Instance()->HasChannel("Flooder"); }, 5s);
+    EXPECT_LT(ResidentKiB() - before, 16 * 1024) << "80 MB of unsolicited answers";
+}
+
+int gForwarded = 0;
+void Forward(VELTRAEvent& event) {
+    ++gForwarded;
+    PostOffice::Instance()->CommunicationReceiveFunction(event);
+}
+void DropDeviceTypeRequests(VELTRAEvent& event) {
+    if (event.GetCommand() != "GET_DEVICE_TYPE") PostOffice::Instance()->CommunicationReceiveFunction(event);
+}
+
+TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefused) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
+    EXPECT_EQ(office->ChangeReceiveFunction(Forward), &PostOffice::DummyReceiveFunction);
+    peer.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    EXPECT_EQ(gForwarded, 1);
+    office->ChangeReceiveFunction(DropDeviceTypeRequests);
+    peer.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(peer.Next(300ms).first, "<none>");
+    peer.Send("IS_READY", "");
+    EXPECT_EQ(peer.Next().first, "ANSWER!IS_READY");
+    office->ChangeReceiveFunction(&PostOffice::DummyReceiveFunction);
+
+    unsigned char sent = 1;
+    std::thread([&] {
+        MyMemoryBlock none;
+        sent = office->Send("Peer", IS_READY, none);
+    }).join();
+    EXPECT_EQ(sent, 0);
+    EXPECT_NE(office->GetLastError().find("another thread"), std::string::npos);
+    ASSERT_FALSE(ui->Boxes().empty());
+    EXPECT_NE(ui->Boxes().back().text.find("PostOffice used from another thread"), std::string::npos);
+    EXPECT_EQ(peer.Next(300ms).first, "<none>");
 }
 
 TEST_F(PostOfficeTest, TheServerEndsOneSecondAfterItsLastPeerDisconnects) {

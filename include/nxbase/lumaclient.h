@@ -30,6 +30,11 @@ struct NXBASE_EXPORT MeasuredSpectrum {
 // what was measured until then stays in *out. `keepWaiting`, when given,
 // is asked while each answer is awaited (false gives up); without it the
 // post office's own waiting rules apply.
+//
+// It sends CONNECT first and DISCONNECT last: the server counts each
+// application's CONNECTs and ends one second after the last is matched, so a
+// part of the same application that subscribes to notices (NOTIFY_MESSUNG)
+// sends its own CONNECT and keeps the server for as long as it stays.
 NXBASE_EXPORT bool MeasureWithLumaServer(PostOffice& axOffice, int alCount, std::vector<MeasuredSpectrum>* pOut,
                                          std::string* pError, ProgressListener* pProgress = nullptr,
                                          boost::function<bool()> fKeepWaiting = {});

@@ -86,7 +86,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // post office is to handle to CommunicationReceiveFunction (one that
     // does not forward filters). Returns the old one.
     ReceiveFunction ChangeReceiveFunction(ReceiveFunction fFunction);
-    static void DummyReceiveFunction(VELTRAEvent&) {}
+    static void DummyReceiveFunction(VELTRAEvent&);
 
     int NumberOfCommand(VELTRAEvent& axEvent);
     static void Encode(MyMemoryBlock& axBlock);
@@ -121,6 +121,11 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     const String& GetLockOwner() const { return amLockOwner; }
     int GetLockCount() const { return amLockCount; }
     int GetConnectionCount() const { return amConnectionCount; }
+    // The CONNECTs of peer `asPeer` not yet matched by a DISCONNECT.
+    int GetConnectionCount(const std::string& asPeer) const {
+        auto at = amConnectedPeers.find(asPeer);
+        return at == amConnectedPeers.end() ? 0 : at->second;
+    }
     std::size_t GetQueueSize() const { return amCommandQueue.size(); }
     bool IsHandlerBusy() const { return amHandlerBusy; }
     // Why the last Send or SendAndReceive failed.

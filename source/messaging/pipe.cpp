@@ -625,11 +625,11 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
                  bool& abByDde) {
     if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
     if ((abByDde = OnDdeBus(asApp))) return true;
+    if (!amRefusal.empty() && !(pmDDE && pmDDE->IsActive())) return Fail(amRefusal);
     if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
         return Fail(asApp + " is not running and not registered");
     }
     if (asCommand == nxbase::kDisconnect) return Fail(asApp + " is not running (nothing to disconnect)");
-    if (!amRefusal.empty() && !(pmDDE && pmDDE->IsActive())) return Fail(amRefusal);
     SendScope& scope = *pmScope;
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
     if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {

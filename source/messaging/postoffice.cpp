@@ -93,6 +93,8 @@ PostOffice::~PostOffice() {
     if (smInstance == this) smInstance = nullptr;
 }
 
+void PostOffice::DummyReceiveFunction(VELTRAEvent&) {}
+
 // The transports deliver here: to the installed receive function, or to the
 // post office itself while none is installed.
 void PostOffice::TransportReceive(VELTRAEvent& axEvent) {

@@ -52,8 +52,8 @@ const char kUsage[] =
     "                      ends when no peer connected for 30 s\n"
     "  --version, --help\n";
 
-constexpr signed char kDone = 0;
-constexpr signed char kRefused = 1;
+constexpr signed char kDone = nxbase::kDone;
+constexpr signed char kRefused = nxbase::kRefused;
 
 class Server {
   public:
@@ -156,8 +156,11 @@ class Server {
         amSubscribers.erase(Event(p).GetSender());
         return StatusOnly(p);
     }
+    // A subscription ends with the subscriber's last connection, not with
+    // the DISCONNECT of another part of the same application.
     long Disconnected(void* p) {
-        amSubscribers.erase(Event(p).GetSender());
+        const std::string& sender = Event(p).GetSender();
+        if (PostOffice::Instance()->GetConnectionCount(sender) == 0) amSubscribers.erase(sender);
         return 0;
     }
 
@@ -264,6 +267,12 @@ int main(int argc, char** argv) {
         PostOffice::CreatePostOffice("LumaServer");
     } catch (const std::exception& failure) {
         std::cerr << "lumaserver: " << failure.what() << "\n";
+        return kExitFailed;
+    }
+    // Without its socket nobody could reach the server: say why and end.
+    if (!Pipe::Instance()->GetRefusal().empty()) {
+        std::cerr << "lumaserver: " << Pipe::Instance()->GetRefusal() << "\n";
+        NxSingleton::DeleteAllSingleton();
         return kExitFailed;
     }
     Server server(std::move(chart));

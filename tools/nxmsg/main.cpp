@@ -160,7 +160,8 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     if (!wait) {
         String command(nxbase::MessageName(number));
         if (!office->Send(app, command, data)) {
-            std::cerr << "nxmsg: cannot send " << message << " to " << app << "\n";
+            std::cerr << "nxmsg: cannot send " << message << " to " << app << ": "
+                      << office->GetLastError() << "\n";
             return kExitFailed;
         }
         return kExitOk;
@@ -182,8 +183,8 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
         }
     } disconnect{office, app, connected};
     if (!office->SendAndReceive(app, number, data, answer)) {
-        std::cerr << "nxmsg: no answer from " << app << " to " << nxbase::MessageName(number)
-                  << "\n";
+        std::cerr << "nxmsg: no answer from " << app << " to " << nxbase::MessageName(number) << ": "
+                  << office->GetLastError() << "\n";
         return kExitFailed;
     }
     signed char status = answer.Len() > 0 ? static_cast<signed char>(answer.GetDatenZeiger()[0]) : -1;
