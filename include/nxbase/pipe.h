@@ -23,6 +23,9 @@
 #include <set>
 #include <string>
 #include <thread>
+#include <vector>
+
+#include <boost/system/error_code.hpp>
 
 #include "nxbase/export.h"
 #include "nxbase/frame.h"
@@ -157,7 +160,7 @@ class NXBASE_EXPORT Pipe {
     bool KeepWaiting() const;
     void AddChannel(const ChannelPtr& axChannel);
     void ArmRead(const ChannelPtr& axChannel);
-    void OnReadable(const ChannelPtr& axChannel);
+    void OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError, std::size_t alRead);
     void LimitPartialFrames();
     void Deliver(const ChannelPtr& axChannel);
     void HandleBody(const ChannelPtr& axChannel, std::string&& asBody);

@@ -7,6 +7,7 @@
 
 #include <boost/asio/local/stream_protocol.hpp>
 #include <boost/asio/steady_timer.hpp>
+#include <array>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -42,7 +43,8 @@ struct Channel {
     std::string peer;  // the peer's application name, once known
     bool closed = false;
     FrameReader reader;
-    std::deque<std::string> pending;  // bodies read, not yet delivered
+    std::array<char, 16 * 1024> input;  // what one read takes
+    std::deque<std::string> pending;    // bodies read, not yet delivered
     std::string outgoing;             // bytes not yet taken by the socket
     bool writeArmed = false;
 };
@@ -54,7 +56,6 @@ namespace {
 using Socket = boost::asio::local::stream_protocol::socket;
 using Stage = detail::Channel::Stage;
 constexpr const char* kLogKey = "Communication";
-constexpr std::size_t kReadChunk = 64 * 1024;
 constexpr int kReadsPerTurn = 16;
 constexpr int kListenBacklog = 64;
 constexpr auto kLongestPause = std::chrono::milliseconds(50);
@@ -297,36 +298,45 @@ void Pipe::AddChannel(const ChannelPtr& axChannel) {
 
 // ---- reading ----
 
+// A read, not a readiness wait: the reactor reads as soon as the socket is
+// readable, and re-arming needs no change of the descriptor's registration.
 void Pipe::ArmRead(const ChannelPtr& axChannel) {
-    axChannel->socket.async_wait(nxbase::Socket::wait_read,
-                                 [this, axChannel](const boost::system::error_code& error) {
-                                     if (axChannel->closed) return;
-                                     if (error) {
-                                         Close(axChannel, error.message());
-                                         return;
-                                     }
-                                     OnReadable(axChannel);
-                                 });
+    axChannel->socket.async_read_some(
+        boost::asio::buffer(axChannel->input),
+        [this, axChannel](const boost::system::error_code& error, std::size_t alRead) {
+            if (axChannel->closed) return;
+            OnRead(axChannel, error, alRead);
+        });
 }
 
-void Pipe::OnReadable(const ChannelPtr& axChannel) {
-    char buffer[nxbase::kReadChunk];
-    int fd = axChannel->socket.native_handle();
+void Pipe::OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError,
+                  std::size_t alRead) {
     std::size_t before = axChannel->reader.Buffered();
-    // Take what is there now; the next readiness brings the rest.
-    for (int round = 0; round < nxbase::kReadsPerTurn; ++round) {
-        ssize_t n = toolkit::Sockets().Receive(fd, buffer, sizeof buffer);
+    if (!axError) axChannel->reader.Append(axChannel->input.data(), alRead);
+    bool ended = axError == boost::asio::error::eof;
+    if (axError && !ended) {
+        Close(axChannel, axError.message());
+        return;
+    }
+    // A full buffer: take the rest that is there now, a bounded amount per turn.
+    int fd = axChannel->socket.native_handle();
+    for (int round = 0; !ended && alRead == axChannel->input.size() && round < nxbase::kReadsPerTurn; ++round) {
+        ssize_t n = toolkit::Sockets().Receive(fd, axChannel->input.data(), axChannel->input.size());
         if (n > 0) {
-            axChannel->reader.Append(buffer, static_cast<std::size_t>(n));
-            if (static_cast<std::size_t>(n) < sizeof buffer) break;
+            axChannel->reader.Append(axChannel->input.data(), static_cast<std::size_t>(n));
+            alRead = static_cast<std::size_t>(n);
             continue;
         }
         if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
-        if (n == 0 && axChannel->reader.Buffered() > 0) {
-            Close(axChannel, "malformed frame (end of file inside a frame)");
-        } else {
-            Close(axChannel, n == 0 ? "end of file" : std::strerror(errno));
+        if (n < 0) {
+            Close(axChannel, std::strerror(errno));
+            return;
         }
+        ended = true;
+    }
+    if (ended) {
+        Close(axChannel, axChannel->reader.Buffered() > 0 ? "malformed frame (end of file inside a frame)"
+                                                          : "end of file");
         return;
     }
     std::string body;
