@@ -1,12 +1,15 @@
 // Messages between two processes against raw Unix sockets carrying the same
-// bytes, with both processes pinned to one CPU and free to run on any:
-// - one message there and back through Pipe (frame, byte stuffing, event
-//   loop, delivery) against a raw ping-pong of the same frame;
+// bytes, in two placements that the program sets itself: both processes
+// pinned to CPU 0 ("SameCpu"), and the caller on CPU 0 with its peer on
+// CPU 1 ("TwoCpus"):
 // - PostOffice::SendAndReceive to a post office answering with its default
 //   handler, against a raw ping-pong of the same request and answer frames;
-// - one-way PostOffice::Send into a peer that reads and drops, against raw
-//   writes of the same frames.
-// The peers are this program started again with "--peer MODE".
+// - one message there and back through Pipe against the same raw ping-pong;
+// - the post office over D-Bus against over the sockets (TwoCpus);
+// - one-way PostOffice::Send into a peer that drops, against raw writes.
+// Each pair runs side by side in every one of five rounds; at the end the
+// program prints the ratio of each pair's times per round as min/median/max.
+// The peers are this program started again with "--peer MODE CPU".
 #include <benchmark/benchmark.h>
 #include <sched.h>
 #include <signal.h>
@@ -14,7 +17,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <functional>
+#include <map>
+#include <vector>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
@@ -46,13 +53,26 @@ std::string Payload() {
     return std::string("\x00\x05LumaSpectro 3", 15);
 }
 
-void PinToOneCpu(bool pinned) {
+// Where the two processes run.
+enum class Placement { kSameCpu, kTwoCpus };
+
+const char* PlacementName(Placement placement) {
+    return placement == Placement::kSameCpu ? "SameCpu" : "TwoCpus";
+}
+
+// The CPU of the caller is 0; its peer's is 0 or 1.
+int PeerCpu(Placement placement) {
+    return placement == Placement::kSameCpu ? 0 : 1;
+}
+
+// Pins the calling process to `cpu`, or lets it run anywhere for -1.
+void PinTo(int cpu) {
     cpu_set_t set;
     CPU_ZERO(&set);
-    if (pinned) {
-        CPU_SET(0, &set);
+    if (cpu >= 0) {
+        CPU_SET(cpu, &set);
     } else {
-        for (int cpu = 0; cpu < CPU_SETSIZE; ++cpu) CPU_SET(cpu, &set);
+        for (int any = 0; any < CPU_SETSIZE; ++any) CPU_SET(any, &set);
     }
     sched_setaffinity(0, sizeof set, &set);
 }
@@ -80,13 +100,14 @@ std::string DefaultAnswerFrame() {
 }
 
 // The raw baseline: a child answering each request frame with `answer`.
-void RawPingPong(benchmark::State& state, bool pinned, const std::string& request,
+void RawPingPong(benchmark::State& state, Placement placement, const std::string& request,
                  const std::string& answer) {
-    PinToOneCpu(pinned);
+    PinTo(0);
     int sockets[2];
     ::socketpair(AF_UNIX, SOCK_STREAM, 0, sockets);
     pid_t child = ::fork();
     if (child == 0) {
+        PinTo(PeerCpu(placement));
         ::close(sockets[0]);
         std::string buffer(request.size(), '\0');
         while (ReadExactly(sockets[1], buffer.data(), buffer.size())) {
@@ -102,16 +123,17 @@ void RawPingPong(benchmark::State& state, bool pinned, const std::string& reques
     }
     ::close(sockets[0]);
     ::waitpid(child, nullptr, 0);
-    PinToOneCpu(false);
+    PinTo(-1);
 }
 
 // The raw one-way baseline: writes of `frame` into a child that reads and drops.
-void RawWrites(benchmark::State& state, bool pinned, const std::string& frame) {
-    PinToOneCpu(pinned);
+void RawWrites(benchmark::State& state, Placement placement, const std::string& frame) {
+    PinTo(0);
     int sockets[2];
     ::socketpair(AF_UNIX, SOCK_STREAM, 0, sockets);
     pid_t child = ::fork();
     if (child == 0) {
+        PinTo(PeerCpu(placement));
         ::close(sockets[0]);
         char buffer[65536];
         while (::read(sockets[1], buffer, sizeof buffer) > 0) {
@@ -124,7 +146,7 @@ void RawWrites(benchmark::State& state, bool pinned, const std::string& frame) {
     }
     ::close(sockets[0]);
     ::waitpid(child, nullptr, 0);
-    PinToOneCpu(false);
+    PinTo(-1);
 }
 
 // A private runtime directory and machine hive, removed at the end.
@@ -149,10 +171,11 @@ struct Scratch {
     std::string directory;
 };
 
-pid_t StartPeer(const char* mode) {
+pid_t StartPeer(const char* mode, Placement placement) {
+    std::string cpu = std::to_string(PeerCpu(placement));
     pid_t peer = ::fork();
     if (peer == 0) {
-        ::execl("/proc/self/exe", "messaging_bench", "--peer", mode, nullptr);
+        ::execl("/proc/self/exe", "messaging_bench", "--peer", mode, cpu.c_str(), nullptr);
         ::_exit(127);
     }
     return peer;
@@ -173,10 +196,10 @@ bool WaitForSocket(const std::string& name) {
 }
 
 // SendAndReceive to a post office that answers with its default handler.
-void PostOfficeRoundTrip(benchmark::State& state, bool pinned) {
-    PinToOneCpu(pinned);
+void PostOfficeRoundTrip(benchmark::State& state, Placement placement) {
+    PinTo(0);
     Scratch scratch;
-    pid_t peer = StartPeer("server");
+    pid_t peer = StartPeer("server", placement);
     WaitForSocket("LumaServer");
     PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
     MyMemoryBlock request, answer;
@@ -187,11 +210,12 @@ void PostOfficeRoundTrip(benchmark::State& state, bool pinned) {
     }
     NxSingleton::DeleteAllSingleton();
     StopPeer(peer);
-    PinToOneCpu(false);
+    PinTo(-1);
 }
 
 // SendAndReceive to the same server reached by DDE on a private D-Bus bus.
-void DdeRoundTrip(benchmark::State& state) {
+void DdeRoundTrip(benchmark::State& state, Placement placement) {
+    PinTo(0);
     Scratch scratch;
     std::string address = "unix:path=" + scratch.directory + "/bus";
     pid_t daemon = ::fork();
@@ -202,7 +226,7 @@ void DdeRoundTrip(benchmark::State& state) {
     }
     for (int i = 0; i < 500 && !std::filesystem::exists(scratch.directory + "/bus"); ++i) ::usleep(10000);
     ::setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
-    pid_t peer = StartPeer("server-dde");
+    pid_t peer = StartPeer("server-dde", placement);
     PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
     MyMemoryBlock request, answer;
     request.Put(Payload().data(), static_cast<long>(Payload().size()));
@@ -218,13 +242,14 @@ void DdeRoundTrip(benchmark::State& state) {
     ::kill(daemon, SIGTERM);
     ::waitpid(daemon, nullptr, 0);
     ::unsetenv("DBUS_SESSION_BUS_ADDRESS");
+    PinTo(-1);
 }
 
 // One-way sends into a peer that drops them.
-void PostOfficeSends(benchmark::State& state, bool pinned) {
-    PinToOneCpu(pinned);
+void PostOfficeSends(benchmark::State& state, Placement placement) {
+    PinTo(0);
     Scratch scratch;
-    pid_t peer = StartPeer("sink");
+    pid_t peer = StartPeer("sink", placement);
     WaitForSocket("BenchSink");
     PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
     MyMemoryBlock request;
@@ -233,14 +258,14 @@ void PostOfficeSends(benchmark::State& state, bool pinned) {
     for (auto _ : state) office->Send("BenchSink", GET_DEVICE_NAME, request);
     NxSingleton::DeleteAllSingleton();
     StopPeer(peer);
-    PinToOneCpu(false);
+    PinTo(-1);
 }
 
 // The same exchange through Pipe with a peer process running its loop.
-void PipeRoundTrip(benchmark::State& state, bool pinned) {
-    PinToOneCpu(pinned);
+void PipeRoundTrip(benchmark::State& state, Placement placement) {
+    PinTo(0);
     Scratch scratch;
-    pid_t peer = StartPeer("echo");
+    pid_t peer = StartPeer("echo", placement);
     WaitForSocket(kPeerName);
     Pipe* pipe = Pipe::CreatePipe("BenchClient");
     pipe->SetReceiveFunction(CountAnswer);
@@ -258,7 +283,7 @@ void PipeRoundTrip(benchmark::State& state, bool pinned) {
     }
     Pipe::DeletePipe();
     StopPeer(peer);
-    PinToOneCpu(false);
+    PinTo(-1);
 }
 
 std::string EchoAnswerFrame() {
@@ -266,54 +291,65 @@ std::string EchoAnswerFrame() {
     return nxbase::EncodeFrame(nxbase::MessageBody(kPeerName, "ANSWER!GET_DEVICE_NAME", stuffed));
 }
 
-void BM_RawSocketPingPong_PipeFrames_Pinned(benchmark::State& state) {
-    RawPingPong(state, true, RequestFrame(), EchoAnswerFrame());
-}
-void BM_PipeRoundTrip_Pinned(benchmark::State& state) { PipeRoundTrip(state, true); }
-void BM_RawSocketPingPong_PipeFrames_Unpinned(benchmark::State& state) {
-    RawPingPong(state, false, RequestFrame(), EchoAnswerFrame());
-}
-void BM_PipeRoundTrip_Unpinned(benchmark::State& state) { PipeRoundTrip(state, false); }
+// Each pair of contenders, peer last: the pair's ratio is peer / baseline.
+struct Pair {
+    std::string name;
+    std::function<void(benchmark::State&, Placement)> contender;
+    std::function<void(benchmark::State&, Placement)> baseline;
+    std::vector<Placement> placements;
+};
 
-void BM_RawSocketPingPong_PostOfficeFrames_Pinned(benchmark::State& state) {
-    RawPingPong(state, true, RequestFrame(), DefaultAnswerFrame());
-}
-void BM_PostOfficeSendAndReceive_Pinned(benchmark::State& state) { PostOfficeRoundTrip(state, true); }
-void BM_RawSocketPingPong_PostOfficeFrames_Unpinned(benchmark::State& state) {
-    RawPingPong(state, false, RequestFrame(), DefaultAnswerFrame());
-}
-void BM_PostOfficeSendAndReceive_Unpinned(benchmark::State& state) {
-    PostOfficeRoundTrip(state, false);
+std::vector<Pair> Pairs() {
+    auto raw = [](const std::string& answer) {
+        return [answer](benchmark::State& state, Placement placement) {
+            RawPingPong(state, placement, RequestFrame(), answer);
+        };
+    };
+    std::vector<Placement> both{Placement::kSameCpu, Placement::kTwoCpus};
+    return {
+        {"SendAndReceive_vs_RawPingPong", PostOfficeRoundTrip, raw(DefaultAnswerFrame()), both},
+        {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
+        {"SendAndReceiveOverDBus_vs_OverSockets", DdeRoundTrip, PostOfficeRoundTrip,
+         {Placement::kTwoCpus}},
+        {"OneWaySend_vs_RawWrites", PostOfficeSends,
+         [](benchmark::State& state, Placement placement) { RawWrites(state, placement, RequestFrame()); },
+         both},
+    };
 }
 
-void BM_PostOfficeSendAndReceive_OverSockets(benchmark::State& state) {
-    PostOfficeRoundTrip(state, false);
-}
-void BM_PostOfficeSendAndReceive_OverDBus(benchmark::State& state) { DdeRoundTrip(state); }
+constexpr int kRounds = 5;
 
-void BM_RawSocketWrites_OneWay_Unpinned(benchmark::State& state) {
-    RawWrites(state, false, RequestFrame());
-}
-void BM_PostOfficeSend_OneWay_Unpinned(benchmark::State& state) { PostOfficeSends(state, false); }
+// Keeps every run's time per iteration by name.
+class RatioReporter : public benchmark::ConsoleReporter {
+  public:
+    void ReportRuns(const std::vector<Run>& runs) override {
+        for (const Run& run : runs) times_[run.benchmark_name()] = run.GetAdjustedRealTime();
+        ConsoleReporter::ReportRuns(runs);
+    }
+    double Time(const std::string& name) const {
+        auto at = times_.find(name);
+        return at == times_.end() ? 0.0 : at->second;
+    }
 
-BENCHMARK(BM_RawSocketPingPong_PipeFrames_Pinned)->UseRealTime();
-BENCHMARK(BM_PipeRoundTrip_Pinned)->UseRealTime();
-BENCHMARK(BM_RawSocketPingPong_PipeFrames_Unpinned)->UseRealTime();
-BENCHMARK(BM_PipeRoundTrip_Unpinned)->UseRealTime();
-BENCHMARK(BM_RawSocketPingPong_PostOfficeFrames_Pinned)->UseRealTime();
-BENCHMARK(BM_PostOfficeSendAndReceive_Pinned)->UseRealTime();
-BENCHMARK(BM_RawSocketPingPong_PostOfficeFrames_Unpinned)->UseRealTime();
-BENCHMARK(BM_PostOfficeSendAndReceive_Unpinned)->UseRealTime();
-BENCHMARK(BM_RawSocketWrites_OneWay_Unpinned)->UseRealTime();
-BENCHMARK(BM_PostOfficeSendAndReceive_OverSockets)->UseRealTime();
-BENCHMARK(BM_PostOfficeSendAndReceive_OverDBus)->UseRealTime();
-BENCHMARK(BM_PostOfficeSend_OneWay_Unpinned)->UseRealTime();
+  private:
+    std::map<std::string, double> times_;
+};
+
+std::string BaseName(const std::string& pair, const char* side, Placement placement, int round) {
+    return pair + "/" + side + "/" + PlacementName(placement) + "/round:" + std::to_string(round);
+}
+
+// As the library reports it: with the real-time suffix.
+std::string RunName(const std::string& pair, const char* side, Placement placement, int round) {
+    return BaseName(pair, side, placement, round) + "/real_time";
+}
 
 }  // namespace
 
 void Ignore(VELTRAEvent&) {}
 
-int RunPeer(const std::string& mode) {
+int RunPeer(const std::string& mode, int cpu) {
+    PinTo(cpu);
     ::signal(SIGTERM, [](int) { Application::Get().Quit(); });
     if (mode == "server" || mode == "server-dde") {
         if (mode == "server-dde") Pipe::SetSocketListening(false);
@@ -329,9 +365,49 @@ int RunPeer(const std::string& mode) {
 }
 
 int main(int argc, char** argv) {
-    if (argc == 3 && std::strcmp(argv[1], "--peer") == 0) return RunPeer(argv[2]);
+    if (argc == 4 && std::strcmp(argv[1], "--peer") == 0) return RunPeer(argv[2], std::atoi(argv[3]));
     benchmark::Initialize(&argc, argv);
-    benchmark::RunSpecifiedBenchmarks();
+    const std::vector<Pair> pairs = Pairs();
+    // Rounds outermost, so that the two sides of a pair run next to each
+    // other and drifts of the machine hit both.
+    for (int round = 1; round <= kRounds; ++round) {
+        for (const Pair& pair : pairs) {
+            for (Placement placement : pair.placements) {
+                auto contender = pair.contender;
+                auto baseline = pair.baseline;
+                benchmark::RegisterBenchmark(BaseName(pair.name, "baseline", placement, round).c_str(),
+                                             [baseline, placement](benchmark::State& state) {
+                                                 baseline(state, placement);
+                                             })
+                    ->UseRealTime();
+                benchmark::RegisterBenchmark(BaseName(pair.name, "contender", placement, round).c_str(),
+                                             [contender, placement](benchmark::State& state) {
+                                                 contender(state, placement);
+                                             })
+                    ->UseRealTime();
+            }
+        }
+    }
+    RatioReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    std::printf("\nRatios contender / baseline of the real time per message, min / median / max "
+                "over %d interleaved rounds; caller on CPU 0, peer on CPU 0 (SameCpu) or 1 "
+                "(TwoCpus), one thread each:\n",
+                kRounds);
+    for (const Pair& pair : pairs) {
+        for (Placement placement : pair.placements) {
+            std::vector<double> ratios;
+            for (int round = 1; round <= kRounds; ++round) {
+                double base = reporter.Time(RunName(pair.name, "baseline", placement, round));
+                double time = reporter.Time(RunName(pair.name, "contender", placement, round));
+                if (base > 0 && time > 0) ratios.push_back(time / base);
+            }
+            if (ratios.empty()) continue;
+            std::sort(ratios.begin(), ratios.end());
+            std::printf("  %-40s %-8s %.2f / %.2f / %.2f\n", pair.name.c_str(), PlacementName(placement),
+                        ratios.front(), ratios[ratios.size() / 2], ratios.back());
+        }
+    }
     benchmark::Shutdown();
     return 0;
 }

@@ -27,6 +27,7 @@
 #include <string>
 
 #include "nxbase/export.h"
+#include "nxbase/mymemblo.h"
 #include "nxbase/veltraevent.h"
 
 class PostOfficeApplications;
@@ -38,6 +39,10 @@ inline constexpr const char* kDdeObjectPath = "/com/klume/VELTRAApplication";
 inline constexpr const char* kDdeInterface = "com.klume.VELTRAApplication";
 // The bus name of a topic.
 NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
+// Takes a poke's data apart: the sender before the first ":", then the
+// encoded block, decoded into `axBlock`. Without a ":" the sender is empty
+// and all of it is the block.
+NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock);
 }  // namespace nxbase
 
 class NXBASE_EXPORT DDE {

@@ -33,6 +33,16 @@ std::string DdeBusName(const std::string& asTopic) {
     return kDdeBusPrefix + element;
 }
 
+void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock) {
+    std::size_t colon = asData.find(':');
+    asSender = colon == std::string::npos ? std::string() : asData.substr(0, colon);
+    std::string bytes = colon == std::string::npos ? asData : asData.substr(colon + 1);
+    bytes.resize(DecodeInPlace(bytes.data(), bytes.size()));
+    MyMemoryBlock block(static_cast<long>(bytes.size()));
+    block.Put(bytes.data(), static_cast<long>(bytes.size()));
+    axBlock = std::move(block);
+}
+
 }  // namespace nxbase
 
 namespace {
@@ -200,13 +210,10 @@ void DDE::Process() {
 }
 
 void DDE::OnPoke(const std::string& asItem, const std::string& asData) {
-    std::size_t colon = asData.find(':');
-    std::string sender = colon == std::string::npos ? std::string() : asData.substr(0, colon);
-    std::string encoded = colon == std::string::npos ? asData : asData.substr(colon + 1);
-    std::string decoded = nxbase::DecodeBytes(encoded.data(), encoded.size());
-    MyMemoryBlock block(static_cast<long>(decoded.size()));
-    block.Put(decoded.data(), static_cast<long>(decoded.size()));
-    amEvents.emplace_back(sender, asItem, block);
+    std::string sender;
+    MyMemoryBlock block;
+    nxbase::SplitPoke(asData, sender, block);
+    amEvents.emplace_back(std::move(sender), asItem, std::move(block));
     // Handled once the bus dispatch has returned: a handler may wait for an
     // answer, which needs the bus again.
     Log(Application::Get().IsInExecute() ? "DDE - PostUserEvent" : "DDE - ExecuteUserEvent");
