@@ -5,13 +5,12 @@
 // office must take any item and block. The first byte is the item's length.
 #include <cstdint>
 #include <cstdlib>
-#include <filesystem>
 #include <string>
 
 #include "nxbase/dde.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/postoffice.h"
-#include "toolkit/userinterface.h"
+#include "messaging_fuzz_env.h"
 
 namespace {
 
@@ -19,29 +18,9 @@ void Require(bool condition) {
     if (!condition) std::abort();
 }
 
-class SilentUserInterface : public UserInterface {
-  public:
-    void ErrorBox(const std::string&) override {}
-    void InfoBox(const std::string&) override {}
-    bool QueryBox(const std::string&, bool answer) override { return answer; }
-};
-
 PostOffice* Office() {
     static PostOffice* office = [] {
-        std::string root = std::filesystem::temp_directory_path() / ("nxbase-ddefuzz-" + std::to_string(::getpid()));
-        std::filesystem::create_directories(root);
-    static std::string removed = root;
-    std::atexit([] {
-        std::error_code ignored;
-        std::filesystem::remove_all(removed, ignored);
-    });
-        ::setenv("NXBASE_RUNTIME_DIR", (root + "/run").c_str(), 1);
-        ::setenv("NXBASE_LOG_PATH", root.c_str(), 1);
-        ::setenv("NXBASE_MACHINE_REGISTRY", (root + "/machine.sqlite").c_str(), 1);
-        ::setenv("NXBASE_USER_REGISTRY", (root + "/user.sqlite").c_str(), 1);
-        ::setenv("DBUS_SESSION_BUS_ADDRESS", "", 1);
-        ::setenv("XDG_RUNTIME_DIR", "", 1);
-        static ScopedUserInterface silent(std::make_shared<SilentUserInterface>());
+        nxfuzz::PrepareMessagingEnvironment("nxbase-ddefuzz");
         return PostOffice::CreatePostOffice("LumaServer");
     }();
     return office;

@@ -11,13 +11,12 @@
 // commands of peers that wait behind a lock pile up.
 #include <cstdint>
 #include <cstdlib>
-#include <filesystem>
 #include <string>
 
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
-#include "toolkit/userinterface.h"
+#include "messaging_fuzz_env.h"
 
 namespace {
 
@@ -25,42 +24,12 @@ void Require(bool condition) {
     if (!condition) std::abort();
 }
 
-// Boxes and dialogs go nowhere: the fuzzer must not wait for a person.
-class SilentUserInterface : public UserInterface {
-  public:
-    void ErrorBox(const std::string&) override {}
-    void InfoBox(const std::string&) override {}
-    bool QueryBox(const std::string&, bool answer) override { return answer; }
-};
-
 const char* const kSenders[] = {"Alpha", "Beta", "Gamma", "LumaServer"};
-
-// A private runtime directory and hives, so that creating the post office
-// touches nothing of the user's.
-void PrepareEnvironment() {
-    static bool done = false;
-    if (done) return;
-    done = true;
-    std::string root = std::filesystem::temp_directory_path() / ("nxbase-pofuzz-" + std::to_string(::getpid()));
-    std::filesystem::create_directories(root);
-    static std::string removed = root;
-    std::atexit([] {
-        std::error_code ignored;
-        std::filesystem::remove_all(removed, ignored);
-    });
-    ::setenv("NXBASE_RUNTIME_DIR", (root + "/run").c_str(), 1);
-    ::setenv("NXBASE_LOG_PATH", root.c_str(), 1);
-    ::setenv("NXBASE_MACHINE_REGISTRY", (root + "/machine.sqlite").c_str(), 1);
-    ::setenv("NXBASE_USER_REGISTRY", (root + "/user.sqlite").c_str(), 1);
-    ::setenv("DBUS_SESSION_BUS_ADDRESS", "", 1);
-    ::setenv("XDG_RUNTIME_DIR", "", 1);
-    static ScopedUserInterface silent(std::make_shared<SilentUserInterface>());
-}
 
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    PrepareEnvironment();
+    nxfuzz::PrepareMessagingEnvironment("nxbase-pofuzz");
     // The server reads no registry, so it needs no installed LumaServer.
     static PostOffice* office = nullptr;
     if (office == nullptr || office->GetQueueSize() > 256) {
@@ -91,6 +60,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         Require(office->GetConnectionCount() >= 0);
     }
     office->BotschaftenHandler();
+    // What the events left for the loop (the handler's tick, cancelled
+    // timers of a replaced office) runs now, as the loop would run it.
+    Application::Get().Reschedule();
     Application::Get().ResetQuit();
     return 0;
 }

@@ -185,6 +185,7 @@ TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPee
 TEST_F(LumaServerTest, APeerThatDiesCountsAsDisconnectedAndFreesTheLock) {
     pid_t child = ::fork();
     if (child == 0) {
+        nxtest::LoopOfItsOwn();
         PostOffice* office = PostOffice::CreatePostOffice("Crasher");
         MyMemoryBlock level, lock, answer;
         level << static_cast<unsigned char>(2);
@@ -428,6 +429,7 @@ TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {
     for (int c = 0; c < kClients; ++c) {
         children[c] = ::fork();
         if (children[c] != 0) continue;
+        nxtest::LoopOfItsOwn();
         int failures = 0;
         try {
             PostOffice* office = PostOffice::CreatePostOffice(String("Soak" + std::to_string(c)));

@@ -21,6 +21,12 @@
 
 namespace nxtest {
 
+// In a forked child that runs an event loop: a reactor of its own, not the
+// parent's epoll instance, which the fork shares.
+inline void LoopOfItsOwn() {
+    Application::Get().GetContext().notify_fork(boost::asio::execution_context::fork_child);
+}
+
 // Runs the loop until `done` or `limit`; false on the time-out.
 inline bool RunUntil(const std::function<bool()>& done,
                      std::chrono::milliseconds limit = std::chrono::seconds(10)) {

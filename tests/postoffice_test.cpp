@@ -365,8 +365,20 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
     long before = ResidentKiB();
     pid_t flooder = ::fork();
     if (flooder == 0) {
-        RawPeer raw("Flooder", path);
-        for (int i = 0; i < 20000; ++i) raw.Send("ANSWER!GET_APP_VERSION", std::string(4096, 'a'));
+        // Blocking calls only: the child must not run the parent's event loop,
+        // whose epoll instance it shares.
+        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, path.c_str());
+        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(1);
+        std::string bytes = nxbase::EncodeFrame("Flooder_1");
+        char reply[256];
+        if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0 || ::recv(fd, reply, sizeof reply, 0) <= 0) ::_exit(2);
+        bytes = nxbase::EncodeFrame(nxbase::MessageBody("Flooder", "ANSWER!GET_APP_VERSION", std::string(4096, 'a')));
+        for (int i = 0; i < 20000; ++i) {
+            if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) ::_exit(3);
+        }
         ::_exit(0);
     }
     int status = 0;

@@ -169,6 +169,7 @@ class NXBASE_EXPORT Pipe {
     bool WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
                       const MyMemoryBlock& axEncodedData);
     void FlushOutgoing(const ChannelPtr& axChannel);
+    bool SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
     bool SendByDde(const std::string& asApp, const std::string& asCommand,

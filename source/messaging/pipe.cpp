@@ -467,22 +467,29 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     }
     // The usual case: the socket takes the whole frame at once, no copy.
     std::size_t done = 0;
-    int fd = axChannel->socket.native_handle();
-    while (done < asFrame.size()) {
-        std::size_t piece = std::min(nxbase::kWriteBlockSize, asFrame.size() - done);
-        ssize_t n = toolkit::Sockets().Send(fd, asFrame.data() + done, piece);
-        if (n > 0) {
-            done += static_cast<std::size_t>(n);
-            continue;
-        }
-        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
-        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
-        return false;
-    }
+    if (!SendWhatFits(axChannel, asFrame, done)) return false;
     if (done == asFrame.size()) return true;
     axChannel->outgoing.assign(asFrame, done, std::string::npos);
     FlushOutgoing(axChannel);
     return !axChannel->closed;
+}
+
+// Writes `asBytes` from `alDone` on in pieces until the socket is full;
+// false (the channel closed) when the write failed.
+bool Pipe::SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone) {
+    int fd = axChannel->socket.native_handle();
+    while (alDone < asBytes.size()) {
+        std::size_t piece = std::min(nxbase::kWriteBlockSize, asBytes.size() - alDone);
+        ssize_t n = toolkit::Sockets().Send(fd, asBytes.data() + alDone, piece);
+        if (n > 0) {
+            alDone += static_cast<std::size_t>(n);
+            continue;
+        }
+        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return true;
+        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
+        return false;
+    }
+    return true;
 }
 
 bool Pipe::WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
@@ -494,18 +501,7 @@ bool Pipe::WriteMessage(const ChannelPtr& axChannel, const std::string& asComman
 void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
     std::string& out = axChannel->outgoing;
     std::size_t done = 0;
-    int fd = axChannel->socket.native_handle();
-    while (done < out.size()) {
-        std::size_t piece = std::min(nxbase::kWriteBlockSize, out.size() - done);
-        ssize_t n = toolkit::Sockets().Send(fd, out.data() + done, piece);
-        if (n > 0) {
-            done += static_cast<std::size_t>(n);
-            continue;
-        }
-        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
-        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
-        return;
-    }
+    if (!SendWhatFits(axChannel, out, done)) return;
     out.erase(0, done);
     if (out.empty() || axChannel->writeArmed) return;
     // The socket is full: go on when the peer has read.
