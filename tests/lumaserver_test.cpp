@@ -213,7 +213,8 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     Notices notices;
     Link handler = LINK(Notices, &notices, Handle);
     office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
-    ASSERT_TRUE(RunUntil([&] { return nxtest::ProcessRunning(serverExecutable); }));
+    // Listening, not merely started: otherwise the send starts a second one.
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
     Connect();
     EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG)), "00");
     ASSERT_TRUE(RunUntil([&] { return notices.received.size() >= 3; }));
@@ -326,7 +327,9 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     ASSERT_GT(::recv(client, answer, sizeof answer, 0), 4);
     ::close(client);
     long once = HighWaterKiB(server) - base;
-    EXPECT_LT(once, 160 * 1024) << "KiB for one 64 MiB message";
+    if (!nxtest::kSanitized) {
+        EXPECT_LT(once, 160 * 1024) << "KiB for one 64 MiB message";
+    }
 
     // Eight peers each stop inside a 64 MiB frame after 63 MiB: the server
     // closes channels rather than hold all of it, and serves the others.
@@ -357,7 +360,9 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
         return ended >= 4;
     }, 30s);
     EXPECT_GE(ended, 4u);
-    EXPECT_LT(HighWaterKiB(server) - base, 400 * 1024) << "KiB with eight partial frames";
+    if (!nxtest::kSanitized) {
+        EXPECT_LT(HighWaterKiB(server) - base, 400 * 1024) << "KiB with eight partial frames";
+    }
     int other = RawClient("Other");
     ASSERT_GE(other, 0);
     auto start = std::chrono::steady_clock::now();

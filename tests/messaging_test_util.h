@@ -21,6 +21,20 @@
 
 namespace nxtest {
 
+// Sanitizers keep freed memory in quarantine and add shadow memory, so
+// resident sizes say nothing about the library there.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kSanitized = true;
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
+constexpr bool kSanitized = true;
+#else
+constexpr bool kSanitized = false;
+#endif
+#else
+constexpr bool kSanitized = false;
+#endif
+
 // In a forked child that runs an event loop: a reactor of its own, not the
 // parent's epoll instance, which the fork shares.
 inline void LoopOfItsOwn() {

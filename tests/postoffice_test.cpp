@@ -384,7 +384,9 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
     int status = 0;
     ASSERT_TRUE(RunUntil([&] { return ::waitpid(flooder, &status, WNOHANG) == flooder; }, 20s));
     RunUntil([] { return !Pipe::Instance()->HasChannel("Flooder"); }, 5s);
-    EXPECT_LT(ResidentKiB() - before, 16 * 1024) << "80 MB of unsolicited answers";
+    if (!nxtest::kSanitized) {
+        EXPECT_LT(ResidentKiB() - before, 16 * 1024) << "80 MB of unsolicited answers";
+    }
 }
 
 int gForwarded = 0;

@@ -107,10 +107,11 @@ class NXBASE_EXPORT Pipe {
 
       private:
         friend class Pipe;
+        std::chrono::steady_clock::time_point Deadline() const;
         Pipe* pmPipe;
         SendScope* pmOuter;
         std::function<bool()> fmKeepWaiting;
-        std::chrono::steady_clock::time_point amDeadline;
+        std::chrono::steady_clock::time_point amStart;
         bool amStarted = false;
         int amStartedPid = -1;
     };

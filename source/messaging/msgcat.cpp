@@ -1,5 +1,7 @@
 #include "nxbase/msgcat.h"
 
+#include <unordered_map>
+
 #include "nxbase/mymemblo.h"
 
 const char PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN + 1][kBotschaftNameWidth] = {
@@ -159,10 +161,16 @@ int NumberOfCommandText(const std::string& asCommand) {
         name = asCommand.substr(bang + 1,
                                 end == std::string::npos ? std::string::npos : end - bang - 1);
     }
-    for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n) {
-        if (name == PO_BotschaftenNamen[n]) return offset + n;
-    }
-    return -1;
+    // Every message passes here several times: a hash look-up, built once,
+    // in place of comparing with 135 names. The names are unique, so the
+    // first match of the table's order is the only one.
+    static const std::unordered_map<std::string, int> numbers = [] {
+        std::unordered_map<std::string, int> table;
+        for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n) table.emplace(PO_BotschaftenNamen[n], n);
+        return table;
+    }();
+    auto at = numbers.find(name);
+    return at == numbers.end() ? -1 : offset + at->second;
 }
 
 std::string CommandTextOfNumber(int alNumber) {

@@ -542,11 +542,18 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
 // ---- opening channels and starting peers ----
 
 Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting)
-    : pmPipe(pPipe), pmOuter(pPipe ? pPipe->pmScope : nullptr), fmKeepWaiting(std::move(fKeepWaiting)) {
+    : pmPipe(pPipe),
+      pmOuter(pPipe ? pPipe->pmScope : nullptr),
+      fmKeepWaiting(std::move(fKeepWaiting)),
+      amStart(std::chrono::steady_clock::now()) {
+    if (pmPipe) pmPipe->pmScope = this;
+}
+
+// Read when first needed: most sends never wait for anybody.
+std::chrono::steady_clock::time_point Pipe::SendScope::Deadline() const {
     auto limit = std::min<std::chrono::seconds>(nxbase::kStartLimit,
                                                 std::chrono::seconds(nxbase::WaitTimeoutSeconds()));
-    amDeadline = std::chrono::steady_clock::now() + limit;
-    if (pmPipe) pmPipe->pmScope = this;
+    return amStart + limit;
 }
 
 Pipe::SendScope::~SendScope() {
@@ -602,7 +609,7 @@ Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
 // Runs the loop until the reply came, asking the caller at least every 50 ms.
 bool Pipe::AwaitHandshake(const ChannelPtr& axChannel) {
     auto deadline = std::chrono::steady_clock::now() + nxbase::kHandshakeLimit;
-    if (pmScope != nullptr) deadline = std::min(deadline, pmScope->amDeadline);
+    if (pmScope != nullptr) deadline = std::min(deadline, pmScope->Deadline());
     while (!axChannel->closed && axChannel->stage != Stage::kOpen) {
         auto now = std::chrono::steady_clock::now();
         if (now >= deadline) {
@@ -652,7 +659,7 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     };
     auto keepWaiting = [this] { return KeepWaiting(); };
     toolkit::StartWait result = toolkit::WaitForStartedProcess(scope.amStartedPid, ready, keepWaiting,
-                                                               scope.amDeadline, why);
+                                                               scope.Deadline(), why);
     if (result == toolkit::StartWait::kReady) return true;
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() + "): " + why);
 }
