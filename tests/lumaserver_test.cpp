@@ -3,6 +3,8 @@
 // on demand and the end one second after the last peer, nxmsg, and a soak of
 // four client processes.
 #include <gtest/gtest.h>
+#include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/wait.h>
@@ -14,6 +16,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <functional>
+#include <iterator>
 #include <sstream>
 #include <thread>
 
@@ -214,7 +217,7 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     Link handler = LINK(Notices, &notices, Handle);
     office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
     // Listening, not merely started: otherwise the send starts a second one.
-    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     Connect();
     EXPECT_EQ(Hex(Ask(NOTIFY_MESSUNG)), "00");
     ASSERT_TRUE(RunUntil([&] { return notices.received.size() >= 3; }));
@@ -314,7 +317,7 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
         ::execl(program.c_str(), program.c_str(), nullptr);
         ::_exit(127);
     }
-    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     long base = HighWaterKiB(server);
     // One legal message just under the limit, with no byte to stuff.
     int client = RawClient("Large");
@@ -373,6 +376,59 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     for (pid_t peer : peers) {
         if (peer > 0) ::kill(peer, SIGKILL), ::waitpid(peer, nullptr, 0);
     }
+    ::kill(server, SIGTERM);
+    ::waitpid(server, nullptr, 0);
+}
+
+// CPU seconds the process has used so far.
+double CpuSeconds(pid_t pid) {
+    std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
+    std::string text((std::istreambuf_iterator<char>(stat)), std::istreambuf_iterator<char>());
+    std::istringstream fields(text.substr(text.rfind(')') + 2));
+    std::string field;
+    long ticks = 0;
+    for (int i = 3; i <= 15 && fields >> field; ++i) {
+        if (i == 14 || i == 15) ticks += std::stol(field);  // utime, stime
+    }
+    return static_cast<double>(ticks) / static_cast<double>(::sysconf(_SC_CLK_TCK));
+}
+
+TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed) {
+    pid_t server = ::fork();
+    if (server == 0) {
+        int errors = ::open((root + "/server.err").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+        ::dup2(errors, 2);
+        ::close(errors);
+        rlimit limit{24, 24};
+        ::setrlimit(RLIMIT_NOFILE, &limit);
+        std::string program = root + "/bin/" + serverExecutable;
+        ::execl(program.c_str(), program.c_str(), nullptr);
+        ::_exit(127);
+    }
+    ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
+    std::vector<int> idle;
+    for (int i = 0; i < 40; ++i) {
+        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
+        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) idle.push_back(fd);
+    }
+    RunUntil([] { return false; }, 300ms);
+    double before = CpuSeconds(server);
+    RunUntil([] { return false; }, 1s);
+    EXPECT_LT(CpuSeconds(server) - before, 0.2) << "the accept loop spins";
+    // The log cannot open its file without descriptors; stderr says it.
+    EXPECT_NE(nxtest::ReadFile(root + "/server.err").find("accepting a connection failed"), std::string::npos);
+    for (int fd : idle) ::close(fd);
+    // The closed ones free their descriptors; a new peer is served.
+    int client = RawClient("Later");
+    ASSERT_GE(client, 0);
+    std::string request = nxbase::EncodeFrame(nxbase::MessageBody("Later", "GET_DEVICE_TYPE", ""));
+    ASSERT_TRUE(SendAll(client, request));
+    char answer[64];
+    EXPECT_GT(::recv(client, answer, sizeof answer, 0), 4);
+    ::close(client);
     ::kill(server, SIGTERM);
     ::waitpid(server, nullptr, 0);
 }

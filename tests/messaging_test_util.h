@@ -5,10 +5,13 @@
 #define NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
 
 #include <dirent.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <functional>
 #include <memory>
@@ -39,6 +42,19 @@ constexpr bool kSanitized = false;
 // parent's epoll instance, which the fork shares.
 inline void LoopOfItsOwn() {
     Application::Get().GetContext().notify_fork(boost::asio::execution_context::fork_child);
+}
+
+// Whether something listens on the socket at `path` (it holds its name's
+// lock a moment before it listens).
+inline bool Accepts(const std::string& path) {
+    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) return false;
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    bool accepted = ::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
+    ::close(fd);
+    return accepted;
 }
 
 // Runs the loop until `done` or `limit`; false on the time-out.

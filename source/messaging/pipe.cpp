@@ -10,6 +10,7 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
+#include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <optional>
@@ -270,8 +271,11 @@ void Pipe::Accept() {
 // connection stays queued; try again after a pause that grows to a second.
 void Pipe::AcceptFailed(const std::string& asReason) {
     Listener& listener = *pmListener;
-    nxbase::LogAlways("Pipe: accepting a connection failed (" + asReason + "); next try in " +
-                      std::to_string(listener.nextPause.count()) + " ms");
+    std::string line = "Pipe: accepting a connection failed (" + asReason + "); next try in " +
+                       std::to_string(listener.nextPause.count()) + " ms";
+    nxbase::LogAlways(line);
+    // Out of descriptors the log cannot open its file either: say it on stderr.
+    if (listener.nextPause == nxbase::kFirstAcceptPause) std::fprintf(stderr, "%s\n", line.c_str());
     listener.pause.expires_after(listener.nextPause);
     listener.nextPause = std::min(listener.nextPause * 2, nxbase::kLongestAcceptPause);
     listener.pause.async_wait([this](const boost::system::error_code& error) {
