@@ -287,6 +287,16 @@ long HighWaterKiB(pid_t pid) {
     return -1;
 }
 
+// Ends a child process when the test ends, however it ends.
+struct Reaper {
+    pid_t pid;
+    ~Reaper() {
+        if (pid <= 0) return;
+        ::kill(pid, SIGKILL);
+        ::waitpid(pid, nullptr, 0);
+    }
+};
+
 // A blocking client on the server's socket, handshake done.
 int RawClient(const std::string& name) {
     int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -317,6 +327,7 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
         ::execl(program.c_str(), program.c_str(), nullptr);
         ::_exit(127);
     }
+    Reaper reaper{server};
     ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     long base = HighWaterKiB(server);
     // One legal message just under the limit, with no byte to stuff.
@@ -352,6 +363,12 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
         }
         peers.push_back(peer);
     }
+    struct PeersReaper {
+        std::vector<pid_t>& peers;
+        ~PeersReaper() {
+            for (pid_t peer : peers) Reaper{peer};
+        }
+    } peersReaper{peers};
     std::size_t ended = 0;
     RunUntil([&] {
         for (pid_t& peer : peers) {
@@ -373,11 +390,6 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     EXPECT_GT(::recv(other, answer, sizeof answer, 0), 4);
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
     ::close(other);
-    for (pid_t peer : peers) {
-        if (peer > 0) ::kill(peer, SIGKILL), ::waitpid(peer, nullptr, 0);
-    }
-    ::kill(server, SIGTERM);
-    ::waitpid(server, nullptr, 0);
 }
 
 // CPU seconds the process has used so far.
@@ -405,6 +417,7 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
         ::execl(program.c_str(), program.c_str(), nullptr);
         ::_exit(127);
     }
+    Reaper reaper{server};
     ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     std::vector<int> idle;
     for (int i = 0; i < 40; ++i) {
@@ -429,8 +442,6 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
     char answer[64];
     EXPECT_GT(::recv(client, answer, sizeof answer, 0), 4);
     ::close(client);
-    ::kill(server, SIGTERM);
-    ::waitpid(server, nullptr, 0);
 }
 
 TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePerSend) {
@@ -443,14 +454,13 @@ TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePe
         ::execl(program.c_str(), program.c_str(), "30", nullptr);
         ::_exit(127);
     }
+    Reaper decoyReaper{decoy};
     PostOffice::CreatePostOffice("Tester");
     Connect();
     EXPECT_TRUE(nxbase::IsApplicationRunning("LumaServer"));
     MyMemoryBlock none;
     PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);
     ASSERT_TRUE(RunUntil([] { return !nxbase::IsApplicationRunning("LumaServer"); }, 5s));
-    ::kill(decoy, SIGKILL);
-    ::waitpid(decoy, nullptr, 0);
     // DISCONNECT never starts a server.
     EXPECT_FALSE(PostOffice::Instance()->Send("LumaServer", DISCONNECT, none));
     EXPECT_FALSE(nxbase::IsApplicationRunning("LumaServer"));
