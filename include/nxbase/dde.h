@@ -15,6 +15,8 @@
 //                                        sent without waiting for the reply
 //                                        (answers come back as pokes)
 //   Execute(s topic, ay data) -> b       at most 500 bytes go to the execute function
+//   Request(s topic, s item) -> b        not served: logged as an unknown
+//                                        transaction, answered false
 // The bus connection is driven by the application's event loop (its file
 // descriptor and time-out), never by a thread of its own, and received pokes
 // reach the receive function on that loop, after the bus dispatch returned.

@@ -29,6 +29,7 @@
 
 #include "nxbase/export.h"
 #include "nxbase/frame.h"
+#include "nxbase/poapps.h"
 #include "nxbase/veltraevent.h"
 
 class DDE;
@@ -46,8 +47,6 @@ constexpr std::size_t kMaxQueuedBytes = 64u << 20;
 constexpr std::size_t kMaxPartialBytes = 256u << 20;
 // A connection must finish its handshake within this time.
 constexpr std::chrono::seconds kHandshakeLimit(5);
-// One Send waits at most this long for a peer it started.
-constexpr std::chrono::seconds kStartLimit(10);
 
 // $NXBASE_RUNTIME_DIR, else $XDG_RUNTIME_DIR/k-lume, else /tmp/k-lume-<uid>.
 NXBASE_EXPORT std::string MessagingRuntimeDirectory();
@@ -58,9 +57,6 @@ NXBASE_EXPORT std::string RequestSocketPath(const std::string& asApp);
 // Whether application `asApp` runs for this user: a listener holds the lock
 // of its request socket. Processes of other sessions or users never count.
 NXBASE_EXPORT bool IsApplicationRunning(const std::string& asApp);
-// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT
-// (default 30).
-NXBASE_EXPORT int WaitTimeoutSeconds();
 
 namespace detail {
 struct Channel;
@@ -94,7 +90,7 @@ class NXBASE_EXPORT Pipe {
     static void SetSocketListening(bool abListen);
 
     // One send of the caller, retries included: at most one start of the
-    // peer, at most kStartLimit (or $NXBASE_WAIT_TIMEOUT, if shorter) of
+    // peer, at most StartWaitLimit() of
     // waiting for it, and `fKeepWaiting` (if set) asked at least every 50 ms
     // while connecting, handshaking or waiting. Sends outside a scope are
     // each a scope of their own.

@@ -9,11 +9,21 @@
 #define NXBASE_POAPPS_H_
 
 #include <boost/shared_ptr.hpp>
+#include <chrono>
 #include <map>
 #include <string>
 #include <vector>
 
 #include "nxbase/export.h"
+
+namespace nxbase {
+// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT
+// (default 30).
+NXBASE_EXPORT int WaitTimeoutSeconds();
+// How long one send waits for an application it started: 10 s, or
+// $NXBASE_WAIT_TIMEOUT if that is shorter.
+NXBASE_EXPORT std::chrono::seconds StartWaitLimit();
+}  // namespace nxbase
 
 class NXBASE_EXPORT PostOfficeApplication {
   public:

@@ -14,7 +14,6 @@
 #include "nxbase/check.h"
 #include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
-#include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
 #include "toolkit/process.h"
@@ -132,6 +131,14 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
                 boost::asio::post(Application::Get().GetContext(),
                                   [this, text] { fmExecute(text); });
                 return true;
+            });
+        // Transactions this transport does not serve (a client asking for
+        // data, say) are logged as the transport logs any unknown one.
+        bus->object->registerMethod("Request")
+            .onInterface(nxbase::kDdeInterface)
+            .implementedAs([](const std::string&, const std::string&) {
+                Log("DDE Callback function (Unknown)");
+                return false;
             });
         bus->object->finishRegistration();
         pmBus = std::move(bus);
@@ -278,9 +285,7 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
             return false;
         }
         std::string why;
-        auto deadline = std::chrono::steady_clock::now() +
-                        std::min<std::chrono::seconds>(nxbase::kStartLimit,
-                                                       std::chrono::seconds(nxbase::WaitTimeoutSeconds()));
+        auto deadline = std::chrono::steady_clock::now() + nxbase::StartWaitLimit();
         if (toolkit::WaitForStartedProcess(pid, [&] { return Connect(asApp); }, fmKeepWaiting, deadline,
                                            why) != toolkit::StartWait::kReady) {
             Log("DDE send abort: ConversationHandle:0, Topic:" + asApp + ", Service:" +

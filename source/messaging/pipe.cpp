@@ -62,7 +62,6 @@ constexpr int kListenBacklog = 64;
 constexpr auto kLongestPause = std::chrono::milliseconds(50);
 constexpr auto kFirstAcceptPause = std::chrono::milliseconds(100);
 constexpr auto kLongestAcceptPause = std::chrono::milliseconds(1000);
-constexpr int kDefaultWaitTimeoutSeconds = 30;
 const std::string kDisconnect = "DISCONNECT";
 
 Pipe* gPipe = nullptr;
@@ -108,15 +107,6 @@ std::string RequestSocketPath(const std::string& asApp) {
 
 bool IsApplicationRunning(const std::string& asApp) {
     return toolkit::Sockets().IsNameLocked(RequestSocketPath(asApp) + ".lock");
-}
-
-int WaitTimeoutSeconds() {
-    const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
-    if (text == nullptr || *text == '\0') return kDefaultWaitTimeoutSeconds;
-    char* end = nullptr;
-    long seconds = std::strtol(text, &end, 10);
-    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds)
-                                                          : kDefaultWaitTimeoutSeconds;
 }
 
 }  // namespace nxbase
@@ -555,9 +545,7 @@ Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting)
 
 // Read when first needed: most sends never wait for anybody.
 std::chrono::steady_clock::time_point Pipe::SendScope::Deadline() const {
-    auto limit = std::min<std::chrono::seconds>(nxbase::kStartLimit,
-                                                std::chrono::seconds(nxbase::WaitTimeoutSeconds()));
-    return amStart + limit;
+    return amStart + nxbase::StartWaitLimit();
 }
 
 Pipe::SendScope::~SendScope() {

@@ -58,6 +58,25 @@ std::string PostOfficeApplication::GetExecutableWithPath() const {
     return amPath + "/" + amExecutable;
 }
 
+namespace nxbase {
+
+int WaitTimeoutSeconds() {
+    constexpr int kDefaultWaitTimeoutSeconds = 30;
+    const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
+    if (text == nullptr || *text == '\0') return kDefaultWaitTimeoutSeconds;
+    char* end = nullptr;
+    long seconds = std::strtol(text, &end, 10);
+    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds)
+                                                          : kDefaultWaitTimeoutSeconds;
+}
+
+std::chrono::seconds StartWaitLimit() {
+    constexpr std::chrono::seconds kStartLimit(10);
+    return std::min(kStartLimit, std::chrono::seconds(WaitTimeoutSeconds()));
+}
+
+}  // namespace nxbase
+
 std::vector<std::string> PostOfficeApplication::StartLine(int alCountryCode) const {
     std::vector<std::string> line{GetExecutableWithPath()};
     if (amExecutable == "KXALWIN") line.push_back("/WM");
