@@ -5,8 +5,7 @@
 // - PostOffice::SendAndReceive to a post office answering with its default
 //   handler, against a raw ping-pong of the same request and answer frames;
 // - one message there and back through Pipe against the same raw ping-pong;
-// - the post office over D-Bus against over the sockets (TwoCpus);
-// - one-way PostOffice::Send into a peer that drops, against raw writes.
+// - the post office over D-Bus against over the sockets (TwoCpus).
 // Each pair runs side by side in every one of five rounds; at the end the
 // program prints the ratio of each pair's times per round as min/median/max.
 // The peers are this program started again with "--peer MODE CPU".
@@ -126,29 +125,6 @@ void RawPingPong(benchmark::State& state, Placement placement, const std::string
     PinTo(-1);
 }
 
-// The raw one-way baseline: writes of `frame` into a child that reads and drops.
-void RawWrites(benchmark::State& state, Placement placement, const std::string& frame) {
-    PinTo(0);
-    int sockets[2];
-    ::socketpair(AF_UNIX, SOCK_STREAM, 0, sockets);
-    pid_t child = ::fork();
-    if (child == 0) {
-        PinTo(PeerCpu(placement));
-        ::close(sockets[0]);
-        char buffer[65536];
-        while (::read(sockets[1], buffer, sizeof buffer) > 0) {
-        }
-        ::_exit(0);
-    }
-    ::close(sockets[1]);
-    for (auto _ : state) {
-        if (::write(sockets[0], frame.data(), frame.size()) < 0) break;
-    }
-    ::close(sockets[0]);
-    ::waitpid(child, nullptr, 0);
-    PinTo(-1);
-}
-
 // A private runtime directory and machine hive, removed at the end.
 struct Scratch {
     Scratch() {
@@ -245,22 +221,6 @@ void DdeRoundTrip(benchmark::State& state, Placement placement) {
     PinTo(-1);
 }
 
-// One-way sends into a peer that drops them.
-void PostOfficeSends(benchmark::State& state, Placement placement) {
-    PinTo(0);
-    Scratch scratch;
-    pid_t peer = StartPeer("sink", placement);
-    WaitForSocket("BenchSink");
-    PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
-    MyMemoryBlock request;
-    request.Put(Payload().data(), static_cast<long>(Payload().size()));
-    office->Send("BenchSink", GET_DEVICE_NAME, request);
-    for (auto _ : state) office->Send("BenchSink", GET_DEVICE_NAME, request);
-    NxSingleton::DeleteAllSingleton();
-    StopPeer(peer);
-    PinTo(-1);
-}
-
 // The same exchange through Pipe with a peer process running its loop.
 void PipeRoundTrip(benchmark::State& state, Placement placement) {
     PinTo(0);
@@ -311,9 +271,6 @@ std::vector<Pair> Pairs() {
         {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
         {"SendAndReceiveOverDBus_vs_OverSockets", DdeRoundTrip, PostOfficeRoundTrip,
          {Placement::kTwoCpus}},
-        {"OneWaySend_vs_RawWrites", PostOfficeSends,
-         [](benchmark::State& state, Placement placement) { RawWrites(state, placement, RequestFrame()); },
-         both},
     };
 }
 
@@ -346,8 +303,6 @@ std::string RunName(const std::string& pair, const char* side, Placement placeme
 
 }  // namespace
 
-void Ignore(VELTRAEvent&) {}
-
 int RunPeer(const std::string& mode, int cpu) {
     PinTo(cpu);
     ::signal(SIGTERM, [](int) { Application::Get().Quit(); });
@@ -355,8 +310,7 @@ int RunPeer(const std::string& mode, int cpu) {
         if (mode == "server-dde") Pipe::SetSocketListening(false);
         PostOffice::CreatePostOffice("LumaServer");  // answers with its default handler
     } else {
-        Pipe* pipe = Pipe::CreatePipe(mode == "sink" ? "BenchSink" : kPeerName);
-        pipe->SetReceiveFunction(mode == "sink" ? Ignore : EchoAnswer);
+        Pipe::CreatePipe(kPeerName)->SetReceiveFunction(EchoAnswer);
     }
     Application::Get().Execute();
     NxSingleton::DeleteAllSingleton();

@@ -23,6 +23,7 @@
 #include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/application.h"
+#include "toolkit/unixsocket.h"
 
 namespace {
 
@@ -132,6 +133,10 @@ class PipeTest : public ::testing::Test {
         }
         Pipe::DeletePipe();
         NxSingleton::DeleteAllSingleton();
+        // A peer nobody told to quit would hold the test's output open.
+        if (pid_t peer = nxtest::FindProcess(peerProgram.substr(peerProgram.rfind('/') + 1))) {
+            ::kill(peer, SIGKILL);
+        }
         for (int i = 0; i < 100 && ::waitpid(-1, nullptr, WNOHANG) >= 0; ++i) {
             std::this_thread::sleep_for(20ms);
         }
@@ -308,6 +313,63 @@ TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
     ::kill(peer, SIGCONT);
     pipe->SetReceiveFunction(Record);
     EXPECT_EQ(RoundTrip("goes on"), "goes on");
+}
+
+// Socket calls that fail on demand, the system's otherwise.
+class FailingSockets : public toolkit::SocketCalls {
+  public:
+    int failSends = 0;
+    bool refuseConnects = false;
+    ssize_t Send(int fd, const char* data, std::size_t size) override {
+        if (failSends > 0) {
+            --failSends;
+            errno = EIO;
+            return -1;
+        }
+        return SocketCalls::Send(fd, data, size);
+    }
+    int Connect(const std::string& path) override {
+        if (!refuseConnects) return SocketCalls::Connect(path);
+        errno = ECONNREFUSED;
+        return -1;
+    }
+};
+
+TEST_F(PipeTest, AFailedWriteClosesOnlyItsChannelAndSaysWhy) {
+    ASSERT_EQ(RoundTrip("before"), "before");
+    FailingSockets failing;
+    toolkit::SocketCalls* previous = toolkit::SetSocketCalls(&failing);
+    failing.failSends = 1;
+    MyMemoryBlock none;
+    EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
+    EXPECT_NE(pipe->GetLastError().find("Input/output error"), std::string::npos) << pipe->GetLastError();
+    EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
+    // The next send opens a new channel to the peer, which still runs.
+    EXPECT_EQ(RoundTrip("after"), "after");
+    // A peer that runs but refuses connections is not started a second time.
+    pipe->SetChannelLostFunction(nullptr);
+    Pipe::DeletePipe();
+    pipe = Pipe::CreatePipe("PipeTestClient");
+    pipe->SetApplications(applications.get());
+    failing.refuseConnects = true;
+    auto startedAt = std::filesystem::last_write_time(runtime + "/EchoPeer.started");
+    std::this_thread::sleep_for(20ms);  // a start now would show in the time
+    auto start = std::chrono::steady_clock::now();
+    {
+        Pipe::SendScope scope(pipe, [&] { return std::chrono::steady_clock::now() - start < 500ms; });
+        EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
+    }
+    EXPECT_GE(std::chrono::steady_clock::now() - start, 450ms);  // it waited for the running one
+    RunUntil([] { return false; }, 200ms);
+    EXPECT_EQ(std::filesystem::last_write_time(runtime + "/EchoPeer.started"), startedAt);
+    toolkit::SetSocketCalls(previous);
+    pipe->SetReceiveFunction(Record);
+    // Stopping frees the name: no socket, no lock file left behind.
+    Pipe::DeletePipe();
+    EXPECT_FALSE(std::filesystem::exists(runtime + "/PipeRequest-PipeTestClient"));
+    EXPECT_FALSE(std::filesystem::exists(runtime + "/PipeRequest-PipeTestClient.lock"));
+    pipe = Pipe::CreatePipe("PipeTestClient");
+    pipe->SetReceiveFunction(Record);
 }
 
 TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {

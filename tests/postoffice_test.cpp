@@ -3,6 +3,7 @@
 #include "nxbase/postoffice.h"
 
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/wait.h>
@@ -95,6 +96,8 @@ class PostOfficeTest : public ::testing::Test {
             RunUntil([] { return !Pipe::Instance()->HasChannel("EchoPeer"); }, 5s);
         }
         NxSingleton::DeleteAllSingleton();
+        // A peer nobody told to quit would hold the test's output open.
+        if (pid_t peer = nxtest::FindProcess(peerExecutable)) ::kill(peer, SIGKILL);
         while (::waitpid(-1, nullptr, 0) > 0) {
         }
         Application::Get().ResetQuit();

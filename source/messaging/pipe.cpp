@@ -43,6 +43,7 @@ struct Channel {
     Stage stage = Stage::kAwaitingRequest;
     std::string peer;  // the peer's application name, once known
     bool closed = false;
+    std::string closedWhy;
     FrameReader reader;
     std::array<char, 16 * 1024> input;  // what one read takes
     std::deque<std::string> pending;    // bodies read, not yet delivered
@@ -515,6 +516,7 @@ void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
 void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
     if (axChannel->closed) return;
     axChannel->closed = true;
+    axChannel->closedWhy = asReason;
     nxbase::Log("Pipe: channel " + (axChannel->peer.empty() ? std::string("(unknown)")
                                                             : axChannel->peer) +
                 " closed: " + asReason);
@@ -672,7 +674,7 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
     if (byDde) return SendByDde(asApp, asCommand, axEncodedData) || Fail("DDE send to " + asApp + " failed");
     return WriteMessage(channel, asCommand, axEncodedData) ||
-           Fail("writing to " + asApp + " failed; the channel is closed");
+           Fail("writing to " + asApp + " failed: " + channel->closedWhy);
 }
 
 bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
@@ -685,8 +687,9 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
     if (nxbase::detail::CommunicationLogged()) {
         nxbase::Log("Pipe::Send -> " + at->second->peer + " " + asCommand);
     }
-    return WriteMessage(at->second, asCommand, axEncodedData) ||
-           Fail("writing to " + at->second->peer + " failed; the channel is closed");
+    ChannelPtr channel = at->second;
+    return WriteMessage(channel, asCommand, axEncodedData) ||
+           Fail("writing to " + channel->peer + " failed: " + channel->closedWhy);
 }
 
 bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
