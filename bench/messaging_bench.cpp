@@ -12,6 +12,7 @@
 #include <benchmark/benchmark.h>
 #include <sched.h>
 #include <signal.h>
+#include <sys/epoll.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -53,15 +54,15 @@ std::string Payload() {
 }
 
 // Where the two processes run.
-enum class Placement { kSameCpu, kTwoCpus };
+enum class Placement { kSameCpu, kTwoCpus, kAnyCpu };
 
 const char* PlacementName(Placement placement) {
-    return placement == Placement::kSameCpu ? "SameCpu" : "TwoCpus";
+    return placement == Placement::kSameCpu ? "SameCpu" : placement == Placement::kTwoCpus ? "TwoCpus" : "AnyCpu";
 }
 
-// The CPU of the caller is 0; its peer's is 0 or 1.
+// The CPU of the caller is 0; its peer's is 0 or 1, or any (-1).
 int PeerCpu(Placement placement) {
-    return placement == Placement::kSameCpu ? 0 : 1;
+    return placement == Placement::kSameCpu ? 0 : placement == Placement::kTwoCpus ? 1 : -1;
 }
 
 // Pins the calling process to `cpu`, or lets it run anywhere for -1.
@@ -251,12 +252,113 @@ std::string EchoAnswerFrame() {
     return nxbase::EncodeFrame(nxbase::MessageBody(kPeerName, "ANSWER!GET_DEVICE_NAME", stuffed));
 }
 
+// ---- one server, many clients ----
+
+constexpr int kRoundTripsPerClient = 2000;
+
+// Runs `client(i)` in `count` child processes at once and waits for them.
+void RunClients(int count, const std::function<void(int)>& client) {
+    std::vector<pid_t> children;
+    for (int i = 0; i < count; ++i) {
+        pid_t child = ::fork();
+        if (child == 0) {
+            // A reactor of its own, not the parent's epoll instance.
+            Application::Get().GetContext().notify_fork(boost::asio::execution_context::fork_child);
+            client(i);
+            ::_exit(0);
+        }
+        children.push_back(child);
+    }
+    for (pid_t child : children) ::waitpid(child, nullptr, 0);
+}
+
+// The raw peer of a server: one epoll loop answering every request frame on
+// any of its connections with the answer frame.
+void RawServer(const std::vector<int>& fds, const std::string& request, const std::string& answer) {
+    int poller = ::epoll_create1(EPOLL_CLOEXEC);
+    for (int fd : fds) {
+        epoll_event event{};
+        event.events = EPOLLIN;
+        event.data.fd = fd;
+        ::epoll_ctl(poller, EPOLL_CTL_ADD, fd, &event);
+    }
+    std::size_t open = fds.size();
+    std::string buffer(request.size(), '\0');
+    epoll_event ready[64];
+    while (open > 0) {
+        int n = ::epoll_wait(poller, ready, 64, -1);
+        for (int i = 0; i < n; ++i) {
+            int fd = ready[i].data.fd;
+            if (!ReadExactly(fd, buffer.data(), buffer.size()) ||
+                ::write(fd, answer.data(), answer.size()) < 0) {
+                ::epoll_ctl(poller, EPOLL_CTL_DEL, fd, nullptr);
+                ::close(fd);
+                --open;
+            }
+        }
+    }
+}
+
+// Round trips per second of `clients` processes against one raw server.
+void RawServerThroughput(benchmark::State& state, int clients) {
+    const std::string request = RequestFrame(), answer = DefaultAnswerFrame();
+    for (auto _ : state) {
+        std::vector<int> serverEnds, clientEnds;
+        for (int i = 0; i < clients; ++i) {
+            int pair[2];
+            ::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair);
+            serverEnds.push_back(pair[0]);
+            clientEnds.push_back(pair[1]);
+        }
+        pid_t server = ::fork();
+        if (server == 0) {
+            for (int fd : clientEnds) ::close(fd);
+            RawServer(serverEnds, request, answer);
+            ::_exit(0);
+        }
+        for (int fd : serverEnds) ::close(fd);
+        RunClients(clients, [&](int i) {
+            std::string received(answer.size(), '\0');
+            for (int k = 0; k < kRoundTripsPerClient; ++k) {
+                if (::write(clientEnds[static_cast<std::size_t>(i)], request.data(), request.size()) < 0) break;
+                ReadExactly(clientEnds[static_cast<std::size_t>(i)], received.data(), received.size());
+            }
+        });
+        for (int fd : clientEnds) ::close(fd);
+        ::waitpid(server, nullptr, 0);
+    }
+    state.SetItemsProcessed(state.iterations() * clients * kRoundTripsPerClient);
+}
+
+// The same with a post office answering with its default handler and
+// clients that each run their own post office.
+void PostOfficeServerThroughput(benchmark::State& state, int clients) {
+    Scratch scratch;
+    pid_t peer = StartPeer("server", Placement::kAnyCpu);
+    WaitForSocket("LumaServer");
+    for (auto _ : state) {
+        RunClients(clients, [&](int i) {
+            ::setenv("NXBASE_LOG_PATH", (scratch.directory + "/log" + std::to_string(i)).c_str(), 1);
+            PostOffice* office = PostOffice::CreatePostOffice(String("BenchClient" + std::to_string(i)));
+            MyMemoryBlock request, answer;
+            request.Put(Payload().data(), static_cast<long>(Payload().size()));
+            for (int k = 0; k < kRoundTripsPerClient; ++k) {
+                office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [] { return true; });
+            }
+            NxSingleton::DeleteAllSingleton();
+        });
+    }
+    state.SetItemsProcessed(state.iterations() * clients * kRoundTripsPerClient);
+    StopPeer(peer);
+}
+
 // Each pair of contenders, peer last: the pair's ratio is peer / baseline.
 struct Pair {
     std::string name;
     std::function<void(benchmark::State&, Placement)> contender;
     std::function<void(benchmark::State&, Placement)> baseline;
     std::vector<Placement> placements;
+    bool rates = false;  // compare items per second instead of time
 };
 
 std::vector<Pair> Pairs() {
@@ -271,6 +373,14 @@ std::vector<Pair> Pairs() {
         {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
         {"SendAndReceiveOverDBus_vs_OverSockets", DdeRoundTrip, PostOfficeRoundTrip,
          {Placement::kTwoCpus}},
+        {"ServerThroughput4Clients_vs_RawServer",
+         [](benchmark::State& state, Placement) { PostOfficeServerThroughput(state, 4); },
+         [](benchmark::State& state, Placement) { RawServerThroughput(state, 4); },
+         {Placement::kAnyCpu}, true},
+        {"ServerThroughput16Clients_vs_RawServer",
+         [](benchmark::State& state, Placement) { PostOfficeServerThroughput(state, 16); },
+         [](benchmark::State& state, Placement) { RawServerThroughput(state, 16); },
+         {Placement::kAnyCpu}, true},
     };
 }
 
@@ -280,16 +390,25 @@ constexpr int kRounds = 5;
 class RatioReporter : public benchmark::ConsoleReporter {
   public:
     void ReportRuns(const std::vector<Run>& runs) override {
-        for (const Run& run : runs) times_[run.benchmark_name()] = run.GetAdjustedRealTime();
+        for (const Run& run : runs) {
+            times_[run.benchmark_name()] = run.GetAdjustedRealTime();
+            auto items = run.counters.find("items_per_second");
+            if (items != run.counters.end()) rates_[run.benchmark_name()] = items->second;
+        }
         ConsoleReporter::ReportRuns(runs);
     }
     double Time(const std::string& name) const {
         auto at = times_.find(name);
         return at == times_.end() ? 0.0 : at->second;
     }
+    double Rate(const std::string& name) const {
+        auto at = rates_.find(name);
+        return at == rates_.end() ? 0.0 : at->second;
+    }
 
   private:
     std::map<std::string, double> times_;
+    std::map<std::string, double> rates_;
 };
 
 std::string BaseName(const std::string& pair, const char* side, Placement placement, int round) {
@@ -344,17 +463,22 @@ int main(int argc, char** argv) {
     }
     RatioReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf("\nRatios contender / baseline of the real time per message, min / median / max "
-                "over %d interleaved rounds; caller on CPU 0, peer on CPU 0 (SameCpu) or 1 "
-                "(TwoCpus), one thread each:\n",
-                kRounds);
+    std::printf("\nRatios contender / baseline, min / median / max over %d interleaved rounds: of the real "
+                "time per message (caller on CPU 0, peer on CPU 0 for SameCpu or 1 for TwoCpus, one thread "
+                "each), and for ServerThroughput of round trips per second (one server process and 4 or 16 "
+                "client processes, all free on every CPU; %d round trips per client):\n",
+                kRounds, kRoundTripsPerClient);
     for (const Pair& pair : pairs) {
         for (Placement placement : pair.placements) {
             std::vector<double> ratios;
             for (int round = 1; round <= kRounds; ++round) {
-                double base = reporter.Time(RunName(pair.name, "baseline", placement, round));
-                double time = reporter.Time(RunName(pair.name, "contender", placement, round));
-                if (base > 0 && time > 0) ratios.push_back(time / base);
+                std::string base = RunName(pair.name, "baseline", placement, round);
+                std::string contender = RunName(pair.name, "contender", placement, round);
+                // Times: contender / baseline; rates: contender / baseline too,
+                // so that above 1 is slower for times and faster for rates.
+                double a = pair.rates ? reporter.Rate(contender) : reporter.Time(contender);
+                double b = pair.rates ? reporter.Rate(base) : reporter.Time(base);
+                if (a > 0 && b > 0) ratios.push_back(a / b);
             }
             if (ratios.empty()) continue;
             std::sort(ratios.begin(), ratios.end());
