@@ -1,5 +1,6 @@
 #include "toolkit/process.h"
 
+#include <signal.h>
 #include <spawn.h>
 #include <sys/wait.h>
 
@@ -79,7 +80,9 @@ void ReapStartedProcesses() {
         int status = 0;
         pid_t result = ::waitpid(pid, &status, WNOHANG);
         if (result == pid) how = DescribeStatus(status);
-        if (result < 0 && errno == ECHILD) how = "ended";
+        // Not ours to wait for (SIGCHLD ignored, or reaped elsewhere): it has
+        // ended only when it no longer exists.
+        if (result < 0 && errno == ECHILD && ::kill(pid, 0) != 0) how = "ended";
     }
     Forget();
 }
