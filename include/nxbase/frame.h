@@ -30,6 +30,10 @@ NXBASE_EXPORT std::string MessageBody(const std::string& asSender, const std::st
 // command, 0x00, the byte-stuffed data.
 NXBASE_EXPORT std::string MessageFrame(const std::string& asSender, const std::string& asCommand,
                                        const char* pEncodedData, std::size_t alSize);
+// The positions of a message body's first two zero bytes (after the sender
+// and after the command), without copying; false when it lacks them.
+NXBASE_EXPORT bool FindMessageFields(const std::string& asBody, std::size_t& alFirst,
+                                     std::size_t& alSecond);
 // Splits a message body at its first two zero bytes; false when it lacks them.
 NXBASE_EXPORT bool SplitMessageBody(const std::string& asBody, std::string& asSender,
                                     std::string& asCommand, std::string& asData);

@@ -57,12 +57,17 @@ std::string MessageFrame(const std::string& asSender, const std::string& asComma
     return frame;
 }
 
+bool FindMessageFields(const std::string& asBody, std::size_t& alFirst, std::size_t& alSecond) {
+    alFirst = asBody.find('\0');
+    if (alFirst == std::string::npos) return false;
+    alSecond = asBody.find('\0', alFirst + 1);
+    return alSecond != std::string::npos;
+}
+
 bool SplitMessageBody(const std::string& asBody, std::string& asSender, std::string& asCommand,
                       std::string& asData) {
-    std::size_t first = asBody.find('\0');
-    if (first == std::string::npos) return false;
-    std::size_t second = asBody.find('\0', first + 1);
-    if (second == std::string::npos) return false;
+    std::size_t first = 0, second = 0;
+    if (!FindMessageFields(asBody, first, second)) return false;
     asSender = asBody.substr(0, first);
     asCommand = asBody.substr(first + 1, second - first - 1);
     asData = asBody.substr(second + 1);

@@ -419,9 +419,8 @@ void Pipe::HandleBody(const ChannelPtr& axChannel, std::string&& asBody) {
         HandleHandshake(axChannel, asBody);
         return;
     }
-    std::size_t first = asBody.find('\0');
-    std::size_t second = first == std::string::npos ? first : asBody.find('\0', first + 1);
-    if (second == std::string::npos) {
+    std::size_t first = 0, second = 0;
+    if (!nxbase::FindMessageFields(asBody, first, second)) {
         Close(axChannel, "malformed frame (no sender and command)");
         return;
     }
@@ -542,7 +541,10 @@ Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting)
       pmOuter(pPipe ? pPipe->pmScope : nullptr),
       fmKeepWaiting(std::move(fKeepWaiting)),
       amStart(std::chrono::steady_clock::now()) {
-    if (pmPipe) pmPipe->pmScope = this;
+    if (pmPipe == nullptr) return;
+    pmPipe->pmScope = this;
+    // DDE starts peers of a DDE-only process itself: the same caller decides.
+    if (pmPipe->pmDDE) pmPipe->pmDDE->SetStartWaitCheck(fmKeepWaiting);
 }
 
 // Read when first needed: most sends never wait for anybody.
@@ -551,7 +553,9 @@ std::chrono::steady_clock::time_point Pipe::SendScope::Deadline() const {
 }
 
 Pipe::SendScope::~SendScope() {
-    if (pmPipe) pmPipe->pmScope = pmOuter;
+    if (pmPipe == nullptr) return;
+    pmPipe->pmScope = pmOuter;
+    if (pmPipe->pmDDE) pmPipe->pmDDE->SetStartWaitCheck(pmOuter ? pmOuter->fmKeepWaiting : nullptr);
 }
 
 bool Pipe::KeepWaiting() const {

@@ -7,7 +7,6 @@
 
 #include "nxbase/applock.h"
 #include "nxbase/check.h"
-#include "nxbase/dde.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
@@ -443,12 +442,9 @@ unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMe
     std::function<bool()> keepTrying;
     if (fKeepTrying) keepTrying = [fKeepTrying] { return fKeepTrying(); };
     Pipe::SendScope scope(Pipe::Instance(), keepTrying);
-    DDE* dde = DDE::Instance();
-    if (dde != nullptr) dde->SetStartWaitCheck(keepTrying);
     for (int retries = 0;;) {
         if (TryOnce(asApp, command, encoded)) {
             NX_COMM_LOG(String("Sent: ") + String(command));
-            if (dde != nullptr) dde->SetStartWaitCheck({});
             return true;
         }
         ++retries;
@@ -464,7 +460,6 @@ unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMe
             LogFile::WriteToLog(String("Send ") + String(command) + " to " + String(asApp) +
                                     " failed: " + String(amLastError),
                                 String(kLogKey));
-            if (dde != nullptr) dde->SetStartWaitCheck({});
             return false;
         }
     }
