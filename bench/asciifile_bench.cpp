@@ -1,8 +1,8 @@
 // Reading a 50 MB ASCII data file of measurement records, against the floor
 // of reading the same file into memory in the same process. The file was just
 // written, so both read it from the page cache, not from the disk: the
-// figures are parsing cost, not I/O. Writing the file is measured too, for
-// reference.
+// figures are parsing cost, not I/O. Writing is measured with checks after
+// every record and every 100 records against one check at the end.
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -14,6 +14,7 @@
 #include <sstream>
 #include <vector>
 
+#include "interleaved.h"
 #include "nxbase/asciifile.h"
 #include "test_util.h"
 
@@ -151,19 +152,97 @@ void BM_ReadMeasurementRecords_PageCache(benchmark::State& state) {
 }
 BENCHMARK(BM_ReadMeasurementRecords_PageCache)->Unit(benchmark::kMillisecond);
 
-void BM_WriteMeasurementRecords_PageCache(benchmark::State& state) {
-    DataFile& data = TheFile();
-    std::vector<Record> patterns;
-    for (int i = 0; i < 1000; ++i) patterns.push_back(MakeRecord(i));
-    std::string path = data.dir.File("written.dat");
+// Writing records by name with a CheckOutError after every record and after
+// every 100 records, against one check at the end (the baseline), into a new
+// file of about 1 MB and of about 100 MB. The destructor syncs the file to
+// the disk in every case, so each side pays one fsync of the same bytes.
+struct WriteCase {
+    const char* size;
+    std::size_t bytes;
+    const char* checks;
+    int every;  // records per check; 0: only at the end
+};
+
+constexpr std::size_t kRecordBytesEstimate = 700;
+constexpr int kRounds = 5;
+
+void WriteRecordsChecking(benchmark::State& state, std::size_t bytes, int every) {
+    static const std::vector<Record> patterns = [] {
+        std::vector<Record> made;
+        for (int i = 0; i < 1000; ++i) made.push_back(MakeRecord(i));
+        return made;
+    }();
+    nxtest::TempDir dir;
+    const std::string path = dir.File("written.dat");
+    const int records = static_cast<int>(bytes / kRecordBytesEstimate);
     for (auto _ : state) {
         auto file = ASCIIFile::Get(String(path), false);
-        for (int i = 0; i < data.records; ++i) WriteRecord(*file, patterns[i % 1000]);
+        for (int i = 0; i < records; ++i) {
+            WriteRecord(*file, patterns[static_cast<std::size_t>(i) % patterns.size()]);
+            if (every > 0 && (i + 1) % every == 0) file->CheckOutError();
+        }
+        file->CheckOutError();
+        if (file->GetError()) state.SkipWithError("write failed");
     }
-    state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * data.bytes));
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations()) *
+                            static_cast<int64_t>(std::filesystem::file_size(path)));
 }
-BENCHMARK(BM_WriteMeasurementRecords_PageCache)->Unit(benchmark::kMillisecond);
+
+std::string WriteCaseName(const WriteCase& c) {
+    return std::string("WriteRecords") + c.size + "_Check" + c.checks + "_vs_CheckAtEnd";
+}
+
+void RegisterWriteRounds() {
+    static const WriteCase cases[] = {
+        {"1MB", 1u << 20, "EveryRecord", 1},
+        {"1MB", 1u << 20, "Every100Records", 100},
+        {"100MB", 100u << 20, "EveryRecord", 1},
+        {"100MB", 100u << 20, "Every100Records", 100},
+    };
+    for (int round = 1; round <= kRounds; ++round) {
+        for (const WriteCase& c : cases) {
+            const std::string name = WriteCaseName(c);
+            benchmark::RegisterBenchmark(nxbench::RoundName(name, "baseline", "1thread", round).c_str(),
+                                         [c](benchmark::State& state) { WriteRecordsChecking(state, c.bytes, 0); })
+                ->UseRealTime()
+                ->Unit(benchmark::kMillisecond);
+            benchmark::RegisterBenchmark(
+                nxbench::RoundName(name, "contender", "1thread", round).c_str(),
+                [c](benchmark::State& state) { WriteRecordsChecking(state, c.bytes, c.every); })
+                ->UseRealTime()
+                ->Unit(benchmark::kMillisecond);
+        }
+    }
+}
+
+void PrintWriteRatios(const nxbench::RoundReporter& reporter) {
+    std::printf("\nWriting by name, time with checks / time with one check at the end, min / median / max "
+                "over %d interleaved rounds (one thread, not pinned; each write ends with an fsync):\n",
+                kRounds);
+    for (const char* size : {"1MB", "100MB"}) {
+        for (const char* checks : {"EveryRecord", "Every100Records"}) {
+            const std::string name = WriteCaseName({size, 0, checks, 0});
+            std::vector<double> ratios;
+            for (int round = 1; round <= kRounds; ++round) {
+                const double contender =
+                    reporter.Time(nxbench::RealTimeName(nxbench::RoundName(name, "contender", "1thread", round)));
+                const double baseline =
+                    reporter.Time(nxbench::RealTimeName(nxbench::RoundName(name, "baseline", "1thread", round)));
+                if (contender > 0 && baseline > 0) ratios.push_back(contender / baseline);
+            }
+            nxbench::PrintSpread(name, ratios);
+        }
+    }
+}
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    benchmark::Initialize(&argc, argv);
+    RegisterWriteRounds();
+    nxbench::RoundReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    PrintWriteRatios(reporter);
+    benchmark::Shutdown();
+    return 0;
+}

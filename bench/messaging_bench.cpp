@@ -10,6 +10,7 @@
 // program prints the ratio of each pair's times per round as min/median/max.
 // The peers are this program started again with "--peer MODE CPU".
 #include <benchmark/benchmark.h>
+
 #include <sched.h>
 #include <signal.h>
 #include <sys/epoll.h>
@@ -27,6 +28,7 @@
 #include <filesystem>
 #include <string>
 
+#include "interleaved.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
@@ -386,38 +388,8 @@ std::vector<Pair> Pairs() {
 
 constexpr int kRounds = 5;
 
-// Keeps every run's time per iteration by name.
-class RatioReporter : public benchmark::ConsoleReporter {
-  public:
-    void ReportRuns(const std::vector<Run>& runs) override {
-        for (const Run& run : runs) {
-            times_[run.benchmark_name()] = run.GetAdjustedRealTime();
-            auto items = run.counters.find("items_per_second");
-            if (items != run.counters.end()) rates_[run.benchmark_name()] = items->second;
-        }
-        ConsoleReporter::ReportRuns(runs);
-    }
-    double Time(const std::string& name) const {
-        auto at = times_.find(name);
-        return at == times_.end() ? 0.0 : at->second;
-    }
-    double Rate(const std::string& name) const {
-        auto at = rates_.find(name);
-        return at == rates_.end() ? 0.0 : at->second;
-    }
-
-  private:
-    std::map<std::string, double> times_;
-    std::map<std::string, double> rates_;
-};
-
 std::string BaseName(const std::string& pair, const char* side, Placement placement, int round) {
-    return pair + "/" + side + "/" + PlacementName(placement) + "/round:" + std::to_string(round);
-}
-
-// As the library reports it: with the real-time suffix.
-std::string RunName(const std::string& pair, const char* side, Placement placement, int round) {
-    return BaseName(pair, side, placement, round) + "/real_time";
+    return nxbench::RoundName(pair, side, PlacementName(placement), round);
 }
 
 }  // namespace
@@ -461,7 +433,7 @@ int main(int argc, char** argv) {
             }
         }
     }
-    RatioReporter reporter;
+    nxbench::RoundReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
     std::printf("\nRatios contender / baseline, min / median / max over %d interleaved rounds: of the real "
                 "time per message (caller on CPU 0, peer on CPU 0 for SameCpu or 1 for TwoCpus, one thread "
@@ -472,18 +444,16 @@ int main(int argc, char** argv) {
         for (Placement placement : pair.placements) {
             std::vector<double> ratios;
             for (int round = 1; round <= kRounds; ++round) {
-                std::string base = RunName(pair.name, "baseline", placement, round);
-                std::string contender = RunName(pair.name, "contender", placement, round);
+                std::string base = nxbench::RealTimeName(BaseName(pair.name, "baseline", placement, round));
+                std::string contender =
+                    nxbench::RealTimeName(BaseName(pair.name, "contender", placement, round));
                 // Times: contender / baseline; rates: contender / baseline too,
                 // so that above 1 is slower for times and faster for rates.
                 double a = pair.rates ? reporter.Rate(contender) : reporter.Time(contender);
                 double b = pair.rates ? reporter.Rate(base) : reporter.Time(base);
                 if (a > 0 && b > 0) ratios.push_back(a / b);
             }
-            if (ratios.empty()) continue;
-            std::sort(ratios.begin(), ratios.end());
-            std::printf("  %-40s %-8s %.2f / %.2f / %.2f\n", pair.name.c_str(), PlacementName(placement),
-                        ratios.front(), ratios[ratios.size() / 2], ratios.back());
+            nxbench::PrintSpread(pair.name + " " + PlacementName(placement), ratios);
         }
     }
     benchmark::Shutdown();

@@ -1,5 +1,6 @@
 // The application's name, directories, configuration files and settings.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -107,6 +108,29 @@ TEST_F(AppConfigTest, FileNamesLoseForbiddenCharacters) {
     EXPECT_EQ(MakeValidFileName("name. "), "name__");
     EXPECT_EQ(MakeValidFileName(""), "_");
     EXPECT_EQ(MakeValidFileName("Caf\xE9"), "Caf\xE9");
+}
+
+TEST_F(AppConfigTest, WholeFileWritesKeepHardLinksAndTheFilesOwner) {
+    const std::string file = dir.File("export.reg");
+    const std::string other = dir.File("second-name.reg");
+    WriteFile(file, "old\n");
+    ASSERT_EQ(::link(file.c_str(), other.c_str()), 0);
+    nxbase::WriteWholeFile(file, "new\n");
+    EXPECT_EQ(ReadFile(other), "new\n");
+    EXPECT_EQ(std::filesystem::hard_link_count(file), 2u);
+
+    // Root writing a user's file leaves it the user's.
+    if (::geteuid() == 0) {
+        const std::string users = dir.File("users.reg");
+        WriteFile(users, "old\n");
+        ASSERT_EQ(::chown(users.c_str(), 65534, 65534), 0);
+        nxbase::WriteWholeFile(users, "new\n");
+        struct stat info {};
+        ASSERT_EQ(::stat(users.c_str(), &info), 0);
+        EXPECT_EQ(info.st_uid, 65534u);
+        EXPECT_EQ(info.st_gid, 65534u);
+        EXPECT_EQ(ReadFile(users), "new\n");
+    }
 }
 
 TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults) {

@@ -1,10 +1,15 @@
 #include "nxbase/asciifile.h"
 
 #include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <charconv>
 #include <clocale>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <limits>
 #include <sstream>
@@ -381,6 +386,31 @@ TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
 }
 
 TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
+    // A file size limit hit in the middle of a line: the line is taken back
+    // and the failure latched.
+    {
+        const std::string limited = dir.File("limited.dat");
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            ::signal(SIGXFSZ, SIG_IGN);
+            struct rlimit limit {1000, 1000};
+            ::setrlimit(RLIMIT_FSIZE, &limit);
+            ASCIIFileImpl file(String(limited), false);
+            for (int i = 0; i < 10; ++i) {
+                file.PutString("Line", String(std::string(295, 'a' + i)));
+                file.CheckOutError();
+            }
+            ::_exit(file.GetError() ? 0 : 1);
+        }
+        int status = 0;
+        ASSERT_EQ(::waitpid(child, &status, 0), child);
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "the failure was not latched";
+        const std::string written = nxtest::ReadFile(limited);
+        EXPECT_EQ(written.size(), 3u * 301u);
+        EXPECT_EQ(written.back(), '\n');
+    }
+
     // A directory that does not exist.
     {
         auto file = ASCIIFile::Get(String(dir.File("missing/dir/out.dat")), false);
@@ -411,17 +441,29 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
     }
     EXPECT_FALSE(std::filesystem::exists(sub));
 
-    // Opened, the file exists (empty); after each flush it holds exactly
-    // the lines written so far, and no temporary file is left beside it.
+    // Opened, the file exists (empty); after each check it holds exactly the
+    // lines written so far, in the same file: a reader that opened it at the
+    // start sees them, and so does a second hard link. No temporary file is
+    // left beside it.
     std::string keep = Write("keep.dat", "Value=1\n");
+    std::string link = dir.File("link.dat");
+    std::filesystem::create_hard_link(keep, link);
     {
         ASCIIFileImpl file(String(keep), false);
         EXPECT_EQ(nxtest::ReadFile(keep), "");
-        file.PutInt("Value", 2);
-        file.CheckOutError();
-        EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\n");
+        std::ifstream follower(keep, std::ios::binary);
+        std::string line;
+        for (int value : {2, 20}) {
+            file.PutInt("Value", value);
+            file.CheckOutError();
+            follower.clear();
+            ASSERT_TRUE(std::getline(follower, line));
+            EXPECT_EQ(line, "Value=" + std::to_string(value));
+        }
+        EXPECT_EQ(nxtest::ReadFile(link), "Value=2\nValue=20\n");
         file.PutInt("Other", 3);
     }
+    std::filesystem::remove(link);
     std::vector<std::string> left;
     for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
         if (entry.path().filename().string().rfind("keep.dat", 0) == 0) {
@@ -429,7 +471,7 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
         }
     }
     EXPECT_EQ(left, std::vector<std::string>{"keep.dat"});
-    EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\nOther=3\n");
+    EXPECT_EQ(nxtest::ReadFile(keep), "Value=2\nValue=20\nOther=3\n");
 
     // A writable file in a directory that takes no new files.
     std::string closed = dir.File("closed");

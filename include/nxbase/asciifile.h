@@ -36,8 +36,9 @@ public:
 
     // True once an output failure has been latched.
     virtual bool GetError() const = 0;
-    // Flushes the output and latches a failure of the output stream (a full
-    // disk, a file removed while written) in the error flag.
+    // Hands the written lines to the output (the kernel, for a file opened by
+    // name; no sync to the disk) and latches a failure of the output stream
+    // (a full disk, a file removed while written) in the error flag.
     virtual void CheckOutError() = 0;
     // The format version read by CheckVersion or set by SetVersion.
     virtual int GetVersion() const = 0;
@@ -137,9 +138,11 @@ public:
     // By name. Reading: a file with a line feed in its first 1024 bytes is
     // read with the caret rules of current files, any other file with the
     // legacy rules (DOS code page). A file that cannot be opened reads as
-    // empty. Writing: the lines go to a temporary file beside the target that
-    // replaces it when the object is destroyed without a latched error;
-    // devices and other non-regular files are written directly.
+    // empty. Writing: the file is emptied (or created) at once, keeping its
+    // owner, permissions and links; each CheckOutError hands the lines
+    // written so far to the kernel, and the destructor writes the rest and
+    // syncs the file to the disk. The file always ends in a whole line: a
+    // failed write is latched and taken back.
     ASCIIFileImpl(const String& asFileName, bool axForReading, bool axTabMode = false);
     // On the caller's stream (not owned). Reading starts at once with the
     // current caret rules; the size is unknown (0xFFFFFFFF).

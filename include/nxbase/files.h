@@ -22,8 +22,11 @@ namespace nxbase {
 // either the old one or the complete new one, never a part:
 // - a regular file (or a missing one) is replaced through a temporary file
 //   in its directory, synced and renamed over it; an existing file keeps its
-//   permissions. When the directory cannot take the temporary file but the
-//   file itself is writable, the file is rewritten in place instead.
+//   permissions and its owner. The file is rewritten in place instead, which
+//   is not atomic, when it has more than one hard link (so that every name
+//   sees the new content), when its owner cannot be given to the
+//   replacement, or when the directory cannot take the temporary file but
+//   the file itself is writable.
 // - a symbolic link is followed to its final target, which is replaced as
 //   above; the link stays a link.
 // - anything else (a FIFO, a terminal, /dev/null, /dev/full) is opened and

@@ -12,7 +12,6 @@
 #include <cstdint>
 #include <mutex>
 #include <string>
-#include <thread>
 #include <utility>
 
 #include "nxbase/export.h"
@@ -45,7 +44,8 @@ class NXBASE_EXPORT ProgressListener {
     double GetMinimalProgressStep() const { return amMinimalStep.load(); }
 
   protected:
-    // True on the listener's user-interface thread: the thread that created it.
+    // True on the application's user-interface thread (the thread that drives
+    // the event loop), whichever thread created the listener.
     bool CheckUIThread() const;
     // True when `axProgress` should be drawn: nothing shown since the last
     // reset, a change of at least the minimal step, or the first report of 1.
@@ -57,13 +57,13 @@ class NXBASE_EXPORT ProgressListener {
     std::atomic<double> amMinimalStep{0.0};
     // Last value drawn; negative when nothing is shown.
     mutable std::atomic<double> amShown{-1.0};
-    std::thread::id amUIThread;
 };
 
 // A step of a larger operation: its own 0..1 maps onto [start, end] of its
-// parent. The parent must outlive the range. A failed range check raises the
-// library's assertion (source "waitvisu"); when the user goes on, the range is
-// clamped to a valid one so that the parent never sees values outside 0..1.
+// parent. The parent must outlive the range. A failed range or progress check
+// raises the library's assertion (source "waitvisu"); when the user goes on,
+// the values are used as given: start + p * (end - start) reaches the parent
+// even when it lies outside 0..1.
 class NXBASE_EXPORT ProgressListenerRange : public ProgressListener {
   public:
     ProgressListenerRange(ProgressListener& axParent, double axStart, double axEnd);
@@ -73,7 +73,7 @@ class NXBASE_EXPORT ProgressListenerRange : public ProgressListener {
     // The next tile: UpdateRunRange(old end, axEnd).
     void UpdateRunRange(double axEnd);
 
-    // Reports the range's start (its own 0) to the parent.
+    // Forgets what this range showed; the parent is not told anything.
     void ResetProgress() override;
     // Checks axProgress, then reports start + axProgress * (end - start).
     void DisplayProgress(double axProgress) override;
@@ -114,8 +114,9 @@ class NXBASE_EXPORT WaitVisualizerRunRange {
     // (0, 1), each entry (a, b), oldest first, narrows (s, e) to
     // (s + (e - s) a, s + (e - s) b).
     static std::pair<double, double> GetCurrentRunRange();
-    // Maps the innermost step's own 0..1 through GetCurrentRunRange() and
-    // passes it to CurrentWaitVisualizer::Display.
+    // Checks axProgress, maps the innermost step's own 0..1 through
+    // GetCurrentRunRange() (unclamped, as the range does) and passes it to
+    // CurrentWaitVisualizer::Display.
     static void Display(double axProgress);
 
   private:

@@ -11,6 +11,7 @@ Application& Application::Get() {
 }
 
 void Application::Execute() {
+    MarkUserInterfaceThread();
     ++executing_;
     while (!quitting_) {
         if (context_.stopped()) context_.restart();
@@ -29,11 +30,13 @@ void Application::ResetQuit() {
 }
 
 void Application::Reschedule() {
+    MarkUserInterfaceThread();
     if (context_.stopped()) context_.restart();
     context_.poll();
 }
 
 bool Application::RunOneFor(std::chrono::milliseconds timeout) {
+    MarkUserInterfaceThread();
     if (context_.stopped()) context_.restart();
     bool ran = context_.run_one_for(timeout) > 0;
     return ran;

@@ -92,6 +92,12 @@ void WriteWholeFile(const std::string& path, std::string_view content) {
         WriteDirectly(target, content, false);
         return;
     }
+    // A second name of the file would keep the old content after a rename:
+    // a hard-linked file is rewritten where it is.
+    if (exists && info.st_nlink > 1) {
+        WriteDirectly(target, content, true);
+        return;
+    }
     std::size_t slash = target.rfind('/');
     std::string temporary =
         (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) + "." +
@@ -107,6 +113,16 @@ void WriteWholeFile(const std::string& path, std::string_view content) {
             return;
         }
         Fail(path, "cannot create a temporary file beside it", errno);
+    }
+    // The replacement belongs to whoever owned the file (root writing a
+    // user's file). Where we may not give it away, the file is rewritten in
+    // place, which keeps its owner.
+    if (exists && (info.st_uid != ::geteuid() || info.st_gid != ::getegid()) &&
+        ::fchown(fd, info.st_uid, info.st_gid) != 0) {
+        ::close(fd);
+        ::unlink(name.data());
+        WriteDirectly(target, content, true);
+        return;
     }
     mode_t mode = exists ? (info.st_mode & 07777) : [] {
         mode_t mask = ::umask(0);

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nxbase/check.h"
+#include "toolkit/application.h"
 
 namespace {
 
@@ -114,7 +115,7 @@ RunRangeStack& Stack() {
 // ---------------------------------------------------------------------------
 // ProgressListener
 
-ProgressListener::ProgressListener() : amUIThread(std::this_thread::get_id()) {}
+ProgressListener::ProgressListener() = default;
 
 ProgressListener::~ProgressListener() = default;
 
@@ -137,7 +138,7 @@ void ProgressListener::SetMinimalProgressStep(double axStep) {
 }
 
 bool ProgressListener::CheckUIThread() const {
-    return std::this_thread::get_id() == amUIThread;
+    return Application::Get().IsUserInterfaceThread();
 }
 
 bool ProgressListener::CheckProgressIncrement(double axProgress) const {
@@ -189,7 +190,7 @@ std::pair<double, double> ProgressListenerRange::GetRunRange() const {
 
 double ProgressListenerRange::Map(double axProgress) const {
     std::lock_guard<std::mutex> lock(amMutex);
-    return amStart + Clamp01(axProgress) * (amEnd - amStart);
+    return amStart + axProgress * (amEnd - amStart);
 }
 
 // Resets this listener's own state only; the parent keeps what it shows.
@@ -272,7 +273,7 @@ std::pair<double, double> WaitVisualizerRunRange::GetCurrentRunRange() {
 void WaitVisualizerRunRange::Display(double axProgress) {
     CheckProgress(axProgress);
     auto range = GetCurrentRunRange();
-    CurrentWaitVisualizer::Display(range.first + Clamp01(axProgress) * (range.second - range.first));
+    CurrentWaitVisualizer::Display(range.first + axProgress * (range.second - range.first));
 }
 
 // ---------------------------------------------------------------------------

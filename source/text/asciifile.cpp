@@ -190,7 +190,7 @@ ASCIIFileImpl::~ASCIIFileImpl() {
     if (!amOwnsStream || !pOwned) return;
     if (pOutput != nullptr) CheckOutError();
     if (!pOwned->Close(!amError) || amError) {
-        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; the file keeps what was flushed before",
+        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; the file keeps the lines written before the failure",
                             "");
     }
 }

@@ -1,16 +1,11 @@
 #include "asciifile_io.h"
 
-#include "nxbase/files.h"
-
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <atomic>
 #include <cerrno>
-#include <climits>
-#include <cstdlib>
 #include <cstring>
 #include <istream>
 #include <streambuf>
@@ -50,23 +45,27 @@ bool WriteAll(int fd, const char* data, std::size_t size) {
     return true;
 }
 
-// The file a path finally names: symbolic links resolved when the target
-// exists, the path itself otherwise.
-std::string ResolvedTarget(const std::string& path) {
-    struct stat info {};
-    if (::lstat(path.c_str(), &info) == 0 && S_ISLNK(info.st_mode)) {
-        char resolved[PATH_MAX];
-        if (::realpath(path.c_str(), resolved) != nullptr) return resolved;
-    }
-    return path;
+bool FsyncRetrying(int fd) {
+    int result;
+    do {
+        result = ::fsync(fd);
+    } while (result != 0 && errno == EINTR);
+    return result == 0;
 }
 
 }  // namespace
 
 // A std::streambuf over one file descriptor, for reading or for writing.
+//
+// Written text reaches the descriptor in whole lines: when the buffer fills,
+// everything up to its last line feed is written and the rest kept (a line
+// longer than the buffer grows it). A sync writes all that is pending. When a
+// write fails the file is cut back to what the earlier writes left, so that
+// it never ends in a part of a line.
 class DescriptorBuffer : public std::streambuf {
 public:
-    DescriptorBuffer(int fd, bool writing) : fd_(fd), buffer_(kBufferSize) {
+    DescriptorBuffer(int fd, bool writing, bool regularFile = false)
+        : fd_(fd), regularFile_(regularFile), buffer_(kBufferSize) {
         if (writing) {
             setp(buffer_.data(), buffer_.data() + buffer_.size());
         } else {
@@ -97,6 +96,10 @@ public:
         return std::memchr(gptr(), c, static_cast<std::size_t>(egptr() - gptr())) != nullptr;
     }
     bool failed() const { return failed_; }
+    // Drops what is pending without writing it.
+    void Discard() {
+        if (pbase() != nullptr) setp(buffer_.data(), buffer_.data() + buffer_.size());
+    }
 
     bool CloseDescriptor() {
         if (fd_ < 0) return true;
@@ -116,7 +119,9 @@ protected:
     }
 
     int_type overflow(int_type c) override {
-        if (!FlushPut()) return traits_type::eof();
+        if (pbase() == nullptr || failed_) return traits_type::eof();
+        if (!WriteCompleteLines()) return traits_type::eof();
+        if (pptr() == epptr()) Grow();
         if (!traits_type::eq_int_type(c, traits_type::eof())) {
             *pptr() = traits_type::to_char_type(c);
             pbump(1);
@@ -126,22 +131,51 @@ protected:
 
     int sync() override {
         if (pbase() == nullptr) return 0;
-        return FlushPut() ? 0 : -1;
+        if (failed_) return -1;
+        const std::size_t pending = static_cast<std::size_t>(pptr() - pbase());
+        return Write(pbase(), pending) ? (Discard(), 0) : -1;
     }
 
 private:
-    bool FlushPut() {
-        if (pbase() == nullptr) return false;
-        std::size_t pending = static_cast<std::size_t>(pptr() - pbase());
-        if (pending > 0) {
-            if (failed_ || fd_ < 0 || !WriteAll(fd_, pbase(), pending)) failed_ = true;
-            setp(buffer_.data(), buffer_.data() + buffer_.size());
+    // Writes the pending text up to its last line feed and moves the rest to
+    // the front of the buffer.
+    bool WriteCompleteLines() {
+        const std::size_t pending = static_cast<std::size_t>(pptr() - pbase());
+        const char* data = pbase();
+        const void* last = ::memrchr(data, '\n', pending);
+        if (last == nullptr) return true;
+        const std::size_t lines = static_cast<std::size_t>(static_cast<const char*>(last) - data) + 1;
+        if (!Write(data, lines)) return false;
+        const std::size_t rest = pending - lines;
+        std::memmove(buffer_.data(), data + lines, rest);
+        setp(buffer_.data(), buffer_.data() + buffer_.size());
+        pbump(static_cast<int>(rest));
+        return true;
+    }
+
+    void Grow() {
+        const std::size_t pending = static_cast<std::size_t>(pptr() - pbase());
+        buffer_.resize(buffer_.size() * 2);
+        setp(buffer_.data(), buffer_.data() + buffer_.size());
+        pbump(static_cast<int>(pending));
+    }
+
+    bool Write(const char* data, std::size_t size) {
+        if (size == 0) return true;
+        if (fd_ >= 0 && WriteAll(fd_, data, size)) {
+            written_ += size;
+            return true;
         }
-        return !failed_;
+        failed_ = true;
+        // A part of a line may have reached the file; take it back.
+        if (fd_ >= 0 && regularFile_) (void)::ftruncate(fd_, static_cast<off_t>(written_));
+        return false;
     }
 
     int fd_;
+    bool regularFile_;
     bool failed_ = false;
+    std::uint64_t written_ = 0;
     std::vector<char> buffer_;
 };
 
@@ -171,44 +205,26 @@ std::unique_ptr<DataFileStream> DataFileStream::OpenForReading(const std::string
 std::unique_ptr<DataFileStream> DataFileStream::OpenForWriting(const std::string& path) {
     std::unique_ptr<DataFileStream> file(new DataFileStream());
     file->writing_ = true;
-    file->target_ = ResolvedTarget(path);
-
+    // Truncated in place: owner, permissions and hard links stay as they
+    // are, a symbolic link is followed, and a directory closed to new files
+    // is no obstacle when the file itself is writable.
+    const int fd = OpenRetrying(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOCTTY, 0666);
     struct stat info {};
-    if (::stat(file->target_.c_str(), &info) == 0 && !S_ISREG(info.st_mode)) {
-        const int fd = OpenRetrying(file->target_.c_str(), O_WRONLY | O_TRUNC);
-        file->buffer_ = std::make_unique<DescriptorBuffer>(fd, true);
-        file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
-        if (fd < 0) file->stream_->setstate(std::ios::badbit);
-        return file;
-    }
-    file->memory_ = std::make_unique<std::stringstream>(std::ios::out | std::ios::binary);
-    file->stream_ = std::make_unique<std::iostream>(file->memory_->rdbuf());
-    // The file exists from the open on, as callers expect of a file opened
-    // for writing.
-    if (!file->Publish()) file->stream_->setstate(std::ios::badbit);
+    file->regular_ = fd >= 0 && ::fstat(fd, &info) == 0 && S_ISREG(info.st_mode);
+    file->buffer_ = std::make_unique<DescriptorBuffer>(fd, true, file->regular_);
+    file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
+    if (fd < 0) file->stream_->setstate(std::ios::badbit);
     return file;
-}
-
-bool DataFileStream::Publish() {
-    stream_->flush();
-    if (stream_->fail()) return false;
-    const std::string content = memory_->str();
-    if (everPublished_ && content.size() == published_) return true;
-    try {
-        nxbase::WriteWholeFile(target_, content);
-    } catch (const std::exception&) {
-        return false;
-    }
-    published_ = content.size();
-    everPublished_ = true;
-    return true;
 }
 
 bool DataFileStream::Flush() {
     if (!writing_ || closed_) return true;
-    if (memory_) return Publish();
     stream_->flush();
-    if (stream_->fail() || buffer_->failed() || buffer_->fd() < 0) return false;
+    return !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0 && StillNamed();
+}
+
+bool DataFileStream::StillNamed() const {
+    if (!regular_) return true;
     struct stat info {};
     return ::fstat(buffer_->fd(), &info) == 0 && info.st_nlink > 0;
 }
@@ -220,16 +236,15 @@ bool DataFileStream::Close(bool commit) {
         buffer_->CloseDescriptor();
         return true;
     }
-    if (memory_) {
-        if (!commit) return true;
-        closed_ = false;
-        const bool ok = Publish();
-        closed_ = true;
-        return ok;
+    if (!commit) {
+        buffer_->Discard();
+        buffer_->CloseDescriptor();
+        return true;
     }
     stream_->flush();
-    const bool ok = commit && !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0;
-    return (buffer_->CloseDescriptor() && ok) || !commit;
+    bool ok = !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0 && StillNamed();
+    if (ok && regular_) ok = FsyncRetrying(buffer_->fd());
+    return buffer_->CloseDescriptor() && ok;
 }
 
 }  // namespace nxbase::detail

@@ -6,7 +6,6 @@
 #include <cstdint>
 #include <iosfwd>
 #include <memory>
-#include <sstream>
 #include <string>
 
 namespace nxbase::detail {
@@ -15,13 +14,12 @@ class DescriptorBuffer;
 
 // One data file opened by name, for reading or for writing.
 //
-// Writing a regular file collects the text in memory and publishes it at
-// every Flush and at Close(true) with nxbase::WriteWholeFile: the file exists
-// from the open on, and whenever a caller can look it holds exactly what was
-// written up to the last flush, never a part of a line. A directory that
-// does not take new files is fine when the file itself is writable. An
-// existing target that is not a regular file (a device such as /dev/full, a
-// pipe) is written directly. A symbolic link is followed to its target.
+// Writing truncates the file at the open, so that it exists from then on
+// with its owner, permissions and links, and appends: each Flush hands every
+// line written so far to the kernel (readers see it, and a crash of the
+// process loses none of it), Close(true) syncs the file to the disk. The
+// file only ever ends in a whole line: a write that fails is taken back. A
+// symbolic link is followed; a device or a pipe is written the same way.
 class DataFileStream {
 public:
     // Opens `path` for reading. Stores the file's size (0 when it cannot be
@@ -41,13 +39,14 @@ public:
     std::uint64_t Size() const { return size_; }
     bool HasLineFeed() const { return lineFeed_; }
 
-    // Flushes buffered output; false when a write failed or when the file
-    // being written has lost its last name (its directory was removed), so
-    // that the data can never be found again.
+    // Hands the buffered output to the kernel; false when a write failed or
+    // when the file being written has lost its last name (its directory was
+    // removed), so that the data can never be found again.
     bool Flush();
-    // Ends the file. A writer publishes what is left when `commit` and every
-    // write succeeded; otherwise the file keeps what the last flush gave it.
-    // Returns false when a commit was asked for and failed.
+    // Ends the file. A writer writes what is left and syncs the file when
+    // `commit`; otherwise what was not yet written is dropped and the file
+    // keeps its whole lines. Returns false when a commit was asked for and
+    // failed.
     bool Close(bool commit);
 
 private:
@@ -59,12 +58,8 @@ private:
     bool lineFeed_ = false;
     bool writing_ = false;
     bool closed_ = false;
-    bool Publish();
-
-    std::string target_;
-    std::unique_ptr<std::stringstream> memory_;  // null when writing directly
-    std::size_t published_ = 0;                  // bytes of memory_ in the file
-    bool everPublished_ = false;
+    bool regular_ = false;
+    bool StillNamed() const;
 };
 
 }  // namespace nxbase::detail

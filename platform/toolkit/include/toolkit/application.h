@@ -13,12 +13,14 @@
 #define TOOLKIT_APPLICATION_H_
 
 #include <array>
+#include <atomic>
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
 #include <cstring>
 #include <functional>
 #include <memory>
+#include <thread>
 
 #include "nxbase/export.h"
 
@@ -74,6 +76,11 @@ class NXBASE_EXPORT Application {
     // Blocks until one handler ran or `timeout` passed; true when one ran.
     bool RunOneFor(std::chrono::milliseconds timeout);
 
+    // True on the application's user-interface thread: the thread that last
+    // drove the loop (Execute, Reschedule, RunOneFor), or, before the loop
+    // ever ran, the thread that first asked for the application object.
+    bool IsUserInterfaceThread() const { return std::this_thread::get_id() == uiThread_.load(); }
+
     // The waiting state of the user interface (busy cursor, input off),
     // passed to the UserInterface handler.
     void Wait(bool abWaiting);
@@ -85,12 +92,14 @@ class NXBASE_EXPORT Application {
 
   private:
     Application() = default;
+    void MarkUserInterfaceThread() { uiThread_.store(std::this_thread::get_id()); }
 
     boost::asio::io_context context_;
     std::function<void(unsigned long, void*)> userEventHandler_;
     bool quitting_ = false;
     bool waiting_ = false;
     int executing_ = 0;
+    std::atomic<std::thread::id> uiThread_{std::this_thread::get_id()};
 };
 
 // A one-shot timer on the application's loop: after Start() it calls its
