@@ -1,9 +1,11 @@
 // The application's name, directories, configuration files and settings.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
+#include <iterator>
 #include <memory>
 #include <string>
 
@@ -131,6 +133,38 @@ TEST_F(AppConfigTest, WholeFileWritesKeepHardLinksAndTheFilesOwner) {
         EXPECT_EQ(info.st_gid, 65534u);
         EXPECT_EQ(ReadFile(users), "new\n");
     }
+
+    // A directory closed to new files, written by a user whom permissions
+    // bind (root is dropped to user 65534): the writable file is rewritten in
+    // place and nothing else appears beside it.
+    TempDir shared(TempDir::Reach::kOtherUsers);
+    const std::string closed = shared.File("closed");
+    const std::string data = closed + "/data.reg";
+    std::filesystem::create_directory(closed);
+    WriteFile(data, "old\n");
+    if (::geteuid() == 0) {
+        ASSERT_EQ(::chmod(shared.path().c_str(), 0755), 0);
+        ASSERT_EQ(::chown(closed.c_str(), 65534, 65534), 0);
+        ASSERT_EQ(::chown(data.c_str(), 65534, 65534), 0);
+    }
+    ASSERT_EQ(::chmod(closed.c_str(), 0555), 0);
+    const pid_t child = ::fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        if (::geteuid() == 0 && (::setgid(65534) != 0 || ::setuid(65534) != 0)) ::_exit(2);
+        try {
+            nxbase::WriteWholeFile(data, "new\n");
+        } catch (const std::exception&) {
+            ::_exit(1);
+        }
+        ::_exit(0);
+    }
+    int status = -1;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    ::chmod(closed.c_str(), 0755);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    EXPECT_EQ(ReadFile(data), "new\n");
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(closed), std::filesystem::directory_iterator()), 1);
 }
 
 TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults) {

@@ -363,7 +363,7 @@ TEST(IniFile, AFailedWriteKeepsTheOldFileAndReportsALine) {
 
 // The store and its log line, with a directory the writer may not change.
 TEST(IniConfigStore, AnUnwritableDirectoryKeepsTheOldFileAndLogsTheFailure) {
-    TempDir dir;
+    TempDir dir(TempDir::Reach::kOtherUsers);
     const std::string path = dir.File("locked.ini");
     IniConfig store(path);
     store.WriteKey("G", "Key", "old");

@@ -1,6 +1,13 @@
 // Enciphered spectra: exact round trips, and every wrong key or altered byte
 // refused rather than turned into a wrong spectrum.
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <fstream>
+#include <string>
 
 #include <cmath>
 #include <cstring>
@@ -56,6 +63,80 @@ TEST(EncryptedSpectralData, RoundTripsBitForBitAndNeverRepeatsItsBytes) {
     EncryptedSpectralData::SetProcessKey(key);
     EXPECT_TRUE(SameBits(a.GetDecryptedSpectrum(), Spectrum()));
     EncryptedSpectralData::ClearProcessKey();
+}
+
+// A key known only as two random halves, so that the test itself never keeps
+// a copy of it: the key byte i is mask[i] ^ masked[i].
+struct SecretKey {
+    EncryptedSpectralData::Key mask, masked;
+    SecretKey() {
+        std::random_device device;
+        for (std::size_t i = 0; i < mask.size(); ++i) {
+            mask[i] = static_cast<unsigned char>(device());
+            masked[i] = static_cast<unsigned char>(device());
+        }
+    }
+    void Into(EncryptedSpectralData::Key& key) const {
+        for (std::size_t i = 0; i < key.size(); ++i) key[i] = mask[i] ^ masked[i];
+    }
+    bool At(const unsigned char* bytes) const {
+        for (std::size_t i = 0; i < mask.size(); ++i) {
+            if (bytes[i] != (mask[i] ^ masked[i])) return false;
+        }
+        return true;
+    }
+};
+
+void Forget(EncryptedSpectralData::Key& key) {
+    volatile unsigned char* bytes = key.data();
+    for (std::size_t i = 0; i < key.size(); ++i) bytes[i] = 0;
+}
+
+// Where the writable memory of this process holds the key: "[heap]",
+// "[stack]", a library's data.
+std::vector<std::string> PlacesHolding(const SecretKey& secret) {
+    std::vector<std::string> found;
+    std::ifstream maps("/proc/self/maps");
+    const int mem = ::open("/proc/self/mem", O_RDONLY | O_CLOEXEC);
+    std::vector<unsigned char> buffer(1 << 20);
+    for (std::string line; std::getline(maps, line);) {
+        unsigned long start = 0, end = 0;
+        char permissions[5] = {};
+        if (std::sscanf(line.c_str(), "%lx-%lx %4s", &start, &end, permissions) != 3) continue;
+        if (permissions[0] != 'r' || permissions[1] != 'w' || line.find("[v") != std::string::npos) continue;
+        for (unsigned long at = start; at < end; at += buffer.size() - 32) {
+            const std::size_t want = std::min<unsigned long>(buffer.size(), end - at);
+            const ssize_t got = ::pread(mem, buffer.data(), want, static_cast<off_t>(at));
+            for (ssize_t i = 0; i + 32 <= got; ++i) {
+                if (secret.At(buffer.data() + i)) found.push_back(line);
+            }
+            if (want < buffer.size()) break;
+        }
+    }
+    ::close(mem);
+    return found;
+}
+
+// Deciphers from deep down the stack, so that what the call leaves in its
+// dead frames is not overwritten by the scan.
+std::size_t DecipherDeep(const EncryptedSpectralData& data, int depth) {
+    volatile unsigned char pad[4096];
+    pad[0] = static_cast<unsigned char>(depth);
+    if (depth > 0) return DecipherDeep(data, depth - 1) + pad[0] * 0;
+    return data.GetDecryptedSpectrum().size();
+}
+
+TEST(EncryptedSpectralData, NoCopyOfTheProcessKeyOutlivesItsUse) {
+    const SecretKey secret;
+    EncryptedSpectralData::Key key;
+    secret.Into(key);
+    const EncryptedSpectralData data = EncryptedSpectralData::Encrypt(Spectrum(), key);
+    EncryptedSpectralData::SetProcessKey(key);
+    Forget(key);
+    EXPECT_EQ(DecipherDeep(data, 16), Spectrum().size());
+    EncryptedSpectralData::ClearProcessKey();
+    const std::vector<std::string> places = PlacesHolding(secret);
+    EXPECT_TRUE(places.empty()) << "the key is still in " << places.front();
 }
 
 TEST(EncryptedSpectralData, RefusesWrongKeysAlteredTruncatedAndForeignBytes) {

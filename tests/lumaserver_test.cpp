@@ -252,12 +252,21 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     EXPECT_EQ(run("--expect s LumaServer 13", status), "status 0\nbytes  00 01 00\nvalues 1\n");
     run("LumaServer MOVE_HOME b:5 s:49 i:-3 str:x hex:0a0b", status);
     EXPECT_EQ(status, 1);  // answered with status 2
-    for (const char* usage : {"LumaServer", "LumaServer NO_SUCH", "LumaServer IS_READY q:1",
-                              "LumaServer IS_READY hex:abc", "LumaServer IS_READY b:300"}) {
+    for (const char* usage : {"LumaServer", "LumaServer IS_READY q:1", "LumaServer IS_READY hex:abc",
+                              "LumaServer IS_READY b:300", "LumaServer 135"}) {
         run(usage, status);
         EXPECT_EQ(status, 2) << usage;
     }
-    run("--timeout 1 Nobody IS_READY", status);
+    EXPECT_NE(run("LumaServer NO_SUCH", status).find("not a message name: NO_SUCH"), std::string::npos);
+    EXPECT_EQ(status, 2);
+    // Every argument is checked before anything is sent: a bad --expect type
+    // must not let the measurement run first.
+    const std::string badType = run("--expect q LumaServer EXEC_MEASUREMENT", status);
+    EXPECT_EQ(status, 2);
+    EXPECT_NE(badType.find("unknown type in --expect: \"q\""), std::string::npos) << badType;
+    EXPECT_EQ(badType.find("status"), std::string::npos) << badType;
+    EXPECT_NE(run("--timeout 1 Nobody IS_READY", status).find("Nobody is not registered and not running"),
+              std::string::npos);
     EXPECT_EQ(status, 3);
 }
 

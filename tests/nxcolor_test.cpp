@@ -250,6 +250,21 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
     EXPECT_NE(out.find("id,dL*,dC*,dH*,dE CMC(2:1)\nB grey,-"), std::string::npos) << out;
     EXPECT_EQ(RunNxcolor("--compare " + reference, &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--compare --de 77 " + reference + " " + sample, &out, &err), 2);
+
+    // No sample with a reference is a usage error, and the unmatched ids are
+    // listed within a bound.
+    const std::string strangers = dir.File("strangers.csv");
+    {
+        std::ofstream file(strangers);
+        file << Header();
+        for (int i = 0; i < 1000; ++i) file << "\nS" << i << ",x," << Values(0.3f);
+        file << "\n";
+    }
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + strangers, &out, &err), 2);
+    EXPECT_NE(err.find("no sample of " + strangers + " has a reference"), std::string::npos) << err;
+    EXPECT_NE(err.find("... and 990 more"), std::string::npos) << err;
+    EXPECT_LT(std::count(err.begin(), err.end(), '\n'), 20) << err;
+    EXPECT_EQ(out.find("pairs"), std::string::npos) << out;
 }
 
 }  // namespace

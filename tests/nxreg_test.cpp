@@ -8,6 +8,7 @@
 #include <thread>
 
 #include <cstdio>
+#include <cstdlib>
 
 #include "test_util.h"
 
@@ -20,9 +21,12 @@ struct Result {
 
 class NxregTest : public ::testing::Test {
   protected:
-    Result Run(const std::string& arguments) {
-        std::string command =
-            std::string(NXBASE_BINARY_DIR) + "/tools/nxreg " + arguments + " 2>&1";
+    // Runs nxreg; `input`, when given, is a shell command piped into it.
+    Result Run(const std::string& arguments, const std::string& input = "") {
+        return Shell((input.empty() ? "" : input + " | ") + Nxreg() + " " + arguments + " 2>&1");
+    }
+    static std::string Nxreg() { return std::string(NXBASE_BINARY_DIR) + "/tools/nxreg"; }
+    Result Shell(const std::string& command) {
         Result result;
         FILE* pipe = ::popen(command.c_str(), "r");
         if (pipe == nullptr) return result;
@@ -102,6 +106,18 @@ TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     EXPECT_NE(import.out.find(bad + ":4: a dword needs"), std::string::npos) << import.out;
     EXPECT_EQ(Run("get 'HKCU\\Software\\K-Lume' a").status, 1);  // nothing applied
 
+    // The first line is checked before the rest is read, and what is read is
+    // bounded: endless inputs are refused instead of filling the memory.
+    Result zeros = Run("import /dev/zero");
+    EXPECT_EQ(zeros.status, 3);
+    EXPECT_NE(zeros.out.find("/dev/zero:1: the first line must be REGEDIT4"), std::string::npos) << zeros.out;
+    Result binary = Run("import -", "printf '\\177ELF\\002\\001\\n...'");
+    EXPECT_EQ(binary.status, 3);
+    EXPECT_NE(binary.out.find("<stdin>:1: the first line must be REGEDIT4"), std::string::npos) << binary.out;
+    Result huge = Run("import -", "{ printf 'REGEDIT4\\n'; cat /dev/zero; }");
+    EXPECT_EQ(huge.status, 3);
+    EXPECT_NE(huge.out.find("<stdin>: more than 64 MiB"), std::string::npos) << huge.out;
+
     nxtest::WriteFile(dir.File("user.sqlite"), std::string(4096, '#'));
     Result corrupt = Run("get 'HKCU\\Software' a");
     EXPECT_EQ(corrupt.status, 3);
@@ -155,6 +171,22 @@ TEST_F(NxregTest, AnImportTouchingBothHivesWritesBothOrNeither) {
                       "[HKEY_LOCAL_MACHINE\\Software\\K-Lume\\Both]\n\"m\"=\"1\"\n");
     EXPECT_EQ(Run("import " + file).status, 3);
     EXPECT_EQ(Run("get 'HKCU\\Software\\K-Lume\\Both' u").status, 1);
+}
+
+TEST_F(NxregTest, HivesOnAReadOnlyMountAreRead) {
+    // A private mount namespace (user namespace for non-root) makes the
+    // hives' directory a read-only bind mount for one nxreg run.
+    if (std::system("unshare -rm true >/dev/null 2>&1") != 0) {
+        GTEST_SKIP() << "cannot make a private mount namespace here (unshare -rm)";
+    }
+    ASSERT_EQ(Run("set 'HKCU\\Software\\K-Lume\\Ro' u user").status, 0);
+    ASSERT_EQ(Run("set 'HKLM\\Software\\K-Lume\\Ro' m machine").status, 0);
+    const std::string mount = "mount --bind -o ro '" + dir.path().string() + "' '" + dir.path().string() + "'";
+    Result readOnly = Shell("unshare -rm sh -c \"" + mount + " && " + Nxreg() +
+                            " get 'HKCU\\Software\\K-Lume\\Ro' u && " + Nxreg() +
+                            " get 'HKLM\\Software\\K-Lume\\Ro' m\" 2>&1");
+    EXPECT_EQ(readOnly.status, 0) << readOnly.out;
+    EXPECT_EQ(readOnly.out, "user\nmachine\n");
 }
 
 }  // namespace

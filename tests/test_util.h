@@ -19,9 +19,15 @@ namespace nxtest {
 // A fresh directory below the system's temporary directory, removed again.
 class TempDir {
   public:
-    TempDir() {
-        std::string pattern =
-            (std::filesystem::temp_directory_path() / "nxbase-test-XXXXXX").string();
+    // For tests that act as a second user: when that user could not reach
+    // the usual place (a checkout in a private home run by root), the
+    // directory is made under /tmp instead, with a fresh unique name.
+    enum class Reach { kOwnerOnly, kOtherUsers };
+
+    explicit TempDir(Reach reach = Reach::kOwnerOnly) {
+        std::filesystem::path base = std::filesystem::temp_directory_path();
+        if (reach == Reach::kOtherUsers && !OthersCanTraverse(base)) base = "/tmp";
+        std::string pattern = (base / "nxbase-test-XXXXXX").string();
         std::vector<char> buffer(pattern.begin(), pattern.end());
         buffer.push_back('\0');
         char* made = ::mkdtemp(buffer.data());
@@ -38,6 +44,20 @@ class TempDir {
     std::string File(const std::string& name) const { return (path_ / name).string(); }
 
   private:
+    // Every directory from the root down to `path` lets other users pass.
+    static bool OthersCanTraverse(const std::filesystem::path& path) {
+        std::error_code error;
+        std::filesystem::path at = std::filesystem::absolute(path, error);
+        for (; !at.empty(); at = at.parent_path()) {
+            const auto permissions = std::filesystem::status(at, error).permissions();
+            if (error || (permissions & std::filesystem::perms::others_exec) == std::filesystem::perms::none) {
+                return false;
+            }
+            if (at == at.root_path()) break;
+        }
+        return true;
+    }
+
     std::filesystem::path path_;
 };
 

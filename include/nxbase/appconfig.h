@@ -146,7 +146,7 @@ class NXBASE_EXPORT AppConfig : public KLConfig, public NxSingleton {
     // file name as a path of its own (absolute, or relative to the working
     // directory).
     static AppConfig* CreateAppConfig(const String& asDirectory, const String& asFileName);
-    // Throws std::logic_error "No AppConfig instance".
+    // Throws std::runtime_error "No AppConfig instance".
     static AppConfig* Instance();
     static bool IsInitialized();
     // Installs an instance made elsewhere (or null), deleting the current one.
@@ -172,7 +172,7 @@ class NXBASE_EXPORT UserConfig : public KLConfig, public NxSingleton {
     // Logs User config file: "<path>" under "Startup".
     static UserConfig* CreateUserConfig(const String& asAppName, const String& asDirectory,
                                         const String& asDefaultsPath);
-    // Throws std::logic_error "No UserConfig instance".
+    // Throws std::runtime_error "No UserConfig instance".
     static UserConfig* Instance();
     static bool IsInitialized();
     // $XDG_CONFIG_HOME/K-Lume (an absolute XDG_CONFIG_HOME only), else

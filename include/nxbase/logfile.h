@@ -2,8 +2,11 @@
 // of processes sharing the file, may write to it. A line with a non-empty key
 // is written only while that key is enabled; an empty key always writes.
 // Every line reaches the file in one write() on an O_APPEND descriptor, so
-// lines never tear or interleave. Writing never throws: a file that cannot be
-// opened loses the line.
+// lines of several threads and processes do not interleave on a local file
+// system that takes each write whole. A line cut short (a full disk, a
+// file-size limit) is left as it is, counts as not written and is reported to
+// the listeners; NFS and other network file systems may interleave appends.
+// Writing never throws: a file that cannot be opened loses the line.
 #ifndef NXBASE_LOGFILE_H_
 #define NXBASE_LOGFILE_H_
 

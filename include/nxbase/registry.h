@@ -28,6 +28,7 @@
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -297,6 +298,13 @@ class NXBASE_EXPORT RegistryStore {
 // (control bytes escaped as \xNN) on the first error; nothing is applied.
 NXBASE_EXPORT std::vector<RegistryStore::Change> ParseRegedit4(const std::string& asText,
                                                                const std::string& asSource);
+// Checks the head of registry text (its first bytes; `abComplete` when they
+// are the whole text) before the rest is read: true when the first non-blank
+// line is the header, false when the head ends before that line does.
+// Throws std::runtime_error as ParseRegedit4 does when the line is another,
+// or when complete text holds no line at all.
+NXBASE_EXPORT bool CheckRegedit4Header(std::string_view asHead, bool abComplete,
+                                       const std::string& asSource);
 // Writes the key and everything below it as REGEDIT4 text in UTF-8 (hex(2)
 // and hex(7) data as UTF-8 bytes with their zero bytes).
 NXBASE_EXPORT std::string ExportRegedit4(RegistryHive axHive, const std::string& asKey);

@@ -1,6 +1,7 @@
 // Enciphered spectra with AES-256-GCM; see nxbase/encryptedspectrum.h.
 #include "nxbase/encryptedspectrum.h"
 
+#include <openssl/crypto.h>
 #include <openssl/evp.h>
 #include <openssl/rand.h>
 
@@ -57,6 +58,20 @@ double GetDouble(const unsigned char* in) {
     return value;
 }
 
+// Overwrites a buffer that held a key or a deciphered spectrum when it goes,
+// in a way the compiler may not drop as a dead store.
+template <class Buffer>
+class Cleansed {
+  public:
+    explicit Cleansed(Buffer& buffer) : buffer_(buffer) {}
+    ~Cleansed() { OPENSSL_cleanse(buffer_.data(), buffer_.size() * sizeof(buffer_[0])); }
+    Cleansed(const Cleansed&) = delete;
+    Cleansed& operator=(const Cleansed&) = delete;
+
+  private:
+    Buffer& buffer_;
+};
+
 [[noreturn]] void NotAuthentic() {
     throw std::runtime_error("EncryptedSpectralData: not authentic (wrong key, or altered or foreign data)");
 }
@@ -71,6 +86,7 @@ EncryptedSpectralData EncryptedSpectralData::Encrypt(const std::vector<double>& 
         throw std::invalid_argument("EncryptedSpectralData: more than " + std::to_string(kMaxValues) + " values");
     }
     std::vector<unsigned char> plain(kCountSize + 8 * axSpectrum.size());
+    const Cleansed<std::vector<unsigned char>> plainGoes(plain);
     const auto count = static_cast<std::uint32_t>(axSpectrum.size());
     for (std::size_t i = 0; i < kCountSize; ++i) plain[i] = static_cast<unsigned char>(count >> (8 * i));
     for (std::size_t i = 0; i < axSpectrum.size(); ++i) PutDouble(axSpectrum[i], &plain[kCountSize + 8 * i]);
@@ -109,6 +125,7 @@ std::vector<double> EncryptedSpectralData::GetDecryptedSpectrum(const Key& axKey
     const std::size_t cipherSize = in.size() - kHeaderSize - kNonceSize - kTagSize;
     if (cipherSize > kCountSize + 8 * kMaxValues) NotAuthentic();
     std::vector<unsigned char> plain(cipherSize);
+    const Cleansed<std::vector<unsigned char>> plainGoes(plain);
     std::vector<unsigned char> tag(cipher + cipherSize, cipher + cipherSize + kTagSize);
     CipherContext context = NewContext();
     int length = 0;
@@ -132,6 +149,7 @@ std::vector<double> EncryptedSpectralData::GetDecryptedSpectrum(const Key& axKey
 
 std::vector<double> EncryptedSpectralData::GetDecryptedSpectrum() const {
     Key key;
+    const Cleansed<Key> keyGoes(key);
     {
         std::lock_guard<std::mutex> lock(KeyMutex());
         if (!ProcessKey()) throw std::logic_error("EncryptedSpectralData: no process key set");
@@ -142,10 +160,11 @@ std::vector<double> EncryptedSpectralData::GetDecryptedSpectrum() const {
 
 void EncryptedSpectralData::SetProcessKey(const Key& axKey) {
     std::lock_guard<std::mutex> lock(KeyMutex());
-    ProcessKey() = axKey;
+    ProcessKey() = axKey;  // overwrites the old key in place
 }
 
 void EncryptedSpectralData::ClearProcessKey() {
     std::lock_guard<std::mutex> lock(KeyMutex());
+    if (ProcessKey()) OPENSSL_cleanse(ProcessKey()->data(), ProcessKey()->size());
     ProcessKey().reset();
 }

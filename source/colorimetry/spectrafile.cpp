@@ -1,6 +1,7 @@
 // Spectral input common to CSV and CGATS: the scale, plausibility, bounded
 // reading of streams and files, and the 36-point grid.
 #include "nxbase/spectrafile.h"
+#include "spectrafile_parse.h"
 
 #include <algorithm>
 #include <cmath>

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nxbase/spectrafile.h"
+#include "spectrafile_parse.h"
 
 #include <lcms2.h>
 

@@ -1,5 +1,6 @@
 // CSV spectra; see nxbase/spectrafile.h for the format.
 #include "nxbase/spectrafile.h"
+#include "spectrafile_parse.h"
 
 #include <cctype>
 #include <charconv>

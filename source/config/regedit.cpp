@@ -342,17 +342,49 @@ void AppendHex(std::string& axOut, const RegistryValue& axValue) {
 
 }  // namespace
 
+namespace {
+
+bool IsWide(std::string_view asText) {
+    return asText.size() >= 2 && asText[0] == '\xFF' && asText[1] == '\xFE';
+}
+
+// The text in UTF-8, its byte-order mark dropped.
+std::string DecodeRegistryText(std::string_view asText) {
+    if (IsWide(asText)) return Utf16LeToUtf8(asText.substr(2));
+    if (asText.substr(0, 3) == "\xEF\xBB\xBF") asText.remove_prefix(3);  // UTF-8 mark
+    return NarrowToUtf8(asText);
+}
+
+}  // namespace
+
+bool CheckRegedit4Header(std::string_view asHead, bool abComplete, const std::string& asSource) {
+    // A UTF-16 head may end inside a character; only whole ones are decoded.
+    if (IsWide(asHead) && asHead.size() % 2 != 0) asHead.remove_suffix(1);
+    const std::string decoded = DecodeRegistryText(asHead);
+    std::string_view text(decoded);
+    std::size_t lineNumber = 0;
+    while (!text.empty()) {
+        const std::size_t end = text.find('\n');
+        if (end == std::string_view::npos && !abComplete) return false;
+        std::string_view line = text.substr(0, end);
+        ++lineNumber;
+        const std::string_view trimmed = TrimLeft(TrimRight(line));
+        if (!trimmed.empty()) {
+            if (trimmed == "REGEDIT4" || trimmed == "Windows Registry Editor Version 5.00") return true;
+            throw std::runtime_error(asSource + ":" + std::to_string(lineNumber) +
+                                     ": the first line must be REGEDIT4: " + Excerpt(line));
+        }
+        if (end == std::string_view::npos) break;
+        text.remove_prefix(end + 1);
+    }
+    if (!abComplete) return false;
+    throw std::runtime_error(asSource + ": not REGEDIT4 text (empty)");
+}
+
 std::vector<RegistryStore::Change> ParseRegedit4(const std::string& asText,
                                                  const std::string& asSource) {
-    bool wide = asText.size() >= 2 && asText[0] == '\xFF' && asText[1] == '\xFE';
-    std::string decoded;
-    if (wide) {
-        decoded = Utf16LeToUtf8(std::string_view(asText).substr(2));
-    } else {
-        std::string_view narrow(asText);
-        if (narrow.substr(0, 3) == "\xEF\xBB\xBF") narrow.remove_prefix(3);  // UTF-8 mark
-        decoded = NarrowToUtf8(narrow);
-    }
+    const bool wide = IsWide(asText);
+    const std::string decoded = DecodeRegistryText(asText);
     std::vector<RegistryStore::Change> changes;
     std::string_view text(decoded);
     bool headerSeen = false;

@@ -18,6 +18,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cstdio>
 #include <array>
 #include <atomic>
 #include <chrono>
@@ -247,6 +248,17 @@ void Run(Connection& axConnection, sqlite3_stmt* pStatement, const char* asWhat)
     if (result != SQLITE_DONE && result != SQLITE_ROW) Fail(axConnection, result, asWhat);
 }
 
+// Test seam: $NXBASE_TEST_SCHEMA_PAUSE_MS widens the window between seeing a
+// fresh file and creating its tables, where racing creators would collide
+// without the transaction around both.
+void PauseBetweenCheckAndCreate() {
+    static const long pause = [] {
+        const char* text = std::getenv("NXBASE_TEST_SCHEMA_PAUSE_MS");
+        return text != nullptr ? std::strtol(text, nullptr, 10) : 0L;
+    }();
+    if (pause > 0) std::this_thread::sleep_for(std::chrono::milliseconds(pause));
+}
+
 // Creates the tables in a fresh file, or checks that an existing file is ours.
 // The check of a file that is not (yet) ours reads the application id and the
 // tables in one transaction, so that a process creating the same hive at this
@@ -261,6 +273,7 @@ void PrepareSchema(Connection& axConnection) {
         long long tables =
             axConnection.QueryInt("SELECT count(*) FROM sqlite_master", "cannot read the schema");
         applicationId = axConnection.QueryInt("PRAGMA application_id", "cannot read");
+        PauseBetweenCheckAndCreate();
         if (applicationId != kApplicationId && (applicationId != 0 || tables != 0)) {
             throw RegistryError(0, "Registry database '" + axConnection.File() +
                                        "': the file is not a registry database");
@@ -310,6 +323,29 @@ void SetJournalMode(Connection& axConnection, const std::string& asMode) {
     }
 }
 
+// `asFile` as an SQLite URI opened read-only and immutable.
+std::unique_ptr<Connection> OpenImmutable(const std::string& asFile) {
+    std::string uri = "file:";
+    for (char c : asFile) {
+        if (c == '%' || c == '?' || c == '#') {
+            char escaped[4];
+            std::snprintf(escaped, sizeof escaped, "%%%02X", static_cast<unsigned char>(c));
+            uri += escaped;
+        } else {
+            uri += c;
+        }
+    }
+    uri += "?immutable=1";
+    sqlite3* pDb = nullptr;
+    const int result =
+        sqlite3_open_v2(uri.c_str(), &pDb, SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_URI, nullptr);
+    auto connection = std::make_unique<Connection>(asFile, pDb, false);
+    if (result != SQLITE_OK) Fail(*connection, result, "cannot open");
+    sqlite3_extended_result_codes(pDb, 1);
+    PrepareSchema(*connection);
+    return connection;
+}
+
 // Opens a hive file. Without `create` a missing file gives null, and a file
 // that cannot be written is opened for reading.
 std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive, bool abCreate) {
@@ -347,6 +383,18 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
             SetJournalMode(*connection, "wal");
             connection->Exec("PRAGMA synchronous = NORMAL", "cannot set the sync mode");
         }
+    }
+    if (!writable) {
+        try {
+            PrepareSchema(*connection);
+        } catch (const RegistryError& error) {
+            // A WAL hive on a read-only mount: SQLite cannot create the
+            // shared-memory file it reads through, so it opens the file only
+            // when told that nothing can change it, which holds there.
+            if ((error.Code() & 0xFF) != SQLITE_CANTOPEN) throw;
+            return OpenImmutable(asFile);
+        }
+        return connection;
     }
     PrepareSchema(*connection);
     return connection;

@@ -158,11 +158,11 @@ std::string ExecutableBaseName() {
 std::string DefaultLogDirectory() {
     std::string refusal;
     std::string directory = toolkit::UserTempDirectory(&refusal);
+    if (directory.empty()) directory = toolkit::TempDirectory();
     if (!refusal.empty()) {
-        std::fprintf(stderr, "Log directory refused (%s); using %s\n", refusal.c_str(),
-                     directory.c_str());
+        std::fprintf(stderr, "Log directory refused (%s); using %s\n", refusal.c_str(), directory.c_str());
     }
-    return directory.empty() ? toolkit::TempDirectory() : directory;
+    return directory;
 }
 
 // The log path: "Path" names the file, or the directory when it is one (or

@@ -2,6 +2,7 @@
 // densities) under a chosen illuminant, observer and density standard, from a
 // CSV or CGATS file or the built-in ColorChecker chart.
 #include <cctype>
+#include <cmath>
 #include <charconv>
 #include <cstdio>
 #include <iostream>
@@ -28,6 +29,15 @@ constexpr int kExitUsage = 2;         // bad options, unreadable or unusable inp
 constexpr int kExitOverTolerance = 3;  // --compare: a pair above --tolerance
 
 constexpr int kMaxPrecision = 9;
+
+// A finite decimal number that fills the whole text.
+bool ParseWholeNumber(const std::string& text, double* value) {
+    double x = 0.0;
+    const auto r = std::from_chars(text.data(), text.data() + text.size(), x);
+    if (r.ec != std::errc() || r.ptr != text.data() + text.size() || !std::isfinite(x)) return false;
+    *value = x;
+    return true;
+}
 // Inputs from this many spectra on get a progress bar (on a terminal).
 constexpr std::size_t kProgressMinRows = 20000;
 
@@ -223,7 +233,7 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
         } else if (arg == "--tolerance") {
             std::string text;
             double x = -1.0;
-            if (!take(&text) || !nxbase::detail::ParseNumber(text, &x) || x < 0.0) {
+            if (!take(&text) || !ParseWholeNumber(text, &x) || x < 0.0) {
                 return "--tolerance needs a colour difference of 0 or more, not \"" + text + "\"";
             }
             options->compareOptions.tolerance = x;
@@ -325,7 +335,19 @@ int RunCompare(Options& options, const MeasuringCondition& condition) {
     options.compareOptions.csv = options.format == "csv";
     if (options.format != "table" && options.format != "csv") return UsageError("--compare writes table or csv");
     const nxcolor::Comparison comparison = nxcolor::Compare(reference, sample, condition, options.compareOptions);
-    for (const std::string& problem : comparison.problems) std::cerr << "nxcolor: " << problem << '\n';
+    // A thousand unmatched samples say no more than the first few.
+    constexpr std::size_t kShownProblems = 10;
+    for (std::size_t i = 0; i < comparison.problems.size() && i < kShownProblems; ++i) {
+        std::cerr << "nxcolor: " << comparison.problems[i] << '\n';
+    }
+    if (comparison.problems.size() > kShownProblems) {
+        std::cerr << "nxcolor: ... and " << comparison.problems.size() - kShownProblems << " more\n";
+    }
+    if (comparison.pairs.empty()) {
+        std::cerr << "nxcolor: no sample of " << sampleName << " has a reference in " << referenceName
+                  << " (the ids differ; --by-order pairs by position)\n";
+        return kExitUsage;
+    }
     const std::string header = sampleName + " against " + referenceName + ": illuminant " + options.illuminant +
                                ", observer " + options.observer + "\xC2\xB0, " +
                                nxbase::DeltaEMethodName(options.compareOptions.method);

@@ -21,7 +21,6 @@ using nxbase::ParseSpectraCsv;
 using nxbase::ReadSpectraFile;
 using nxbase::SpectraTable;
 using nxbase::SpectrumRow;
-namespace detail = nxbase::detail;
 
 // The ColorChecker chart built into nxcolor (BabelColor average, 24 patches).
 std::string_view EmbeddedChart();

@@ -1,6 +1,7 @@
 // nxmsg: the command-line peer of the post office. Sends one message with
 // typed values and prints the answer, or listens under a name and prints
 // every command it receives.
+#include <algorithm>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -93,6 +94,35 @@ std::string Hex(const MyMemoryBlock& block) {
     return hex;
 }
 
+const char* const kAnswerTypes[] = {"b", "s", "i", "str"};
+
+// Refuses an --expect list with an unknown type, before anything is sent.
+void CheckAnswerTypes(const std::string& types) {
+    std::stringstream list(types);
+    for (std::string type; std::getline(list, type, ',');) {
+        if (std::find(std::begin(kAnswerTypes), std::end(kAnswerTypes), type) == std::end(kAnswerTypes)) {
+            throw UsageError("unknown type in --expect: \"" + type + "\" (types b, s, i, str)");
+        }
+    }
+}
+
+// The number of a message given by name or by number.
+int MessageNumber(const std::string& message) {
+    int number = nxbase::NumberOfCommandText(message);
+    if (number >= 0) return number;
+    if (message.empty() || message.find_first_not_of("0123456789") != std::string::npos) {
+        throw UsageError("not a message name: " + message + " (names such as GET_DEVICE_NAME, or numbers 0 to " +
+                         std::to_string(ANZAHL_BOTSCHAFTEN - 1) + ")");
+    }
+    char* end = nullptr;
+    const long value = std::strtol(message.c_str(), &end, 10);
+    if (*end != '\0' || value >= ANZAHL_BOTSCHAFTEN) {
+        throw UsageError("no message has the number " + message + " (0 to " +
+                         std::to_string(ANZAHL_BOTSCHAFTEN - 1) + ")");
+    }
+    return static_cast<int>(value);
+}
+
 // The answer after its status byte, as the given types.
 std::string Decode(MyMemoryBlock block, const std::string& types) {
     std::ostringstream out;
@@ -116,8 +146,6 @@ std::string Decode(MyMemoryBlock block, const std::string& types) {
             String v;
             block >> v;
             out << " \"" << v.str() << "\"";
-        } else {
-            throw UsageError("unknown type in --expect: " + type);
         }
         if (block.ReadPastEnd()) return out.str() + " (the answer is shorter)";
     }
@@ -148,15 +176,16 @@ int Listen(const std::string& name) {
 int SendOne(const std::string& self, const std::string& app, const std::string& message,
             const std::vector<std::string>& values, const std::string& expect, bool wait,
             int timeout) {
-    int number = nxbase::NumberOfCommandText(message);
-    if (number < 0) {
-        long given = ParseNumber(message, 0, ANZAHL_BOTSCHAFTEN - 1);
-        number = static_cast<int>(given);
-    }
+    const int number = MessageNumber(message);
+    CheckAnswerTypes(expect);
     MyMemoryBlock data;
     for (const std::string& value : values) AppendValue(data, value);
     ::setenv("NXBASE_WAIT_TIMEOUT", std::to_string(timeout).c_str(), 1);
     PostOffice* office = PostOffice::CreatePostOffice(String(self));
+    if (!office->HasApplication(app) && !nxbase::IsApplicationRunning(app)) {
+        std::cerr << "nxmsg: " << app << " is not registered and not running (nxreg --help shows how to register it)\n";
+        return kExitFailed;
+    }
     if (!wait) {
         String command(nxbase::MessageName(number));
         if (!office->Send(app, command, data)) {

@@ -1,6 +1,12 @@
 // nxreg: inspects and changes the registry hives of NxBase from the command
 // line, and moves keys in and out as REGEDIT4 text.
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
 #include <charconv>
+#include <cstring>
 #include <cstdio>
 #include <fstream>
 #include <iostream>
@@ -203,18 +209,55 @@ int Export(const std::vector<std::string>& asArguments) {
     return kOk;
 }
 
+// Registry text is never large: an import refuses more than this.
+constexpr std::size_t kMaxImportBytes = 64u << 20;
+// The first line must be complete within these bytes.
+constexpr std::size_t kHeadBytes = 64u << 10;
+
+// Appends up to `limit` more bytes of `fd` to `text`; true at the end of input.
+bool ReadUpTo(int fd, std::string& text, std::size_t limit, const std::string& source) {
+    char buffer[1 << 16];
+    while (limit > 0) {
+        const ssize_t n = ::read(fd, buffer, std::min(sizeof buffer, limit));
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0) throw std::runtime_error("cannot read " + source + ": " + std::strerror(errno));
+        if (n == 0) return true;
+        text.append(buffer, static_cast<std::size_t>(n));
+        limit -= static_cast<std::size_t>(n);
+    }
+    return false;
+}
+
 int Import(const std::vector<std::string>& asArguments) {
     if (asArguments.size() != 1) throw UsageError("import takes one file");
-    std::string text;
     const std::string& file = asArguments[0];
-    if (file == "-") {
-        text.assign(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
-    } else {
-        std::ifstream in(file, std::ios::binary);
-        if (!in) throw std::runtime_error("cannot read " + file);
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+    const std::string source = file == "-" ? "<stdin>" : file;
+    int fd = 0;
+    if (file != "-") {
+        fd = ::open(file.c_str(), O_RDONLY | O_CLOEXEC);
+        if (fd < 0) throw std::runtime_error("cannot read " + file + ": " + std::strerror(errno));
     }
-    auto changes = nxbase::ParseRegedit4(text, file == "-" ? "<stdin>" : file);
+    struct Closer {
+        int fd;
+        ~Closer() {
+            if (fd > 0) ::close(fd);
+        }
+    } closer{fd};
+    // The header is checked before the rest is read, so that a wrong file
+    // is refused at once, whatever its size.
+    std::string text;
+    bool atEnd = ReadUpTo(fd, text, kHeadBytes, source);
+    if (!nxbase::CheckRegedit4Header(text, atEnd, source)) {
+        throw std::runtime_error(source + ":1: the first line must be REGEDIT4 (no line end within " +
+                                 std::to_string(kHeadBytes >> 10) + " KiB)");
+    }
+    std::string beyond;
+    if (!atEnd && !ReadUpTo(fd, text, kMaxImportBytes - text.size(), source) &&
+        !ReadUpTo(fd, beyond, 1, source)) {
+        throw std::runtime_error(source + ": more than " + std::to_string(kMaxImportBytes >> 20) +
+                                 " MiB; registry text is never this large");
+    }
+    auto changes = nxbase::ParseRegedit4(text, source);
     nxbase::RegistryStore::Apply(changes);
     return kOk;
 }
