@@ -42,8 +42,10 @@ NXBASE_EXPORT bool SplitMessageBody(const std::string& asBody, std::string& asSe
 NXBASE_EXPORT bool SplitRequest(const std::string& asRequest, std::string& asName);
 
 // Collects bytes as they arrive and hands out whole frame bodies. A large
-// frame is collected in a buffer of its own size and handed out without a
-// copy, so the reader never holds its bytes twice.
+// frame is collected in a buffer of its own that grows with the bytes that
+// arrive, never beyond the frame's size, and is handed out without a copy:
+// the reader holds at most twice a frame's bytes, and only while its buffer
+// grows.
 class NXBASE_EXPORT FrameReader {
   public:
     enum class Result { kFrame, kNeedMore, kMalformed };
@@ -56,6 +58,7 @@ class NXBASE_EXPORT FrameReader {
 
   private:
     void Compact();
+    void ReserveLarge(std::size_t alNeeded);
 
     std::string amBuffer;  // headers and small frames
     std::size_t amStart = 0;

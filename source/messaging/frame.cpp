@@ -89,6 +89,7 @@ bool SplitRequest(const std::string& asRequest, std::string& asName) {
 void FrameReader::Append(const char* pData, std::size_t alSize) {
     if (amInLarge) {
         std::size_t take = std::min(alSize, amLargeLength - amLarge.size());
+        ReserveLarge(amLarge.size() + take);
         amLarge.append(pData, take);
         pData += take;
         alSize -= take;
@@ -99,6 +100,14 @@ void FrameReader::Append(const char* pData, std::size_t alSize) {
         amStart = 0;
     }
     amBuffer.append(pData, alSize);
+}
+
+// Room for `needed` bytes of the large frame: doubling, capped at its size,
+// so that the old and the new buffer together never exceed twice the frame.
+void FrameReader::ReserveLarge(std::size_t needed) {
+    if (needed <= amLarge.capacity()) return;
+    const std::size_t doubled = std::max(needed, std::max(2 * amLarge.capacity(), kLargeFrame));
+    amLarge.reserve(std::min(doubled, amLargeLength));
 }
 
 void FrameReader::Compact() {
@@ -136,10 +145,13 @@ FrameReader::Result FrameReader::Next(std::string& asBody) {
             return Result::kFrame;
         }
         if (length < kLargeFrame) return Result::kNeedMore;
-        // A large frame: its body goes into a buffer of exactly its size.
-        amLarge.reserve(length);
-        amLarge.assign(amBuffer, amStart + kFrameHeaderSize, std::string::npos);
+        // A large frame: its body goes into a buffer of its own, which grows
+        // with the bytes that arrive (a claimed length costs nothing before
+        // its bytes come) and never beyond the frame's size.
         amLargeLength = length;
+        amLarge.clear();
+        ReserveLarge(available - kFrameHeaderSize);
+        amLarge.append(amBuffer, amStart + kFrameHeaderSize, std::string::npos);
         amInLarge = true;
         amBuffer.clear();
         std::string().swap(amBuffer);
