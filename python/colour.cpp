@@ -104,6 +104,23 @@ std::shared_ptr<const nxbase::ColorBatch> BatchFor(const std::string& illuminant
 
 enum class Quantity { kXYZ, kLab };
 
+// Spectra beyond this Y (percent of the white) are no reflectance factors:
+// with every value at most 2 (the readers' bound) Y stays below 200.
+constexpr float kMaxPlausibleY = 200.0f;
+// L* of Y = 200 % of the white.
+constexpr float kMaxPlausibleL = 130.2f;
+
+// The index of the first result whose lightness says the spectrum was not a
+// reflectance factor (percentages, most likely); -1 when all are plausible.
+long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
+    const int axis = quantity == Quantity::kXYZ ? 1 : 0;
+    const float limit = quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
+    for (std::size_t i = 0; i < count; ++i) {
+        if (out[3 * i + axis] > limit) return static_cast<long>(i);
+    }
+    return -1;
+}
+
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
                              const py::object& observer) {
     const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
@@ -112,6 +129,7 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
     const std::size_t count = static_cast<std::size_t>(input.size() / kBands);
     const float* in = input.data();
     float* out = result.mutable_data();
+    long implausible = -1;
     {
         py::gil_scoped_release unlocked;
         const bool parallel = count >= kParallelFrom;
@@ -120,6 +138,13 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
         } else {
             parallel ? batch->ToLabParallel(in, count, out) : batch->ToLab(in, count, out);
         }
+        implausible = FirstImplausible(out, count, quantity);
+    }
+    if (implausible >= 0) {
+        const float* v = out + 3 * implausible;
+        throw py::value_error("spectrum " + std::to_string(implausible) + " gives " +
+                              (quantity == Quantity::kXYZ ? "Y " + std::to_string(v[1]) : "L* " + std::to_string(v[0])) +
+                              ": not reflectance factors (white = 1); divide percentages by 100 first");
     }
     return result;
 }
@@ -219,7 +244,18 @@ py::array_t<double> Resample(const py::object& wavelengths, const py::object& va
     return result;
 }
 
-py::tuple ReadSpectra(const std::string& path, const std::string& scale) {
+// Warning categories of spectral input, made when the module is loaded:
+// SpectralDataWarning for rejected rows, and its subclass
+// SpectralScaleWarning for a scale that was guessed.
+PyObject* gDataWarning = nullptr;
+PyObject* gScaleWarning = nullptr;
+
+void Warn(PyObject* category, const std::string& message) {
+    if (PyErr_WarnEx(category, message.c_str(), 1) != 0) throw py::error_already_set();
+}
+
+py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale) {
+    const std::string path = py::str(py::module_::import("os").attr("fspath")(pathLike)).cast<std::string>();
     nxbase::SpectralReadOptions options;
     if (scale == "percent") {
         options.scale = nxbase::SpectralScale::kPercent;
@@ -236,9 +272,12 @@ py::tuple ReadSpectra(const std::string& path, const std::string& scale) {
         read = nxbase::ReadSpectraFile(path, options, &table, &error);
     }
     if (!read) throw py::value_error(error);
-    const py::object warn = py::module_::import("warnings").attr("warn");
-    for (const std::string& message : table.errors) warn(message);
     if (table.unusable) throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
+    if (table.rows.empty()) {
+        throw py::value_error(table.errors.empty() ? path + ": no spectra" : path + ": no spectra; " + table.errors.front());
+    }
+    for (const std::string& message : table.errors) Warn(gDataWarning, message);
+    if (!table.scaleNote.empty()) Warn(gScaleWarning, table.scaleNote);
     py::list ids, names;
     py::array_t<float> values(std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), kBands});
     float* out = values.mutable_data();
@@ -256,12 +295,23 @@ const char kSpectraDoc[] =
     "float32 or float64 (float64 is rounded to float32 first, as the batch path works in single "
     "precision), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
     "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
-    "of shape (..., 3). ";
+    "of shape (..., 3). A spectrum whose Y would exceed twice the white (percentages, most likely) "
+    "raises ValueError. ";
 
 }  // namespace
 
 void RegisterColour(py::module_& m) {
     const py::object two = py::int_(2);
+    gDataWarning = PyErr_NewExceptionWithDoc("nxbase.SpectralDataWarning",
+                                             "Spectra of a file that were rejected (read_spectra).",
+                                             PyExc_UserWarning, nullptr);
+    gScaleWarning = PyErr_NewExceptionWithDoc("nxbase.SpectralScaleWarning",
+                                              "read_spectra guessed whether a file holds percentages or "
+                                              "reflectance factors; the message says which and why.",
+                                              gDataWarning, nullptr);
+    if (gDataWarning == nullptr || gScaleWarning == nullptr) throw py::error_already_set();
+    m.attr("SpectralDataWarning") = py::handle(gDataWarning);
+    m.attr("SpectralScaleWarning") = py::handle(gScaleWarning);
     m.def(
         "spectra_to_XYZ",
         [](const py::object& s, const std::string& i, const py::object& o) { return SpectraTo(Quantity::kXYZ, s, i, o); },
@@ -292,8 +342,10 @@ void RegisterColour(py::module_& m) {
           "on uneven ones, end values held outside the range. float64 (..., 36).");
     m.def("read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto",
           "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, spectra) "
-          "with spectra float32 of shape (N, 36). Rejected rows become warnings; an unreadable or unusable "
-          "file raises ValueError. scale: \"auto\", \"percent\" or \"fraction\".");
+          "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows become "
+          "SpectralDataWarning; a scale that was guessed (the file does not say, scale=\"auto\") a "
+          "SpectralScaleWarning saying which and why; an unreadable or unusable file, or one without "
+          "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\".");
 }
 
 }  // namespace nxpy

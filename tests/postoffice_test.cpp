@@ -247,7 +247,10 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer,
                                         [] { return true; }));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 3s);
-    RunUntil([&] { return !nxtest::ProcessRunning(peerExecutable); }, 5s);
+    // Gone from /proc is not yet gone: an exiting process drops its memory
+    // before its descriptors, its socket and name lock among them.
+    RunUntil([&] { return !nxtest::ProcessRunning(peerExecutable) && !nxbase::IsApplicationRunning("EchoPeer"); },
+             5s);
     // The next send starts it again.
     ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
 

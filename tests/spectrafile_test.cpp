@@ -139,17 +139,58 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     ASSERT_EQ(detected.rows.size(), 1u);
     EXPECT_TRUE(detected.percent);
     EXPECT_EQ(detected.rows[0].values[3], 0.5f);
-    ASSERT_EQ(detected.notes.size(), 1u);
+    EXPECT_NE(detected.scaleNote.find("p.csv: read as percentages: 1 of 1 spectra"), std::string::npos)
+        << detected.scaleNote;
+
+    // The whole file decides, never one row. A typo (50 for 0.50) in a file
+    // of reflectance factors rejects that row with a hint and keeps the
+    // others as they are.
+    std::string typo = Header();
+    for (int i = 1; i <= 5; ++i) typo += "\n" + std::to_string(i) + ",f," + Values(0.5);
+    typo += "\n6,typo,50," + Values(0.5, 35) + "\n";
+    const SpectraTable mixed = nxbase::ParseSpectraCsv(typo, "t.csv");
+    EXPECT_FALSE(mixed.percent);
+    ASSERT_EQ(mixed.rows.size(), 5u);
+    EXPECT_EQ(mixed.rows[0].values[3], 0.5f);
+    ASSERT_EQ(mixed.errors.size(), 1u);
+    EXPECT_NE(mixed.errors[0].find("t.csv:7: a value of 50.00 fits only percentages"), std::string::npos)
+        << mixed.errors[0];
+    EXPECT_NE(mixed.errors[0].find("--percent or --fraction"), std::string::npos);
+    // Rows beyond both scales take no part in the vote: one row of 1e4 does
+    // not outvote the single percent row.
+    const SpectraTable beyond = nxbase::ParseSpectraCsv(
+        Header() + "\n1,p," + Values(40.0) + "\n2,x," + Values(1e4) + "\n3,y," + Values(1e4) + "\n", "b.csv");
+    EXPECT_TRUE(beyond.percent);
+    EXPECT_EQ(beyond.rows.size(), 1u);
+    // Dark patches in percent without SPECTRAL_NORM: every value at most 1.5
+    // reads as reflectance factors, but a mean above 1.05 where Y lies is
+    // brighter than any reflectance: an error with the hint, not Y 118.
+    std::string dark = Header() + "\n1,d," + Values(1.18) + "\n2,e," + Values(0.9) + "\n";
+    const SpectraTable guessed = nxbase::ParseSpectraCsv(dark, "d.csv");
+    EXPECT_FALSE(guessed.percent);
+    ASSERT_EQ(guessed.errors.size(), 1u);
+    EXPECT_NE(guessed.errors[0].find("d.csv:2: as reflectance factors this is brighter than any reflectance (Y "
+                                     "about 118 % of the white); if the file holds percentages, --percent"),
+              std::string::npos)
+        << guessed.errors[0];
+    EXPECT_NE(guessed.scaleNote.find("read as reflectance factors (white = 1): no value is above 1.5"),
+              std::string::npos)
+        << guessed.scaleNote;
+    const SpectraTable told = nxbase::ParseSpectraCsv(dark, "d.csv", {SpectralScale::kPercent});
+    EXPECT_EQ(told.rows.size(), 2u);
+    EXPECT_TRUE(told.scaleNote.empty());
     // Forced fraction: 50 is not a reflectance factor.
     const SpectraTable forced = nxbase::ParseSpectraCsv(percent, "p.csv", {SpectralScale::kFraction});
     EXPECT_TRUE(forced.rows.empty());
     ASSERT_EQ(forced.errors.size(), 1u);
     EXPECT_NE(forced.errors[0].find("p.csv:2: value 50"), std::string::npos) << forced.errors[0];
-    // A fraction file stays as it is: 1.2 is fluorescent paper, not percent.
-    const SpectraTable fraction = nxbase::ParseSpectraCsv(Header() + "\n1,f," + Values(1.2) + "\n", "f.csv");
+    // A fraction file stays as it is: 1.25 in the blue is a fluorescent
+    // paper's brightener, not percent, and its Y stays below the limit.
+    const std::string paper = Values(1.25, 11) + "," + Values(0.92, 25);
+    const SpectraTable fraction = nxbase::ParseSpectraCsv(Header() + "\n1,f," + paper + "\n", "f.csv");
     ASSERT_EQ(fraction.rows.size(), 1u);
     EXPECT_FALSE(fraction.percent);
-    EXPECT_EQ(fraction.rows[0].values[0], 1.2f);
+    EXPECT_EQ(fraction.rows[0].values[0], 1.25f);
 
     // CGATS: SPECTRAL_NORM, and ArgyllCMS's CTI3 convention of percent even
     // for a dark set whose values stay below 1.5.

@@ -19,9 +19,16 @@
 // SPECTRAL_BANDS, SPECTRAL_START_NM and SPECTRAL_END_NM the grid is taken from
 // those (exact for fractional steps). SAMPLE_ID and SAMPLE_NAME are kept apart.
 //
-// Scale: percent when the caller says so, when the file says so
-// (SPECTRAL_NORM gives the value that stands for 1.0; an ArgyllCMS "CTI3" file
-// holds percent), or when any value is above 1.5; fractions otherwise. After
+// Scale: as the caller says, else as the file says (SPECTRAL_NORM gives the
+// value that stands for 1.0; an ArgyllCMS "CTI3" file holds percent). Else it
+// is guessed from the whole file, never from one row: a spectrum with a value
+// above 1.5 can only be percent, one without fits both (a reflectance factor,
+// or a dark patch in percent); percent when such spectra are the majority,
+// reflectance factors otherwise. Under a guessed fraction scale a spectrum
+// that only percent explains is rejected, and so is one brighter than any
+// reflectance (a mean above 1.05 over 500..620 nm, where Y lies), each with
+// the hint --percent / --fraction; the guess and its reason are in
+// scaleNote. Spectra beyond both scales take no part in the guess. After
 // scaling, a spectrum with a value above kMaxPlausibleReflectance or below
 // -kMaxPlausibleReflectance, or with every value zero, is implausible: it is
 // reported with its line and left out, rather than turned into an L* of 300.
@@ -85,6 +92,10 @@ struct NXBASE_EXPORT SpectralSet {
     std::vector<std::string> notes;
     bool unusable = false;   // nothing could be read (no grid, a file the parser rejects)
     bool percent = false;    // the values were read as percentages
+    // How the scale was chosen when neither the caller nor the file said:
+    // "<source>: read as ...: <why>; <the option that reads the other>".
+    // Empty when the scale was given. Worth showing every time.
+    std::string scaleNote;
     std::string format;      // "CSV" or "CGATS"
 
     bool HasErrors() const { return !errors.empty() || suppressedErrors > 0; }
@@ -126,6 +137,7 @@ struct NXBASE_EXPORT SpectraTable {
     std::vector<std::string> notes;
     bool unusable = false;
     bool percent = false;
+    std::string scaleNote;  // as SpectralSet::scaleNote
     // The grid the spectra were read on, and how they were brought onto
     // 380..730/10 nm ("as read", "Sprague", "linear").
     std::vector<double> sourceWavelengths;

@@ -109,6 +109,22 @@ def test_bad_input_raises_with_the_librarys_words(tmp_path):
     bad.write_text("id,r400,r500,r600\nA,0.1,0.2,0.3\nB,0.1,x,0.3\n")
     with warnings.catch_warnings(record=True) as caught:
         warnings.simplefilter("always")
-        ids, _, spectra = nxbase.read_spectra(str(bad))
+        ids, _, spectra = nxbase.read_spectra(bad)  # os.PathLike
     assert ids == ["A"] and spectra.shape == (1, 36)
-    assert any("bad.csv:3" in str(w.message) for w in caught)
+    assert any("bad.csv:3" in str(w.message) and w.category is nxbase.SpectralDataWarning for w in caught)
+    # The guessed scale is a warning of its own category, which users filter.
+    assert any(w.category is nxbase.SpectralScaleWarning and "read as reflectance factors" in str(w.message)
+               for w in caught)
+    with warnings.catch_warnings():
+        warnings.simplefilter("error", nxbase.SpectralDataWarning)
+        with pytest.raises(nxbase.SpectralDataWarning):
+            nxbase.read_spectra(bad)
+    empty = tmp_path / "empty.csv"
+    empty.write_text("")
+    with pytest.raises(ValueError, match="no spectra"):
+        nxbase.read_spectra(empty)
+    # Percentages handed over as reflectance factors: refused, not L* 411.
+    with pytest.raises(ValueError, match="spectrum 1 gives L\\* .*divide percentages by 100"):
+        nxbase.spectra_to_Lab(np.stack([np.full(36, 0.5), np.full(36, 50.0)]))
+    with pytest.raises(ValueError, match="gives Y "):
+        nxbase.spectra_to_XYZ(np.full(36, 50.0))

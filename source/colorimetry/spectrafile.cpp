@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -17,7 +18,12 @@
 namespace nxbase {
 namespace {
 
-constexpr double kPercentThreshold = 1.5;  // above it, auto-detection reads percent
+constexpr double kPercentThreshold = 1.5;  // above it, a value can only be a percentage
+// Read as reflectance factors, a sample whose Y is this far above the white is
+// no reflectance: fluorescent papers stay below.
+constexpr double kBrightestReflectance = 1.05;
+constexpr double kYProxyFrom = 500.0;
+constexpr double kYProxyTo = 620.0;
 constexpr std::size_t kReadChunk = 64 * 1024;
 constexpr std::size_t kSniffBytes = 1 << 20;  // looked at to tell CGATS from CSV
 
@@ -38,6 +44,91 @@ std::string Implausible(const SpectralSample& sample) {
     return allZero ? "every value is zero" : "";
 }
 
+// The largest value of a sample.
+float Largest(const SpectralSample& sample) {
+    float largest = 0.0f;
+    for (const float v : sample.values) largest = std::max(largest, v);
+    return largest;
+}
+
+// The mean reflectance over 500..620 nm, where the Y weights lie: Y / 100
+// within a few percent, and untouched by optical brighteners, which
+// fluoresce below 480 nm. Negative when the grid does not reach there.
+double YProxy(const SpectralSample& sample, const std::vector<double>& wavelengths) {
+    double sum = 0.0;
+    int count = 0;
+    for (std::size_t k = 0; k < wavelengths.size() && k < sample.values.size(); ++k) {
+        if (wavelengths[k] >= kYProxyFrom && wavelengths[k] <= kYProxyTo) {
+            sum += sample.values[k];
+            ++count;
+        }
+    }
+    return count > 0 ? sum / count : -1.0;
+}
+
+std::string Number(double value, int decimals) {
+    char text[64];
+    std::snprintf(text, sizeof text, "%.*f", decimals, value);
+    return text;
+}
+
+void DivideBy100(SpectralSample& sample) {
+    for (float& v : sample.values) v = static_cast<float>(static_cast<double>(v) / 100.0);
+}
+
+// The scale of a file that does not state it, decided from all its rows: a
+// row with a value above 1.5 can only be percent; a row without one fits
+// both, as reflectance factors or as a dark patch in percent. The majority
+// decides; rows that only the other scale explains are rejected with a
+// hint, as are rows that read as reflectance factors brighter than any
+// reflectance. Rows beyond both scales take no part.
+void GuessScale(SpectralSet* pSet, const std::string& source) {
+    std::size_t needPercent = 0, fitFraction = 0;
+    float largest = 0.0f;
+    for (const SpectralSample& sample : pSet->samples) {
+        const float m = Largest(sample);
+        if (m > 100.0 * kMaxPlausibleReflectance) continue;
+        if (m > kPercentThreshold) {
+            ++needPercent;
+            largest = std::max(largest, m);
+        } else if (m > 0.0f) {
+            ++fitFraction;
+        }
+    }
+    const std::string counts = std::to_string(needPercent) + " of " + std::to_string(needPercent + fitFraction);
+    std::vector<SpectralSample> kept;
+    kept.reserve(pSet->samples.size());
+    if (needPercent > fitFraction) {
+        pSet->percent = true;
+        for (SpectralSample& sample : pSet->samples) DivideBy100(sample);
+        pSet->scaleNote = source + ": read as percentages: " + counts + " spectra have values above 1.5 (up to " +
+                          Number(largest, 2) + "); --fraction reads them as they stand";
+        return;
+    }
+    pSet->scaleNote = source + ": read as reflectance factors (white = 1): " +
+                      (needPercent == 0 ? std::string("no value is above 1.5")
+                                        : std::to_string(fitFraction) + " of " +
+                                              std::to_string(needPercent + fitFraction) +
+                                              " spectra stay at or below 1.5") +
+                      " and the file does not give its scale; --percent reads percentages";
+    for (SpectralSample& sample : pSet->samples) {
+        const float m = Largest(sample);
+        const double y = YProxy(sample, pSet->wavelengths);
+        if (m > kPercentThreshold && m <= 100.0 * kMaxPlausibleReflectance) {
+            detail::AddError(pSet, Where(source, sample.line) + ": a value of " + Number(m, 2) +
+                               " fits only percentages, while the other spectra read as reflectance factors; "
+                               "--percent or --fraction says which the file holds");
+        } else if (y > kBrightestReflectance) {
+            detail::AddError(pSet, Where(source, sample.line) + ": as reflectance factors this is brighter than any "
+                               "reflectance (Y about " + Number(100.0 * y, 0) +
+                               " % of the white); if the file holds percentages, --percent reads it");
+        } else {
+            kept.push_back(std::move(sample));
+        }
+    }
+    pSet->samples = std::move(kept);
+}
+
 }  // namespace
 
 namespace detail {
@@ -56,18 +147,7 @@ void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double
         pSet->percent = true;
         if (axFileNorm > 0.0) pSet->notes.push_back(source + ": values read as " + axNormReason);
     } else if (axOptions.scale == SpectralScale::kAuto) {
-        float largest = 0.0f;
-        for (const SpectralSample& sample : pSet->samples) {
-            for (const float v : sample.values) largest = std::max(largest, v);
-        }
-        if (largest > kPercentThreshold) {
-            pSet->percent = true;
-            for (SpectralSample& sample : pSet->samples) {
-                for (float& v : sample.values) v = static_cast<float>(static_cast<double>(v) / 100.0);
-            }
-            pSet->notes.push_back(source + ": values read as percentages (largest " + std::to_string(largest) +
-                                  " is above 1.5); --fraction reads them as they stand");
-        }
+        GuessScale(pSet, source);
     }
     std::vector<SpectralSample> kept;
     kept.reserve(pSet->samples.size());
@@ -209,6 +289,7 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
     table.notes = axSet.notes;
     table.unusable = axSet.unusable;
     table.percent = axSet.percent;
+    table.scaleNote = axSet.scaleNote;
     table.sourceWavelengths = axSet.wavelengths;
     if (axSet.unusable || axSet.wavelengths.size() < 2) {
         table.unusable = true;

@@ -297,7 +297,10 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
     std::string error;
     if (file.empty()) {
         *source = nxcolor::EmbeddedChartName();
-        *table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), *source, options.read);
+        // The built-in chart is stored as reflectance factors.
+        nxbase::SpectralReadOptions chart = options.read;
+        chart.scale = nxbase::SpectralScale::kFraction;
+        *table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), *source, chart);
     } else {
         *source = file == "-" ? "<stdin>" : file;
         if (!nxcolor::ReadSpectraFile(file, options.read, table, &error)) {
@@ -306,6 +309,8 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
         }
     }
     for (const std::string& message : table->errors) std::cerr << "nxcolor: " << message << '\n';
+    // A guessed scale is said every time: a wrong guess changes every number.
+    if (!table->scaleNote.empty()) std::cerr << "nxcolor: " << table->scaleNote << '\n';
     if (options.verbose) {
         for (const std::string& note : table->notes) std::cerr << "nxcolor: " << note << '\n';
         if (!table->sourceWavelengths.empty()) {
