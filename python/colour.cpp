@@ -209,7 +209,9 @@ py::array_t<float> LabToSRGB(const py::object& lab) {
 py::array_t<double> DeltaE(const py::object& reference, const py::object& sample, const std::string& method) {
     nxbase::DeltaEMethod chosen{};
     if (!nxbase::ParseDeltaEMethod(method.c_str(), &chosen)) {
-        throw py::value_error("unknown method \"" + method + "\"; use 2000, 94, 94t, cmc, cmc11 or ab");
+        throw py::value_error("unknown method \"" + method +
+                              "\"; use 2000, 94, 94t, cmc, cmc11 or ab (or \"CIE 2000\", \"CIE 1994\", \"CMC\", "
+                              "\"CIE 1976\")");
     }
     AsDoubleRows(reference, 3, "lab1");
     AsDoubleRows(sample, 3, "lab2");
@@ -326,16 +328,18 @@ void RegisterColour(py::module_& m) {
           (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
           py::arg("observer") = two, (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
-    m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status T",
+    m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status E",
           "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status A\", \"Status E\", "
-          "\"Status M\", \"Status T\" or an installed standard. NaN where nothing is reflected. float32 (..., 3).");
+          "\"Status M\", \"Status T\" or an installed standard; \"Status E\" by default, as everywhere in NxBase. NaN "
+          "where nothing is reflected. float32 (..., 3).");
     m.def("Lab_to_sRGB", &LabToSRGB, py::arg("lab"),
           "Screen sRGB components 0..100 of CIE 1976 Lab values of shape (..., 3), by the formula path of "
           "nxbase::LabToScreenRGB (no ICC profile). float32 (..., 3).");
     m.def("delta_E", &DeltaE, py::arg("lab1"), py::arg("lab2"), py::arg("method") = "2000",
           "Colour difference of Lab arrays of shape (..., 3), broadcast against each other; lab1 is the "
           "reference. method: \"2000\" (CIEDE2000), \"94\" (graphic arts), \"94t\" (textiles), \"cmc\" (2:1), "
-          "\"cmc11\", \"ab\" (CIE76). float64 of the broadcast shape without the last axis.");
+          "\"cmc11\", \"ab\" (CIE76), or colour-science's \"CIE 2000\", \"CIE 1994\", \"CMC\" (2:1), "
+          "\"CIE 1976\" (any case). float64 of the broadcast shape without the last axis.");
     m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),
           "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm steps: the "
           "values themselves where the grid has the wavelength, Sprague interpolation on equal steps, linear "

@@ -138,6 +138,19 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     EXPECT_EQ(text.find("<script>"), std::string::npos);
     EXPECT_NE(text.find("&lt;script&gt;&amp;x "), std::string::npos);
     EXPECT_NE(text.find("a&lt;b&gt;&amp;&quot;c&quot;"), std::string::npos);
+
+    // Windows-1252 names (a Windows export's "gr\xFCn") and file names that
+    // are not UTF-8 become UTF-8: the SVG is well-formed for an XML parser.
+    report.source = "messung-\xE9t\xE9.csv";
+    report.rows[0].id = "gr\xFCn";
+    ASSERT_TRUE(nxcolor::WriteSvgReport(report, MeasuringCondition(), svg, &error)) << error;
+    text = nxtest::ReadFile(svg);
+    EXPECT_NE(text.find("gr\xC3\xBCn"), std::string::npos);
+    EXPECT_NE(text.find("messung-\xC3\xA9t\xC3\xA9.csv"), std::string::npos);
+    if (std::system("python3 -c 'import xml.etree.ElementTree' 2>/dev/null") == 0) {
+        EXPECT_EQ(std::system(("python3 -c 'import sys, xml.etree.ElementTree as E; E.parse(sys.argv[1])' " + svg).c_str()),
+                  0);
+    }
     EXPECT_FALSE(nxcolor::WriteSvgReport(report, MeasuringCondition(),
                                          dir.File("no/such/dir/x.svg"), &error));
     EXPECT_NE(error.find("cannot write"), std::string::npos);

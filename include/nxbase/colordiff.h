@@ -86,7 +86,8 @@ NXBASE_EXPORT void DeltaE2000Batch(const float* pReference, const float* pSample
                                    float* pDeltaE, const DeltaE2000Weights& axWeights = {});
 
 // A formula by name, for tools and scripts: "ab" (or "76"), "94" (graphic
-// arts), "94t" (textiles), "cmc" (2:1), "cmc11" (1:1), "2000" (or "00").
+// arts), "94t" (textiles), "cmc" (2:1), "cmc11" (1:1), "2000" (or "00"), and
+// colour-science's "CIE 1976", "CIE 1994", "CIE 2000"; any case.
 enum class DeltaEMethod { kCie76, kCie94, kCie94Textiles, kCmc21, kCmc11, kCiede2000 };
 NXBASE_EXPORT bool ParseDeltaEMethod(const char* pName, DeltaEMethod* pMethod);
 NXBASE_EXPORT const char* DeltaEMethodName(DeltaEMethod axMethod);

@@ -264,6 +264,30 @@ void AppendUtf8(std::string& out, char32_t code) {
     }
 }
 
+bool IsValidUtf8(std::string_view text) {
+    for (std::size_t at = 0; at < text.size();) {
+        const unsigned char lead = static_cast<unsigned char>(text[at]);
+        const std::size_t length = lead < 0x80 ? 1 : lead < 0xC2 ? 0 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 0;
+        if (length == 0 || at + length > text.size()) return false;
+        // The second byte's range where the lead alone does not rule out
+        // overlong forms, surrogates and code points above U+10FFFF.
+        const unsigned char second = static_cast<unsigned char>(text[at + (length > 1 ? 1 : 0)]);
+        if ((lead == 0xE0 && second < 0xA0) || (lead == 0xED && second > 0x9F) || (lead == 0xF0 && second < 0x90) ||
+            (lead == 0xF4 && second > 0x8F)) {
+            return false;
+        }
+        for (std::size_t i = 1; i < length; ++i) {
+            if ((static_cast<unsigned char>(text[at + i]) & 0xC0) != 0x80) return false;
+        }
+        at += length;
+    }
+    return true;
+}
+
+std::string EightBitToUtf8(std::string_view text) {
+    return IsValidUtf8(text) ? std::string(text) : Windows1252ToUtf8(text);
+}
+
 std::string Windows1252ToUtf8(std::string_view ansi) {
     if (IsAscii(ansi)) return std::string(ansi);
     std::string out;

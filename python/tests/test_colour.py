@@ -55,6 +55,9 @@ def test_values_agree_with_nxcolor(chart):
     lch = nxbase.spectra_to_LCh(chart, illuminant="D65", observer=10)
     din = nxbase.spectra_to_DIN99(chart, illuminant="D65", observer=10)
     density = nxbase.spectra_to_density(chart, density_standard="Status T")
+    # One default density standard in NxBase, Python included.
+    np.testing.assert_array_equal(nxbase.spectra_to_density(chart),
+                                  nxbase.spectra_to_density(chart, density_standard="Status E"))
     # XYZ are the very numbers nxcolor's objects compute; Lab and what follows
     # from it within the batch cube root's few units in the last place.
     assert [f"{v:.4f}" for v in xyz.ravel()] == [f"{v:.4f}" for v in printed[:, 0:3].ravel()]
@@ -75,6 +78,10 @@ def test_differences_resampling_and_screen_colours():
     # Broadcasting: one reference against many samples.
     assert nxbase.delta_E([50, 0, 0], pairs[:, 4:7], method="ab").shape == (34,)
     assert nxbase.delta_E(np.zeros((2, 1, 3)), np.ones((5, 3)), method="cmc").shape == (2, 5)
+    # colour-science's method names give the same formulas as the short ones.
+    for long_name, short in (("CIE 2000", "2000"), ("CIE 1994", "94"), ("CMC", "cmc"), ("cie 1976", "ab")):
+        np.testing.assert_array_equal(nxbase.delta_E(pairs[:, 1:4], pairs[:, 4:7], method=long_name),
+                                      nxbase.delta_E(pairs[:, 1:4], pairs[:, 4:7], method=short))
     # A 5 nm spectrum holding a line comes back exactly at the 10 nm points.
     grid = np.arange(380, 731, 5.0)
     values = 0.2 + 0.001 * (grid - 380)

@@ -1,6 +1,8 @@
 // Colour-difference formulas; see nxbase/colordiff.h.
 #include "nxbase/colordiff.h"
 
+#include <strings.h>
+
 #include <cmath>
 #include <cstring>
 
@@ -272,12 +274,14 @@ constexpr MethodName kMethodNames[] = {
     {"2000", DeltaEMethod::kCiede2000}, {"00", DeltaEMethod::kCiede2000},   {"ab", DeltaEMethod::kCie76},
     {"76", DeltaEMethod::kCie76},       {"94", DeltaEMethod::kCie94},       {"94t", DeltaEMethod::kCie94Textiles},
     {"cmc", DeltaEMethod::kCmc21},      {"cmc21", DeltaEMethod::kCmc21},    {"cmc11", DeltaEMethod::kCmc11},
+    // colour-science's names (CMC there defaults to l = 2, c = 1).
+    {"CIE 1976", DeltaEMethod::kCie76}, {"CIE 1994", DeltaEMethod::kCie94}, {"CIE 2000", DeltaEMethod::kCiede2000},
 };
 }  // namespace
 
 bool ParseDeltaEMethod(const char* pName, DeltaEMethod* pMethod) {
     for (const MethodName& entry : kMethodNames) {
-        if (pName && std::strcmp(pName, entry.name) == 0) {
+        if (pName && ::strcasecmp(pName, entry.name) == 0) {
             *pMethod = entry.method;
             return true;
         }

@@ -4,6 +4,7 @@
 #include "spectrafile_parse.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <cmath>
 #include <cstdio>
 #include <cstring>
@@ -273,7 +274,7 @@ bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOpti
     }
     std::ifstream in(path, std::ios::binary);
     if (!in) {
-        *pError = path + ": cannot open the file";
+        *pError = path + ": cannot open the file: " + std::strerror(errno);
         return false;
     }
     *pSet = ReadSpectralStream(in, path, axOptions);

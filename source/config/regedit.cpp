@@ -62,28 +62,8 @@ std::string Utf16LeToUtf8(std::string_view asBytes) {
     return out;
 }
 
-bool IsValidUtf8(std::string_view asText) {
-    for (std::size_t at = 0; at < asText.size();) {
-        unsigned char lead = static_cast<unsigned char>(asText[at]);
-        std::size_t length = lead < 0x80   ? 1
-                             : lead < 0xC2 ? 0
-                             : lead < 0xE0 ? 2
-                             : lead < 0xF0 ? 3
-                             : lead < 0xF5 ? 4
-                                           : 0;
-        if (length == 0 || at + length > asText.size()) return false;
-        for (std::size_t i = 1; i < length; ++i) {
-            if ((static_cast<unsigned char>(asText[at + i]) & 0xC0) != 0x80) return false;
-        }
-        at += length;
-    }
-    return true;
-}
-
 // Eight-bit text as UTF-8: kept when it is UTF-8 already, else Windows-1252.
-std::string NarrowToUtf8(std::string_view asText) {
-    return IsValidUtf8(asText) ? std::string(asText) : toolkit::Windows1252ToUtf8(asText);
-}
+std::string NarrowToUtf8(std::string_view asText) { return toolkit::EightBitToUtf8(asText); }
 
 std::string_view TrimRight(std::string_view asText) {
     while (!asText.empty() && (asText.back() == ' ' || asText.back() == '\t')) {

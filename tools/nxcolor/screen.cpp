@@ -2,6 +2,8 @@
 #include "nxbase/files.h"
 #include "screen.h"
 
+#include "toolkit/string.h"
+
 #include <algorithm>
 #include <charconv>
 #include <cmath>
@@ -34,7 +36,10 @@ std::string Num(double value, int precision) {
     return std::string(buffer, result.ptr);
 }
 
-std::string Escape(const std::string& text) {
+// Text for the SVG: UTF-8 (names from Windows exports are Windows-1252),
+// with XML's special characters escaped.
+std::string Escape(const std::string& raw) {
+    const std::string text = toolkit::EightBitToUtf8(raw);
     std::string out;
     for (char c : text) {
         switch (c) {

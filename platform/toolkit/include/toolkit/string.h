@@ -113,6 +113,12 @@ NXBASE_EXPORT std::string Windows1252ToUtf8(std::string_view ansi);
 // UTF-8 to Windows-1252: a character the code page lacks becomes "?", and so
 // does each byte of an invalid UTF-8 sequence.
 NXBASE_EXPORT std::string Utf8ToWindows1252(std::string_view utf8);
+// True when `text` is well-formed UTF-8 (no overlong forms, no surrogates,
+// nothing above U+10FFFF).
+NXBASE_EXPORT bool IsValidUtf8(std::string_view text);
+// Eight-bit text of unknown origin as UTF-8: kept when it is UTF-8 already,
+// else read as Windows-1252 (what Windows programs export).
+NXBASE_EXPORT std::string EightBitToUtf8(std::string_view text);
 
 }  // namespace toolkit
 
