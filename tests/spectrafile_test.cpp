@@ -102,6 +102,26 @@ TEST(SpectraFile, TakesAnyIncreasingGridAndNumericHeaders) {
         EXPECT_EQ(t.rows[0].line, 2);
     }
 
+    // European spreadsheets: ";" between fields, decimal commas, "380 nm"
+    // headers, a name holding a comma; TAB-separated files alike. Headerless
+    // ones too: decimal commas must not make the first row look like text.
+    std::string european = "Probe;Name";
+    for (int nm = 380; nm <= 730; nm += 10) european += ";" + std::to_string(nm) + " nm";
+    std::string commaValues;
+    for (int i = 0; i < 36; ++i) commaValues += (i ? ";" : "") + std::string("0,4512");
+    european += "\nA1;\"Gr\u00fcn, hell\";" + commaValues + "\n";
+    std::string tabbed = european;
+    for (char& c : tabbed) c = c == ';' ? '\t' : c;
+    for (const std::string& text : {european, tabbed, "A1;\"x, hell\";" + commaValues + "\n"}) {
+        const SpectraTable t = nxbase::ParseSpectraCsv(text, "eu.csv");
+        ASSERT_TRUE(t.errors.empty()) << t.errors[0];
+        ASSERT_EQ(t.rows.size(), 1u);
+        EXPECT_EQ(t.rows[0].values[7], 0.4512f);
+        EXPECT_NE(t.rows[0].id.find(", hell"), std::string::npos) << t.rows[0].id;
+        ASSERT_FALSE(t.notes.empty());
+        EXPECT_NE(t.notes[0].find("eu.csv: CSV with fields separated by"), std::string::npos) << t.notes[0];
+    }
+
     for (const std::string& bad : {std::string("id,r400,r390,r410"), std::string("id,r380,r380,r390"),
                                    std::string("id,SPEC_380,SPEC_385"), std::string("a,b,c")}) {
         const SpectraTable t = nxbase::ParseSpectraCsv("# c\n" + bad + "\n1," + Values(0.5, 3) + "\n", "g.csv");

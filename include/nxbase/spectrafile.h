@@ -1,12 +1,15 @@
 // Reading reflectance spectra of any wavelength grid from CSV or CGATS text,
 // and bringing them onto the library's 36-point grid (380..730 nm, 10 nm).
 //
-// CSV: fields separated by ","; double quotes around a field are removed ("" inside
-// stands for one quote); blank lines and lines starting with "#" are skipped;
-// CR LF line ends and a UTF-8 byte order mark are accepted. Numbers use "." as
-// decimal separator whatever the locale. An optional header is the first
+// CSV: fields separated by ",", or by ";" or TABs when the first content line
+// holds more of those than commas (spreadsheets of continental Europe); in
+// those two dialects a number may have a decimal comma ("0,4512"). Double
+// quotes around a field are removed ("" inside stands for one quote); blank
+// lines and lines starting with "#" are skipped; CR LF line ends and a UTF-8
+// byte order mark are accepted. Numbers never depend on the locale. A dialect
+// other than "," is named in the notes. An optional header is the first
 // content line that ends in wavelength names ("r380", "380", "nm380",
-// "SPEC_380", "SPECTRAL_NM380", "SPECTRAL_NM_380", "380nm"); its trailing
+// "SPEC_380", "SPECTRAL_NM380", "SPECTRAL_NM_380", "380nm", "380 nm"); its trailing
 // wavelength fields must increase and give the grid; fields before them are
 // ids (the first one the sample id, the second its name). A header of bare
 // numbers ("id,380,390,...") is recognised by its increasing whole numbers from

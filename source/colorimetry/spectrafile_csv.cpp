@@ -15,9 +15,9 @@ std::string_view Trim(std::string_view s) {
     return s;
 }
 
-// Splits one line at "," outside double quotes; quotes are removed and ""
-// inside quotes gives one quote.
-std::vector<std::string> SplitFields(std::string_view line) {
+// Splits one line at `separator` outside double quotes; quotes are removed
+// and "" inside quotes gives one quote.
+std::vector<std::string> SplitFields(std::string_view line, char separator) {
     std::vector<std::string> fields;
     std::string field;
     bool quoted = false;
@@ -34,7 +34,7 @@ std::vector<std::string> SplitFields(std::string_view line) {
             }
         } else if (c == '"') {
             quoted = true;
-        } else if (c == ',') {
+        } else if (c == separator) {
             fields.emplace_back(Trim(field));
             field.clear();
         } else {
@@ -43,6 +43,39 @@ std::vector<std::string> SplitFields(std::string_view line) {
     }
     fields.emplace_back(Trim(field));
     return fields;
+}
+
+// The separator of a CSV dialect, from its first content line: ";" or a TAB
+// when the line holds more of it than of ",", else ",".
+char DetectSeparator(std::string_view line) {
+    std::size_t commas = 0, semicolons = 0, tabs = 0;
+    bool quoted = false;
+    for (const char c : line) {
+        if (c == '"') quoted = !quoted;
+        if (quoted) continue;
+        commas += c == ',';
+        semicolons += c == ';';
+        tabs += c == '\t';
+    }
+    if (semicolons > 0 && semicolons >= commas && semicolons >= tabs) return ';';
+    if (tabs > 0 && tabs >= commas) return '\t';
+    return ',';
+}
+
+// "0,4512" as "0.4512": a field with one comma and no point that then reads
+// as a number (spreadsheets of continental Europe write decimal commas).
+void UseDecimalPoints(std::vector<std::string>& fields) {
+    for (std::string& field : fields) {
+        const std::size_t comma = field.find(',');
+        if (comma == std::string::npos || field.find(',', comma + 1) != std::string::npos ||
+            field.find('.') != std::string::npos) {
+            continue;
+        }
+        std::string candidate = field;
+        candidate[comma] = '.';
+        double value = 0.0;
+        if (detail::ParseNumber(candidate, &value)) field = std::move(candidate);
+    }
 }
 
 }  // namespace
@@ -69,7 +102,8 @@ int WavelengthOf(std::string_view field) {
         if (!match) continue;
         std::string_view rest = field.substr(p.size());
         if (rest.size() > 2 && upper(rest[rest.size() - 2]) == 'N' && upper(rest.back()) == 'M') {
-            rest.remove_suffix(2);  // "380nm"
+            rest.remove_suffix(2);  // "380nm", "380 nm"
+            while (!rest.empty() && rest.back() == ' ') rest.remove_suffix(1);
         }
         int nm = 0;
         const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), nm);
@@ -161,7 +195,9 @@ bool CsvSpectraParser::Line(std::string_view line, int number) {
         amStopped = true;
         return false;
     }
-    const std::vector<std::string> fields = SplitFields(line);
+    if (!amSeenContent) DetectDialect(content);
+    std::vector<std::string> fields = SplitFields(line, amSeparator);
+    if (amSeparator != ',') UseDecimalPoints(fields);
     if (!amSeenContent) {
         amSeenContent = true;
         if (LooksLikeHeader(fields)) {
@@ -171,6 +207,15 @@ bool CsvSpectraParser::Line(std::string_view line, int number) {
     }
     Row(fields, number);
     return !amStopped;
+}
+
+void CsvSpectraParser::DetectDialect(std::string_view firstLine) {
+    amSeparator = DetectSeparator(firstLine);
+    if (amSeparator != ',') {
+        pSet->notes.push_back(amSource + ": CSV with fields separated by " +
+                              std::string(amSeparator == ';' ? "\";\"" : "TABs") +
+                              "; a comma in a number is its decimal separator");
+    }
 }
 
 void CsvSpectraParser::Finish() {

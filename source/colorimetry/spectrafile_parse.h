@@ -42,6 +42,7 @@ private:
     void Header(const std::vector<std::string>& fields, int line);
     void Row(const std::vector<std::string>& fields, int line);
     void Error(int line, const std::string& what);
+    void DetectDialect(std::string_view firstLine);
 
     std::string amSource;
     SpectralReadOptions amOptions;
@@ -49,6 +50,7 @@ private:
     bool amSeenContent = false;
     int amIdFields = -1;  // from the header; -1 without one
     bool amStopped = false;
+    char amSeparator = ',';  // "," ";" or TAB, from the first content line
 };
 }  // namespace detail
 
