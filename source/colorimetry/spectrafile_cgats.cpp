@@ -44,6 +44,124 @@ std::vector<int> DataLines(std::string_view text) {
     return lines;
 }
 
+// The whitespace-separated tokens of a CGATS line as LittleCMS reads them: a
+// token that starts with a double quote runs to the next one (so "a""b" is
+// two tokens and "" one empty token); "#" outside quotes starts a comment.
+std::size_t CountTokens(std::string_view line) {
+    std::size_t count = 0;
+    std::size_t at = 0;
+    while (at < line.size()) {
+        const char c = line[at];
+        if (c == ' ' || c == '\t' || c == '\r') {
+            ++at;
+        } else if (c == '#') {
+            break;
+        } else if (c == '"') {
+            const std::size_t close = line.find('"', at + 1);
+            ++count;
+            if (close == std::string_view::npos) break;
+            at = close + 1;
+        } else {
+            ++count;
+            while (at < line.size() && line[at] != ' ' && line[at] != '\t' && line[at] != '\r' && line[at] != '"') ++at;
+        }
+    }
+    return count;
+}
+
+std::string_view TrimLine(std::string_view line) {
+    while (!line.empty() && (line.front() == ' ' || line.front() == '\t')) line.remove_prefix(1);
+    while (!line.empty() && (line.back() == '\r' || line.back() == ' ' || line.back() == '\t')) line.remove_suffix(1);
+    return line;
+}
+
+// The value after a keyword ("NUMBER_OF_SETS 24" or "NUMBER_OF_SETS \"24\"").
+std::string KeywordValue(std::string_view line, std::string_view keyword) {
+    std::string_view rest = TrimLine(line.substr(keyword.size()));
+    if (rest.size() >= 2 && rest.front() == '"' && rest.back() == '"') rest = rest.substr(1, rest.size() - 2);
+    return std::string(rest);
+}
+
+bool IsCount(const std::string& text, double* value) {
+    return detail::ParseNumber(text, value) && *value >= 0 && *value == std::floor(*value) && *value < 1e9;
+}
+
+// Checks what LittleCMS would misreport, with the line a user must look at:
+// NUMBER_OF_FIELDS and NUMBER_OF_SETS against the data format and the data,
+// and, where the data holds one set per line as writers lay it out, the
+// first line whose count of values differs. "" when nothing is found.
+std::string CheckLayout(std::string_view text, const std::string& source) {
+    int fieldsLine = 0, setsLine = 0, formatLine = 0, number = 0;
+    std::string fieldsText, setsText;
+    std::size_t formatFields = 0;
+    std::vector<std::pair<int, std::size_t>> dataLines;  // (line, tokens)
+    enum { kHeader, kFormat, kData, kDone } section = kHeader;
+    while (!text.empty() && section != kDone) {
+        const std::size_t end = text.find('\n');
+        const std::string_view line = TrimLine(text.substr(0, end));
+        ++number;
+        if (section == kFormat) {
+            if (line.rfind("END_DATA_FORMAT", 0) == 0) {
+                section = kHeader;
+            } else {
+                formatFields += CountTokens(line);
+            }
+        } else if (section == kData) {
+            if (line.rfind("END_DATA", 0) == 0) {
+                section = kDone;
+            } else if (!line.empty() && line.front() != '#') {
+                dataLines.emplace_back(number, CountTokens(line));
+            }
+        } else if (line.rfind("NUMBER_OF_FIELDS", 0) == 0) {
+            fieldsLine = number;
+            fieldsText = KeywordValue(line, "NUMBER_OF_FIELDS");
+        } else if (line.rfind("NUMBER_OF_SETS", 0) == 0) {
+            setsLine = number;
+            setsText = KeywordValue(line, "NUMBER_OF_SETS");
+        } else if (line.rfind("BEGIN_DATA_FORMAT", 0) == 0) {
+            formatLine = number;
+            section = kFormat;
+        } else if (line.rfind("BEGIN_DATA", 0) == 0) {
+            section = kData;
+        }
+        if (end == std::string_view::npos) break;
+        text.remove_prefix(end + 1);
+    }
+    const auto at = [&](int line) { return source + ":" + std::to_string(line) + ": "; };
+    double fields = 0.0, sets = 0.0;
+    if (formatLine > 0 && fieldsLine == 0) {
+        return at(formatLine) + "NUMBER_OF_FIELDS is missing: it must stand before BEGIN_DATA_FORMAT and give the "
+               "number of fields (" + std::to_string(formatFields) + " here)";
+    }
+    if (fieldsLine > 0 && !IsCount(fieldsText, &fields)) {
+        return at(fieldsLine) + "NUMBER_OF_FIELDS \"" + detail::Shown(fieldsText) + "\" is not a number of fields";
+    }
+    if (formatLine > 0 && static_cast<std::size_t>(fields) != formatFields) {
+        return at(formatLine) + "the data format names " + std::to_string(formatFields) +
+               " fields, NUMBER_OF_FIELDS on line " + std::to_string(fieldsLine) + " says " + fieldsText;
+    }
+    if (setsLine > 0 && !IsCount(setsText, &sets)) {
+        return at(setsLine) + "NUMBER_OF_SETS \"" + detail::Shown(setsText) + "\" is not a number of sets";
+    }
+    if (fields == 0.0 || dataLines.empty()) return "";
+    std::size_t oneSetLines = 0;
+    for (const auto& line : dataLines) oneSetLines += line.second == static_cast<std::size_t>(fields);
+    if (2 * oneSetLines < dataLines.size()) return "";  // sets laid out over several lines
+    for (const auto& line : dataLines) {
+        if (line.second != static_cast<std::size_t>(fields)) {
+            return at(line.first) + std::to_string(line.second) + (line.second == 1 ? " value" : " values") +
+                   " where the data format has " +
+                   fieldsText + " fields (a value missing or extra, a name with blanks outside quotes, or an "
+                   "unclosed quote)";
+        }
+    }
+    if (setsLine > 0 && static_cast<std::size_t>(sets) != dataLines.size()) {
+        return at(setsLine) + "NUMBER_OF_SETS says " + setsText + ", the data holds " +
+               std::to_string(dataLines.size()) + " sets";
+    }
+    return "";
+}
+
 // LittleCMS words syntax errors "<file>: Line <n>, <what>" (no file name for
 // text in memory); they become "<source>:<n>: <what>".
 std::string LocateError(const std::string& source, const std::string& message) {
@@ -142,6 +260,19 @@ std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spec
     const bool declared = bands == static_cast<double>(spectral.size()) && start > 0.0 && end > start &&
                           std::fabs(start - spectral.front().first) < 1.0 &&
                           std::fabs(end - spectral.back().first) < 1.0;
+    // A header that states a grid the fields do not have: ArgyllCMS refuses
+    // the file, and so do we, rather than pick one of the two silently.
+    const bool stated = cmsIT8GetProperty(it8, "SPECTRAL_BANDS") || cmsIT8GetProperty(it8, "SPECTRAL_START_NM") ||
+                        cmsIT8GetProperty(it8, "SPECTRAL_END_NM");
+    if (stated && !declared) {
+        const auto shown = [&](const char* name) {
+            const char* text = cmsIT8GetProperty(it8, name);
+            return std::string(name) + " " + (text ? detail::Shown(text) : std::string("(missing)"));
+        };
+        return "the header (" + shown("SPECTRAL_BANDS") + ", " + shown("SPECTRAL_START_NM") + ", " +
+               shown("SPECTRAL_END_NM") + ") contradicts the " + std::to_string(spectral.size()) +
+               " spectral fields; ArgyllCMS refuses such a file too";
+    }
     for (std::size_t i = 0; i < spectral.size(); ++i) {
         set->wavelengths.push_back(declared ? start + (end - start) * static_cast<double>(i) / (bands - 1.0)
                                             : spectral[i].first);
@@ -156,6 +287,12 @@ namespace detail {
 SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
     SpectralSet set;
     set.format = "CGATS";
+    const std::string layout = CheckLayout(text, source);
+    if (!layout.empty()) {
+        AddError(&set, layout);
+        set.unusable = true;
+        return set;
+    }
     Cgats cgats;
     if (!cgats.Load(text)) {
         AddError(&set, LocateError(source, cgats.FirstError()));
