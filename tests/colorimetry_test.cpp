@@ -5,6 +5,7 @@
 #include <atomic>
 #include <cmath>
 #include <filesystem>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -12,6 +13,11 @@
 #include "color_test_util.h"
 #include "colorimetry_test_util.h"
 #include "nxbase/cmetry.h"
+#include "nxbase/colordiff.h"
+#include "nxbase/colorvector.h"
+#include "nxbase/finegrid.h"
+#include "nxbase/resample.h"
+#include "nxbase/spectrafile.h"
 
 namespace {
 
@@ -396,4 +402,109 @@ TEST(CMetryFilter, AnIlluminantWithoutLightFallsBackToTheDefaultWithALogLine) {
     EXPECT_NEAR(filter.GetWeightSum(1), 100.0f, 1e-4f);
     EXPECT_NE(log.Text().find("Illuminant \"Dark\" has no weights"), std::string::npos)
         << log.Text();
+}
+
+namespace {
+
+// A table "wavelength,v1,v2,..." of the CIE data, read here without the
+// library, for an independent summation.
+std::vector<std::vector<double>> ReadTable(const std::string& path) {
+    std::vector<std::vector<double>> rows;
+    const std::vector<std::string> lines = nxtest::ReadLines(path);
+    for (std::size_t i = 1; i < lines.size(); ++i) {
+        std::vector<double> row;
+        std::stringstream fields(lines[i]);
+        for (std::string field; std::getline(fields, field, ',');) row.push_back(std::stod(field));
+        if (!row.empty()) rows.push_back(row);
+    }
+    return rows;
+}
+
+// Column `column` of a table at `nm`: linear between rows, ends held.
+double At(const std::vector<std::vector<double>>& table, double nm, std::size_t column) {
+    if (nm <= table.front()[0]) return table.front()[column];
+    if (nm >= table.back()[0]) return table.back()[column];
+    std::size_t i = 1;
+    while (table[i][0] < nm) ++i;
+    const double t = (nm - table[i - 1][0]) / (table[i][0] - table[i - 1][0]);
+    return table[i - 1][column] + t * (table[i][column] - table[i - 1][column]);
+}
+
+// CIE 15 summation at the grid's interval over 360..830 nm, R held at its
+// ends, in long double: X = 100 sum(S x R) / sum(S y).
+std::array<double, 3> IndependentXyz(const std::string& illuminant, const std::vector<double>& grid,
+                                     const std::vector<float>& r) {
+    const std::string cie = std::string(NXBASE_SOURCE_DIR) + "/platform/cmetry/data/cie/";
+    static const auto cmf = ReadTable(cie + "cmf_cie1931_2deg.csv");
+    const auto light = ReadTable(cie + "illuminants/" + illuminant + ".csv");
+    const double step = grid[1] - grid[0];
+    long double sums[3] = {}, norm = 0;
+    for (double nm = grid[0] - step * std::floor((grid[0] - 360.0) / step + 1e-9); nm <= 830.0 + 1e-9; nm += step) {
+        const std::size_t k = nm < grid.front() ? 0 : nm > grid.back() ? grid.size() - 1
+                                                                        : static_cast<std::size_t>(std::lround((nm - grid[0]) / step));
+        const long double s = At(light, nm, 1);
+        for (int c = 0; c < 3; ++c) sums[c] += s * At(cmf, nm, 1 + c) * r[k];
+        norm += s * At(cmf, nm, 2);
+    }
+    return {static_cast<double>(100 * sums[0] / norm), static_cast<double>(100 * sums[1] / norm),
+            static_cast<double>(100 * sums[2] / norm)};
+}
+
+std::vector<double> Grid(double from, double to, double step) {
+    std::vector<double> grid;
+    for (double nm = from; nm <= to + 1e-9; nm += step) grid.push_back(nm);
+    return grid;
+}
+
+}  // namespace
+
+TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathForSmoothSpectra) {
+    EXPECT_TRUE(nxbase::FineGridTristimulus::Applies(Grid(380, 730, 5)));
+    EXPECT_TRUE(nxbase::FineGridTristimulus::Applies(Grid(400, 700, 10.0 / 3.0)));
+    EXPECT_FALSE(nxbase::FineGridTristimulus::Applies(Grid(380, 730, 10)));
+    EXPECT_FALSE(nxbase::FineGridTristimulus::Applies({380, 385, 395, 400}));
+
+    // A lamp line: a narrow peak between the 10 nm points, on 1 nm and 5 nm
+    // grids, against an independent summation of the CIE tables.
+    for (const char* illuminant : {"D65", "FL2"}) {
+        const MeasuringCondition condition(IllumClass(illuminant), ObserverClass(String("2")), DStdClass(),
+                                           PhysicalConditions());
+        for (double step : {1.0, 5.0}) {
+            const std::vector<double> grid = Grid(380, 730, step);
+            std::vector<float> line(grid.size(), 0.1f);
+            for (std::size_t k = 0; k < grid.size(); ++k) {
+                if (std::fabs(grid[k] - 545.0) <= 2.0) line[k] = 0.9f;
+            }
+            const nxbase::FineGridTristimulus fine(condition, grid);
+            const std::array<double, 3> xyz = fine.ToXYZ(line.data());
+            const std::array<double, 3> expected = IndependentXyz(illuminant, grid, line);
+            for (int c = 0; c < 3; ++c) EXPECT_NEAR(xyz[c], expected[c], 1e-9) << illuminant << " " << step << " " << c;
+            EXPECT_NEAR(fine.White()[1], 100.0, 1e-9);
+        }
+    }
+
+    // The ColorChecker, brought onto 5 nm and 1 nm by Sprague interpolation:
+    // smooth spectra, for which both paths must agree within 0.05 dE00.
+    const MeasuringCondition d50;
+    const nxbase::SpectraTable chart = [] {
+        nxbase::SpectraTable t;
+        std::string error;
+        nxbase::ReadSpectraFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t, &error);
+        return t;
+    }();
+    ASSERT_EQ(chart.rows.size(), 24u);
+    double worst = 0.0;
+    for (double step : {1.0, 5.0}) {
+        const std::vector<double> grid = Grid(380, 730, step);
+        const nxbase::SpectralResampler finer(nxbase::StandardWavelengths(), grid);
+        const nxbase::FineGridTristimulus fine(d50, grid);
+        for (const nxbase::SpectrumRow& row : chart.rows) {
+            std::vector<float> values(grid.size());
+            finer.Resample(row.values.data(), values.data());
+            const std::array<double, 3> lab = fine.ToLab(values.data());
+            const LABVector tenNm(ReflectanceSpectrum(row.values.data(), PhysicalConditions()), d50);
+            worst = std::max(worst, nxbase::DeltaE2000({lab[0], lab[1], lab[2]}, nxbase::ToLabValue(tenNm)));
+        }
+    }
+    EXPECT_LT(worst, 0.05);
 }

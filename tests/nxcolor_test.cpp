@@ -184,8 +184,12 @@ TEST(NxcolorProgram, ReadsOtherGridsScalesAndNames) {
     std::string err;
     const std::string five = std::string(NXBASE_TEST_DATA_DIR) + "/spectra/colorchecker_5nm_percent.csv";
     ASSERT_EQ(RunNxcolor(five + " -f csv -p 2 -i d50 -v", &out, &err), 0) << err;
-    EXPECT_NE(out.find("\n1 dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos) << out;
-    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent"), std::string::npos) << err;
+    // A 5 nm file: colour summed at 5 nm (the 10 nm path gives 11.81,10.33,
+    // 5.17,38.42,13.69,... for the same patch).
+    EXPECT_NE(out.find("\n1 dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"), std::string::npos) << out;
+    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's own interval"),
+              std::string::npos)
+        << err;
     std::string f2, fl2;
     ASSERT_EQ(RunNxcolor("-i f2 -f csv", &f2, &err), 0) << err;
     ASSERT_EQ(RunNxcolor("-i FL2 -f csv", &fl2, &err), 0) << err;

@@ -132,6 +132,10 @@ struct NXBASE_EXPORT SpectrumRow {
     int line = 0;      // 1-based line in the source; 0 unknown
     std::string sampleId;
     std::string sampleName;
+    // The values as read, on the table's sourceWavelengths, kept when that
+    // grid is finer than 10 nm (SpectraTable::fineGrid): colour is then
+    // computed from them at their own interval (nxbase/finegrid.h).
+    std::vector<float> native;
 };
 
 struct NXBASE_EXPORT SpectraTable {
@@ -145,6 +149,9 @@ struct NXBASE_EXPORT SpectraTable {
     // 380..730/10 nm ("as read", "Sprague", "linear").
     std::vector<double> sourceWavelengths;
     std::string resampling;
+    // sourceWavelengths is a regular grid finer than 10 nm, and every row
+    // keeps its values on it (SpectrumRow::native).
+    bool fineGrid = false;
 };
 
 // The samples of a set on the 36-point grid (see nxbase/resample.h); a set on

@@ -14,6 +14,7 @@
 #include <memory>
 #include <new>
 
+#include "nxbase/finegrid.h"
 #include "nxbase/resample.h"
 
 namespace nxbase {
@@ -298,6 +299,7 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
     }
     const SpectralResampler resampler(axSet.wavelengths);
     table.resampling = resampler.MethodName();
+    table.fineGrid = FineGridTristimulus::Applies(axSet.wavelengths);
     table.rows.reserve(axSet.samples.size());
     for (const SpectralSample& sample : axSet.samples) {
         SpectrumRow row;
@@ -307,6 +309,7 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
                                    : (sample.name.empty() ? sample.id : sample.id + " " + sample.name);
         row.line = sample.line;
         resampler.Resample(sample.values.data(), row.values.data());
+        if (table.fineGrid) row.native = sample.values;
         table.rows.push_back(std::move(row));
     }
     return table;

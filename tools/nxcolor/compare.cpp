@@ -5,15 +5,31 @@
 #include <cmath>
 #include <map>
 #include <numeric>
+#include <optional>
 
 #include "nxbase/colorvector.h"
+#include "nxbase/finegrid.h"
 #include "report.h"
 
 namespace nxcolor {
 namespace {
 
+// The colour of a table's spectra at their own interval when they are finer
+// than 10 nm; empty otherwise.
+using FineGrid = std::optional<nxbase::FineGridTristimulus>;
+
+FineGrid FineGridOf(const SpectraTable& table, const MeasuringCondition& condition) {
+    FineGrid fine;
+    if (table.fineGrid) fine.emplace(condition, table.sourceWavelengths);
+    return fine;
+}
+
 // CIELAB of a spectrum, whatever the process-wide Lab type.
-nxbase::LabValue LabOf(const SpectrumRow& row, const MeasuringCondition& condition) {
+nxbase::LabValue LabOf(const SpectrumRow& row, const MeasuringCondition& condition, const FineGrid& fine) {
+    if (fine && row.native.size() == fine->Wavelengths().size()) {
+        const std::array<double, 3> lab = fine->ToLab(row.native.data());
+        return {lab[0], lab[1], lab[2]};
+    }
     const ReflectanceSpectrum spectrum(row.values.data(), PhysicalConditions());
     const LABVector lab(spectrum, condition);
     const LABVector cie = lab.GetLabVectorColorSpace() == LAB_CIE1976 ? lab : lab.GetCIELab();
@@ -24,9 +40,9 @@ nxbase::LabValue LabOf(const SpectrumRow& row, const MeasuringCondition& conditi
 const std::string& PairKey(const SpectrumRow& row) { return row.sampleId.empty() ? row.id : row.sampleId; }
 
 ComparedPair ComparePair(const SpectrumRow& reference, const SpectrumRow& sample, const MeasuringCondition& condition,
-                         nxbase::DeltaEMethod method) {
-    const nxbase::LabValue r = LabOf(reference, condition);
-    const nxbase::LabValue s = LabOf(sample, condition);
+                         nxbase::DeltaEMethod method, const FineGrid& referenceGrid, const FineGrid& sampleGrid) {
+    const nxbase::LabValue r = LabOf(reference, condition, referenceGrid);
+    const nxbase::LabValue s = LabOf(sample, condition, sampleGrid);
     ComparedPair pair;
     pair.id = sample.id;
     const float a[3] = {static_cast<float>(s.L), static_cast<float>(s.a), static_cast<float>(s.b)};
@@ -60,10 +76,12 @@ void Summarise(Comparison* comparison, double tolerance) {
 Comparison Compare(const SpectraTable& reference, const SpectraTable& sample, const MeasuringCondition& condition,
                    const CompareOptions& options) {
     Comparison comparison;
+    const FineGrid referenceGrid = FineGridOf(reference, condition);
+    const FineGrid sampleGrid = FineGridOf(sample, condition);
     if (options.byOrder) {
         const std::size_t n = std::min(reference.rows.size(), sample.rows.size());
         for (std::size_t i = 0; i < n; ++i) {
-            comparison.pairs.push_back(ComparePair(reference.rows[i], sample.rows[i], condition, options.method));
+            comparison.pairs.push_back(ComparePair(reference.rows[i], sample.rows[i], condition, options.method, referenceGrid, sampleGrid));
         }
         if (reference.rows.size() != sample.rows.size()) {
             comparison.problems.push_back(std::to_string(reference.rows.size()) + " references and " +
@@ -84,7 +102,7 @@ Comparison Compare(const SpectraTable& reference, const SpectraTable& sample, co
                                               "\" (--by-order pairs by position)");
                 continue;
             }
-            comparison.pairs.push_back(ComparePair(*match->second, row, condition, options.method));
+            comparison.pairs.push_back(ComparePair(*match->second, row, condition, options.method, referenceGrid, sampleGrid));
         }
     }
     Summarise(&comparison, options.tolerance);

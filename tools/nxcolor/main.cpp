@@ -317,7 +317,8 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
             std::cerr << "nxcolor: " << *source << ": " << table->rows.size() << " spectra, "
                       << table->sourceWavelengths.size() << " wavelengths " << table->sourceWavelengths.front()
                       << ".." << table->sourceWavelengths.back() << " nm, " << table->resampling << ", "
-                      << (table->percent ? "percent" : "reflectance factors") << '\n';
+                      << (table->percent ? "percent" : "reflectance factors")
+                      << (table->fineGrid ? "; colour summed at the file's own interval" : "") << '\n';
         }
     }
     if (table->unusable) return false;

@@ -7,6 +7,9 @@
 #include <charconv>
 #include <cmath>
 #include <ctime>
+#include <optional>
+
+#include "nxbase/finegrid.h"
 
 namespace nxcolor {
 namespace {
@@ -29,27 +32,49 @@ void CopyThree(const ColorVector& v, float* pOut) {
     for (int i = 0; i < 3; ++i) pOut[i] = v[i];
 }
 
+using Triple = std::array<double, 3>;
+
+void CopyTriple(const Triple& v, float* pOut) {
+    for (int i = 0; i < 3; ++i) pOut[i] = static_cast<float>(v[i]);
+}
+
+// A CIE 1976 LABVector of values computed elsewhere.
+LABVector LabOf(const Triple& lab, const MeasuringCondition& mc) {
+    return LABVector(static_cast<float>(lab[0]), static_cast<float>(lab[1]), static_cast<float>(lab[2]), mc);
+}
+
 std::vector<Quantity> MakeQuantities() {
     std::vector<Quantity> q;
     q.push_back({"xyz", {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(XYZVector(filter, s), out);
-                 }});
+                 },
+                 [](const Triple& xyz, const Triple&, const MeasuringCondition&, float* out) { CopyTriple(xyz, out); }});
     q.push_back({"xyy", {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(xyYVector(XYZVector(filter, s)), out);
+                 },
+                 [](const Triple& xyz, const Triple&, const MeasuringCondition&, float* out) {
+                     const double sum = xyz[0] + xyz[1] + xyz[2];
+                     CopyTriple({xyz[0] / sum, xyz[1] / sum, xyz[1]}, out);
                  }});
     q.push_back({"lab", {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      CopyThree(LABVector(s, mc), out);
-                 }});
+                 },
+                 [](const Triple&, const Triple& lab, const MeasuringCondition&, float* out) { CopyTriple(lab, out); }});
     q.push_back({"lch", {{"C*", "LAB_C"}, {"h", "LAB_H"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      const LChVector lch{LABVector(s, mc)};
+                     out[0] = lch[1];
+                     out[1] = lch[2];
+                 },
+                 [](const Triple&, const Triple& lab, const MeasuringCondition& mc, float* out) {
+                     const LChVector lch{LabOf(lab, mc)};
                      out[0] = lch[1];
                      out[1] = lch[2];
                  }});
@@ -57,6 +82,11 @@ std::vector<Quantity> MakeQuantities() {
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType din(LAB_DIN99);
                      CopyThree(LABVector(s, mc), out);
+                 },
+                 [](const Triple&, const Triple& lab, const MeasuringCondition&, float* out) {
+                     float cie[3];
+                     CopyTriple(lab, cie);
+                     nxbase::LabToDin99(cie, out, 1);
                  }});
     // ISO 5-3 status densities of the condition's density standard (red,
     // green, blue filter: cyan, magenta, yellow density); NaN where the
@@ -73,12 +103,20 @@ std::vector<Quantity> MakeQuantities() {
                          out[c] = std::nanf("");
                          filter.GetDensity(s, c, out[c]);
                      }
-                 }});
+                 },
+                 nullptr});
     // Screen colour levels 0..255 and their hex code (not a CGATS.17 field).
     Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
     q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const ScreenColor c = ScreenColorOf(s, mc);
+                     out[0] = c.red;
+                     out[1] = c.green;
+                     out[2] = c.blue;
+                     out[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+                 },
+                 [](const Triple&, const Triple& lab, const MeasuringCondition& mc, float* out) {
+                     const ScreenColor c = ScreenColorOf(LabOf(lab, mc));
                      out[0] = c.red;
                      out[1] = c.green;
                      out[2] = c.blue;
@@ -249,6 +287,9 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
             report.columns.push_back(c);
         }
     }
+    // Spectra finer than 10 nm: colour at their own interval.
+    std::optional<nxbase::FineGridTristimulus> fine;
+    if (table.fineGrid) fine.emplace(condition, table.sourceWavelengths);
     // Progress in steps of this many rows: cheap against the computation.
     constexpr std::size_t kProgressRows = 1024;
     for (const SpectrumRow& in : table.rows) {
@@ -261,9 +302,16 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
         row.spectrum = in.values;
         const ReflectanceSpectrum spectrum(in.values.data(), PhysicalConditions());
         std::string bad;
+        const bool atOwnInterval = fine && in.native.size() == fine->Wavelengths().size();
+        const Triple xyz = atOwnInterval ? fine->ToXYZ(in.native.data()) : Triple{};
+        const Triple lab = atOwnInterval ? fine->ToLab(in.native.data()) : Triple{};
         for (const Quantity* q : chosen) {
             float values[8] = {};
-            q->compute(spectrum, condition, values);
+            if (atOwnInterval && q->fromColour) {
+                q->fromColour(xyz, lab, condition, values);
+            } else {
+                q->compute(spectrum, condition, values);
+            }
             for (std::size_t c = 0; c < q->columns.size() && bad.empty() && q->key != "density"; ++c) {
                 if (!std::isfinite(values[c])) bad = q->columns[c].name + " is " + FormatNumber(values[c], 0);
             }

@@ -36,6 +36,11 @@ struct Quantity {
     std::string key;  // "xyz", "xyy", "lab", "lch", "din99", "density"
     std::vector<Column> columns;
     std::function<void(const ReflectanceSpectrum&, const MeasuringCondition&, float* pOut)> compute;
+    // The same from XYZ and CIE 1976 Lab computed at a fine grid's own
+    // interval; empty for quantities that need the 36-point spectrum.
+    std::function<void(const std::array<double, 3>& xyz, const std::array<double, 3>& lab,
+                       const MeasuringCondition&, float* pOut)>
+        fromColour;
 };
 
 // Every quantity nxcolor knows, in output order.

@@ -147,6 +147,11 @@ ScreenColor ScreenColorOf(const ReflectanceSpectrum& spectrum, const MeasuringCo
     return {colour.GetRed8(), colour.GetGreen8(), colour.GetBlue8()};
 }
 
+ScreenColor ScreenColorOf(const LABVector& lab) {
+    const Color colour = ColorConverter::RGBToColor(RGBVector(lab));
+    return {colour.GetRed8(), colour.GetGreen8(), colour.GetBlue8()};
+}
+
 std::string ScreenColorSource() {
     if (ICCEngine::Instance()->IsActive())
         return "ICC profile " + std::string(ICCProfile::GetProfileName().str());

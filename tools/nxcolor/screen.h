@@ -20,6 +20,8 @@ struct ScreenColor {
 // The colour the library paints for the spectrum's Lab under `condition`:
 // RGBVector(LABVector) and ColorConverter::RGBToColor, reduced to 8 bits.
 ScreenColor ScreenColorOf(const ReflectanceSpectrum& spectrum, const MeasuringCondition& condition);
+// The same for a CIE 1976 Lab computed elsewhere (spectra finer than 10 nm).
+ScreenColor ScreenColorOf(const LABVector& lab);
 
 // "sRGB (built-in formulas)" or "ICC profile <description>".
 std::string ScreenColorSource();

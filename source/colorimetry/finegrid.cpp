@@ -1,0 +1,122 @@
+// Tristimulus values at the spectra's own interval; see nxbase/finegrid.h.
+#include "nxbase/finegrid.h"
+
+#include <algorithm>
+#include <cmath>
+#include <stdexcept>
+
+#include "klume/cmetry/data.h"
+#include "nxbase/meascond.h"
+
+namespace nxbase {
+namespace {
+
+// The range the colour-matching functions are summed over (CIE 15).
+constexpr double kSumFrom = 360.0;
+constexpr double kSumTo = 830.0;
+// Equal steps within this much make a regular grid.
+constexpr double kStepTolerance = 0.01;
+constexpr double kCoarsestStep = 10.0;
+
+// A colour-matching function at `nm`: linear between its 1 nm values, zero
+// outside its table.
+double CmfAt(const klume::cmetry::IObserver& observer, int channel, double nm) {
+    const double position = nm - observer.GetFirstWavelength();
+    const int count = observer.GetSampleCount();
+    if (position < 0.0 || position > count - 1) return 0.0;
+    const int below = std::min(static_cast<int>(position), count - 2);
+    const double t = position - below;
+    const double* cmf = observer.GetCMF(channel);
+    return cmf[below] + t * (cmf[below + 1] - cmf[below]);
+}
+
+// CIELAB's f(t) with the library's constants.
+double LabF(double t) {
+    return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0;
+}
+
+}  // namespace
+
+bool FineGridTristimulus::Applies(const std::vector<double>& wavelengths) {
+    const std::size_t n = wavelengths.size();
+    if (n < 3) return false;
+    const double step = (wavelengths.back() - wavelengths.front()) / static_cast<double>(n - 1);
+    if (!(step > 0.0) || step >= kCoarsestStep - kStepTolerance) return false;
+    for (std::size_t k = 0; k < n; ++k) {
+        if (std::fabs(wavelengths[k] - (wavelengths.front() + step * static_cast<double>(k))) > kStepTolerance) {
+            return false;
+        }
+    }
+    return true;
+}
+
+FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition, std::vector<double> wavelengths)
+    : amWavelengths(std::move(wavelengths)) {
+    if (!Applies(amWavelengths)) {
+        throw std::invalid_argument("FineGridTristimulus: not a regular grid finer than 10 nm");
+    }
+    const auto illuminant = axCondition.GetIllum().GetIlluminant();
+    const auto observer = axCondition.GetObserver().GetObserver();
+    const std::size_t n = amWavelengths.size();
+    const double first = amWavelengths.front();
+    const double step = (amWavelengths.back() - first) / static_cast<double>(n - 1);
+    for (auto& channel : amWeights) channel.assign(n, 0.0);
+    // Every grid wavelength within the summation range, the measured ones
+    // and those beyond the ends, where the end values are held.
+    const long from = static_cast<long>(std::ceil((kSumFrom - first) / step - 1e-9));
+    const long to = static_cast<long>(std::floor((kSumTo - first) / step + 1e-9));
+    double ySum = 0.0;
+    for (long j = from; j <= to; ++j) {
+        const double nm = first + step * static_cast<double>(j);
+        const std::size_t k = static_cast<std::size_t>(std::clamp<long>(j, 0, static_cast<long>(n) - 1));
+        const double power = illuminant->GetPower(nm);
+        for (int c = 0; c < 3; ++c) amWeights[c][k] += power * CmfAt(*observer, c, nm);
+        ySum += power * CmfAt(*observer, 1, nm);
+    }
+    const double scale = ySum > 0.0 ? 100.0 / ySum : 0.0;
+    for (int c = 0; c < 3; ++c) {
+        double white = 0.0;
+        for (double& w : amWeights[c]) {
+            w *= scale;
+            white += w;
+        }
+        amWhite[c] = white;
+    }
+}
+
+std::array<double, 3> FineGridTristimulus::ToXYZ(const float* pValues) const {
+    std::array<double, 3> xyz{};
+    for (int c = 0; c < 3; ++c) {
+        const std::vector<double>& weights = amWeights[c];
+        double sum = 0.0;
+        for (std::size_t k = 0; k < weights.size(); ++k) sum += weights[k] * pValues[k];
+        xyz[c] = sum;
+    }
+    return xyz;
+}
+
+std::array<double, 3> FineGridTristimulus::ToLab(const float* pValues) const {
+    const std::array<double, 3> xyz = ToXYZ(pValues);
+    const double fx = LabF(xyz[0] / amWhite[0]);
+    const double fy = LabF(xyz[1] / amWhite[1]);
+    const double fz = LabF(xyz[2] / amWhite[2]);
+    return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
+}
+
+void FineGridTristimulus::ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const {
+    const std::size_t n = amWavelengths.size();
+    for (std::size_t i = 0; i < alCount; ++i) {
+        const std::array<double, 3> v = ToXYZ(pSpectra + i * n);
+        for (int c = 0; c < 3; ++c) pOut[3 * i + c] = static_cast<float>(v[c]);
+    }
+}
+
+void FineGridTristimulus::ToLab(const float* pSpectra, std::size_t alCount, float* pOut) const {
+    const std::size_t n = amWavelengths.size();
+    for (std::size_t i = 0; i < alCount; ++i) {
+        const std::array<double, 3> v = ToLab(pSpectra + i * n);
+        for (int c = 0; c < 3; ++c) pOut[3 * i + c] = static_cast<float>(v[c]);
+    }
+}
+
+}  // namespace nxbase
