@@ -13,6 +13,7 @@
 #include "nxbase/colorconverter.h"
 #include "nxbase/colordiff.h"
 #include "nxbase/colorvector.h"
+#include "nxbase/finegrid.h"
 #include "nxbase/meascond.h"
 #include "nxbase/resample.h"
 #include "nxbase/spectrafile.h"
@@ -121,8 +122,66 @@ long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     return -1;
 }
 
+// Fine-grid weights are kept per illuminant, observer and grid, as batches are.
+std::shared_ptr<const nxbase::FineGridTristimulus> FineGridFor(const std::string& illuminant,
+                                                             const py::object& observer,
+                                                             const std::vector<double>& grid) {
+    static std::mutex mutex;
+    static std::map<std::tuple<std::string, std::string, std::vector<double>>,
+                    std::shared_ptr<const nxbase::FineGridTristimulus>>
+        grids;
+    const std::string name = IlluminantName(illuminant);
+    const std::string observerName = ObserverName(observer);
+    std::lock_guard<std::mutex> lock(mutex);
+    auto& fine = grids[{name, observerName, grid}];
+    if (!fine) fine = std::make_shared<const nxbase::FineGridTristimulus>(Condition(name, observer), grid);
+    return fine;
+}
+
+std::vector<double> GridOf(const py::object& wavelengths) {
+    const DoubleArray grid = DoubleArray::ensure(py::array::ensure(wavelengths));
+    if (!grid || grid.ndim() != 1) throw py::value_error("wavelengths must be one-dimensional");
+    return std::vector<double>(grid.data(), grid.data() + grid.shape(0));
+}
+
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer) {
+                             const py::object& observer, const py::object& wavelengths);
+
+// Spectra on their own grid: summed at its interval when it is finer than
+// 10 nm, else brought onto the 36 points first.
+py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
+                                   const py::object& observer, const std::vector<double>& grid) {
+    const FloatArray input = AsFloatRows(spectra, static_cast<py::ssize_t>(grid.size()), "spectra");
+    const std::size_t count = static_cast<std::size_t>(input.size() / static_cast<py::ssize_t>(grid.size()));
+    if (!nxbase::FineGridTristimulus::Applies(grid)) {
+        const nxbase::SpectralResampler resampler(grid);
+        py::array_t<float> standard(ResultShape(input, kBands));
+        {
+            py::gil_scoped_release unlocked;
+            resampler.ResampleMany(input.data(), count, standard.mutable_data());
+        }
+        return SpectraTo(quantity, standard, illuminant, observer, py::none());
+    }
+    const auto fine = FineGridFor(illuminant, observer, grid);
+    py::array_t<float> result(ResultShape(input, 3));
+    float* out = result.mutable_data();
+    long implausible = -1;
+    {
+        py::gil_scoped_release unlocked;
+        quantity == Quantity::kXYZ ? fine->ToXYZ(input.data(), count, out) : fine->ToLab(input.data(), count, out);
+        implausible = FirstImplausible(out, count, quantity);
+    }
+    if (implausible >= 0) {
+        throw py::value_error("spectrum " + std::to_string(implausible) +
+                              " is brighter than twice the white: not reflectance factors (white = 1); divide "
+                              "percentages by 100 first");
+    }
+    return result;
+}
+
+py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
+                             const py::object& observer, const py::object& wavelengths) {
+    if (!wavelengths.is_none()) return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths));
     const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
     const auto batch = BatchFor(illuminant, observer);
     py::array_t<float> result(ResultShape(input, 3));
@@ -150,7 +209,7 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
 }
 
 py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer);
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none());
     const MeasuringCondition condition = Condition(illuminant, observer);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
@@ -165,7 +224,7 @@ py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& il
 
 py::array_t<float> SpectraToDin99(const py::object& spectra, const std::string& illuminant,
                                   const py::object& observer) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer);
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none());
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
     py::gil_scoped_release unlocked;
@@ -256,7 +315,7 @@ void Warn(PyObject* category, const std::string& message) {
     if (PyErr_WarnEx(category, message.c_str(), 1) != 0) throw py::error_already_set();
 }
 
-py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale) {
+py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool native) {
     const std::string path = py::str(py::module_::import("os").attr("fspath")(pathLike)).cast<std::string>();
     nxbase::SpectralReadOptions options;
     if (scale == "percent") {
@@ -266,12 +325,14 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale) {
     } else if (scale != "auto") {
         throw py::value_error("scale must be \"auto\", \"percent\" or \"fraction\"");
     }
+    nxbase::SpectralSet set;
     nxbase::SpectraTable table;
     std::string error;
     bool read = false;
     {
         py::gil_scoped_release unlocked;
-        read = nxbase::ReadSpectraFile(path, options, &table, &error);
+        read = nxbase::ReadSpectralFile(path, options, &set, &error);
+        if (read) table = nxbase::ToStandardGrid(set);
     }
     if (!read) throw py::value_error(error);
     if (table.unusable) throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
@@ -281,15 +342,25 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale) {
     for (const std::string& message : table.errors) Warn(gDataWarning, message);
     if (!table.scaleNote.empty()) Warn(gScaleWarning, table.scaleNote);
     py::list ids, names;
-    py::array_t<float> values(std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), kBands});
+    const py::ssize_t bands = native ? static_cast<py::ssize_t>(table.sourceWavelengths.size()) : kBands;
+    py::array_t<float> values(std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), bands});
     float* out = values.mutable_data();
-    for (const nxbase::SpectrumRow& row : table.rows) {
+    // The table holds one row per sample of the set, in order.
+    for (std::size_t r = 0; r < table.rows.size(); ++r) {
+        const nxbase::SpectrumRow& row = table.rows[r];
         ids.append(row.sampleId.empty() ? row.id : row.sampleId);
         names.append(row.sampleName);
-        std::copy(row.values.begin(), row.values.end(), out);
-        out += kBands;
+        if (native) {
+            std::copy(set.samples[r].values.begin(), set.samples[r].values.end(), out);
+        } else {
+            std::copy(row.values.begin(), row.values.end(), out);
+        }
+        out += bands;
     }
-    return py::make_tuple(ids, names, values);
+    if (!native) return py::make_tuple(ids, names, values);
+    py::array_t<double> grid(static_cast<py::ssize_t>(table.sourceWavelengths.size()));
+    std::copy(table.sourceWavelengths.begin(), table.sourceWavelengths.end(), grid.mutable_data());
+    return py::make_tuple(ids, names, values, grid);
 }
 
 const char kSpectraDoc[] =
@@ -299,6 +370,11 @@ const char kSpectraDoc[] =
     "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
     "of shape (..., 3). A spectrum whose Y would exceed twice the white (percentages, most likely) "
     "raises ValueError. ";
+
+const char kGridDoc[] =
+    "wavelengths: the spectra's own grid (shape (N,), spectra (..., N)) instead of the 36 points: a "
+    "regular grid finer than 10 nm (1 nm, 5 nm) is summed at its own interval (nxbase::FineGridTristimulus, "
+    "CIE 15), any other is brought onto the 36 points first. ";
 
 }  // namespace
 
@@ -316,14 +392,18 @@ void RegisterColour(py::module_& m) {
     m.attr("SpectralScaleWarning") = py::handle(gScaleWarning);
     m.def(
         "spectra_to_XYZ",
-        [](const py::object& s, const std::string& i, const py::object& o) { return SpectraTo(Quantity::kXYZ, s, i, o); },
-        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
-        (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc).c_str());
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w) {
+            return SpectraTo(Quantity::kXYZ, s, i, o, w);
+        },
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
+        (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc + kGridDoc).c_str());
     m.def(
         "spectra_to_Lab",
-        [](const py::object& s, const std::string& i, const py::object& o) { return SpectraTo(Quantity::kLab, s, i, o); },
-        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
-        (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc).c_str());
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w) {
+            return SpectraTo(Quantity::kLab, s, i, o, w);
+        },
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
+        (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc + kGridDoc).c_str());
     m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
           (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
@@ -344,12 +424,14 @@ void RegisterColour(py::module_& m) {
           "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm steps: the "
           "values themselves where the grid has the wavelength, Sprague interpolation on equal steps, linear "
           "on uneven ones, end values held outside the range. float64 (..., 36).");
-    m.def("read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto",
+    m.def("read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto", py::arg("native") = false,
           "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, spectra) "
           "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows become "
           "SpectralDataWarning; a scale that was guessed (the file does not say, scale=\"auto\") a "
           "SpectralScaleWarning saying which and why; an unreadable or unusable file, or one without "
-          "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\".");
+          "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\". native=True returns "
+          "(ids, names, spectra, wavelengths) with the spectra as read, on the file's own grid, for "
+          "spectra_to_XYZ/Lab(..., wavelengths=wavelengths).");
 }
 
 }  // namespace nxpy

@@ -87,6 +87,25 @@ def test_differences_resampling_and_screen_colours():
     values = 0.2 + 0.001 * (grid - 380)
     np.testing.assert_allclose(nxbase.resample(grid, np.stack([values, values])),
                                np.tile(0.2 + 0.01 * np.arange(36), (2, 1)), atol=1e-12)
+    # Spectra on their own grid: 5 nm is summed at 5 nm (as nxcolor does),
+    # 10 nm goes the 36-point way.
+    five = CHART.replace("tools/nxcolor/data/colorchecker_babelcolor_average.csv",
+                         "tests/data/spectra/colorchecker_5nm_percent.csv")
+    with warnings.catch_warnings():
+        warnings.simplefilter("ignore", nxbase.SpectralScaleWarning)
+        _, _, fine, grid = nxbase.read_spectra(five, native=True)
+        _, _, standard = nxbase.read_spectra(five)
+    assert fine.shape == (24, 71) and grid[0] == 380 and grid[-1] == 730
+    xyz = nxbase.spectra_to_XYZ(fine, wavelengths=grid)
+    printed = subprocess.run([tool("nxcolor"), five, "-f", "csv", "-p", "4"], capture_output=True, text=True,
+                             check=True).stdout.splitlines()[1].split(",")
+    np.testing.assert_allclose(xyz[0], [float(v) for v in printed[1:4]], atol=1e-4)
+    lab_fine = nxbase.spectra_to_Lab(fine, wavelengths=grid)
+    # Summed at 5 nm against the 10 nm tables: close for the chart's smooth
+    # spectra, not equal (0.11 dE00 at most here).
+    assert 0 < np.max(nxbase.delta_E(lab_fine, nxbase.spectra_to_Lab(standard))) < 0.25
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(standard, wavelengths=np.arange(380, 731, 10.0)),
+                                  nxbase.spectra_to_Lab(standard))
     rgb = nxbase.Lab_to_sRGB(np.array([[100, 0, 0], [0, 0, 0]], dtype=np.float32))
     assert rgb.shape == (2, 3) and rgb[0, 0] > 99 and rgb[1, 0] < 1
 
