@@ -10,6 +10,7 @@ packages=(
     libsdbus-c++-dev dbus-daemon dbus-bin procps
     libgtest-dev libgmock-dev libbenchmark-dev help2man
     python3-dev pybind11-dev python3-numpy python3-pytest
+    argyll
 )
 
 missing=()

@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdio>
+#include <cstdlib>
 #include <filesystem>
 
 #include <lcms2.h>
@@ -228,6 +229,39 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
         EXPECT_EQ(back.rows[i].id, chart.rows[i].id);
         EXPECT_EQ(back.rows[i].values, chart.rows[i].values) << i;
     }
+
+    // -f ti3: an ArgyllCMS measurement file. The real spec2cie reads it and
+    // computes the same XYZ from its spectra; the library reads it back.
+    const std::string ti3 = dir.File("argyll.ti3");
+    ASSERT_EQ(RunNxcolor("-f ti3 -i D65 > " + ti3 + "; cat " + ti3, &out, &err), 0) << err;
+    ASSERT_TRUE(ReadSpectraFile(ti3, {}, &back, &error)) << error;
+    ASSERT_EQ(back.rows.size(), 24u);
+    EXPECT_TRUE(back.scaleNote.empty()) << "a CTI3 file states its scale";
+    for (std::size_t i = 0; i < 24; ++i) {
+        for (int k = 0; k < 36; ++k) EXPECT_NEAR(back.rows[i].values[k], chart.rows[i].values[k], 5e-7) << i;
+    }
+    if (std::system("command -v spec2cie >/dev/null 2>&1") != 0) {
+        GTEST_SKIP() << "ArgyllCMS (package argyll) is not installed: spec2cie not run";
+    }
+    const std::string converted = dir.File("spec2cie.ti3");
+    ASSERT_EQ(std::system(("spec2cie -i D65 " + ti3 + " " + converted + " >/dev/null 2>&1").c_str()), 0);
+    cmsHANDLE ours = cmsIT8LoadFromFile(nullptr, ti3.c_str());
+    cmsHANDLE theirs = cmsIT8LoadFromFile(nullptr, converted.c_str());
+    ASSERT_NE(ours, nullptr);
+    ASSERT_NE(theirs, nullptr);
+    ASSERT_EQ(cmsIT8GetPropertyDbl(theirs, "NUMBER_OF_SETS"), 24.0);
+    for (int set = 0; set < 24; ++set) {
+        for (const char* field : {"XYZ_X", "XYZ_Y", "XYZ_Z"}) {
+            const int ourColumn = cmsIT8FindDataFormat(ours, field);
+            const int theirColumn = cmsIT8FindDataFormat(theirs, field);
+            // ASTM E308 10 nm tables here, ArgyllCMS's own integration there.
+            EXPECT_NEAR(cmsIT8GetDataRowColDbl(theirs, set, theirColumn), cmsIT8GetDataRowColDbl(ours, set, ourColumn),
+                        0.01)
+                << set << " " << field;
+        }
+    }
+    cmsIT8Free(ours);
+    cmsIT8Free(theirs);
 }
 
 TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {

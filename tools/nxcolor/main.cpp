@@ -74,10 +74,11 @@ const char kUsage[] =
     "                          ISO 5-3 standard: \"Status A\", \"Status E\",\n"
     "                          \"Status M\", \"Status T\", one installed in\n"
     "                          $NXBASE_DATA_DIR/density, or a table by its path\n"
-    "  -f, --format table|csv|cgats\n"
-    "                          output layout (default table)\n"
+    "  -f, --format table|csv|cgats|ti3\n"
+    "                          output layout (default table); ti3: an ArgyllCMS\n"
+    "                          measurement file with the spectra (CTI3)\n"
     "      --keep-spectra      with -f cgats: also write the spectra, so that the\n"
-    "                          output is a measurement file (ArgyllCMS SPEC_nnn)\n"
+    "                          output is a CGATS measurement file (SPEC_nnn)\n"
     "  -p, --precision N       decimals, 0..9 (default 4; 2 with --compare)\n"
     "      --percent           the values are percentages (0..100)\n"
     "      --fraction          the values are reflectance factors (0..1)\n"
@@ -397,7 +398,7 @@ int Run(Options& options) {
     if (!densityProblem.empty()) return UsageError(densityProblem);
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
-        return UsageError("unknown format \"" + options.format + "\"; use table, csv or cgats");
+        return UsageError("unknown format \"" + options.format + "\"; use table, csv, cgats or ti3");
     }
     if (options.keepSpectra && options.format != "cgats") return UsageError("--keep-spectra needs -f cgats");
     const MeasuringCondition condition(
@@ -429,8 +430,9 @@ int Run(Options& options) {
     if (options.xyy) quantities.push_back("xyy");
     if (options.din99) quantities.push_back("din99");
     if (!options.density.empty()) quantities.push_back("density");
-    if (options.rgb) quantities.push_back("rgb");
-    if (options.rgb || !options.svgReport.empty()) {
+    // A CTI3 file carries the screen colours as its device values.
+    if (options.rgb || options.format == "ti3") quantities.push_back("rgb");
+    if (options.rgb || options.format == "ti3" || !options.svgReport.empty()) {
         const std::string warning = nxcolor::SetUpScreenColors(options.iccProfile);
         // A profile asked for on the command line that cannot be used is an
         // error; one from the configuration falls back to the formulas.

@@ -224,6 +224,58 @@ void WriteCgats(const Report& report, std::ostream& out) {
     out << "END_DATA\n";
 }
 
+// The index of the column named `cgats` (its CGATS field name); -1 if absent.
+int ColumnIndex(const Report& report, const char* cgats) {
+    for (std::size_t i = 0; i < report.columns.size(); ++i) {
+        if (report.columns[i].cgats == cgats) return static_cast<int>(i);
+    }
+    return -1;
+}
+
+// An ArgyllCMS measurement file (CTI3): the keywords and fields its tools
+// require. CTI3 needs device values beside the measurement; the samples'
+// screen colours (sRGB, 0..100) stand in for them. Spectra in percent.
+void WriteTi3(const Report& report, std::ostream& out) {
+    constexpr int kSpectrumDecimals = 4;
+    const char* const kDevice[] = {"RGB_R", "RGB_G", "RGB_B"};
+    const char* const kXyz[] = {"XYZ_X", "XYZ_Y", "XYZ_Z"};
+    out << "CTI3\n\n"
+        << "DESCRIPTOR \"Argyll Calibration Target chart information 3\"\n"
+        << "ORIGINATOR " << CgatsString(report.originator) << "\n"
+        << "CREATED " << CgatsString(report.created.empty() ? NowIso8601() : report.created) << "\n"
+        << "KEYWORD \"DEVICE_CLASS\"\nDEVICE_CLASS \"OUTPUT\"\n"
+        << "KEYWORD \"COLOR_REP\"\nCOLOR_REP \"RGB_XYZ\"\n"
+        << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
+        << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer + " degree") << "\n"
+        << "KEYWORD \"SPECTRAL_BANDS\"\nSPECTRAL_BANDS \"" << kSpectrumSize << "\"\n"
+        << "KEYWORD \"SPECTRAL_START_NM\"\nSPECTRAL_START_NM \"" << kFirstWavelength << ".000000\"\n"
+        << "KEYWORD \"SPECTRAL_END_NM\"\nSPECTRAL_END_NM \""
+        << kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1) << ".000000\"\n"
+        << "KEYWORD \"SPECTRAL_NORM\"\nSPECTRAL_NORM \"100.0\"\n\n"
+        << "NUMBER_OF_FIELDS " << 2 + 3 + 3 + kSpectrumSize << "\n"
+        << "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME RGB_R RGB_G RGB_B XYZ_X XYZ_Y XYZ_Z";
+    for (int k = 0; k < kSpectrumSize; ++k) out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
+    out << "\nEND_DATA_FORMAT\n\n"
+        << "NUMBER_OF_SETS " << report.rows.size() << "\n"
+        << "BEGIN_DATA\n";
+    int device[3], xyz[3];
+    for (int c = 0; c < 3; ++c) {
+        device[c] = ColumnIndex(report, kDevice[c]);
+        xyz[c] = ColumnIndex(report, kXyz[c]);
+    }
+    for (const ReportRow& row : report.rows) {
+        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId) << ' '
+            << CgatsString(row.sampleName);
+        for (int c = 0; c < 3; ++c) {
+            out << ' ' << FormatNumber(device[c] < 0 ? 0.0f : row.values[device[c]] * (100.0f / 255.0f), 4);
+        }
+        for (int c = 0; c < 3; ++c) out << ' ' << FormatNumber(xyz[c] < 0 ? 0.0f : row.values[xyz[c]], 6);
+        for (const float v : row.spectrum) out << ' ' << FormatNumber(100.0f * v, kSpectrumDecimals);
+        out << '\n';
+    }
+    out << "END_DATA\n";
+}
+
 void WriteTable(const Report& report, std::ostream& out) {
     out << "# " << report.source << ": " << report.rows.size() << " spectra, illuminant "
         << report.illuminant << ", observer " << report.observer << "\xC2\xB0";
@@ -329,7 +381,7 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
 }
 
 const std::map<std::string, Writer>& Writers() {
-    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}};
+    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}, {"ti3", WriteTi3}};
     return writers;
 }
 
