@@ -1,4 +1,6 @@
 // Colour functions over NumPy arrays, on the library's batch path.
+#include <algorithm>
+#include <cctype>
 #include <cmath>
 #include <map>
 #include <memory>
@@ -9,6 +11,7 @@
 
 #include "common.h"
 #include "klume/cmetry/repository.h"
+#include "nxbase/adaptation.h"
 #include "nxbase/colorbatch.h"
 #include "nxbase/colorconverter.h"
 #include "nxbase/colordiff.h"
@@ -122,6 +125,31 @@ long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     return -1;
 }
 
+// Spectra per call of a progress call-back: large enough that the call costs
+// nothing against the work, small enough for a bar to move.
+constexpr std::size_t kProgressChunk = 1 << 18;
+
+// Runs work(begin, end) over [0, count) without the GIL. With a progress
+// call-back, in chunks, calling progress(fraction done) with the GIL after
+// each and 1.0 at the end; an exception from it stops the work.
+template <class Work>
+void RunWithProgress(std::size_t count, const py::object& progress, Work work) {
+    if (progress.is_none()) {
+        py::gil_scoped_release unlocked;
+        work(std::size_t{0}, count);
+        return;
+    }
+    for (std::size_t begin = 0; begin < count; begin += kProgressChunk) {
+        const std::size_t end = std::min(count, begin + kProgressChunk);
+        {
+            py::gil_scoped_release unlocked;
+            work(begin, end);
+        }
+        progress(static_cast<double>(end) / static_cast<double>(count));
+    }
+    if (count == 0) progress(1.0);
+}
+
 // Fine-grid weights are kept per illuminant, observer and grid, as batches are.
 std::shared_ptr<const nxbase::FineGridTristimulus> FineGridFor(const std::string& illuminant,
                                                              const py::object& observer,
@@ -145,12 +173,13 @@ std::vector<double> GridOf(const py::object& wavelengths) {
 }
 
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths);
+                             const py::object& observer, const py::object& wavelengths, const py::object& progress);
 
 // Spectra on their own grid: summed at its interval when it is finer than
 // 10 nm, else brought onto the 36 points first.
 py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                                   const py::object& observer, const std::vector<double>& grid) {
+                                   const py::object& observer, const std::vector<double>& grid,
+                                   const py::object& progress) {
     const FloatArray input = AsFloatRows(spectra, static_cast<py::ssize_t>(grid.size()), "spectra");
     const std::size_t count = static_cast<std::size_t>(input.size() / static_cast<py::ssize_t>(grid.size()));
     if (!nxbase::FineGridTristimulus::Applies(grid)) {
@@ -160,17 +189,18 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
             py::gil_scoped_release unlocked;
             resampler.ResampleMany(input.data(), count, standard.mutable_data());
         }
-        return SpectraTo(quantity, standard, illuminant, observer, py::none());
+        return SpectraTo(quantity, standard, illuminant, observer, py::none(), progress);
     }
     const auto fine = FineGridFor(illuminant, observer, grid);
     py::array_t<float> result(ResultShape(input, 3));
     float* out = result.mutable_data();
-    long implausible = -1;
-    {
-        py::gil_scoped_release unlocked;
-        quantity == Quantity::kXYZ ? fine->ToXYZ(input.data(), count, out) : fine->ToLab(input.data(), count, out);
-        implausible = FirstImplausible(out, count, quantity);
-    }
+    const float* in = input.data();
+    const std::size_t bands = grid.size();
+    RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
+        quantity == Quantity::kXYZ ? fine->ToXYZ(in + begin * bands, end - begin, out + 3 * begin)
+                                   : fine->ToLab(in + begin * bands, end - begin, out + 3 * begin);
+    });
+    const long implausible = FirstImplausible(out, count, quantity);
     if (implausible >= 0) {
         throw py::value_error("spectrum " + std::to_string(implausible) +
                               " is brighter than twice the white: not reflectance factors (white = 1); divide "
@@ -180,23 +210,30 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
 }
 
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths) {
-    if (!wavelengths.is_none()) return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths));
+                             const py::object& observer, const py::object& wavelengths, const py::object& progress) {
+    if (!wavelengths.is_none()) {
+        return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths), progress);
+    }
     const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
     const auto batch = BatchFor(illuminant, observer);
     py::array_t<float> result(ResultShape(input, 3));
     const std::size_t count = static_cast<std::size_t>(input.size() / kBands);
     const float* in = input.data();
     float* out = result.mutable_data();
+    RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
+        const float* from = in + begin * kBands;
+        float* to = out + 3 * begin;
+        const std::size_t n = end - begin;
+        const bool parallel = n >= kParallelFrom;
+        if (quantity == Quantity::kXYZ) {
+            parallel ? batch->ToXYZParallel(from, n, to) : batch->ToXYZ(from, n, to);
+        } else {
+            parallel ? batch->ToLabParallel(from, n, to) : batch->ToLab(from, n, to);
+        }
+    });
     long implausible = -1;
     {
         py::gil_scoped_release unlocked;
-        const bool parallel = count >= kParallelFrom;
-        if (quantity == Quantity::kXYZ) {
-            parallel ? batch->ToXYZParallel(in, count, out) : batch->ToXYZ(in, count, out);
-        } else {
-            parallel ? batch->ToLabParallel(in, count, out) : batch->ToLab(in, count, out);
-        }
         implausible = FirstImplausible(out, count, quantity);
     }
     if (implausible >= 0) {
@@ -208,8 +245,9 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
     return result;
 }
 
-py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none());
+py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer,
+                                const py::object& progress) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress);
     const MeasuringCondition condition = Condition(illuminant, observer);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
@@ -223,8 +261,8 @@ py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& il
 }
 
 py::array_t<float> SpectraToDin99(const py::object& spectra, const std::string& illuminant,
-                                  const py::object& observer) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none());
+                                  const py::object& observer, const py::object& progress) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
     py::gil_scoped_release unlocked;
@@ -289,6 +327,94 @@ py::array_t<double> DeltaE(const py::object& reference, const py::object& sample
         out[i] = nxbase::DeltaE({p[3 * i], p[3 * i + 1], p[3 * i + 2]}, {q[3 * i], q[3 * i + 1], q[3 * i + 2]}, chosen);
     }
     return result;
+}
+
+// A white point: an illuminant name (with the observer) or XYZ values.
+nxbase::Tristimulus WhiteOf(const py::object& white, const py::object& observer) {
+    if (py::isinstance<py::str>(white)) {
+        return nxbase::WhitePointOf(Condition(white.cast<std::string>(), observer));
+    }
+    const DoubleArray xyz = AsDoubleRows(white, 3, "white");
+    if (xyz.ndim() != 1) throw py::value_error("white must be an illuminant name or one XYZ triple");
+    return {xyz.data()[0], xyz.data()[1], xyz.data()[2]};
+}
+
+// CIELAB's f and its inverse, with the library's constants.
+double LabF(double t) { return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0; }
+double LabFInverse(double f) { return f > 0.206893034423 ? f * f * f : (f - 16.0 / 116.0) / 7.787; }
+
+// Applies `convert` to each triple of a (..., 3) array, into float64.
+template <class Convert>
+py::array_t<double> MapTriples(const py::object& values, const char* what, Convert convert) {
+    const DoubleArray input = AsDoubleRows(values, 3, what);
+    py::array_t<double> result(ResultShape(input, 3));
+    const std::size_t count = static_cast<std::size_t>(input.size() / 3);
+    const double* in = input.data();
+    double* out = result.mutable_data();
+    py::gil_scoped_release unlocked;
+    for (std::size_t i = 0; i < count; ++i) convert(in + 3 * i, out + 3 * i);
+    return result;
+}
+
+py::array_t<double> XYZToLab(const py::object& xyz, const py::object& white, const py::object& observer) {
+    const nxbase::Tristimulus w = WhiteOf(white, observer);
+    return MapTriples(xyz, "XYZ", [w](const double* v, double* out) {
+        const double fx = LabF(v[0] / w[0]), fy = LabF(v[1] / w[1]), fz = LabF(v[2] / w[2]);
+        out[0] = 116.0 * fy - 16.0;
+        out[1] = 500.0 * (fx - fy);
+        out[2] = 200.0 * (fy - fz);
+    });
+}
+
+py::array_t<double> LabToXYZ(const py::object& lab, const py::object& white, const py::object& observer) {
+    const nxbase::Tristimulus w = WhiteOf(white, observer);
+    return MapTriples(lab, "Lab", [w](const double* v, double* out) {
+        const double fy = (v[0] + 16.0) / 116.0;
+        out[0] = LabFInverse(v[1] / 500.0 + fy) * w[0];
+        out[1] = LabFInverse(fy) * w[1];
+        out[2] = LabFInverse(fy - v[2] / 200.0) * w[2];
+    });
+}
+
+// LCh as LChVector has it: h in degrees within (0, 360], grey (|a|, |b| below
+// 1e-5) and an exact 0 degrees give 360.
+py::array_t<double> LabToLCh(const py::object& lab) {
+    return MapTriples(lab, "Lab", [](const double* v, double* out) {
+        out[0] = v[0];
+        out[1] = std::hypot(v[1], v[2]);
+        double h = std::atan2(v[2], v[1]) * 180.0 / M_PI;
+        if (std::fabs(v[1]) < 1e-5 && std::fabs(v[2]) < 1e-5) h = 360.0;
+        if (h <= 0.0) h += 360.0;
+        out[2] = h;
+    });
+}
+
+// colour-science's method names as well as the library's.
+nxbase::AdaptationMethod AdaptationMethodOf(const std::string& name) {
+    std::string key;
+    for (const char c : name) {
+        if (c != ' ' && c != '_' && c != '-') key += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+    }
+    if (key == "xyzscaling") key = "xyz";
+    nxbase::AdaptationMethod method{};
+    if (!nxbase::ParseAdaptationMethod(key.c_str(), &method)) {
+        throw py::value_error("unknown method \"" + name + "\"; use Bradford, CAT02, Von Kries or XYZ Scaling");
+    }
+    return method;
+}
+
+py::array_t<double> ChromaticAdaptation(const py::object& xyz, const py::object& source, const py::object& target,
+                                        const std::string& method, const py::object& observer) {
+    nxbase::Matrix3 m{};
+    try {
+        m = nxbase::AdaptationMatrix(WhiteOf(source, observer), WhiteOf(target, observer), AdaptationMethodOf(method));
+    } catch (const std::invalid_argument& error) {
+        throw py::value_error(error.what());
+    }
+    return MapTriples(xyz, "XYZ", [m](const double* v, double* out) {
+        const nxbase::Tristimulus r = nxbase::Apply(m, {v[0], v[1], v[2]});
+        std::copy(r.begin(), r.end(), out);
+    });
 }
 
 py::array_t<double> Resample(const py::object& wavelengths, const py::object& values) {
@@ -369,7 +495,8 @@ const char kSpectraDoc[] =
     "precision), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
     "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
     "of shape (..., 3). A spectrum whose Y would exceed twice the white (percentages, most likely) "
-    "raises ValueError. ";
+    "raises ValueError. progress: a call-back taking the fraction done (0..1], called every 262144 "
+    "spectra and at the end (for tqdm: lambda f: bar.update(...)); the GIL is released between calls. ";
 
 const char kGridDoc[] =
     "wavelengths: the spectra's own grid (shape (N,), spectra (..., N)) instead of the 36 points: a "
@@ -392,22 +519,25 @@ void RegisterColour(py::module_& m) {
     m.attr("SpectralScaleWarning") = py::handle(gScaleWarning);
     m.def(
         "spectra_to_XYZ",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w) {
-            return SpectraTo(Quantity::kXYZ, s, i, o, w);
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p) {
+            return SpectraTo(Quantity::kXYZ, s, i, o, w, p);
         },
         py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
+        py::arg("progress") = py::none(),
         (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc + kGridDoc).c_str());
     m.def(
         "spectra_to_Lab",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w) {
-            return SpectraTo(Quantity::kLab, s, i, o, w);
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p) {
+            return SpectraTo(Quantity::kLab, s, i, o, w, p);
         },
         py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
+        py::arg("progress") = py::none(),
         (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc + kGridDoc).c_str());
     m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+          py::arg("progress") = py::none(),
           (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
-          py::arg("observer") = two, (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
+          py::arg("observer") = two, py::arg("progress") = py::none(), (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status E",
           "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status A\", \"Status E\", "
           "\"Status M\", \"Status T\" or an installed standard; \"Status E\" by default, as everywhere in NxBase. NaN "
@@ -420,6 +550,19 @@ void RegisterColour(py::module_& m) {
           "reference. method: \"2000\" (CIEDE2000), \"94\" (graphic arts), \"94t\" (textiles), \"cmc\" (2:1), "
           "\"cmc11\", \"ab\" (CIE76), or colour-science's \"CIE 2000\", \"CIE 1994\", \"CMC\" (2:1), "
           "\"CIE 1976\" (any case). float64 of the broadcast shape without the last axis.");
+    const py::object d50 = py::str("D50");
+    m.def("XYZ_to_Lab", &XYZToLab, py::arg("XYZ"), py::arg("white") = d50, py::arg("observer") = two,
+          "CIE 1976 L*a*b* of XYZ (white Y = 100) of shape (..., 3). white: an illuminant name (its white "
+          "point for the observer) or an XYZ triple. The library's constants (t > 0.008856). float64.");
+    m.def("Lab_to_XYZ", &LabToXYZ, py::arg("Lab"), py::arg("white") = d50, py::arg("observer") = two,
+          "The inverse of XYZ_to_Lab. float64 (..., 3).");
+    m.def("Lab_to_LCh", &LabToLCh, py::arg("Lab"),
+          "L, C*, h of Lab values (..., 3); h in degrees within (0, 360], grey 360, as nxcolor prints. float64.");
+    m.def("chromatic_adaptation", &ChromaticAdaptation, py::arg("XYZ"), py::arg("source"), py::arg("target"),
+          py::arg("method") = "Bradford", py::arg("observer") = two,
+          "XYZ seen under the source white as the corresponding colour under the target white, (..., 3). "
+          "source, target: illuminant names or XYZ triples; method: \"Bradford\", \"CAT02\", \"Von Kries\" or "
+          "\"XYZ Scaling\" (any case). float64.");
     m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),
           "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm steps: the "
           "values themselves where the grid has the wavelength, Sprague interpolation on equal steps, linear "

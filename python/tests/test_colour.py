@@ -70,6 +70,40 @@ def test_values_agree_with_nxcolor(chart):
     np.testing.assert_allclose(density, printed[:, 11:14], atol=1.5e-4)
 
 
+def test_conversions_adaptation_and_progress(chart):
+    # XYZ to Lab and back agree with the spectra's own paths and invert.
+    xyz = nxbase.spectra_to_XYZ(chart, illuminant="D65").astype(np.float64)
+    lab = nxbase.XYZ_to_Lab(xyz, "D65")
+    np.testing.assert_allclose(lab, nxbase.spectra_to_Lab(chart, illuminant="D65"), atol=2e-3)
+    np.testing.assert_allclose(nxbase.Lab_to_XYZ(lab, "D65"), xyz, rtol=1e-12, atol=1e-12)
+    white = nxbase.Lab_to_XYZ([100, 0, 0], "D65")  # the white point itself
+    np.testing.assert_allclose(white, nxbase.spectra_to_XYZ(np.ones(36), illuminant="D65"), rtol=1e-6)
+    np.testing.assert_array_equal(nxbase.XYZ_to_Lab(xyz, white), lab)
+    lch = nxbase.Lab_to_LCh(lab)
+    np.testing.assert_allclose(lch, nxbase.spectra_to_LCh(chart, illuminant="D65"), atol=2e-3)
+    assert nxbase.Lab_to_LCh([50, 0, 0])[2] == 360.0
+    # Bradford D65 to D50 takes the D65 white onto the D50 white; the names
+    # of colour-science are accepted, a zero white is refused.
+    d50 = nxbase.XYZ_to_Lab(nxbase.chromatic_adaptation(white, "D65", "D50", method="Bradford"), "D50")
+    np.testing.assert_allclose(d50, [100, 0, 0], atol=1e-9)
+    np.testing.assert_allclose(nxbase.chromatic_adaptation(xyz, "D65", "D50", method="von kries"),
+                               nxbase.chromatic_adaptation(xyz, "D65", "D50", method="VonKries"))
+    with pytest.raises(ValueError, match="unknown method"):
+        nxbase.chromatic_adaptation(xyz, "D65", "D50", method="CAT16x")
+    with pytest.raises(ValueError):
+        nxbase.chromatic_adaptation(xyz, [0, 0, 0], "D50")
+    # Progress: rising fractions, ending at 1, and the same numbers.
+    many = np.tile(chart, (30000, 1))
+    seen = []
+    np.testing.assert_array_equal(nxbase.spectra_to_Lab(many, progress=seen.append), nxbase.spectra_to_Lab(many))
+    assert seen == sorted(seen) and seen[-1] == 1.0 and len(seen) == 3
+
+    def stop(fraction):
+        raise KeyboardInterrupt
+    with pytest.raises(KeyboardInterrupt):
+        nxbase.spectra_to_XYZ(many, progress=stop)
+
+
 def test_differences_resampling_and_screen_colours():
     pairs = np.loadtxt(CHART.replace("tools/nxcolor/data/colorchecker_babelcolor_average.csv",
                                      "tests/data/ciede2000_sharma2005.csv"), delimiter=",", skiprows=1)
