@@ -44,6 +44,9 @@ std::vector<int> DataLines(std::string_view text) {
     return lines;
 }
 
+// LittleCMS's CGATS parser takes at most this many sets and fields.
+constexpr int kMostCgatsSets = 32766;
+
 // The whitespace-separated tokens of a CGATS line as LittleCMS reads them: a
 // token that starts with a double quote runs to the next one (so "a""b" is
 // two tokens and "" one empty token); "#" outside quotes starts a comment.
@@ -142,6 +145,11 @@ std::string CheckLayout(std::string_view text, const std::string& source) {
     }
     if (setsLine > 0 && !IsCount(setsText, &sets)) {
         return at(setsLine) + "NUMBER_OF_SETS \"" + detail::Shown(setsText) + "\" is not a number of sets";
+    }
+    if (sets > kMostCgatsSets || fields > kMostCgatsSets) {
+        return at(sets > kMostCgatsSets ? setsLine : fieldsLine) + "more than " + std::to_string(kMostCgatsSets) +
+               (sets > kMostCgatsSets ? " sets" : " fields") +
+               ", which the CGATS parser (LittleCMS) does not take; split the file, or write it as CSV";
     }
     if (fields == 0.0 || dataLines.empty()) return "";
     std::size_t oneSetLines = 0;
