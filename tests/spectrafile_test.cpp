@@ -40,6 +40,12 @@ SpectraTable Chart() {
     return table;
 }
 
+// The table holds exactly one error, and it says `expected`.
+void ExpectOnlyError(const SpectraTable& table, const std::string& expected) {
+    ASSERT_EQ(table.errors.size(), 1u) << expected;
+    EXPECT_NE(table.errors[0].find(expected), std::string::npos) << table.errors[0];
+}
+
 TEST(SpectraFile, ReadsCsvRowsAndReportsBadOnesWithTheirLine) {
     const SpectraTable chart = Chart();
     ASSERT_EQ(chart.rows.size(), 24u);
@@ -172,10 +178,8 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     EXPECT_FALSE(mixed.percent);
     ASSERT_EQ(mixed.rows.size(), 5u);
     EXPECT_EQ(mixed.rows[0].values[3], 0.5f);
-    ASSERT_EQ(mixed.errors.size(), 1u);
-    EXPECT_NE(mixed.errors[0].find("t.csv:7: a value of 50.00 fits only percentages"), std::string::npos)
-        << mixed.errors[0];
-    EXPECT_NE(mixed.errors[0].find("--percent or --fraction"), std::string::npos);
+    ExpectOnlyError(mixed, "t.csv:7: a value of 50.00 fits only percentages, while the other spectra read as "
+                           "reflectance factors; --percent or --fraction");
     // Rows beyond both scales take no part in the vote: one row of 1e4 does
     // not outvote the single percent row.
     const SpectraTable beyond = nxbase::ParseSpectraCsv(
@@ -188,11 +192,8 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     std::string dark = Header() + "\n1,d," + Values(1.18) + "\n2,e," + Values(0.9) + "\n";
     const SpectraTable guessed = nxbase::ParseSpectraCsv(dark, "d.csv");
     EXPECT_FALSE(guessed.percent);
-    ASSERT_EQ(guessed.errors.size(), 1u);
-    EXPECT_NE(guessed.errors[0].find("d.csv:2: as reflectance factors this is brighter than any reflectance (Y "
-                                     "about 118 % of the white); if the file holds percentages, --percent"),
-              std::string::npos)
-        << guessed.errors[0];
+    ExpectOnlyError(guessed, "d.csv:2: as reflectance factors this is brighter than any reflectance (Y about 118 % "
+                             "of the white); if the file holds percentages, --percent");
     EXPECT_NE(guessed.scaleNote.find("read as reflectance factors (white = 1): no value is above 1.5"),
               std::string::npos)
         << guessed.scaleNote;
@@ -304,16 +305,12 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     contradicted.replace(contradicted.find("\"71\""), 4, "\"36\"");
     const SpectraTable refused = nxbase::ParseSpectra(contradicted, "x.sp");
     EXPECT_TRUE(refused.unusable);
-    ASSERT_EQ(refused.errors.size(), 1u);
-    EXPECT_NE(refused.errors[0].find("x.sp: the header (SPECTRAL_BANDS 36, SPECTRAL_START_NM 377.5, "
-                                     "SPECTRAL_END_NM 727.5) contradicts the 71 spectral fields"),
-              std::string::npos)
-        << refused.errors[0];
+    ExpectOnlyError(refused, "x.sp: the header (SPECTRAL_BANDS 36, SPECTRAL_START_NM 377.5, SPECTRAL_END_NM 727.5) "
+                             "contradicts the 71 spectral fields");
     for (const auto& [text, expected] : faults) {
         const SpectraTable t = nxbase::ParseSpectra(text, "c");
         EXPECT_TRUE(t.unusable) << expected;
-        ASSERT_EQ(t.errors.size(), 1u) << expected;
-        EXPECT_EQ(t.errors[0].rfind(expected, 0), 0u) << t.errors[0];
+        ExpectOnlyError(t, expected);
     }
     const SpectraTable broken = nxbase::ParseSpectra("CGATS.17\nBEGIN_DATA_FORMAT\nKEYWORD\n", "b");
     EXPECT_TRUE(broken.unusable);
