@@ -17,33 +17,6 @@
 namespace nxbase {
 namespace {
 
-// The line of each data set, counting one set per non-blank, non-comment
-// line after the BEGIN_DATA keyword (the layout writers use).
-std::vector<int> DataLines(std::string_view text) {
-    std::vector<int> lines;
-    bool inData = false;
-    int number = 0;
-    while (!text.empty()) {
-        const std::size_t end = text.find('\n');
-        std::string_view line = text.substr(0, end);
-        ++number;
-        while (!line.empty() && (line.front() == ' ' || line.front() == '\t')) line.remove_prefix(1);
-        while (!line.empty() && (line.back() == '\r' || line.back() == ' ' || line.back() == '\t')) {
-            line.remove_suffix(1);
-        }
-        if (!inData) {
-            inData = line == "BEGIN_DATA";
-        } else if (line == "END_DATA") {
-            break;
-        } else if (!line.empty() && line.front() != '#') {
-            lines.push_back(number);
-        }
-        if (end == std::string_view::npos) break;
-        text.remove_prefix(end + 1);
-    }
-    return lines;
-}
-
 // LittleCMS's CGATS parser takes at most this many sets and fields.
 constexpr int kMostCgatsSets = 32766;
 
@@ -89,11 +62,22 @@ bool IsCount(const std::string& text, double* value) {
     return detail::ParseNumber(text, value) && *value >= 0 && *value == std::floor(*value) && *value < 1e9;
 }
 
-// Checks what LittleCMS would misreport, with the line a user must look at:
-// NUMBER_OF_FIELDS and NUMBER_OF_SETS against the data format and the data,
-// and, where the data holds one set per line as writers lay it out, the
-// first line whose count of values differs. "" when nothing is found.
-std::string CheckLayout(std::string_view text, const std::string& source) {
+// What one pass over the text finds: the line of each data set (one set
+// per non-blank, non-comment line after BEGIN_DATA, the layout writers
+// use) and the first fault LittleCMS would misreport.
+struct Layout {
+    std::vector<int> dataLines;
+    std::string problem;  // "" when nothing is found
+};
+
+// The problem: NUMBER_OF_FIELDS and NUMBER_OF_SETS against the data format
+// and the data, and, where the data holds one set per line, the first line
+// whose count of values differs, each with the line a user must look at.
+std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText, int setsLine,
+                          const std::string& setsText, int formatLine, std::size_t formatFields,
+                          const std::vector<std::pair<int, std::size_t>>& dataLines);
+
+Layout ScanLayout(std::string_view text, const std::string& source) {
     int fieldsLine = 0, setsLine = 0, formatLine = 0, number = 0;
     std::string fieldsText, setsText;
     std::size_t formatFields = 0;
@@ -130,6 +114,16 @@ std::string CheckLayout(std::string_view text, const std::string& source) {
         if (end == std::string_view::npos) break;
         text.remove_prefix(end + 1);
     }
+    Layout layout;
+    for (const auto& line : dataLines) layout.dataLines.push_back(line.first);
+    layout.problem =
+        LayoutProblem(source, fieldsLine, fieldsText, setsLine, setsText, formatLine, formatFields, dataLines);
+    return layout;
+}
+
+std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText, int setsLine,
+                          const std::string& setsText, int formatLine, std::size_t formatFields,
+                          const std::vector<std::pair<int, std::size_t>>& dataLines) {
     const auto at = [&](int line) { return source + ":" + std::to_string(line) + ": "; };
     double fields = 0.0, sets = 0.0;
     if (formatLine > 0 && fieldsLine == 0) {
@@ -295,9 +289,9 @@ namespace detail {
 SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
     SpectralSet set;
     set.format = "CGATS";
-    const std::string layout = CheckLayout(text, source);
-    if (!layout.empty()) {
-        AddError(&set, layout);
+    const Layout layout = ScanLayout(text, source);
+    if (!layout.problem.empty()) {
+        AddError(&set, layout.problem);
         set.unusable = true;
         return set;
     }
@@ -339,7 +333,7 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source, cons
     if (axOptions.scale == SpectralScale::kPercent) divisor = 100.0;
     if (axOptions.scale == SpectralScale::kFraction) divisor = 1.0;
 
-    const std::vector<int> lines = DataLines(text);
+    const std::vector<int>& lines = layout.dataLines;
     const char* setsText = cmsIT8GetProperty(it8, "NUMBER_OF_SETS");
     double sets = 0.0;
     if (!setsText || !ParseNumber(setsText, &sets) || sets < 0 || sets != std::floor(sets)) {

@@ -214,6 +214,11 @@ RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDele
     throw ParseError("a value must be \"text\", dword:XXXXXXXX, hex...: or -");
 }
 
+// The first line of registry text: REGEDIT4, or what regedit writes today.
+bool IsHeaderLine(std::string_view asLine) {
+    return asLine == "REGEDIT4" || asLine == "Windows Registry Editor Version 5.00";
+}
+
 void RefuseZeroByte(const std::string& asName, const char* asWhat) {
     if (asName.find('\0') != std::string::npos) {
         throw ParseError(std::string("a ") + asWhat + " holding a NUL byte");
@@ -225,7 +230,7 @@ void ParseLine(std::string_view asLine, bool abWide, bool& axHeaderSeen, bool& a
     std::string_view line = TrimLeft(TrimRight(asLine));
     if (!axHeaderSeen) {
         if (line.empty()) return;
-        if (line != "REGEDIT4" && line != "Windows Registry Editor Version 5.00") {
+        if (!IsHeaderLine(line)) {
             throw ParseError("the first line must be REGEDIT4");
         }
         axHeaderSeen = true;
@@ -350,7 +355,7 @@ bool CheckRegedit4Header(std::string_view asHead, bool abComplete, const std::st
         ++lineNumber;
         const std::string_view trimmed = TrimLeft(TrimRight(line));
         if (!trimmed.empty()) {
-            if (trimmed == "REGEDIT4" || trimmed == "Windows Registry Editor Version 5.00") return true;
+            if (IsHeaderLine(trimmed)) return true;
             throw std::runtime_error(asSource + ":" + std::to_string(lineNumber) +
                                      ": the first line must be REGEDIT4: " + Excerpt(line));
         }
