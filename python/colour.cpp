@@ -339,10 +339,6 @@ nxbase::Tristimulus WhiteOf(const py::object& white, const py::object& observer)
     return {xyz.data()[0], xyz.data()[1], xyz.data()[2]};
 }
 
-// CIELAB's f and its inverse, with the library's constants.
-double LabF(double t) { return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0; }
-double LabFInverse(double f) { return f > 0.206893034423 ? f * f * f : (f - 16.0 / 116.0) / 7.787; }
-
 // Applies `convert` to each triple of a (..., 3) array, into float64.
 template <class Convert>
 py::array_t<double> MapTriples(const py::object& values, const char* what, Convert convert) {
@@ -359,20 +355,16 @@ py::array_t<double> MapTriples(const py::object& values, const char* what, Conve
 py::array_t<double> XYZToLab(const py::object& xyz, const py::object& white, const py::object& observer) {
     const nxbase::Tristimulus w = WhiteOf(white, observer);
     return MapTriples(xyz, "XYZ", [w](const double* v, double* out) {
-        const double fx = LabF(v[0] / w[0]), fy = LabF(v[1] / w[1]), fz = LabF(v[2] / w[2]);
-        out[0] = 116.0 * fy - 16.0;
-        out[1] = 500.0 * (fx - fy);
-        out[2] = 200.0 * (fy - fz);
+        const std::array<double, 3> lab = nxbase::CielabOf({v[0], v[1], v[2]}, w);
+        std::copy(lab.begin(), lab.end(), out);
     });
 }
 
 py::array_t<double> LabToXYZ(const py::object& lab, const py::object& white, const py::object& observer) {
     const nxbase::Tristimulus w = WhiteOf(white, observer);
     return MapTriples(lab, "Lab", [w](const double* v, double* out) {
-        const double fy = (v[0] + 16.0) / 116.0;
-        out[0] = LabFInverse(v[1] / 500.0 + fy) * w[0];
-        out[1] = LabFInverse(fy) * w[1];
-        out[2] = LabFInverse(fy - v[2] / 200.0) * w[2];
+        const std::array<double, 3> xyz = nxbase::XyzOfCielab({v[0], v[1], v[2]}, w);
+        std::copy(xyz.begin(), xyz.end(), out);
     });
 }
 

@@ -11,6 +11,9 @@
 //   little-endian) | 16-byte authentication tag.
 // Keys are 32 bytes chosen by the application (a random key stored with its
 // licence, for instance); the library never derives or stores one itself.
+// The copies of a key and the deciphered bytes that the library makes while
+// it works are wiped (OPENSSL_cleanse) before their memory is given back;
+// the caller's own copies remain the caller's to wipe.
 #ifndef NXBASE_ENCRYPTEDSPECTRUM_H_
 #define NXBASE_ENCRYPTEDSPECTRUM_H_
 
@@ -45,8 +48,10 @@ public:
     // The same with the process key; std::logic_error when none is set.
     std::vector<double> GetDecryptedSpectrum() const;
 
-    // The key GetDecryptedSpectrum() uses, for the whole process.
+    // The key GetDecryptedSpectrum() uses, for the whole process; a new key
+    // overwrites the old one in place.
     static void SetProcessKey(const Key& axKey);
+    // Wipes the process key; GetDecryptedSpectrum() then throws.
     static void ClearProcessKey();
 
 private:

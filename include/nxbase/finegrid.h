@@ -29,6 +29,14 @@ class MeasuringCondition;
 
 namespace nxbase {
 
+// CIE 1976 L*a*b* of XYZ against a white, in double, with the library's
+// CIELAB constants (t > 0.008856: cube root, else 7.787 t + 16/116), and
+// its inverse (f > 0.206893034423: cube, else linear).
+NXBASE_EXPORT std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
+                                             const std::array<double, 3>& axWhite);
+NXBASE_EXPORT std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
+                                                const std::array<double, 3>& axWhite);
+
 class NXBASE_EXPORT FineGridTristimulus {
 public:
     // True when `wavelengths` is a regular grid (equal steps within 0.01 nm)
@@ -48,8 +56,7 @@ public:
 
     // XYZ of one spectrum (Wavelengths().size() values, reflectance factors).
     std::array<double, 3> ToXYZ(const float* pValues) const;
-    // CIE 1976 L*a*b* relative to White(), with the library's CIELAB
-    // constants (t > 0.008856: cube root, else 7.787 t + 16/116).
+    // CIE 1976 L*a*b* relative to White(): CielabOf(ToXYZ(...), White()).
     std::array<double, 3> ToLab(const float* pValues) const;
     // alCount spectra, spectrum i at pSpectra + i * Wavelengths().size(), into
     // pOut[3i..3i+2] as float.

@@ -167,7 +167,8 @@ namespace nxbase {
 // The name of message `alNumber` (0..134), or "" for any other number.
 NXBASE_EXPORT const char* MessageName(int alNumber);
 // The number of a command text: n for the name of message n, 1000 + n for
-// "ANSWER!" and that name, -1 for anything else (names compare exactly).
+// "ANSWER!" and that name, -1 for anything else (names compare exactly; one
+// hash look-up, whatever the number of messages).
 NXBASE_EXPORT int NumberOfCommandText(const std::string& asCommand);
 // The command text of message number `alNumber`: its name below 1000,
 // "ANSWER!" and the name of message alNumber - 1000 from 1000 on; "" when

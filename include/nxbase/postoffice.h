@@ -51,9 +51,11 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // Sends one message (by number or by command text; a numeric text n is
     // the name of message n, or the answer to n - 1000 from 1000 on). The
     // data block is encoded on the way. Four retries, each after letting the
-    // loop run; `keepTrying` returning false stops early, and is also asked
-    // while a peer that was started is awaited (one start per Send, at most
-    // 10 s). True on success; GetLastError() says why a send failed.
+    // loop run and a 1 ms pause; `keepTrying` returning false stops early,
+    // and is also asked while a peer that was started is awaited, whichever
+    // transport started it (one start per Send, all retries included, and
+    // at most nxbase::StartWaitLimit(): 10 s, less when $NXBASE_WAIT_TIMEOUT
+    // is shorter). True on success; GetLastError() says why a send failed.
     unsigned char Send(const std::string& asApp, PO_Botschaften axMessage, MyMemoryBlock& axData,
                        boost::function<bool()> fKeepTrying = boost::function<bool()>());
     unsigned char Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,

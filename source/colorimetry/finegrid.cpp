@@ -30,12 +30,29 @@ double CmfAt(const klume::cmetry::IObserver& observer, int channel, double nm) {
     return cmf[below] + t * (cmf[below + 1] - cmf[below]);
 }
 
-// CIELAB's f(t) with the library's constants.
+// CIELAB's f(t) with the library's constants, and its inverse.
 double LabF(double t) {
     return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0;
 }
 
+double LabFInverse(double f) {
+    return f > 0.206893034423 ? f * f * f : (f - 16.0 / 116.0) / 7.787;
+}
+
 }  // namespace
+
+std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ, const std::array<double, 3>& axWhite) {
+    const double fx = LabF(axXYZ[0] / axWhite[0]);
+    const double fy = LabF(axXYZ[1] / axWhite[1]);
+    const double fz = LabF(axXYZ[2] / axWhite[2]);
+    return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
+}
+
+std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab, const std::array<double, 3>& axWhite) {
+    const double fy = (axLab[0] + 16.0) / 116.0;
+    return {LabFInverse(axLab[1] / 500.0 + fy) * axWhite[0], LabFInverse(fy) * axWhite[1],
+            LabFInverse(fy - axLab[2] / 200.0) * axWhite[2]};
+}
 
 bool FineGridTristimulus::Applies(const std::vector<double>& wavelengths) {
     const std::size_t n = wavelengths.size();
@@ -96,11 +113,7 @@ std::array<double, 3> FineGridTristimulus::ToXYZ(const float* pValues) const {
 }
 
 std::array<double, 3> FineGridTristimulus::ToLab(const float* pValues) const {
-    const std::array<double, 3> xyz = ToXYZ(pValues);
-    const double fx = LabF(xyz[0] / amWhite[0]);
-    const double fy = LabF(xyz[1] / amWhite[1]);
-    const double fz = LabF(xyz[2] / amWhite[2]);
-    return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
+    return CielabOf(ToXYZ(pValues), amWhite);
 }
 
 void FineGridTristimulus::ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const {

@@ -38,6 +38,14 @@ void CopyTriple(const Triple& v, float* pOut) {
     for (int i = 0; i < 3; ++i) pOut[i] = static_cast<float>(v[i]);
 }
 
+// The levels and the packed hex code of a screen colour, as the rgb columns hold them.
+void PutScreenColor(const ScreenColor& c, float* pOut) {
+    pOut[0] = c.red;
+    pOut[1] = c.green;
+    pOut[2] = c.blue;
+    pOut[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+}
+
 // A CIE 1976 LABVector of values computed elsewhere.
 LABVector LabOf(const Triple& lab, const MeasuringCondition& mc) {
     return LABVector(static_cast<float>(lab[0]), static_cast<float>(lab[1]), static_cast<float>(lab[2]), mc);
@@ -109,18 +117,10 @@ std::vector<Quantity> MakeQuantities() {
     Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
     q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
-                     const ScreenColor c = ScreenColorOf(s, mc);
-                     out[0] = c.red;
-                     out[1] = c.green;
-                     out[2] = c.blue;
-                     out[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+                     PutScreenColor(ScreenColorOf(s, mc), out);
                  },
                  [](const Triple&, const Triple& lab, const MeasuringCondition& mc, float* out) {
-                     const ScreenColor c = ScreenColorOf(LabOf(lab, mc));
-                     out[0] = c.red;
-                     out[1] = c.green;
-                     out[2] = c.blue;
-                     out[3] = static_cast<float>((c.red << 16) | (c.green << 8) | c.blue);
+                     PutScreenColor(ScreenColorOf(LabOf(lab, mc)), out);
                  }});
 
     return q;
