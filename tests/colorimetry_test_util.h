@@ -13,6 +13,7 @@
 #include <gtest/gtest.h>
 
 #include "nxbase/logfile.h"
+#include "log_test_util.h"
 #include "test_util.h"
 
 namespace nxtest {
@@ -36,24 +37,6 @@ inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path
 }
 
 inline double ToDouble(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
-
-// Sends the process log into a temporary directory for the whole test
-// program (the log is a process singleton and keeps its first path).
-class LogDirEnvironment : public ::testing::Environment {
-public:
-    void SetUp() override {
-        dir.reset(new TempDir());
-        logPath.reset(new ScopedEnv("NXBASE_LOG_PATH", dir->File("log")));
-    }
-    void TearDown() override {
-        logPath.reset();
-        dir.reset();
-    }
-
-private:
-    std::unique_ptr<TempDir> dir;
-    std::unique_ptr<ScopedEnv> logPath;
-};
 
 // Records the log lines written while it exists ("key|text" each).
 class LogCapture {
