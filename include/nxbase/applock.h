@@ -5,7 +5,7 @@
 #define NXBASE_APPLOCK_H_
 
 #include <memory>
-#include <string>
+#include <string_view>
 
 #include "nxbase/export.h"
 
@@ -15,7 +15,7 @@ class NXBASE_EXPORT ApplicationLockHolder {
   public:
     // Opens the scoped log entry "ApplicationLockHolder <name>" under
     // "ApplicationLock"; does not lock.
-    explicit ApplicationLockHolder(const std::string& asName);
+    explicit ApplicationLockHolder(std::string_view asName);
     // Releases the lock if this holder took it.
     ~ApplicationLockHolder();
     ApplicationLockHolder(const ApplicationLockHolder&) = delete;
@@ -28,7 +28,6 @@ class NXBASE_EXPORT ApplicationLockHolder {
 
   private:
     bool amLocked = false;
-    std::string amName;
     std::shared_ptr<AutoLog> pmLog;
 };
 

@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 
 #include "nxbase/export.h"
 
@@ -30,6 +31,9 @@ NXBASE_EXPORT std::string MessageBody(const std::string& asSender, const std::st
 // command, 0x00, the byte-stuffed data.
 NXBASE_EXPORT std::string MessageFrame(const std::string& asSender, const std::string& asCommand,
                                        const char* pEncodedData, std::size_t alSize);
+// The same written over `asFrame`, whose storage is reused.
+NXBASE_EXPORT void BuildMessageFrame(std::string& asFrame, std::string_view asSender,
+                                     std::string_view asCommand, std::string_view asEncodedData);
 // The positions of a message body's first two zero bytes (after the sender
 // and after the command), without copying; false when it lacks them.
 NXBASE_EXPORT bool FindMessageFields(const std::string& asBody, std::size_t& alFirst,

@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <string>
+#include <string_view>
 
 #include "nxbase/export.h"
 
@@ -169,7 +170,7 @@ NXBASE_EXPORT const char* MessageName(int alNumber);
 // The number of a command text: n for the name of message n, 1000 + n for
 // "ANSWER!" and that name, -1 for anything else (names compare exactly; one
 // hash look-up, whatever the number of messages).
-NXBASE_EXPORT int NumberOfCommandText(const std::string& asCommand);
+NXBASE_EXPORT int NumberOfCommandText(std::string_view asCommand);
 // The command text of message number `alNumber`: its name below 1000,
 // "ANSWER!" and the name of message alNumber - 1000 from 1000 on; "" when
 // there is no such message.
@@ -182,6 +183,8 @@ NXBASE_EXPORT void EncodeBlock(MyMemoryBlock& axBlock);
 NXBASE_EXPORT void DecodeBlock(MyMemoryBlock& axBlock);
 // The same on plain bytes.
 NXBASE_EXPORT std::string EncodeBytes(const char* pData, std::size_t alSize);
+// Appends the stuffed form of `alSize` bytes at `pData` to `asOut`.
+NXBASE_EXPORT void AppendEncoded(std::string& asOut, const char* pData, std::size_t alSize);
 NXBASE_EXPORT std::string DecodeBytes(const char* pData, std::size_t alSize);
 // Decodes `alSize` bytes at `pData` in place (decoding never grows them);
 // returns the decoded length.

@@ -22,6 +22,7 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -117,10 +118,13 @@ class NXBASE_EXPORT Pipe {
     // for DISCONNECT). False on failure; GetLastError() then says why.
     bool Send(const std::string& asApp, const std::string& asCommand,
               const MyMemoryBlock& axEncodedData);
+    bool Send(const std::string& asApp, const std::string& asCommand, std::string_view asEncodedData);
     // The same on the connection a received event came in on
     // (VELTRAEvent::GetChannel()); false when it is closed.
     bool SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
                        const MyMemoryBlock& axEncodedData);
+    bool SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
+                       std::string_view asEncodedData);
     // Why the last failed send failed.
     const std::string& GetLastError() const { return amLastError; }
     // Why this process cannot use sockets (a refused runtime directory);
@@ -164,13 +168,13 @@ class NXBASE_EXPORT Pipe {
     void HandleHandshake(const ChannelPtr& axChannel, const std::string& asBody);
     bool Write(const ChannelPtr& axChannel, const std::string& asFrame);
     bool WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
-                      const MyMemoryBlock& axEncodedData);
+                      std::string_view asEncodedData);
     void FlushOutgoing(const ChannelPtr& axChannel);
     bool SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
     bool SendByDde(const std::string& asApp, const std::string& asCommand,
-                   const MyMemoryBlock& axEncodedData);
+                   std::string_view asEncodedData);
     bool OnDdeBus(const std::string& asApp);
     std::string OwnRequestText() const;
 
@@ -179,6 +183,8 @@ class NXBASE_EXPORT Pipe {
     std::string amSocketPath;
     std::string amRefusal;
     std::string amLastError;
+    std::string amFrame;  // the last frame written, its storage reused
+    bool amFrameInUse = false;
     std::thread::id amThread;
     int amLockFd = -1;  // held while this process owns its name
     ReceiveFunction fmReceiveFunction = nullptr;

@@ -18,6 +18,7 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -138,8 +139,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
 
     static void TransportReceive(VELTRAEvent& axEvent);
     unsigned char CheckLock(const String& asSender);
-    bool TryOnce(const std::string& asApp, const std::string& asCommand,
-                 const MyMemoryBlock& axEncoded);
+    bool TryOnce(const std::string& asApp, const std::string& asCommand, std::string_view asEncoded);
+    unsigned char SendCommand(const std::string& asApp, const std::string& asCommand,
+                              const MyMemoryBlock& axData, const boost::function<bool()>& fKeepTrying);
     bool OnOwnThread(const char* asCall);
     void AnswerStatus(VELTRAEvent& axEvent, signed char axStatus);
     void HandleConnect(VELTRAEvent& axEvent);
@@ -155,8 +157,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     PostOfficeApplications amApplications;
     FlagSet amFlags;
     std::deque<VELTRAEvent> amCommandQueue;
-    // Answers awaited by SendAndReceive, by peer and answer number: nothing
-    // else is kept.
+    // Answers awaited by SendAndReceive, by peer and answer number; one
+    // arriving while nobody waits is dropped. Entries stay for the next wait.
     struct AwaitedAnswer {
         int waiters = 0;
         bool arrived = false;
@@ -177,6 +179,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     std::map<std::string, int> amConnectedPeers;  // CONNECTs not yet matched, per peer
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
     std::string amLastError;
+    std::string amEncoded;  // the last message's stuffed data, its storage reused
+    bool amEncodedInUse = false;
     std::thread::id amThread = std::this_thread::get_id();
 
     static PostOffice* smInstance;

@@ -9,6 +9,7 @@
 #include <string>
 
 #include "nxbase/export.h"
+#include "nxbase/msgcat.h"
 #include "nxbase/mymemblo.h"
 
 class NXBASE_EXPORT VELTRAEvent {
@@ -23,16 +24,24 @@ class NXBASE_EXPORT VELTRAEvent {
 
     const std::string& GetSender() const { return amSender; }
     const std::string& GetCommand() const { return amCommand; }
+    // The command's message number (nxbase::NumberOfCommandText), looked up
+    // once: every stage of the post office asks for it.
+    int GetNumber() const {
+        if (amNumber == kNotLookedUp) amNumber = nxbase::NumberOfCommandText(amCommand);
+        return amNumber;
+    }
     MyMemoryBlock& GetData() { return amData; }
     const MyMemoryBlock& GetData() const { return amData; }
     // The socket connection it came in on (0: none, e.g. from DDE).
     std::uint64_t GetChannel() const { return amChannel; }
 
   private:
+    static constexpr int kNotLookedUp = -2;
     std::string amSender;
     std::string amCommand;
     MyMemoryBlock amData;
     std::uint64_t amChannel = 0;
+    mutable int amNumber = kNotLookedUp;
 };
 
 // The plain function through which a transport delivers events.

@@ -14,7 +14,7 @@ void LockLog(const char* asText) {
 
 }  // namespace
 
-ApplicationLockHolder::ApplicationLockHolder(const std::string& asName) : amName(asName) {
+ApplicationLockHolder::ApplicationLockHolder(std::string_view asName) {
     // The scoped entry exists only while its key is on: the handler takes a
     // holder for every command.
     if (nxbase::detail::ApplicationLockLogged()) {

@@ -45,16 +45,22 @@ std::string MessageBody(const std::string& asSender, const std::string& asComman
 
 std::string MessageFrame(const std::string& asSender, const std::string& asCommand,
                          const char* pEncodedData, std::size_t alSize) {
-    std::size_t length = asSender.size() + asCommand.size() + 2 + alSize;
     std::string frame;
-    frame.reserve(kFrameHeaderSize + length);
-    AppendLength(frame, static_cast<std::uint32_t>(length));
-    frame += asSender;
-    frame += '\0';
-    frame += asCommand;
-    frame += '\0';
-    frame.append(pEncodedData, alSize);
+    BuildMessageFrame(frame, asSender, asCommand, std::string_view(pEncodedData, alSize));
     return frame;
+}
+
+void BuildMessageFrame(std::string& asFrame, std::string_view asSender, std::string_view asCommand,
+                       std::string_view asEncodedData) {
+    std::size_t length = asSender.size() + asCommand.size() + 2 + asEncodedData.size();
+    asFrame.clear();
+    asFrame.reserve(kFrameHeaderSize + length);
+    AppendLength(asFrame, static_cast<std::uint32_t>(length));
+    asFrame += asSender;
+    asFrame += '\0';
+    asFrame += asCommand;
+    asFrame += '\0';
+    asFrame += asEncodedData;
 }
 
 bool FindMessageFields(const std::string& asBody, std::size_t& alFirst, std::size_t& alSecond) {

@@ -150,22 +150,22 @@ const char* MessageName(int alNumber) {
     return PO_BotschaftenNamen[alNumber];
 }
 
-int NumberOfCommandText(const std::string& asCommand) {
+int NumberOfCommandText(std::string_view asCommand) {
     int offset = 0;
-    std::string name = asCommand;
+    std::string_view name = asCommand;
     std::size_t bang = asCommand.find('!');
-    if (bang != std::string::npos && asCommand.compare(0, bang, "ANSWER") == 0) {
+    if (bang != std::string_view::npos && asCommand.substr(0, bang) == "ANSWER") {
         offset = kAnswerOffset;
         // Token 1: the text after the first "!" up to the next one.
         std::size_t end = asCommand.find('!', bang + 1);
         name = asCommand.substr(bang + 1,
-                                end == std::string::npos ? std::string::npos : end - bang - 1);
+                                end == std::string_view::npos ? std::string_view::npos : end - bang - 1);
     }
     // Every message passes here several times: a hash look-up, built once,
     // in place of comparing with 135 names. The names are unique, so the
     // first match of the table's order is the only one.
-    static const std::unordered_map<std::string, int> numbers = [] {
-        std::unordered_map<std::string, int> table;
+    static const std::unordered_map<std::string_view, int> numbers = [] {
+        std::unordered_map<std::string_view, int> table;
         for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n) table.emplace(PO_BotschaftenNamen[n], n);
         return table;
     }();
@@ -182,21 +182,26 @@ std::string CommandTextOfNumber(int alNumber) {
     return std::string();
 }
 
-std::string EncodeBytes(const char* pData, std::size_t alSize) {
-    std::string out;
-    out.reserve(alSize + alSize / 8 + 1);
+void AppendEncoded(std::string& asOut, const char* pData, std::size_t alSize) {
+    std::size_t specials = 0;
+    for (std::size_t i = 0; i < alSize; ++i) specials += static_cast<unsigned char>(pData[i]) <= 1;
+    std::size_t at = asOut.size();
+    asOut.resize(at + alSize + specials);
+    char* out = asOut.data() + at;
     for (std::size_t i = 0; i < alSize; ++i) {
         char c = pData[i];
-        if (c == '\x00') {
-            out += '\x01';
-            out += '\x0A';
-        } else if (c == '\x01') {
-            out += '\x01';
-            out += '\x01';
+        if (c == '\x00' || c == '\x01') {
+            *out++ = '\x01';
+            *out++ = c == '\x00' ? '\x0A' : '\x01';
         } else {
-            out += c;
+            *out++ = c;
         }
     }
+}
+
+std::string EncodeBytes(const char* pData, std::size_t alSize) {
+    std::string out;
+    AppendEncoded(out, pData, alSize);
     return out;
 }
 
@@ -225,7 +230,7 @@ namespace {
 void Replace(MyMemoryBlock& axBlock, const std::string& asBytes) {
     MyMemoryBlock replaced(static_cast<long>(asBytes.size()));
     replaced.Put(asBytes.data(), static_cast<long>(asBytes.size()));
-    axBlock = replaced;
+    axBlock = std::move(replaced);
 }
 
 }  // namespace

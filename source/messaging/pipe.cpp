@@ -32,13 +32,21 @@ namespace nxbase {
 
 namespace detail {
 
+// The loop's own executor type rather than the polymorphic default: every
+// read and write would otherwise go through a type-erased executor.
+using Executor = boost::asio::io_context::executor_type;
+using Socket = boost::asio::basic_stream_socket<boost::asio::local::stream_protocol, Executor>;
+using Acceptor = boost::asio::basic_socket_acceptor<boost::asio::local::stream_protocol, Executor>;
+using Timer = boost::asio::basic_waitable_timer<std::chrono::steady_clock,
+                                                boost::asio::wait_traits<std::chrono::steady_clock>, Executor>;
+
 // One connection to a peer, in both directions.
 struct Channel {
     enum class Stage { kAwaitingRequest, kAwaitingReply, kOpen };
     Channel(boost::asio::io_context& context, std::uint64_t alId)
-        : socket(context), timer(context), id(alId) {}
-    boost::asio::local::stream_protocol::socket socket;
-    boost::asio::steady_timer timer;  // the handshake's time limit
+        : socket(context.get_executor()), timer(context.get_executor()), id(alId) {}
+    Socket socket;
+    Timer timer;  // the handshake's time limit
     std::uint64_t id;
     Stage stage = Stage::kAwaitingRequest;
     std::string peer;  // the peer's application name, once known
@@ -55,7 +63,7 @@ struct Channel {
 
 namespace {
 
-using Socket = boost::asio::local::stream_protocol::socket;
+using detail::Socket;
 using Stage = detail::Channel::Stage;
 constexpr const char* kLogKey = "Communication";
 constexpr int kReadsPerTurn = 16;
@@ -118,9 +126,10 @@ using nxbase::FrameReader;
 using nxbase::StartsWith;
 
 struct Pipe::Listener {
-    explicit Listener(boost::asio::io_context& context) : acceptor(context), pause(context) {}
-    boost::asio::local::stream_protocol::acceptor acceptor;
-    boost::asio::steady_timer pause;  // after a failed accept
+    explicit Listener(boost::asio::io_context& context)
+        : acceptor(context.get_executor()), pause(context.get_executor()) {}
+    nxbase::detail::Acceptor acceptor;
+    nxbase::detail::Timer pause;  // after a failed accept
     std::chrono::milliseconds nextPause = nxbase::kFirstAcceptPause;
 };
 
@@ -487,9 +496,21 @@ bool Pipe::SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes,
 }
 
 bool Pipe::WriteMessage(const ChannelPtr& axChannel, const std::string& asCommand,
-                        const MyMemoryBlock& axEncodedData) {
-    return Write(axChannel, nxbase::MessageFrame(amOwnName, asCommand, axEncodedData.GetDatenZeiger(),
-                                                 static_cast<std::size_t>(axEncodedData.Len())));
+                        std::string_view asEncodedData) {
+    // Frames are built in storage kept from the last one. A send nested in
+    // this one (from a handler the write's failure runs) finds it taken and
+    // builds in its own; a large frame's storage is not kept.
+    std::string nested;
+    const bool outer = !amFrameInUse;
+    std::string& frame = outer ? amFrame : nested;
+    amFrameInUse = true;
+    nxbase::BuildMessageFrame(frame, amOwnName, asCommand, asEncodedData);
+    bool written = Write(axChannel, frame);
+    if (outer) {
+        amFrameInUse = false;
+        if (frame.capacity() > nxbase::kWriteBlockSize) std::string().swap(frame);
+    }
+    return written;
 }
 
 void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
@@ -662,27 +683,44 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() + "): " + why);
 }
 
+namespace {
+
+std::string_view BytesOf(const MyMemoryBlock& axBlock) {
+    return std::string_view(axBlock.GetDatenZeiger(), static_cast<std::size_t>(axBlock.Len()));
+}
+
+}  // namespace
+
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 const MyMemoryBlock& axEncodedData) {
+    return Send(asApp, asCommand, BytesOf(axEncodedData));
+}
+
+bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
+                         const MyMemoryBlock& axEncodedData) {
+    return SendOnChannel(alChannel, asCommand, BytesOf(axEncodedData));
+}
+
+bool Pipe::Send(const std::string& asApp, const std::string& asCommand, std::string_view asEncodedData) {
     NX_ASSERT(IsOwnThread());
     if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
     if (nxbase::detail::CommunicationLogged()) nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
-        return SendByDde(asApp, asCommand, axEncodedData) || Fail("DDE send to " + asApp + " failed");
+        return SendByDde(asApp, asCommand, asEncodedData) || Fail("DDE send to " + asApp + " failed");
     }
     std::optional<SendScope> own;
     if (pmScope == nullptr) own.emplace(this, nullptr);
     ChannelPtr channel = ChannelTo(asApp);
     bool byDde = false;
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
-    if (byDde) return SendByDde(asApp, asCommand, axEncodedData) || Fail("DDE send to " + asApp + " failed");
-    return WriteMessage(channel, asCommand, axEncodedData) ||
+    if (byDde) return SendByDde(asApp, asCommand, asEncodedData) || Fail("DDE send to " + asApp + " failed");
+    return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + asApp + " failed: " + channel->closedWhy);
 }
 
 bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
-                         const MyMemoryBlock& axEncodedData) {
+                         std::string_view asEncodedData) {
     NX_ASSERT(IsOwnThread());
     auto at = amAllChannels.find(alChannel);
     if (at == amAllChannels.end() || at->second->closed || at->second->stage != Stage::kOpen) {
@@ -692,16 +730,14 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
         nxbase::Log("Pipe::Send -> " + at->second->peer + " " + asCommand);
     }
     ChannelPtr channel = at->second;
-    return WriteMessage(channel, asCommand, axEncodedData) ||
+    return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + channel->peer + " failed: " + channel->closedWhy);
 }
 
 bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
-                     const MyMemoryBlock& axEncodedData) {
+                     std::string_view asEncodedData) {
     if (!pmDDE || !pmDDE->IsActive()) return false;
-    return pmDDE->Send(asApp, asCommand,
-                       std::string(axEncodedData.GetDatenZeiger(),
-                                   static_cast<std::size_t>(axEncodedData.Len())));
+    return pmDDE->Send(asApp, asCommand, std::string(asEncodedData));
 }
 
 bool Pipe::HasChannel(const std::string& asApp) const {

@@ -39,6 +39,34 @@ String Number(long alValue) {
     return String::CreateFromInt(alValue);
 }
 
+// A block's stuffed bytes, built in storage kept between messages. A send
+// nested in another (a handler run while a send waits) finds the storage
+// taken and uses its own.
+class StuffedData {
+  public:
+    StuffedData(std::string& asKept, bool& abKeptInUse, const MyMemoryBlock& axData)
+        : amInUse(abKeptInUse), amOuter(!abKeptInUse), amBytes(amOuter ? asKept : amNested) {
+        amInUse = true;
+        amBytes.clear();
+        nxbase::AppendEncoded(amBytes, axData.GetDatenZeiger(), static_cast<std::size_t>(axData.Len()));
+    }
+    ~StuffedData() {
+        if (!amOuter) return;
+        amInUse = false;
+        if (amBytes.capacity() > kKeptCapacity) std::string().swap(amBytes);
+    }
+    StuffedData(const StuffedData&) = delete;
+    StuffedData& operator=(const StuffedData&) = delete;
+    std::string_view Bytes() const { return amBytes; }
+
+  private:
+    static constexpr std::size_t kKeptCapacity = 4096;
+    bool& amInUse;
+    const bool amOuter;
+    std::string amNested;
+    std::string& amBytes;
+};
+
 String TextOr(const char* asGroup, unsigned long alIndex, const char* asFallback) {
     String text = Text::GetText(String(asGroup), alIndex);
     return text.IsEmpty() ? String(asFallback) : text;
@@ -110,7 +138,7 @@ bool PostOffice::IsLPMServer() const {
 }
 
 int PostOffice::NumberOfCommand(VELTRAEvent& axEvent) {
-    return nxbase::NumberOfCommandText(axEvent.GetCommand());
+    return axEvent.GetNumber();
 }
 
 void PostOffice::Encode(MyMemoryBlock& axBlock) {
@@ -338,7 +366,7 @@ void PostOffice::BotschaftenHandler() {
     // handler runs waits for the next tick. While a peer holds the lock its
     // commands are handled wherever they stand, so that it can finish its
     // conversation; the others keep their places until UNLOCK.
-    std::deque<VELTRAEvent> waiting;
+    std::vector<VELTRAEvent> waiting;  // no allocation while nobody waits
     for (std::size_t count = amCommandQueue.size(); count > 0 && !amCommandQueue.empty();
          --count) {
         VELTRAEvent event = std::move(amCommandQueue.front());
@@ -371,7 +399,7 @@ long PostOffice::DefaultHdl(void* pEvent) {
         NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number) + " not supported");
         status = nxbase::kNotSupported;
     }
-    MyMemoryBlock answer;
+    MyMemoryBlock answer(1);
     answer << status;
     if (!Answer(event, answer)) {
         UserInterface::Current()->InfoBox("Answer failed in PostOffice::DefaultHdl()!");
@@ -380,7 +408,7 @@ long PostOffice::DefaultHdl(void* pEvent) {
 }
 
 void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
-    MyMemoryBlock answer;
+    MyMemoryBlock answer(1);
     answer << axStatus;
     Answer(&axEvent, answer);
 }
@@ -389,17 +417,17 @@ void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
 
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     NX_COMM_LOG(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
-    String command = String(kAnswerPrefix) + String(pCommand->GetCommand());
-    if (pCommand->GetChannel() == 0) {
-        MyMemoryBlock copy = axData;
-        return Send(pCommand->GetSender(), command, copy);
-    }
+    const std::string command = kAnswerPrefix + pCommand->GetCommand();
+    if (pCommand->GetChannel() == 0) return SendCommand(pCommand->GetSender(), command, axData, {});
     if (!OnOwnThread("Answer")) return false;
-    MyMemoryBlock encoded = axData;
-    Encode(encoded);
     Pipe* pipe = Pipe::Instance();
-    if (pipe != nullptr && pipe->SendOnChannel(pCommand->GetChannel(), command.str(), encoded)) {
-        NX_COMM_LOG(String("Sent: ") + command);
+    bool sent = false;
+    if (pipe != nullptr) {
+        StuffedData encoded(amEncoded, amEncodedInUse, axData);
+        sent = pipe->SendOnChannel(pCommand->GetChannel(), command, encoded.Bytes());
+    }
+    if (sent) {
+        NX_COMM_LOG(String("Sent: ") + String(command));
         return true;
     }
     amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
@@ -424,26 +452,32 @@ unsigned char PostOffice::Send(const std::string& asApp, PO_Botschaften axMessag
 }
 
 bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
-                         const MyMemoryBlock& axEncoded) {
+                         std::string_view asEncoded) {
     Pipe* pipe = Pipe::Instance();
-    if (pipe != nullptr && pipe->Send(asApp, asCommand, axEncoded)) return true;
+    if (pipe != nullptr && pipe->Send(asApp, asCommand, asEncoded)) return true;
     amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
     return false;
 }
 
 unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
                                boost::function<bool()> fKeepTrying) {
-    if (!OnOwnThread("Send")) return false;
     std::string command = asCommand.str();
     if (asCommand.IsNumeric()) command = nxbase::CommandTextOfNumber(std::atoi(command.c_str()));
-    MyMemoryBlock encoded = axData;
-    Encode(encoded);
+    return SendCommand(asApp, command, axData, fKeepTrying);
+}
+
+unsigned char PostOffice::SendCommand(const std::string& asApp, const std::string& command,
+                                      const MyMemoryBlock& axData,
+                                      const boost::function<bool()>& fKeepTrying) {
+    if (!OnOwnThread("Send")) return false;
+    StuffedData encoded(amEncoded, amEncodedInUse, axData);
     // One start of the peer and one bounded wait for it, retries included.
+    // The function refers to the caller's, which outlives the scope.
     std::function<bool()> keepTrying;
-    if (fKeepTrying) keepTrying = [fKeepTrying] { return fKeepTrying(); };
-    Pipe::SendScope scope(Pipe::Instance(), keepTrying);
+    if (fKeepTrying) keepTrying = [&fKeepTrying] { return fKeepTrying(); };
+    Pipe::SendScope scope(Pipe::Instance(), std::move(keepTrying));
     for (int retries = 0;;) {
-        if (TryOnce(asApp, command, encoded)) {
+        if (TryOnce(asApp, command, encoded.Bytes())) {
             NX_COMM_LOG(String("Sent: ") + String(command));
             return true;
         }
@@ -485,11 +519,10 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     AwaitedAnswer& awaited = amAnswers[key];
     ++awaited.waiters;
     amLostPeers.erase(asApp);
-    String command = Number(alMessage);
     bool answered = false;
     // The caller's wish to stop waiting also ends the sending, which may
     // wait for a peer that was just started.
-    if (!Send(asApp, command, axSend, fKeepWaiting)) {
+    if (!SendCommand(asApp, nxbase::CommandTextOfNumber(alMessage), axSend, fKeepWaiting)) {
         NX_COMM_LOG("SendAndReceive, Send failed");
     } else {
         std::optional<AutoLog> waiting;
@@ -518,7 +551,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         NX_COMM_LOG(answered ? String("Answer received: ") + Number(alMessage)
                      : String("SendAndReceive, Abort"));
     }
-    if (--awaited.waiters == 0) amAnswers.erase(key);
+    --awaited.waiters;
     if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
     return answered;
 }

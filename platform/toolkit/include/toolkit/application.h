@@ -31,15 +31,13 @@ class NXBASE_EXPORT Link {
   public:
     Link() = default;
     template <class T>
-    Link(T* pObject, long (T::*pMember)(void*))
-        : call_([pObject, pMember](void* pData) { return (pObject->*pMember)(pData); }),
-          object_(pObject) {
+    Link(T* pObject, long (T::*pMember)(void*)) : call_(&Invoke<T>), object_(pObject) {
         static_assert(sizeof pMember <= sizeof member_, "member pointer too large");
         std::memcpy(member_.data(), &pMember, sizeof pMember);
     }
 
-    long Call(void* pData) const { return call_ ? call_(pData) : 0; }
-    bool IsSet() const { return static_cast<bool>(call_); }
+    long Call(void* pData) const { return call_ ? call_(*this, pData) : 0; }
+    bool IsSet() const { return call_ != nullptr; }
     explicit operator bool() const { return IsSet(); }
 
     friend bool operator==(const Link& a, const Link& b) {
@@ -48,8 +46,17 @@ class NXBASE_EXPORT Link {
     friend bool operator!=(const Link& a, const Link& b) { return !(a == b); }
 
   private:
-    std::function<long(void*)> call_;
-    const void* object_ = nullptr;
+    // The object and the member are kept as plain bytes, so that a link is
+    // copied without an allocation: handlers are copied for every message.
+    template <class T>
+    static long Invoke(const Link& axLink, void* pData) {
+        long (T::*member)(void*);
+        std::memcpy(&member, axLink.member_.data(), sizeof member);
+        return (static_cast<T*>(axLink.object_)->*member)(pData);
+    }
+
+    long (*call_)(const Link&, void*) = nullptr;
+    void* object_ = nullptr;
     std::array<unsigned char, 2 * sizeof(void*)> member_{};
 };
 
