@@ -5,11 +5,14 @@
 // - PostOffice::SendAndReceive to a post office answering with its default
 //   handler, against a raw ping-pong of the same request and answer frames;
 // - one message there and back through Pipe against the same raw ping-pong;
-// - the post office over D-Bus against over the sockets (TwoCpus).
+// - the post office over D-Bus against over the sockets (TwoCpus);
+// - the floor of any messaging on the loop: a bare asio ping-pong of the same
+//   frames (a read kept armed, run_one_for, no library code) against raw.
 // Each pair runs side by side in every one of five rounds; at the end the
 // program prints the ratio of each pair's times per round as min/median/max.
 // The peers are this program started again with "--peer MODE CPU".
 #include <benchmark/benchmark.h>
+#include <boost/asio/local/stream_protocol.hpp>
 
 #include <sched.h>
 #include <signal.h>
@@ -19,6 +22,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <chrono>
 #include <functional>
 #include <map>
@@ -249,6 +253,62 @@ void PipeRoundTrip(benchmark::State& state, Placement placement) {
     PinTo(-1);
 }
 
+// Both ends of the bare loop ping-pong: a read kept armed on a socket of the
+// loop, as the library's channels do, and a send of `answer` per frame read
+// on the answering side.
+struct LoopEnd {
+    explicit LoopEnd(int fd) : socket(context) {
+        socket.assign(boost::asio::local::stream_protocol(), fd);
+        socket.non_blocking(true);
+        Arm();
+    }
+    void Arm() {
+        socket.async_read_some(boost::asio::buffer(input), [this](const boost::system::error_code& error,
+                                                                  std::size_t) {
+            if (error) {
+                closed = true;
+                return;
+            }
+            ++received;
+            Arm();
+            if (!answer.empty()) ::send(socket.native_handle(), answer.data(), answer.size(), MSG_NOSIGNAL);
+        });
+    }
+    boost::asio::io_context context;
+    boost::asio::local::stream_protocol::socket socket;
+    std::array<char, 16 * 1024> input;
+    std::string answer;
+    long received = 0;
+    bool closed = false;
+};
+
+void LoopPingPong(benchmark::State& state, Placement placement) {
+    const std::string request = RequestFrame(), answer = DefaultAnswerFrame();
+    PinTo(0);
+    int sockets[2];
+    ::socketpair(AF_UNIX, SOCK_STREAM, 0, sockets);
+    pid_t child = ::fork();
+    if (child == 0) {
+        PinTo(PeerCpu(placement));
+        ::close(sockets[0]);
+        LoopEnd end(sockets[1]);
+        end.answer = answer;
+        while (!end.closed) end.context.run_one_for(std::chrono::milliseconds(100));
+        ::_exit(0);
+    }
+    ::close(sockets[1]);
+    {
+        LoopEnd end(sockets[0]);
+        for (auto _ : state) {
+            long before = end.received;
+            ::send(sockets[0], request.data(), request.size(), MSG_NOSIGNAL);
+            while (end.received == before) end.context.run_one_for(std::chrono::milliseconds(50));
+        }
+    }
+    ::waitpid(child, nullptr, 0);
+    PinTo(-1);
+}
+
 std::string EchoAnswerFrame() {
     std::string stuffed = nxbase::EncodeBytes(Payload().data(), Payload().size());
     return nxbase::EncodeFrame(nxbase::MessageBody(kPeerName, "ANSWER!GET_DEVICE_NAME", stuffed));
@@ -373,6 +433,7 @@ std::vector<Pair> Pairs() {
     return {
         {"SendAndReceive_vs_RawPingPong", PostOfficeRoundTrip, raw(DefaultAnswerFrame()), both},
         {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
+        {"BareLoopPingPong_vs_RawPingPong", LoopPingPong, raw(DefaultAnswerFrame()), both},
         {"SendAndReceiveOverDBus_vs_OverSockets", DdeRoundTrip, PostOfficeRoundTrip,
          {Placement::kTwoCpus}},
         {"ServerThroughput4Clients_vs_RawServer",

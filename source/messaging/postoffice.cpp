@@ -1,6 +1,7 @@
 #include "nxbase/postoffice.h"
 
 #include <boost/asio/post.hpp>
+#include <array>
 #include <cstdlib>
 #include <optional>
 #include <stdexcept>
@@ -66,6 +67,17 @@ class StuffedData {
     std::string amNested;
     std::string& amBytes;
 };
+
+// "ANSWER!" and the name of message `alNumber` (0..134), built once: every
+// answer needs one.
+const std::string& AnswerText(int alNumber) {
+    static const auto texts = [] {
+        std::array<std::string, ANZAHL_BOTSCHAFTEN> all;
+        for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n) all[n] = kAnswerPrefix + std::string(nxbase::MessageName(n));
+        return all;
+    }();
+    return texts[static_cast<std::size_t>(alNumber)];
+}
 
 String TextOr(const char* asGroup, unsigned long alIndex, const char* asFallback) {
     String text = Text::GetText(String(asGroup), alIndex);
@@ -417,7 +429,11 @@ void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
 
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     NX_COMM_LOG(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
-    const std::string command = kAnswerPrefix + pCommand->GetCommand();
+    std::string unlisted;
+    const int number = pCommand->GetNumber();
+    const std::string& command = number >= 0 && number < ANZAHL_BOTSCHAFTEN
+                                     ? AnswerText(number)
+                                     : (unlisted = kAnswerPrefix + pCommand->GetCommand());
     if (pCommand->GetChannel() == 0) return SendCommand(pCommand->GetSender(), command, axData, {});
     if (!OnOwnThread("Answer")) return false;
     Pipe* pipe = Pipe::Instance();
