@@ -38,17 +38,29 @@ void VectorisedLab(const float* w, const float* sums, const float* spectra, std:
     }
 }
 
-float StreamingSum(const float* data, std::size_t count) {
-    float lanes[16] = {};
+// 64 bytes per step in 16-lane sums, so that the loop is bound by reading,
+// each line fetched 64 spectra ahead as the batch kernel fetches them: on
+// these machines the hardware prefetcher alone leaves a fifth of the
+// bandwidth unused.
+template <class T>
+T SumOnce(const T* data, std::size_t count) {
+    constexpr int kLanes = 64 / sizeof(T);
+    constexpr std::size_t kAhead = 64 * 36;
+    T lanes[kLanes] = {};
     std::size_t i = 0;
-    for (; i + 16 <= count; i += 16) {
+    for (; i + kLanes <= count; i += kLanes) {
+        __builtin_prefetch(data + i + kAhead, 0, 3);
 #pragma omp simd
-        for (int l = 0; l < 16; ++l) lanes[l] += data[i + l];
+        for (int l = 0; l < kLanes; ++l) lanes[l] += data[i + l];
     }
-    float sum = 0.0f;
+    T sum = 0;
     for (; i < count; ++i) sum += data[i];
-    for (float v : lanes) sum += v;
+    for (T v : lanes) sum += v;
     return sum;
 }
+
+float StreamingSum(const float* data, std::size_t count) { return SumOnce(data, count); }
+
+double StreamingSum(const double* data, std::size_t count) { return SumOnce(data, count); }
 
 }  // namespace colorbench

@@ -10,6 +10,7 @@ namespace colorbench {
 void VectorisedLab(const float* w, const float* sums, const float* spectra, std::size_t count, float* lab);
 // Sum of `count` floats, read once: the memory-bandwidth yardstick.
 float StreamingSum(const float* data, std::size_t count);
+double StreamingSum(const double* data, std::size_t count);
 
 }  // namespace colorbench
 

@@ -1,16 +1,16 @@
-// Spectrum to CIELAB: the object path (LABVector), the batch path
-// (nxbase::ColorBatch) and, in the same process, two yardsticks: the plain
-// scalar loop a careful programmer writes first, and the same formula as a
-// loop written for the compiler to vectorise (color_baseline.cpp, -O3
-// -march=native -ffast-math with vector cbrtf), the fair peer of the
-// hand-vectorised batch. Cache-resident runs use 4096 spectra (576 KiB);
-// DRAM-resident runs use at least four times the last-level cache, measured
-// at run time, next to a streaming read of the same bytes (the memory
-// bandwidth bound). After the runs the program prints each rate as a ratio
-// to its same-run baseline.
+// Spectrum to CIELAB, each contender next to its baseline in interleaved
+// rounds of one program:
+// - cache-resident (4096 spectra, 576 KiB): the batch path (ColorBatch)
+//   against the same formula as a loop written for the compiler to vectorise
+//   (color_baseline.cpp, -O3 -march=native -ffast-math, vector cbrtf), its
+//   fair peer; that loop and the LABVector object path against the plain
+//   scalar loop a careful programmer writes first;
+// - DRAM-resident (a fixed size beyond any cache of these machines): the
+//   batch path against one read of the same bytes with the same software
+//   prefetch (the memory-bandwidth bound), for float and double spectra, on
+//   one thread and on two.
+// One-thread cases run pinned to CPU 0, two-thread cases on CPUs 0 and 1.
 #include <benchmark/benchmark.h>
-
-#include <unistd.h>
 
 #include <algorithm>
 #include <cmath>
@@ -18,19 +18,21 @@
 #include <cstdlib>
 #include <fstream>
 #include <map>
-#include <thread>
 #include <random>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "color_baseline.h"
+#include "interleaved.h"
 #include "nxbase/colorbatch.h"
 #include "nxbase/colorvector.h"
 
 namespace {
 
 constexpr int kSamples = 36;
-constexpr int kCacheSpectra = 4096;  // 576 KiB of spectra: cache-resident
+constexpr std::size_t kCacheSpectra = 4096;
+constexpr int kRounds = 5;
 
 // The last-level cache in bytes (32 MiB when the system does not say).
 // The kernel's figure first: in virtual machines sysconf may report the sum
@@ -48,40 +50,71 @@ std::size_t LastLevelCache() {
     return bytes > 0 ? static_cast<std::size_t>(bytes) : std::size_t{32} << 20;
 }
 
-// Spectra filling at least four times the last-level cache (and 1 million).
-int DramSpectra() {
-    const std::size_t bytes = 4 * LastLevelCache();
-    const std::size_t count = std::max<std::size_t>(1 << 20, bytes / (kSamples * sizeof(float)) + 1);
-    return static_cast<int>((count + 7) / 8 * 8);
+// 8 million spectra (1.15 GB as floats), or four times the last-level cache
+// when that is more: beyond any cache of these machines, and the same size
+// wherever the bench runs.
+std::size_t DramSpectra() {
+    const std::size_t fourCaches = 4 * LastLevelCache() / (kSamples * sizeof(float)) + 1;
+    return (std::max<std::size_t>(8000000, fourCaches) + 15) / 16 * 16;
 }
 
-std::vector<float> MakeSpectra(int count) {
-    std::vector<float> spectra(static_cast<std::size_t>(count) * kSamples);
+std::vector<float> MakeSpectra(std::size_t count) {
+    std::vector<float> spectra(count * kSamples);
     std::mt19937 random(7);
     std::uniform_real_distribution<float> unit(0.0f, 1.0f);
-    for (int s = 0; s < count; ++s) {
+    for (std::size_t s = 0; s < count; ++s) {
         float v = unit(random);
         for (int k = 0; k < kSamples; ++k) {
             v = std::clamp(v + (unit(random) - 0.5f) * 0.1f, 0.0f, 1.0f);
-            spectra[static_cast<std::size_t>(s) * kSamples + k] = v;
+            spectra[s * kSamples + k] = v;
         }
     }
     return spectra;
 }
 
-const std::vector<float>& Spectra(int count) {
-    static std::map<int, std::vector<float>> cache;
-    auto it = cache.find(count);
-    if (it == cache.end()) it = cache.emplace(count, MakeSpectra(count)).first;
+template <class T>
+const std::vector<T>& Spectra(std::size_t count) {
+    static std::map<std::size_t, std::vector<T>> made;
+    auto it = made.find(count);
+    if (it == made.end()) {
+        std::vector<float> floats = MakeSpectra(count);
+        it = made.emplace(count, std::vector<T>(floats.begin(), floats.end())).first;
+    }
     return it->second;
 }
 
+// Result arrays made and touched once, so that no run pays their page faults.
+float* Results(std::size_t count) {
+    static std::map<std::size_t, std::vector<float>> made;
+    auto it = made.find(count);
+    if (it == made.end()) it = made.emplace(count, std::vector<float>(3 * count, 0.0f)).first;
+    return it->second.data();
+}
+
+const nxbase::ColorBatch& Batch() {
+    static const nxbase::ColorBatch batch;
+    return batch;
+}
+
+// Runs body() per iteration with the spectra count as the item count, on
+// CPU 0 or, for two threads, on CPUs 0 and 1.
+template <class Body>
+void Timed(benchmark::State& state, std::size_t count, unsigned threads, Body body) {
+    nxbench::PinToCpus(0, static_cast<int>(threads));
+    for (auto _ : state) {
+        body();
+        benchmark::ClobberMemory();
+    }
+    state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * count));
+    nxbench::PinTo(-1);
+}
+
 // The yardstick: what a careful programmer writes first.
-void ScalarLab(const float* w, const float* sums, const float* spectra, int count, float* lab) {
+void ScalarLab(const float* w, const float* sums, const float* spectra, std::size_t count, float* lab) {
     const float xn = 100.0f * sums[0] / sums[1];
     const float zn = 100.0f * sums[2] / sums[1];
-    for (int s = 0; s < count; ++s) {
-        const float* r = spectra + static_cast<std::size_t>(s) * kSamples;
+    for (std::size_t s = 0; s < count; ++s) {
+        const float* r = spectra + s * kSamples;
         float x = 0.0f;
         float y = 0.0f;
         float z = 0.0f;
@@ -101,130 +134,68 @@ void ScalarLab(const float* w, const float* sums, const float* spectra, int coun
     }
 }
 
-void LabScalarLoop(benchmark::State& state) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& spectra = Spectra(count);
-    const nxbase::ColorBatch batch;
-    const nxbase::BatchWeights& w = batch.Weights();
-    std::vector<float> lab(3 * static_cast<std::size_t>(count));
-    for (auto _ : state) {
-        ScalarLab(&w.weights[0][0], w.sums, spectra.data(), count, lab.data());
-        benchmark::DoNotOptimize(lab.data());
-        benchmark::ClobberMemory();
-    }
-    state.SetItemsProcessed(state.iterations() * count);
+void ScalarLoop(benchmark::State& state) {
+    const float* spectra = Spectra<float>(kCacheSpectra).data();
+    const nxbase::BatchWeights& w = Batch().Weights();
+    float* lab = Results(kCacheSpectra);
+    Timed(state, kCacheSpectra, 1, [&] { ScalarLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab); });
 }
 
-void LabVectorisedLoop(benchmark::State& state) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& spectra = Spectra(count);
-    const nxbase::ColorBatch batch;
-    const nxbase::BatchWeights& w = batch.Weights();
-    std::vector<float> lab(3 * static_cast<std::size_t>(count));
-    for (auto _ : state) {
-        colorbench::VectorisedLab(&w.weights[0][0], w.sums, spectra.data(), count, lab.data());
-        benchmark::DoNotOptimize(lab.data());
-        benchmark::ClobberMemory();
-    }
-    state.SetItemsProcessed(state.iterations() * count);
+void VectorisedLoop(benchmark::State& state) {
+    const float* spectra = Spectra<float>(kCacheSpectra).data();
+    const nxbase::BatchWeights& w = Batch().Weights();
+    float* lab = Results(kCacheSpectra);
+    Timed(state, kCacheSpectra, 1,
+          [&] { colorbench::VectorisedLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab); });
 }
 
-void LabObjectPath(benchmark::State& state) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& values = Spectra(count);
+void ObjectPath(benchmark::State& state) {
+    const std::vector<float>& values = Spectra<float>(kCacheSpectra);
     std::vector<ReflectanceSpectrum> spectra;
-    spectra.reserve(count);
-    for (int s = 0; s < count; ++s) {
-        spectra.emplace_back(&values[static_cast<std::size_t>(s) * kSamples], PhysicalConditions());
-    }
-    for (auto _ : state) {
+    spectra.reserve(kCacheSpectra);
+    for (std::size_t s = 0; s < kCacheSpectra; ++s) spectra.emplace_back(&values[s * kSamples], PhysicalConditions());
+    Timed(state, kCacheSpectra, 1, [&] {
         for (const ReflectanceSpectrum& spectrum : spectra) {
             const LABVector lab(spectrum);
             benchmark::DoNotOptimize(lab.getV()[0]);
         }
-    }
-    state.SetItemsProcessed(state.iterations() * count);
+    });
 }
 
-void LabBatch(benchmark::State& state, unsigned threads) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& spectra = Spectra(count);
-    const nxbase::ColorBatch batch;
-    std::vector<float> lab(3 * static_cast<std::size_t>(count));
-    for (auto _ : state) {
+template <class T>
+void BatchLab(benchmark::State& state, std::size_t count, unsigned threads) {
+    const T* spectra = Spectra<T>(count).data();
+    float* lab = Results(count);
+    Timed(state, count, threads, [&] {
+        threads == 1 ? Batch().ToLab(spectra, count, lab) : Batch().ToLabParallel(spectra, count, lab, threads);
+    });
+}
+
+// One read of the spectra, split over the threads as the batch splits them.
+template <class T>
+void ReadOnce(benchmark::State& state, std::size_t count, unsigned threads) {
+    const std::vector<T>& spectra = Spectra<T>(count);
+    const std::size_t values = spectra.size();
+    Timed(state, count, threads, [&] {
+        double sums[2] = {};
         if (threads == 1) {
-            batch.ToLab(spectra.data(), count, lab.data());
+            sums[0] = colorbench::StreamingSum(spectra.data(), values);
         } else {
-            batch.ToLabParallel(spectra.data(), count, lab.data(), threads);
-        }
-        benchmark::DoNotOptimize(lab.data());
-        benchmark::ClobberMemory();
-    }
-    state.SetItemsProcessed(state.iterations() * count);
-}
-
-void XyzBatch(benchmark::State& state) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& spectra = Spectra(count);
-    const nxbase::ColorBatch batch;
-    std::vector<float> xyz(3 * static_cast<std::size_t>(count));
-    for (auto _ : state) {
-        batch.ToXYZ(spectra.data(), count, xyz.data());
-        benchmark::DoNotOptimize(xyz.data());
-        benchmark::ClobberMemory();
-    }
-    state.SetItemsProcessed(state.iterations() * count);
-}
-
-// Reading the spectra once, on one or two threads: the rate (in spectra per
-// second) that memory bandwidth allows.
-void ReadBandwidth(benchmark::State& state, unsigned threads) {
-    const int count = static_cast<int>(state.range(0));
-    const std::vector<float>& spectra = Spectra(count);
-    const std::size_t floats = spectra.size();
-    for (auto _ : state) {
-        float sums[2] = {};
-        if (threads == 1) {
-            sums[0] = colorbench::StreamingSum(spectra.data(), floats);
-        } else {
-            const std::size_t half = floats / 2;
-            std::thread other([&] { sums[1] = colorbench::StreamingSum(spectra.data() + half, floats - half); });
+            const std::size_t half = values / 2;
+            std::thread other([&] { sums[1] = colorbench::StreamingSum(spectra.data() + half, values - half); });
             sums[0] = colorbench::StreamingSum(spectra.data(), half);
             other.join();
         }
         benchmark::DoNotOptimize(sums);
-    }
-    state.SetItemsProcessed(state.iterations() * count);
+    });
 }
 
-// Keeps each run's rate for the summary (the last repetition's, or the
-// median when repetitions are aggregated).
-class RateReporter : public benchmark::ConsoleReporter {
-public:
-    void ReportRuns(const std::vector<Run>& runs) override {
-        for (const Run& run : runs) {
-            if (run.error_occurred) continue;
-            if (run.run_type == Run::RT_Aggregate && run.aggregate_name != "median") continue;
-            const auto it = run.counters.find("items_per_second");
-            if (it != run.counters.end()) amRates[run.run_name.function_name] = it->second.value;
-        }
-        ConsoleReporter::ReportRuns(runs);
-    }
-    double Rate(const std::string& asName) const {
-        const auto it = amRates.find(asName);
-        return it == amRates.end() ? 0.0 : it->second;
-    }
-
-private:
-    std::map<std::string, double> amRates;
-};
-
-void PrintRatio(const RateReporter& reporter, const char* what, const std::string& name,
-                const std::string& baseline) {
-    const double rate = reporter.Rate(name);
-    const double base = reporter.Rate(baseline);
-    if (rate <= 0.0 || base <= 0.0) return;
-    std::printf("%-58s %8.2f M/s  x%5.2f  %s\n", what, rate / 1e6, rate / base, baseline.c_str());
+template <class T>
+nxbench::Pair DramPair(const char* type, std::size_t count, unsigned threads) {
+    const std::string name = std::string("LabBatch_vs_ReadOnce_DramResident_") + type + "_" +
+                             (threads == 1 ? "OneThread" : "TwoThreads");
+    return {name, [=](benchmark::State& s) { ReadOnce<T>(s, count, threads); },
+            [=](benchmark::State& s) { BatchLab<T>(s, count, threads); }};
 }
 
 }  // namespace
@@ -232,39 +203,38 @@ void PrintRatio(const RateReporter& reporter, const char* what, const std::strin
 int main(int argc, char** argv) {
     benchmark::Initialize(&argc, argv);
     if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-    const int dram = DramSpectra();
-    using benchmark::RegisterBenchmark;
-    RegisterBenchmark("Lab_ScalarLoop_CacheResident", LabScalarLoop)->Arg(kCacheSpectra);
-    RegisterBenchmark("Lab_VectorisedLoop_CacheResident", LabVectorisedLoop)->Arg(kCacheSpectra);
-    RegisterBenchmark("Lab_ObjectPath_CacheResident", LabObjectPath)->Arg(kCacheSpectra);
-    RegisterBenchmark("Lab_Batch_CacheResident", LabBatch, 1u)->Arg(kCacheSpectra);
-    RegisterBenchmark("Xyz_Batch_CacheResident", XyzBatch)->Arg(kCacheSpectra);
-    RegisterBenchmark("Lab_VectorisedLoop_DramResident", LabVectorisedLoop)->Arg(dram)->UseRealTime();
-    RegisterBenchmark("Lab_Batch_DramResident", LabBatch, 1u)->Arg(dram)->UseRealTime();
-    RegisterBenchmark("Read_OneThread_DramResident", ReadBandwidth, 1u)->Arg(dram)->UseRealTime();
-    RegisterBenchmark("Lab_BatchTwoThreads_DramResident", LabBatch, 2u)->Arg(dram)->UseRealTime();
-    RegisterBenchmark("Read_TwoThreads_DramResident", ReadBandwidth, 2u)->Arg(dram)->UseRealTime();
-    RateReporter reporter;
+    const std::size_t dram = DramSpectra();
+    auto batchInCache = [](benchmark::State& s) { BatchLab<float>(s, kCacheSpectra, 1); };
+    const std::vector<nxbench::Pair> pairs = {
+        {"LabBatch_vs_VectorisedLoop_CacheResident", VectorisedLoop, batchInCache},
+        {"LabVectorisedLoop_vs_ScalarLoop_CacheResident", ScalarLoop, VectorisedLoop},
+        {"LabObjectPath_vs_ScalarLoop_CacheResident", ScalarLoop, ObjectPath},
+        DramPair<float>("float", dram, 1),
+        DramPair<float>("float", dram, 2),
+        DramPair<double>("double", dram, 1),
+        DramPair<double>("double", dram, 2),
+    };
+    std::printf("DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "
+                "MiB)\n",
+                dram, dram * 144.0 / (1 << 20), dram * 288.0 / (1 << 20), LastLevelCache() >> 20);
+    nxbench::WarnIfBusy(2);
+    // The arrays are made and read once before the rounds: the first pass
+    // over fresh memory runs at a fraction of the later ones.
+    benchmark::DoNotOptimize(colorbench::StreamingSum(Spectra<float>(dram).data(), dram * kSamples));
+    benchmark::DoNotOptimize(colorbench::StreamingSum(Spectra<double>(dram).data(), dram * kSamples));
+    Batch().ToLab(Spectra<float>(dram).data(), dram, Results(dram));
+    nxbench::RegisterRounds(pairs, kRounds);
+    nxbench::RoundReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf("\nSpectrum to Lab: rates and ratios to same-run baselines (DRAM-resident: %d spectra, "
-                "%.0f MiB; last-level cache %zu MiB)\n",
-                dram, dram * 144.0 / (1 << 20), LastLevelCache() >> 20);
-    PrintRatio(reporter, "vectorised plain loop, cache-resident", "Lab_VectorisedLoop_CacheResident",
-               "Lab_ScalarLoop_CacheResident");
-    PrintRatio(reporter, "LABVector object path, cache-resident", "Lab_ObjectPath_CacheResident",
-               "Lab_ScalarLoop_CacheResident");
-    PrintRatio(reporter, "ColorBatch::ToLab, cache-resident", "Lab_Batch_CacheResident",
-               "Lab_VectorisedLoop_CacheResident");
-    PrintRatio(reporter, "ColorBatch::ToXYZ, cache-resident", "Xyz_Batch_CacheResident",
-               "Lab_Batch_CacheResident");
-    PrintRatio(reporter, "ColorBatch::ToLab, DRAM-resident", "Lab_Batch_DramResident",
-               "Lab_VectorisedLoop_DramResident");
-    PrintRatio(reporter, "ColorBatch::ToLab, DRAM-resident, of the bandwidth bound", "Lab_Batch_DramResident",
-               "Read_OneThread_DramResident");
-    PrintRatio(reporter, "ColorBatch::ToLabParallel(2), DRAM-resident", "Lab_BatchTwoThreads_DramResident",
-               "Lab_Batch_DramResident");
-    PrintRatio(reporter, "ColorBatch::ToLabParallel(2), of the two-thread bound",
-               "Lab_BatchTwoThreads_DramResident", "Read_TwoThreads_DramResident");
+    std::printf("\nRatios of spectra per second, contender / baseline, min / median / max over %d interleaved "
+                "rounds; one-thread cases on CPU 0, two-thread cases on CPUs 0 and 1 (one thread each):\n",
+                kRounds);
+    nxbench::PrintPairs(reporter, pairs, kRounds);
+    for (int type = 0; type < 2; ++type) {
+        nxbench::PrintSpread(std::string("LabBatch_TwoThreads_vs_OneThread_DramResident_") +
+                                 (type ? "double" : "float"),
+                             nxbench::ContenderRatios(reporter, pairs[4 + 2 * type], pairs[3 + 2 * type], kRounds));
+    }
     benchmark::Shutdown();
     return 0;
 }

@@ -71,17 +71,7 @@ int PeerCpu(Placement placement) {
     return placement == Placement::kSameCpu ? 0 : placement == Placement::kTwoCpus ? 1 : -1;
 }
 
-// Pins the calling process to `cpu`, or lets it run anywhere for -1.
-void PinTo(int cpu) {
-    cpu_set_t set;
-    CPU_ZERO(&set);
-    if (cpu >= 0) {
-        CPU_SET(cpu, &set);
-    } else {
-        for (int any = 0; any < CPU_SETSIZE; ++any) CPU_SET(any, &set);
-    }
-    sched_setaffinity(0, sizeof set, &set);
-}
+using nxbench::PinTo;
 
 // Blocking exact read; false at end of file.
 bool ReadExactly(int fd, char* buffer, std::size_t size) {

@@ -39,9 +39,8 @@ std::string ShapeText(const py::array& array) {
     return text + (array.ndim() == 1 ? ",)" : ")");
 }
 
-// The argument as a C-contiguous float32 array whose last axis has `size`
-// entries (copied only when it is not one already).
-FloatArray AsFloatRows(const py::handle& object, py::ssize_t size, const char* what) {
+// The argument as an array of numbers whose last axis has `size` entries.
+py::array CheckedRows(const py::handle& object, py::ssize_t size, const char* what) {
     py::array any = py::array::ensure(object);
     if (!any) throw py::value_error(std::string(what) + " must be an array of numbers");
     if (any.dtype().kind() != 'f' && any.dtype().kind() != 'i' && any.dtype().kind() != 'u') {
@@ -52,7 +51,47 @@ FloatArray AsFloatRows(const py::handle& object, py::ssize_t size, const char* w
         throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) + "), got " +
                               ShapeText(any));
     }
-    return FloatArray::ensure(any);
+    return any;
+}
+
+// The argument as a C-contiguous float32 array whose last axis has `size`
+// entries (copied only when it is not one already).
+FloatArray AsFloatRows(const py::handle& object, py::ssize_t size, const char* what) {
+    return FloatArray::ensure(CheckedRows(object, size, what));
+}
+
+// Spectra of 36 values as the batch reads them: contiguous float32 or
+// float64 as given (the batch rounds doubles as it reads them), anything
+// else copied once into float32.
+struct SpectraRows {
+    py::array array;  // holds the data
+    const float* floats = nullptr;
+    const double* doubles = nullptr;
+    std::size_t count = 0;
+};
+
+SpectraRows AsSpectraRows(const py::handle& object) {
+    SpectraRows rows;
+    py::array any = CheckedRows(object, kBands, "spectra");
+    if (py::isinstance<py::array_t<double, py::array::c_style>>(any)) {
+        rows.array = any;
+        rows.doubles = static_cast<const double*>(any.data());
+    } else {
+        const FloatArray floats = FloatArray::ensure(any);
+        rows.array = floats;
+        rows.floats = floats.data();
+    }
+    rows.count = static_cast<std::size_t>(rows.array.size() / kBands);
+    return rows;
+}
+
+// threads=: None for the default (all cores for large arrays), else at
+// least 1; 1 runs on the calling thread.
+unsigned ThreadCount(const py::object& threads) {
+    if (threads.is_none()) return 0;
+    const long count = threads.cast<long>();
+    if (count < 1) throw py::value_error("threads must be at least 1, got " + std::to_string(count));
+    return static_cast<unsigned>(std::min<long>(count, 1024));
 }
 
 DoubleArray AsDoubleRows(const py::handle& object, py::ssize_t size, const char* what) {
@@ -173,7 +212,8 @@ std::vector<double> GridOf(const py::object& wavelengths) {
 }
 
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths, const py::object& progress);
+                             const py::object& observer, const py::object& wavelengths, const py::object& progress,
+                             const py::object& threads = py::none());
 
 // Spectra on their own grid: summed at its interval when it is finer than
 // 10 nm, else brought onto the 36 points first.
@@ -210,26 +250,31 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
 }
 
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths, const py::object& progress) {
+                             const py::object& observer, const py::object& wavelengths, const py::object& progress,
+                             const py::object& threadsWanted) {
+    const unsigned threads = ThreadCount(threadsWanted);
     if (!wavelengths.is_none()) {
         return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths), progress);
     }
-    const FloatArray input = AsFloatRows(spectra, kBands, "spectra");
+    const SpectraRows input = AsSpectraRows(spectra);
     const auto batch = BatchFor(illuminant, observer);
-    py::array_t<float> result(ResultShape(input, 3));
-    const std::size_t count = static_cast<std::size_t>(input.size() / kBands);
-    const float* in = input.data();
+    py::array_t<float> result(ResultShape(input.array, 3));
+    const std::size_t count = input.count;
     float* out = result.mutable_data();
-    RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
-        const float* from = in + begin * kBands;
+    const auto convert = [&](const auto* in, std::size_t begin, std::size_t end) {
+        const auto* from = in + begin * kBands;
         float* to = out + 3 * begin;
         const std::size_t n = end - begin;
-        const bool parallel = n >= kParallelFrom;
-        if (quantity == Quantity::kXYZ) {
-            parallel ? batch->ToXYZParallel(from, n, to) : batch->ToXYZ(from, n, to);
+        const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
+        if (parts == 1) {
+            quantity == Quantity::kXYZ ? batch->ToXYZ(from, n, to) : batch->ToLab(from, n, to);
         } else {
-            parallel ? batch->ToLabParallel(from, n, to) : batch->ToLab(from, n, to);
+            quantity == Quantity::kXYZ ? batch->ToXYZParallel(from, n, to, parts)
+                                       : batch->ToLabParallel(from, n, to, parts);
         }
+    };
+    RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
+        input.doubles ? convert(input.doubles, begin, end) : convert(input.floats, begin, end);
     });
     long implausible = -1;
     {
@@ -246,8 +291,8 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
 }
 
 py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer,
-                                const py::object& progress) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress);
+                                const py::object& progress, const py::object& threads) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
     const MeasuringCondition condition = Condition(illuminant, observer);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
@@ -261,8 +306,8 @@ py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& il
 }
 
 py::array_t<float> SpectraToDin99(const py::object& spectra, const std::string& illuminant,
-                                  const py::object& observer, const py::object& progress) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress);
+                                  const py::object& observer, const py::object& progress, const py::object& threads) {
+    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
     py::gil_scoped_release unlocked;
@@ -483,12 +528,14 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool
 
 const char kSpectraDoc[] =
     "spectra: reflectance factors (white = 1) of shape (..., 36), 380..730 nm in 10 nm steps; "
-    "float32 or float64 (float64 is rounded to float32 first, as the batch path works in single "
-    "precision), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
+    "float32 or float64 (float64 is rounded to float32 as it is read, as the batch path works in single "
+    "precision; contiguous float32 and float64 are not copied), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
     "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
     "of shape (..., 3). A spectrum whose Y would exceed twice the white (percentages, most likely) "
     "raises ValueError. progress: a call-back taking the fraction done (0..1], called every 262144 "
-    "spectra and at the end (for tqdm: lambda f: bar.update(...)); the GIL is released between calls. ";
+    "spectra and at the end (for tqdm: lambda f: bar.update(...)); the GIL is released between calls. "
+    "threads: None (all cores from 65536 spectra on, else the calling thread) or a count; 1 runs on the "
+    "calling thread. ";
 
 const char kGridDoc[] =
     "wavelengths: the spectra's own grid (shape (N,), spectra (..., N)) instead of the 36 points: a "
@@ -511,25 +558,24 @@ void RegisterColour(py::module_& m) {
     m.attr("SpectralScaleWarning") = py::handle(gScaleWarning);
     m.def(
         "spectra_to_XYZ",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p) {
-            return SpectraTo(Quantity::kXYZ, s, i, o, w, p);
-        },
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p,
+           const py::object& t) { return SpectraTo(Quantity::kXYZ, s, i, o, w, p, t); },
         py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
-        py::arg("progress") = py::none(),
+        py::arg("progress") = py::none(), py::arg("threads") = py::none(),
         (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc + kGridDoc).c_str());
     m.def(
         "spectra_to_Lab",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p) {
-            return SpectraTo(Quantity::kLab, s, i, o, w, p);
-        },
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p,
+           const py::object& t) { return SpectraTo(Quantity::kLab, s, i, o, w, p, t); },
         py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
-        py::arg("progress") = py::none(),
+        py::arg("progress") = py::none(), py::arg("threads") = py::none(),
         (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc + kGridDoc).c_str());
     m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
-          py::arg("progress") = py::none(),
+          py::arg("progress") = py::none(), py::arg("threads") = py::none(),
           (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
-          py::arg("observer") = two, py::arg("progress") = py::none(), (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
+          py::arg("observer") = two, py::arg("progress") = py::none(), py::arg("threads") = py::none(),
+          (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
     m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status E",
           "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status A\", \"Status E\", "
           "\"Status M\", \"Status T\" or an installed standard; \"Status E\" by default, as everywhere in NxBase. NaN "

@@ -68,6 +68,21 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
         for (int i = 0; i < 3; ++i)
             ASSERT_NEAR(b[i], object[i], kBatchRelative * scale) << "spectrum " << s << " Lab " << i;
     }
+    // Doubles (here with bits below float resolution) are rounded to float as
+    // they are read: the same results as from a float copy, including the
+    // tail after the last block of sixteen.
+    std::vector<double> doubles(spectra.begin(), spectra.end());
+    for (std::size_t i = 0; i < doubles.size(); ++i) doubles[i] += 3e-9 * static_cast<double>(i % 11);
+    const std::vector<float> floatCopy(doubles.begin(), doubles.end());
+    for (const bool labs : {true, false}) {
+        std::vector<float> fromDoubles(3 * count);
+        std::vector<float> fromCopy(3 * count);
+        labs ? batch.ToLab(doubles.data(), count, fromDoubles.data())
+             : batch.ToXYZ(doubles.data(), count, fromDoubles.data());
+        labs ? batch.ToLab(floatCopy.data(), count, fromCopy.data())
+             : batch.ToXYZ(floatCopy.data(), count, fromCopy.data());
+        EXPECT_EQ(fromDoubles, fromCopy) << (labs ? "Lab" : "XYZ");
+    }
     const CMetryFilter filter(Lichtart(condition.GetIllum()), Observer(condition.GetObserver()));
     for (std::size_t s = 0; s < count; ++s) {
         const XYZVector object(filter, ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));
@@ -122,6 +137,12 @@ TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
     batch.ToXYZ(spectra.data(), count, xyz.data());
     batch.ToXYZParallel(spectra.data(), count, xyzParallel.data(), 2);
     EXPECT_EQ(xyz, xyzParallel);
+    const std::vector<double> doubles(spectra.begin(), spectra.end());
+    batch.ToXYZParallel(doubles.data(), count, xyzParallel.data(), 3);
+    EXPECT_EQ(xyz, xyzParallel);
+    std::vector<float> labFromDoubles(3 * count);
+    batch.ToLabParallel(doubles.data(), count, labFromDoubles.data(), 2);
+    EXPECT_TRUE(std::equal(serial.begin(), serial.end(), labFromDoubles.begin()));
 }
 
 TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {

@@ -69,6 +69,12 @@ public:
     // does not apply here. pSpectra and pLab must not overlap.
     void ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const;
 
+    // As above for spectra held as doubles: each value is rounded to float
+    // as it is read, so the results equal those of a float copy of the array
+    // without making one.
+    void ToXYZ(const double* pSpectra, std::size_t alCount, float* pXYZ) const;
+    void ToLab(const double* pSpectra, std::size_t alCount, float* pLab) const;
+
     // As ToXYZ and ToLab, with the array split over alThreads threads (0: one
     // per core); the calling thread takes one part. Results are identical to
     // the one-thread forms. Small counts, or threads that cannot be started,
@@ -76,6 +82,10 @@ public:
     void ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
                        unsigned alThreads = 0) const;
     void ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
+                       unsigned alThreads = 0) const;
+    void ToXYZParallel(const double* pSpectra, std::size_t alCount, float* pXYZ,
+                       unsigned alThreads = 0) const;
+    void ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
                        unsigned alThreads = 0) const;
 
     // White point Xn, Yn (= 100), Zn of the weights.

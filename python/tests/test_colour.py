@@ -1,5 +1,6 @@
 """Colour functions: shapes, dtypes, exactness against the C++ paths, errors."""
 import subprocess
+import tracemalloc
 import warnings
 
 import numpy as np
@@ -43,6 +44,25 @@ def test_large_arrays_take_the_parallel_path_with_identical_results(chart):
     lab = nxbase.spectra_to_Lab(many)
     np.testing.assert_array_equal(lab[-24:], nxbase.spectra_to_Lab(chart))
     np.testing.assert_array_equal(nxbase.spectra_to_XYZ(many)[:24], nxbase.spectra_to_XYZ(chart))
+    # Any thread count gives the same numbers; 1 runs on the calling thread.
+    for threads in (1, 2, 3):
+        np.testing.assert_array_equal(nxbase.spectra_to_Lab(many, threads=threads), lab)
+    np.testing.assert_array_equal(nxbase.spectra_to_LCh(many, threads=1), nxbase.spectra_to_LCh(many))
+    with pytest.raises(ValueError, match="threads must be at least 1"):
+        nxbase.spectra_to_Lab(chart, threads=0)
+    # Contiguous float64 is read in place: the same numbers, and no copy of
+    # the input (the peak grows by the result only, not by 17 MB of float32).
+    wide = many.astype(np.float64)
+    tracemalloc.start()
+    try:
+        tracemalloc.reset_peak()
+        before = tracemalloc.get_traced_memory()[0]
+        lab64 = nxbase.spectra_to_Lab(wide, threads=2)
+        peak = tracemalloc.get_traced_memory()[1] - before
+    finally:
+        tracemalloc.stop()
+    np.testing.assert_array_equal(lab64, lab)
+    assert peak < 2 * lab64.nbytes, peak
 
 
 def test_values_agree_with_nxcolor(chart):
