@@ -1,24 +1,43 @@
 #!/usr/bin/env python3
-"""spectra_to_Lab of one million spectra: the NxBase module against NumPy's own
-fastest way of doing the same job in the same process (the weights as a
-(36, 3) float32 matrix, one matrix product, the CIELAB formula in NumPy).
-Both work on the same float32 array (144 MB, larger than any cache); the
-module splits the work over the cores as it does for large arrays, NumPy's
-matrix product uses its BLAS threads. Prints min/median/max of each and the
-ratio of the medians.
+"""spectra_to_Lab of one million float32 spectra (144 MB, larger than any
+cache): the NxBase module against NumPy doing the same job (the weights as a
+(36, 3) matrix, one matrix product, the CIELAB formula in NumPy), thread for
+thread, NumPy's BLAS held to one thread per calling thread. NumPy runs in two
+forms: on the whole array in one go, and in slices of 32 768 spectra whose
+temporaries stay in the cache (its fastest form here, several times faster).
 
-    PYTHONPATH=build/default/python python3 bench/python_bench.py [RUNS]
+- one thread each: the process pinned to CPU 0, the module with threads=1;
+- two threads each: the process on CPUs 0 and 1, the module with threads=2,
+  NumPy (sliced) on two Python threads that each take half of the array
+  (NumPy releases the GIL in the product and the ufuncs); and the module's
+  two threads against its one in the same rounds, the one thread pinned to
+  CPU 0 as in the one-thread case and free on both CPUs (where it runs on
+  the faster one: the CPUs of a virtual machine need not be equally fast).
+
+Each round runs the contenders back to back, the side that goes first
+alternating, each for about a quarter of a second (repeated calls, as a
+single call of a few milliseconds is at the mercy of the scheduler); prints
+min / median / max over the rounds of each rate and of the per-round ratios.
+
+    PYTHONPATH=build/default/python python3 bench/python_bench.py [ROUNDS]
 """
-import statistics
-import sys
-import time
+import os
 
-import numpy as np
+# BLAS libraries read these when they load, so before NumPy is imported.
+for _variable in ("OPENBLAS_NUM_THREADS", "OMP_NUM_THREADS", "MKL_NUM_THREADS", "BLIS_NUM_THREADS"):
+    os.environ[_variable] = "1"
 
-import nxbase
+import statistics  # noqa: E402
+import sys  # noqa: E402
+import time  # noqa: E402
+from concurrent.futures import ThreadPoolExecutor  # noqa: E402
+
+import numpy as np  # noqa: E402
+
+import nxbase  # noqa: E402
 
 COUNT = 1_000_000
-RUNS = int(sys.argv[1]) if len(sys.argv) > 1 else 7
+ROUNDS = max(7, int(sys.argv[1]) if len(sys.argv) > 1 else 7)
 
 
 def numpy_lab(spectra, weights, white):
@@ -32,10 +51,71 @@ def numpy_lab(spectra, weights, white):
     return lab
 
 
-def timed(function, *args):
+SLICE = 32768
+
+
+def numpy_lab_sliced(spectra, weights, white, out):
+    for first in range(0, len(spectra), SLICE):
+        out[first:first + SLICE] = numpy_lab(spectra[first:first + SLICE], weights, white)
+    return out
+
+
+def numpy_lab_on_two_threads(pool, spectra, weights, white, out):
+    half = len(spectra) // 2
+    halves = ((spectra[:half], out[:half]), (spectra[half:], out[half:]))
+    list(pool.map(lambda part: numpy_lab_sliced(part[0], weights, white, part[1]), halves))
+    return out
+
+
+SAMPLE_SECONDS = 0.25
+
+
+def on_cpu0(function):
+    """Runs function with the calling thread on CPU 0, then back on 0 and 1."""
+    os.sched_setaffinity(0, {0})
+    try:
+        return function()
+    finally:
+        os.sched_setaffinity(0, {0, 1})
+
+
+def seconds(function, repeats):
+    """Seconds per call over `repeats` calls."""
     start = time.perf_counter()
-    result = function(*args)
-    return time.perf_counter() - start, result
+    for _ in range(repeats):
+        function()
+    return (time.perf_counter() - start) / repeats
+
+
+def repeats_for(function):
+    """Calls that take about SAMPLE_SECONDS (one untimed call first: page
+    faults of fresh arrays and thread start-up are not what is compared)."""
+    function()
+    return max(1, round(SAMPLE_SECONDS / seconds(function, 3)))
+
+
+def spread(values):
+    return f"{min(values):6.2f} / {statistics.median(values):6.2f} / {max(values):6.2f}"
+
+
+def run_rounds(contenders):
+    """Times each contender once per round, the starting one rotating."""
+    times = {name: [] for name, _ in contenders}
+    repeats = {name: repeats_for(function) for name, function in contenders}
+    for round_number in range(ROUNDS):
+        shift = round_number % len(contenders)
+        for name, function in contenders[shift:] + contenders[:shift]:
+            times[name].append(seconds(function, repeats[name]))
+    return times
+
+
+def report(title, times, ratios):
+    print(title)
+    for name, values in times.items():
+        print(f"  {name:36s} M spectra/s  min / median / max {spread([COUNT / t / 1e6 for t in values])}")
+    for label, (faster, slower) in ratios.items():
+        per_round = [s / f for f, s in zip(times[faster], times[slower])]
+        print(f"  {label:36s} ratio       min / median / max {spread(per_round)}")
 
 
 def main():
@@ -46,24 +126,39 @@ def main():
     # The same weights as the module's: XYZ of the 36 unit spectra.
     weights = nxbase.spectra_to_XYZ(np.eye(36, dtype=np.float32))
     white = nxbase.spectra_to_XYZ(np.ones(36, dtype=np.float32))
-    # One untimed run of each first: page faults of fresh result arrays and
-    # thread start-up are not what is compared.
-    nxbase.spectra_to_Lab(spectra)
-    numpy_lab(spectra, weights, white)
-    ours, theirs = [], []
-    for _ in range(RUNS):
-        seconds, lab = timed(nxbase.spectra_to_Lab, spectra)
-        ours.append(seconds)
-        seconds, reference = timed(numpy_lab, spectra, weights, white)
-        theirs.append(seconds)
-    worst = float(np.max(np.abs(lab - reference)))
-    for name, times in (("nxbase.spectra_to_Lab", ours), ("NumPy matmul + Lab", theirs)):
-        rates = [COUNT / t / 1e6 for t in times]
-        print(f"{name:24s} M spectra/s  min {min(rates):7.1f}  median {statistics.median(rates):7.1f}  "
-              f"max {max(rates):7.1f}")
-    ratios = sorted(t / o for t, o in zip(theirs, ours))
-    print(f"speed-up over NumPy (per run): min {ratios[0]:.2f}  median {statistics.median(ratios):.2f}  "
-          f"max {ratios[-1]:.2f}; largest Lab difference {worst:.2e}")
+    worst = float(np.max(np.abs(nxbase.spectra_to_Lab(spectra) - numpy_lab(spectra, weights, white))))
+    print(f"{COUNT} float32 spectra, {ROUNDS} rounds; largest Lab difference between the two {worst:.2e}; "
+          f"NumPy {np.__version__}, BLAS held to one thread per calling thread")
+
+    out = np.empty((COUNT, 3), dtype=np.float32)
+    sliced = numpy_lab_sliced(spectra, weights, white, out)
+    assert np.array_equal(sliced, numpy_lab(spectra, weights, white))
+
+    os.sched_setaffinity(0, {0})
+    one = run_rounds([
+        ("nxbase threads=1", lambda: nxbase.spectra_to_Lab(spectra, threads=1)),
+        ("NumPy whole array", lambda: numpy_lab(spectra, weights, white)),
+        ("NumPy sliced", lambda: numpy_lab_sliced(spectra, weights, white, out)),
+    ])
+    report("One thread each, pinned to CPU 0:", one,
+           {"nxbase over NumPy whole array": ("nxbase threads=1", "NumPy whole array"),
+            "nxbase over NumPy sliced": ("nxbase threads=1", "NumPy sliced")})
+
+    if len(os.sched_getaffinity(0) | set(range(os.cpu_count() or 1))) < 2:
+        print("Two threads each: skipped, one CPU")
+        return
+    os.sched_setaffinity(0, {0, 1})
+    with ThreadPoolExecutor(2) as pool:
+        two = run_rounds([
+            ("nxbase threads=2", lambda: nxbase.spectra_to_Lab(spectra, threads=2)),
+            ("NumPy sliced, two threads", lambda: numpy_lab_on_two_threads(pool, spectra, weights, white, out)),
+            ("nxbase threads=1 on CPU 0", lambda: on_cpu0(lambda: nxbase.spectra_to_Lab(spectra, threads=1))),
+            ("nxbase threads=1 free", lambda: nxbase.spectra_to_Lab(spectra, threads=1)),
+        ])
+    report("Two threads each, on CPUs 0 and 1:", two,
+           {"nxbase over NumPy sliced": ("nxbase threads=2", "NumPy sliced, two threads"),
+            "nxbase two threads over one on CPU 0": ("nxbase threads=2", "nxbase threads=1 on CPU 0"),
+            "nxbase two threads over one free": ("nxbase threads=2", "nxbase threads=1 free")})
 
 
 if __name__ == "__main__":

@@ -1,5 +1,6 @@
 // Colour functions over NumPy arrays, on the library's batch path.
 #include <algorithm>
+#include <atomic>
 #include <cctype>
 #include <cmath>
 #include <map>
@@ -20,13 +21,16 @@
 #include "nxbase/meascond.h"
 #include "nxbase/resample.h"
 #include "nxbase/spectrafile.h"
+#include "nxbase/thread.h"
 
 namespace nxpy {
 namespace {
 
 constexpr py::ssize_t kBands = 36;
-// From this many spectra on the work is split over the cores.
+// From this many spectra on the work is split over the cores, in parts of at
+// least kMinPerThread (a thread costs about as much as that many spectra).
 constexpr std::size_t kParallelFrom = 1 << 16;
+constexpr std::size_t kMinPerThread = 16384;
 
 using FloatArray = py::array_t<float, py::array::c_style | py::array::forcecast>;
 using DoubleArray = py::array_t<double, py::array::c_style | py::array::forcecast>;
@@ -261,29 +265,28 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
     py::array_t<float> result(ResultShape(input.array, 3));
     const std::size_t count = input.count;
     float* out = result.mutable_data();
-    const auto convert = [&](const auto* in, std::size_t begin, std::size_t end) {
-        const auto* from = in + begin * kBands;
-        float* to = out + 3 * begin;
-        const std::size_t n = end - begin;
-        const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
-        if (parts == 1) {
-            quantity == Quantity::kXYZ ? batch->ToXYZ(from, n, to) : batch->ToLab(from, n, to);
-        } else {
-            quantity == Quantity::kXYZ ? batch->ToXYZParallel(from, n, to, parts)
-                                       : batch->ToLabParallel(from, n, to, parts);
+    // Each part is converted and checked by the thread that wrote it, while
+    // its results are still in that core's cache.
+    std::atomic<long> implausible{-1};
+    const auto convert = [&](const auto* in, std::size_t first, std::size_t n) {
+        float* to = out + 3 * first;
+        quantity == Quantity::kXYZ ? batch->ToXYZ(in + first * kBands, n, to) : batch->ToLab(in + first * kBands, n, to);
+        const long bad = FirstImplausible(to, n, quantity);
+        long seen = implausible.load();
+        while (bad >= 0 && (seen < 0 || seen > static_cast<long>(first) + bad) &&
+               !implausible.compare_exchange_weak(seen, static_cast<long>(first) + bad)) {
         }
     };
     RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
-        input.doubles ? convert(input.doubles, begin, end) : convert(input.floats, begin, end);
+        const std::size_t n = end - begin;
+        const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
+        nxbase::RunInParts(n, parts, kMinPerThread, 16, [&](std::size_t first, std::size_t count) {
+            input.doubles ? convert(input.doubles, begin + first, count) : convert(input.floats, begin + first, count);
+        });
     });
-    long implausible = -1;
-    {
-        py::gil_scoped_release unlocked;
-        implausible = FirstImplausible(out, count, quantity);
-    }
     if (implausible >= 0) {
         const float* v = out + 3 * implausible;
-        throw py::value_error("spectrum " + std::to_string(implausible) + " gives " +
+        throw py::value_error("spectrum " + std::to_string(implausible.load()) + " gives " +
                               (quantity == Quantity::kXYZ ? "Y " + std::to_string(v[1]) : "L* " + std::to_string(v[0])) +
                               ": not reflectance factors (white = 1); divide percentages by 100 first");
     }

@@ -11,6 +11,8 @@ packages=(
     libgtest-dev libgmock-dev libbenchmark-dev help2man
     python3-dev pybind11-dev python3-numpy python3-pytest
     argyll
+    # NumPy's vectorised BLAS, so that bench/python_bench.py compares with a fair peer
+    libopenblas0-pthread
 )
 
 missing=()

@@ -6,6 +6,8 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <cstddef>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -99,5 +101,18 @@ class NXBASE_EXPORT Thread {
     static std::mutex smRunningMutex;
     static std::vector<std::string> smRunningThreads;
 };
+
+namespace nxbase {
+
+// Runs fPart(first, count) over [0, alCount) on up to alThreads threads (0:
+// one per core; fewer when alCount / alMinPerThread is smaller), the calling
+// thread one of them. The range is cut into parts whose starts are multiples
+// of alGranule, eight or so per thread, taken by whichever thread is free;
+// the call returns when all are done. With one thread, or when no thread can
+// be started, the work is done on the calling thread. fPart must not throw.
+NXBASE_EXPORT void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread,
+                              std::size_t alGranule, const std::function<void(std::size_t, std::size_t)>& fPart);
+
+}  // namespace nxbase
 
 #endif  // NXBASE_THREAD_H_

@@ -50,6 +50,12 @@ def test_large_arrays_take_the_parallel_path_with_identical_results(chart):
     np.testing.assert_array_equal(nxbase.spectra_to_LCh(many, threads=1), nxbase.spectra_to_LCh(many))
     with pytest.raises(ValueError, match="threads must be at least 1"):
         nxbase.spectra_to_Lab(chart, threads=0)
+    # Percentages in two parts of a split array: the earliest is named.
+    bad = many * 1
+    bad[[90001, 70001]] *= 100
+    for threads in (None, 3):
+        with pytest.raises(ValueError, match="spectrum 70001 gives L"):
+            nxbase.spectra_to_Lab(bad, threads=threads)
     # Contiguous float64 is read in place: the same numbers, and no copy of
     # the input (the peak grows by the result only, not by 17 MB of float32).
     wide = many.astype(np.float64)

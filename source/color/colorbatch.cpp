@@ -18,15 +18,13 @@
 #include <algorithm>
 #include <cstdint>
 #include <cstring>
-#include <system_error>
-#include <thread>
-#include <vector>
 
 #if defined(__x86_64__) && defined(__GNUC__) && !defined(__clang__)
 #include <immintrin.h>
 #endif
 
 #include "nxbase/cmetry.h"
+#include "nxbase/thread.h"
 #include "tristimulus.h"
 
 // The vector helpers below are file-local and inlined; the ABI note GCC and
@@ -530,38 +528,11 @@ namespace {
 // Spectra per thread below which starting a thread costs more than it saves.
 constexpr std::size_t kMinPerThread = 16384;
 
-// Runs fRun(first, count) over [0, alCount) in up to alThreads parts whose
-// starts are multiples of eight.
-template <typename Run>
-void SplitOverThreads(std::size_t alCount, unsigned alThreads, Run fRun) {
-    unsigned threads = alThreads ? alThreads : std::max(1u, std::thread::hardware_concurrency());
-    threads = static_cast<unsigned>(
-        std::min<std::size_t>(threads, std::max<std::size_t>(1, alCount / kMinPerThread)));
-    if (threads <= 1) {
-        fRun(0, alCount);
-        return;
-    }
-    const std::size_t part = (alCount / threads + kLanes - 1) / kLanes * kLanes;
-    std::vector<std::thread> workers;
-    std::size_t next = part;  // the calling thread takes [0, part)
-    for (unsigned t = 1; t < threads && next < alCount; ++t) {
-        const std::size_t first = next;
-        const std::size_t count = std::min(part, alCount - first);
-        try {
-            workers.emplace_back([=] { fRun(first, count); });
-        } catch (const std::system_error&) {
-            fRun(first, count);  // no thread to be had: do it here
-        }
-        next += count;
-    }
-    if (next < alCount) fRun(next, alCount - next);
-    fRun(0, std::min(part, alCount));
-    for (std::thread& worker : workers) worker.join();
-}
-
 template <bool kLab, class T>
 void RunParallel(const PaddedWeights& w, const T* src, std::size_t count, float* out, unsigned threads) {
-    SplitOverThreads(count, threads, [&](std::size_t first, std::size_t n) {
+    // Parts start at multiples of sixteen: every part but the last runs on
+    // the wide kernel only.
+    RunInParts(count, threads, kMinPerThread, 2 * kLanes, [&](std::size_t first, std::size_t n) {
         Run<kLab>(w, src + first * kSamples, n, out + 3 * first);
     });
 }

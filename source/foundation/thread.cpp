@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <exception>
 #include <map>
+#include <system_error>
 
 #include "nxbase/check.h"
 #include "nxbase/logfile.h"
@@ -209,3 +210,39 @@ std::vector<std::string> Thread::GetRunningThreads() {
     std::lock_guard<std::mutex> lock(smRunningMutex);
     return smRunningThreads;
 }
+
+namespace nxbase {
+
+void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread, std::size_t alGranule,
+                const std::function<void(std::size_t, std::size_t)>& fPart) {
+    unsigned threads = alThreads ? alThreads : std::max(1u, std::thread::hardware_concurrency());
+    threads = static_cast<unsigned>(
+        std::min<std::size_t>(threads, std::max<std::size_t>(1, alCount / std::max<std::size_t>(1, alMinPerThread))));
+    if (threads <= 1) {
+        fPart(0, alCount);
+        return;
+    }
+    // Eight parts per thread, taken in turn by whichever thread is free: a
+    // core slowed by other work then takes fewer, instead of holding up
+    // the call with a fixed share.
+    const std::size_t granule = std::max<std::size_t>(1, alGranule);
+    const std::size_t part = std::max(granule * 256, (alCount / (8 * threads) + granule - 1) / granule * granule);
+    std::atomic<std::size_t> next{0};
+    const auto take = [&] {
+        for (std::size_t first = next.fetch_add(part); first < alCount; first = next.fetch_add(part)) {
+            fPart(first, std::min(part, alCount - first));
+        }
+    };
+    std::vector<std::thread> workers;
+    for (unsigned t = 1; t < threads; ++t) {
+        try {
+            workers.emplace_back(take);
+        } catch (const std::system_error&) {
+            break;  // no thread to be had: the others take its parts
+        }
+    }
+    take();
+    for (std::thread& worker : workers) worker.join();
+}
+
+}  // namespace nxbase
