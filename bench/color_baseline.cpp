@@ -8,7 +8,8 @@
 
 namespace colorbench {
 
-void VectorisedLab(const float* w, const float* sums, const float* spectra, std::size_t count, float* lab) {
+void VectorisedLab(const float* w, const float* sums, const float* spectra, std::size_t count,
+                   float* lab) {
     constexpr std::size_t kBlock = 256;
     constexpr int kSamples = 36;
     const float scale[3] = {100.0f / sums[1] / (100.0f * sums[0] / sums[1]), 1.0f / sums[1],
@@ -59,8 +60,12 @@ T SumOnce(const T* data, std::size_t count) {
     return sum;
 }
 
-float StreamingSum(const float* data, std::size_t count) { return SumOnce(data, count); }
+float StreamingSum(const float* data, std::size_t count) {
+    return SumOnce(data, count);
+}
 
-double StreamingSum(const double* data, std::size_t count) { return SumOnce(data, count); }
+double StreamingSum(const double* data, std::size_t count) {
+    return SumOnce(data, count);
+}
 
 }  // namespace colorbench

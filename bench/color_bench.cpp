@@ -110,7 +110,8 @@ void Timed(benchmark::State& state, std::size_t count, unsigned threads, Body bo
 }
 
 // The yardstick: what a careful programmer writes first.
-void ScalarLab(const float* w, const float* sums, const float* spectra, std::size_t count, float* lab) {
+void ScalarLab(const float* w, const float* sums, const float* spectra, std::size_t count,
+               float* lab) {
     const float xn = 100.0f * sums[0] / sums[1];
     const float zn = 100.0f * sums[2] / sums[1];
     for (std::size_t s = 0; s < count; ++s) {
@@ -138,22 +139,25 @@ void ScalarLoop(benchmark::State& state) {
     const float* spectra = Spectra<float>(kCacheSpectra).data();
     const nxbase::BatchWeights& w = Batch().Weights();
     float* lab = Results(kCacheSpectra);
-    Timed(state, kCacheSpectra, 1, [&] { ScalarLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab); });
+    Timed(state, kCacheSpectra, 1,
+          [&] { ScalarLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab); });
 }
 
 void VectorisedLoop(benchmark::State& state) {
     const float* spectra = Spectra<float>(kCacheSpectra).data();
     const nxbase::BatchWeights& w = Batch().Weights();
     float* lab = Results(kCacheSpectra);
-    Timed(state, kCacheSpectra, 1,
-          [&] { colorbench::VectorisedLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab); });
+    Timed(state, kCacheSpectra, 1, [&] {
+        colorbench::VectorisedLab(&w.weights[0][0], w.sums, spectra, kCacheSpectra, lab);
+    });
 }
 
 void ObjectPath(benchmark::State& state) {
     const std::vector<float>& values = Spectra<float>(kCacheSpectra);
     std::vector<ReflectanceSpectrum> spectra;
     spectra.reserve(kCacheSpectra);
-    for (std::size_t s = 0; s < kCacheSpectra; ++s) spectra.emplace_back(&values[s * kSamples], PhysicalConditions());
+    for (std::size_t s = 0; s < kCacheSpectra; ++s)
+        spectra.emplace_back(&values[s * kSamples], PhysicalConditions());
     Timed(state, kCacheSpectra, 1, [&] {
         for (const ReflectanceSpectrum& spectrum : spectra) {
             const LABVector lab(spectrum);
@@ -167,7 +171,8 @@ void BatchLab(benchmark::State& state, std::size_t count, unsigned threads) {
     const T* spectra = Spectra<T>(count).data();
     float* lab = Results(count);
     Timed(state, count, threads, [&] {
-        threads == 1 ? Batch().ToLab(spectra, count, lab) : Batch().ToLabParallel(spectra, count, lab, threads);
+        threads == 1 ? Batch().ToLab(spectra, count, lab)
+                     : Batch().ToLabParallel(spectra, count, lab, threads);
     });
 }
 
@@ -182,7 +187,8 @@ void ReadOnce(benchmark::State& state, std::size_t count, unsigned threads) {
             sums[0] = colorbench::StreamingSum(spectra.data(), values);
         } else {
             const std::size_t half = values / 2;
-            std::thread other([&] { sums[1] = colorbench::StreamingSum(spectra.data() + half, values - half); });
+            std::thread other(
+                [&] { sums[1] = colorbench::StreamingSum(spectra.data() + half, values - half); });
             sums[0] = colorbench::StreamingSum(spectra.data(), half);
             other.join();
         }
@@ -214,26 +220,32 @@ int main(int argc, char** argv) {
         DramPair<double>("double", dram, 1),
         DramPair<double>("double", dram, 2),
     };
-    std::printf("DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "
-                "MiB)\n",
-                dram, dram * 144.0 / (1 << 20), dram * 288.0 / (1 << 20), LastLevelCache() >> 20);
+    std::printf(
+        "DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "
+        "MiB)\n",
+        dram, dram * 144.0 / (1 << 20), dram * 288.0 / (1 << 20), LastLevelCache() >> 20);
     nxbench::WarnIfBusy(2);
     // The arrays are made and read once before the rounds: the first pass
     // over fresh memory runs at a fraction of the later ones.
-    benchmark::DoNotOptimize(colorbench::StreamingSum(Spectra<float>(dram).data(), dram * kSamples));
-    benchmark::DoNotOptimize(colorbench::StreamingSum(Spectra<double>(dram).data(), dram * kSamples));
+    benchmark::DoNotOptimize(
+        colorbench::StreamingSum(Spectra<float>(dram).data(), dram * kSamples));
+    benchmark::DoNotOptimize(
+        colorbench::StreamingSum(Spectra<double>(dram).data(), dram * kSamples));
     Batch().ToLab(Spectra<float>(dram).data(), dram, Results(dram));
     nxbench::RegisterRounds(pairs, kRounds);
     nxbench::RoundReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf("\nRatios of spectra per second, contender / baseline, min / median / max over %d interleaved "
-                "rounds; one-thread cases on CPU 0, two-thread cases on CPUs 0 and 1 (one thread each):\n",
-                kRounds);
+    std::printf(
+        "\nRatios of spectra per second, contender / baseline, min / median / max over %d "
+        "interleaved "
+        "rounds; one-thread cases on CPU 0, two-thread cases on CPUs 0 and 1 (one thread each):\n",
+        kRounds);
     nxbench::PrintPairs(reporter, pairs, kRounds);
     for (int type = 0; type < 2; ++type) {
-        nxbench::PrintSpread(std::string("LabBatch_TwoThreads_vs_OneThread_DramResident_") +
-                                 (type ? "double" : "float"),
-                             nxbench::ContenderRatios(reporter, pairs[4 + 2 * type], pairs[3 + 2 * type], kRounds));
+        nxbench::PrintSpread(
+            std::string("LabBatch_TwoThreads_vs_OneThread_DramResident_") +
+                (type ? "double" : "float"),
+            nxbench::ContenderRatios(reporter, pairs[4 + 2 * type], pairs[3 + 2 * type], kRounds));
     }
     benchmark::Shutdown();
     return 0;

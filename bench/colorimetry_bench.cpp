@@ -8,6 +8,7 @@
 #include <map>
 #include <string>
 
+#include "interleaved.h"
 #include "nxbase/cmetry.h"
 
 namespace {
@@ -18,18 +19,17 @@ void BM_ProviderFilterLookup(benchmark::State& state) {
         benchmark::DoNotOptimize(klume::cmetry::CMetryFilter::Find("D50", "2"));
     }
 }
-BENCHMARK(BM_ProviderFilterLookup);
 
 void BM_PairMapLookup_Baseline(benchmark::State& state) {
     std::map<std::pair<std::string, std::string>, int> pairs;
-    for (const char* illuminant : {"A", "C", "D50", "D55", "D65", "D75", "E", "FL2", "FL7", "FL11"}) {
+    for (const char* illuminant :
+         {"A", "C", "D50", "D55", "D65", "D75", "E", "FL2", "FL7", "FL11"}) {
         for (const char* observer : {"2", "10"}) pairs[{illuminant, observer}] = 1;
     }
     for (auto _ : state) {
         benchmark::DoNotOptimize(pairs.find({"D50", "2"}));
     }
 }
-BENCHMARK(BM_PairMapLookup_Baseline);
 
 void BM_CMetryFilterConstruction(benchmark::State& state) {
     const Lichtart illuminant{IllumClass(ILLUM_D50, 0)};
@@ -39,7 +39,6 @@ void BM_CMetryFilterConstruction(benchmark::State& state) {
         benchmark::DoNotOptimize(filter.GetWeights(0));
     }
 }
-BENCHMARK(BM_CMetryFilterConstruction);
 
 void BM_WeightComputation(benchmark::State& state) {
     const auto illuminant = klume::cmetry::IlluminantRepository::Get("FL4");
@@ -48,7 +47,6 @@ void BM_WeightComputation(benchmark::State& state) {
         benchmark::DoNotOptimize(klume::cmetry::ComputeWeights(*illuminant, *observer));
     }
 }
-BENCHMARK(BM_WeightComputation);
 
 void BM_Tristimulus(benchmark::State& state) {
     const CMetryFilter& filter = *CMetry::Instance()->GetLXYZFilter();
@@ -62,12 +60,12 @@ void BM_Tristimulus(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_Tristimulus);
 
 void BM_PlainDotProducts_Baseline(benchmark::State& state) {
     const CMetryFilter& filter = *CMetry::Instance()->GetLXYZFilter();
     float weights[3][36];
-    for (unsigned short c = 0; c < 3; ++c) std::copy(filter.GetWeights(c), filter.GetWeights(c) + 36, weights[c]);
+    for (unsigned short c = 0; c < 3; ++c)
+        std::copy(filter.GetWeights(c), filter.GetWeights(c) + 36, weights[c]);
     float spectrum[36];
     for (int i = 0; i < 36; ++i) spectrum[i] = 0.02f * static_cast<float>(i);
     float sums[3];
@@ -82,7 +80,17 @@ void BM_PlainDotProducts_Baseline(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_PlainDotProducts_Baseline);
 
 }  // namespace
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"ProviderFilterLookup_vs_PairMapLookup", BM_PairMapLookup_Baseline,
+         BM_ProviderFilterLookup, false},
+        {"CMetryFilterConstruction_vs_ProviderFilterLookup", BM_ProviderFilterLookup,
+         BM_CMetryFilterConstruction, false},
+        {"WeightComputation_vs_ProviderFilterLookup", BM_ProviderFilterLookup, BM_WeightComputation,
+         false},
+        {"Tristimulus_vs_PlainDotProducts", BM_PlainDotProducts_Baseline, BM_Tristimulus, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "call");
+}

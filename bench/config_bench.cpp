@@ -1,13 +1,13 @@
 // CascadedConfig::ReadKey against an application and a user file of 200 keys
 // each, next to its floor: a read checks both files for changes by one stat()
 // each, so two stat() calls in the same program are the baseline.
-#include <sys/stat.h>
-
 #include <benchmark/benchmark.h>
+#include <sys/stat.h>
 
 #include <map>
 #include <string>
 
+#include "interleaved.h"
 #include "nxbase/appconfig.h"
 #include "nxbase/configuration.h"
 #include "test_util.h"
@@ -50,17 +50,15 @@ void BM_TwoStatCalls(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_TwoStatCalls);
 
-// `state.range(0)`: 0 the user's key, 1 the application's, 2 neither.
-void BM_CascadedReadKey(benchmark::State& state) {
+// `which`: 0 the user's key, 1 the application's, 2 neither.
+void CascadedReadKey(benchmark::State& state, int which) {
     Files files;
     const char* keys[] = {"AppKey100", "AppKey101", "NoSuchKey"};
-    String group("Measure"), key(keys[state.range(0)]), fallback("default");
+    String group("Measure"), key(keys[which]), fallback("default");
     for (auto _ : state) benchmark::DoNotOptimize(CascadedConfig::ReadKey(group, key, fallback));
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_CascadedReadKey)->Arg(0)->Arg(1)->Arg(2);
 
 void BM_CascadedGetEntries(benchmark::State& state) {
     Files files;
@@ -68,8 +66,18 @@ void BM_CascadedGetEntries(benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(CascadedConfig::GetEntries(group));
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_CascadedGetEntries);
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"CascadedReadKey_UserKey_vs_TwoStatCalls", BM_TwoStatCalls,
+         [](benchmark::State& state) { CascadedReadKey(state, 0); }, false},
+        {"CascadedReadKey_ApplicationKey_vs_TwoStatCalls", BM_TwoStatCalls,
+         [](benchmark::State& state) { CascadedReadKey(state, 1); }, false},
+        {"CascadedReadKey_MissingKey_vs_TwoStatCalls", BM_TwoStatCalls,
+         [](benchmark::State& state) { CascadedReadKey(state, 2); }, false},
+        {"CascadedGetEntries_vs_TwoStatCalls", BM_TwoStatCalls, BM_CascadedGetEntries, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "call");
+}

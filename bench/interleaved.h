@@ -5,7 +5,6 @@
 #define NXBASE_BENCH_INTERLEAVED_H_
 
 #include <benchmark/benchmark.h>
-
 #include <sched.h>
 #include <unistd.h>
 
@@ -50,15 +49,17 @@ inline std::string RoundName(const std::string& pair, const char* side, const st
 }
 
 // As the library reports a run registered with UseRealTime().
-inline std::string RealTimeName(const std::string& registered) { return registered + "/real_time"; }
+inline std::string RealTimeName(const std::string& registered) {
+    return registered + "/real_time";
+}
 
 // Prints "<label> min / median / max" of the ratios; nothing when none was
 // measured (a filtered run).
 inline void PrintSpread(const std::string& label, std::vector<double> ratios) {
     if (ratios.empty()) return;
     std::sort(ratios.begin(), ratios.end());
-    std::printf("  %-52s %.2f / %.2f / %.2f\n", label.c_str(), ratios.front(), ratios[ratios.size() / 2],
-                ratios.back());
+    std::printf("  %-52s %.2f / %.2f / %.2f\n", label.c_str(), ratios.front(),
+                ratios[ratios.size() / 2], ratios.back());
 }
 
 // Pins the calling thread (and the threads it starts later) to CPUs
@@ -72,7 +73,9 @@ inline void PinToCpus(int first, int count) {
 }
 
 // Pins to `cpu`, or lets the thread run anywhere for -1.
-inline void PinTo(int cpu) { cpu >= 0 ? PinToCpus(cpu, 1) : PinToCpus(0, 0); }
+inline void PinTo(int cpu) {
+    cpu >= 0 ? PinToCpus(cpu, 1) : PinToCpus(0, 0);
+}
 
 // A contender and its baseline, run one after the other in every round.
 // The ratio is contender / baseline of items per second (rates) or of real
@@ -92,8 +95,10 @@ inline std::string PairRun(const Pair& pair, const char* side, int round) {
 inline void RegisterRounds(const std::vector<Pair>& pairs, int rounds) {
     for (int round = 1; round <= rounds; ++round) {
         for (const Pair& pair : pairs) {
-            benchmark::RegisterBenchmark(PairRun(pair, "baseline", round).c_str(), pair.baseline)->UseRealTime();
-            benchmark::RegisterBenchmark(PairRun(pair, "contender", round).c_str(), pair.contender)->UseRealTime();
+            benchmark::RegisterBenchmark(PairRun(pair, "baseline", round).c_str(), pair.baseline)
+                ->UseRealTime();
+            benchmark::RegisterBenchmark(PairRun(pair, "contender", round).c_str(), pair.contender)
+                ->UseRealTime();
         }
     }
 }
@@ -113,8 +118,8 @@ inline std::vector<double> PairRatios(const RoundReporter& reporter, const Pair&
 
 // The ratio of two pairs' contenders in each round (e.g. two threads
 // against one), rates.
-inline std::vector<double> ContenderRatios(const RoundReporter& reporter, const Pair& top, const Pair& bottom,
-                                           int rounds) {
+inline std::vector<double> ContenderRatios(const RoundReporter& reporter, const Pair& top,
+                                           const Pair& bottom, int rounds) {
     std::vector<double> ratios;
     for (int round = 1; round <= rounds; ++round) {
         const double a = reporter.Rate(RealTimeName(PairRun(top, "contender", round)));
@@ -128,6 +133,28 @@ inline void PrintPairs(const RoundReporter& reporter, const std::vector<Pair>& p
     for (const Pair& pair : pairs) PrintSpread(pair.name, PairRatios(reporter, pair, rounds));
 }
 
+// The whole program of a bench of one-thread pairs: runs every pair in
+// `rounds` interleaved rounds on CPU 0 and prints each pair's ratio, real
+// time contender / baseline (above 1: the contender takes longer), with
+// `what` saying what one item is.
+inline int RunPairs(int argc, char** argv, const std::vector<Pair>& pairs, const char* what,
+                    int rounds = 5) {
+    benchmark::Initialize(&argc, argv);
+    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+    PinTo(0);
+    RegisterRounds(pairs, rounds);
+    RoundReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    std::printf(
+        "\nRatios of real time per %s, contender / baseline, min / median / max over %d "
+        "interleaved "
+        "rounds; one thread, pinned to CPU 0:\n",
+        what, rounds);
+    PrintPairs(reporter, pairs, rounds);
+    benchmark::Shutdown();
+    return 0;
+}
+
 // Warns when fewer than `threads` CPUs look idle (one-minute load average
 // above the CPU count less `threads`): a ratio of a many-thread run is then
 // not what the machine can do.
@@ -137,9 +164,10 @@ inline void WarnIfBusy(unsigned threads) {
     if (!(file >> load)) return;
     const long cpus = sysconf(_SC_NPROCESSORS_ONLN);
     if (load > static_cast<double>(cpus) - threads) {
-        std::printf("WARNING: load average %.2f on %ld CPUs: fewer than %u idle CPUs for the %u-thread "
-                    "cases; their ratios understate the machine\n",
-                    load, cpus, threads, threads);
+        std::printf(
+            "WARNING: load average %.2f on %ld CPUs: fewer than %u idle CPUs for the %u-thread "
+            "cases; their ratios understate the machine\n",
+            load, cpus, threads, threads);
     }
 }
 

@@ -1,10 +1,10 @@
 // The log line against its own floor: a bare open/append/close of the same
 // bytes in the same program, and the cost of a disabled key.
+#include <benchmark/benchmark.h>
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <benchmark/benchmark.h>
-
+#include "interleaved.h"
 #include "nxbase/logfile.h"
 #include "test_util.h"
 
@@ -24,7 +24,6 @@ void BM_BareOpenWriteClose(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_BareOpenWriteClose);
 
 void BM_LogLineEnabledKey(benchmark::State& state) {
     nxtest::TempDir dir;
@@ -36,7 +35,6 @@ void BM_LogLineEnabledKey(benchmark::State& state) {
     for (auto _ : state) log.WriteLog(text, key);
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_LogLineEnabledKey);
 
 void BM_LogLineDisabledKey(benchmark::State& state) {
     nxtest::TempDir dir;
@@ -46,7 +44,6 @@ void BM_LogLineDisabledKey(benchmark::State& state) {
     for (auto _ : state) log.WriteLog(text, key);
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_LogLineDisabledKey);
 
 // The same through the process log, as library code writes its lines.
 void BM_WriteToLogDisabledKey(benchmark::State& state) {
@@ -56,16 +53,23 @@ void BM_WriteToLogDisabledKey(benchmark::State& state) {
     for (auto _ : state) LogFile::WriteToLog(text, key);
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_WriteToLogDisabledKey);
 
 // The yardstick for the disabled key: one look-up in a set of a few keys.
 void BM_OneSetLookup(benchmark::State& state) {
-    std::set<std::string, std::less<>> keys{"Startup", "Language", "Keys", "Measure", "Communication"};
+    std::set<std::string, std::less<>> keys{"Startup", "Language", "Keys", "Measure",
+                                            "Communication"};
     std::string key = "Quiet";
     for (auto _ : state) benchmark::DoNotOptimize(keys.find(key) != keys.end());
 }
-BENCHMARK(BM_OneSetLookup);
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"LogLineEnabledKey_vs_BareOpenWriteClose", BM_BareOpenWriteClose, BM_LogLineEnabledKey,
+         false},
+        {"LogLineDisabledKey_vs_OneSetLookup", BM_OneSetLookup, BM_LogLineDisabledKey, false},
+        {"WriteToLogDisabledKey_vs_OneSetLookup", BM_OneSetLookup, BM_WriteToLogDisabledKey, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "line");
+}

@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "interleaved.h"
 #include "nxbase/mymemblo.h"
 
 namespace {
@@ -35,7 +36,6 @@ void BM_MemoryBlockWriteFresh(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations() * kRecords * kValuesPerRecord);
     state.SetBytesProcessed(state.iterations() * kRecords * kRecordBytes);
 }
-BENCHMARK(BM_MemoryBlockWriteFresh)->Unit(benchmark::kMillisecond);
 
 // One block rewound for every pass, like the memcpy buffer below.
 void BM_MemoryBlockWrite(benchmark::State& state) {
@@ -50,7 +50,6 @@ void BM_MemoryBlockWrite(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations() * kRecords * kValuesPerRecord);
     state.SetBytesProcessed(state.iterations() * kRecords * kRecordBytes);
 }
-BENCHMARK(BM_MemoryBlockWrite)->Unit(benchmark::kMillisecond);
 
 void BM_MemoryBlockRead(benchmark::State& state) {
     MyMemoryBlock block;
@@ -73,7 +72,6 @@ void BM_MemoryBlockRead(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations() * kRecords * kValuesPerRecord);
     state.SetBytesProcessed(state.iterations() * kRecords * kRecordBytes);
 }
-BENCHMARK(BM_MemoryBlockRead)->Unit(benchmark::kMillisecond);
 
 // The floor: the same bytes copied value by value into a buffer of the final
 // size (host order, which is the block's order on this machine).
@@ -99,7 +97,6 @@ void BM_MemcpyWrite(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations() * kRecords * kValuesPerRecord);
     state.SetBytesProcessed(state.iterations() * kRecords * kRecordBytes);
 }
-BENCHMARK(BM_MemcpyWrite)->Unit(benchmark::kMillisecond);
 
 void BM_MemcpyRead(benchmark::State& state) {
     MyMemoryBlock block;
@@ -126,8 +123,14 @@ void BM_MemcpyRead(benchmark::State& state) {
     state.SetItemsProcessed(state.iterations() * kRecords * kValuesPerRecord);
     state.SetBytesProcessed(state.iterations() * kRecords * kRecordBytes);
 }
-BENCHMARK(BM_MemcpyRead)->Unit(benchmark::kMillisecond);
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"MemoryBlockWriteFresh_vs_MemcpyWrite", BM_MemcpyWrite, BM_MemoryBlockWriteFresh, false},
+        {"MemoryBlockWrite_vs_MemcpyWrite", BM_MemcpyWrite, BM_MemoryBlockWrite, false},
+        {"MemoryBlockRead_vs_MemcpyRead", BM_MemcpyRead, BM_MemoryBlockRead, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "pass of one million values");
+}

@@ -1,6 +1,8 @@
 // Registry point reads and autocommit writes against their floor: a raw
 // SQLite loop (WAL, synchronous=NORMAL, one prepared statement, a plain
-// key/value table) in the same program on the same disk. Two sizes: 1000
+// key/value table) in the same program on the same disk, each pair run in
+// interleaved rounds and timed in real time (the work waits on the file
+// system, which CPU time leaves out). Two sizes: 1000
 // values visited in turn (all in SQLite's page cache: "Cached1000"), and one
 // million values in 1000 keys visited in random order ("Random1M", a 60 MB
 // database whose pages mostly miss SQLite's cache; the files stay in the
@@ -13,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "interleaved.h"
 #include "nxbase/registry.h"
 #include "test_util.h"
 
@@ -90,7 +93,6 @@ void BM_RawSqlitePointRead_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RawSqlitePointRead_Cached1000);
 
 void BM_RawSqliteAutocommitWrite_Cached1000(benchmark::State& state) {
     nxtest::TempDir dir;
@@ -104,12 +106,15 @@ void BM_RawSqliteAutocommitWrite_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RawSqliteAutocommitWrite_Cached1000);
 
 // ---- one million values, random access ----
 
-std::string LargeKey(int i) { return kKey + "\\K" + std::to_string(i / (kLargeValues / kLargeKeys)); }
-std::string LargeName(int i) { return Name(i % (kLargeValues / kLargeKeys)); }
+std::string LargeKey(int i) {
+    return kKey + "\\K" + std::to_string(i / (kLargeValues / kLargeKeys));
+}
+std::string LargeName(int i) {
+    return Name(i % (kLargeValues / kLargeKeys));
+}
 
 // A random visiting order, the same for every case.
 const std::vector<int>& RandomOrder() {
@@ -169,7 +174,6 @@ void BM_RawSqlitePointRead_Random1M(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RawSqlitePointRead_Random1M);
 
 void BM_RawSqliteAutocommitWrite_Random1M(benchmark::State& state) {
     LargeRaw& large = Raw1M();
@@ -181,7 +185,6 @@ void BM_RawSqliteAutocommitWrite_Random1M(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RawSqliteAutocommitWrite_Random1M);
 
 void BM_RegistryStorePointRead_Random1M(benchmark::State& state) {
     Registry1M();
@@ -189,12 +192,12 @@ void BM_RegistryStorePointRead_Random1M(benchmark::State& state) {
     std::size_t i = 0;
     for (auto _ : state) {
         const int v = order[i];
-        benchmark::DoNotOptimize(RegistryStore::Read(RegistryHive::CurrentUser, LargeKey(v), LargeName(v)));
+        benchmark::DoNotOptimize(
+            RegistryStore::Read(RegistryHive::CurrentUser, LargeKey(v), LargeName(v)));
         i = (i + 1) % order.size();
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryStorePointRead_Random1M);
 
 void BM_RegistryAutocommitWrite_Random1M(benchmark::State& state) {
     Registry1M();
@@ -208,7 +211,6 @@ void BM_RegistryAutocommitWrite_Random1M(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryAutocommitWrite_Random1M);
 
 // ---- the registry ----
 
@@ -237,7 +239,6 @@ void BM_RegistryStorePointRead_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryStorePointRead_Cached1000);
 
 void BM_RegistryHandlerGetValue_Cached1000(benchmark::State& state) {
     RegistryFixture fixture;
@@ -250,7 +251,6 @@ void BM_RegistryHandlerGetValue_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryHandlerGetValue_Cached1000);
 
 void BM_RegistryAutocommitWrite_Cached1000(benchmark::State& state) {
     RegistryFixture fixture;
@@ -262,7 +262,6 @@ void BM_RegistryAutocommitWrite_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryAutocommitWrite_Cached1000);
 
 void BM_RegistryHandlerAddEntry_Cached1000(benchmark::State& state) {
     RegistryFixture fixture;
@@ -275,8 +274,38 @@ void BM_RegistryHandlerAddEntry_Cached1000(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations());
 }
-BENCHMARK(BM_RegistryHandlerAddEntry_Cached1000);
+
+constexpr int kRounds = 5;
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    benchmark::Initialize(&argc, argv);
+    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+    // Time ratios: how many times the raw SQLite loop's time per value.
+    const std::vector<nxbench::Pair> pairs = {
+        {"RegistryStorePointRead_vs_RawSqlite_Cached1000", BM_RawSqlitePointRead_Cached1000,
+         BM_RegistryStorePointRead_Cached1000, false},
+        {"RegistryHandlerGetValue_vs_RawSqlite_Cached1000", BM_RawSqlitePointRead_Cached1000,
+         BM_RegistryHandlerGetValue_Cached1000, false},
+        {"RegistryAutocommitWrite_vs_RawSqlite_Cached1000", BM_RawSqliteAutocommitWrite_Cached1000,
+         BM_RegistryAutocommitWrite_Cached1000, false},
+        {"RegistryHandlerAddEntry_vs_RawSqlite_Cached1000", BM_RawSqliteAutocommitWrite_Cached1000,
+         BM_RegistryHandlerAddEntry_Cached1000, false},
+        {"RegistryStorePointRead_vs_RawSqlite_Random1M", BM_RawSqlitePointRead_Random1M,
+         BM_RegistryStorePointRead_Random1M, false},
+        {"RegistryAutocommitWrite_vs_RawSqlite_Random1M", BM_RawSqliteAutocommitWrite_Random1M,
+         BM_RegistryAutocommitWrite_Random1M, false},
+    };
+    nxbench::PinTo(0);
+    nxbench::RegisterRounds(pairs, kRounds);
+    nxbench::RoundReporter reporter;
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    std::printf(
+        "\nRatios of real time per value, registry / raw SQLite, min / median / max over %d "
+        "interleaved rounds; one thread, pinned to CPU 0:\n",
+        kRounds);
+    nxbench::PrintPairs(reporter, pairs, kRounds);
+    benchmark::Shutdown();
+    return 0;
+}

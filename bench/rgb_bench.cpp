@@ -13,6 +13,7 @@
 #include <random>
 #include <vector>
 
+#include "interleaved.h"
 #include "nxbase/colorconverter.h"
 #include "nxbase/iccprofile.h"
 #include "test_util.h"
@@ -41,11 +42,12 @@ class ScopedSrgbEngine {
         cmsHPROFILE p = cmsCreate_sRGBProfile();
         cmsSaveProfileToFile(p, path_.c_str());
         cmsCloseProfile(p);
-        previous_ = nxbase::SetICCSettingsReader([this](const std::string& key, const std::string& def) {
-            if (key == ICCEngine::kEnableKey) return std::string("1");
-            if (key == ICCEngine::kPathKey) return path_;
-            return def;
-        });
+        previous_ =
+            nxbase::SetICCSettingsReader([this](const std::string& key, const std::string& def) {
+                if (key == ICCEngine::kEnableKey) return std::string("1");
+                if (key == ICCEngine::kPathKey) return path_;
+                return def;
+            });
         ICCEngine::CreateICCEngine();
     }
     ~ScopedSrgbEngine() {
@@ -73,7 +75,6 @@ void BM_LabToRgbFormulaObject(benchmark::State& state) {
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgbFormulaObject);
 
 void BM_LabToRgbFormulaBatch(benchmark::State& state) {
     std::vector<float> lab = RandomLab(), rgb(lab.size());
@@ -83,12 +84,13 @@ void BM_LabToRgbFormulaBatch(benchmark::State& state) {
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgbFormulaBatch);
 
 // The textbook formula (D65 white, IEC 61966-2-1 matrix and curve), scalar.
 void BM_LabToRgb_PlainFormulaLoop_Baseline(benchmark::State& state) {
     std::vector<float> lab = RandomLab(), rgb(lab.size());
-    auto inverse = [](float f) { return f > 6.0f / 29.0f ? f * f * f : 3.0f * 0.042806183f * (f - 4.0f / 29.0f); };
+    auto inverse = [](float f) {
+        return f > 6.0f / 29.0f ? f * f * f : 3.0f * 0.042806183f * (f - 4.0f / 29.0f);
+    };
     auto curve = [](float v) {
         v = std::min(1.0f, std::max(0.0f, v));
         return 100.0f * (v <= 0.0031308f ? 12.92f * v : 1.055f * std::pow(v, 1.0f / 2.4f) - 0.055f);
@@ -107,7 +109,6 @@ void BM_LabToRgb_PlainFormulaLoop_Baseline(benchmark::State& state) {
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgb_PlainFormulaLoop_Baseline);
 
 // LittleCMS alone: Lab (D50) doubles to sRGB doubles, the ICC path's work.
 void BM_LabToRgb_BareLittleCms_Baseline(benchmark::State& state) {
@@ -126,20 +127,19 @@ void BM_LabToRgb_BareLittleCms_Baseline(benchmark::State& state) {
     cmsCloseProfile(labProfile);
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgb_BareLittleCms_Baseline);
 
 void BM_LabToRgbIccObject(benchmark::State& state) {
     ScopedSrgbEngine engine;
     std::vector<float> lab = RandomLab();
     for (auto _ : state) {
         for (std::size_t i = 0; i < kValues; ++i) {
-            RGBVector rgb(LABVector(lab[3 * i], lab[3 * i + 1], lab[3 * i + 2], MeasuringCondition()));
+            RGBVector rgb(
+                LABVector(lab[3 * i], lab[3 * i + 1], lab[3 * i + 2], MeasuringCondition()));
             benchmark::DoNotOptimize(rgb);
         }
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgbIccObject);
 
 void BM_LabToRgbIccBatch(benchmark::State& state) {
     ScopedSrgbEngine engine;
@@ -151,7 +151,6 @@ void BM_LabToRgbIccBatch(benchmark::State& state) {
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * kValues));
 }
-BENCHMARK(BM_LabToRgbIccBatch);
 
 void BM_SpectrumToRgb(benchmark::State& state) {
     std::mt19937 random(11);
@@ -171,8 +170,20 @@ void BM_SpectrumToRgb(benchmark::State& state) {
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * spectra.size()));
 }
-BENCHMARK(BM_SpectrumToRgb);
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"LabToRgbFormulaObject_vs_PlainFormulaLoop", BM_LabToRgb_PlainFormulaLoop_Baseline,
+         BM_LabToRgbFormulaObject, false},
+        {"LabToRgbFormulaBatch_vs_PlainFormulaLoop", BM_LabToRgb_PlainFormulaLoop_Baseline,
+         BM_LabToRgbFormulaBatch, false},
+        {"LabToRgbIccObject_vs_BareLittleCms", BM_LabToRgb_BareLittleCms_Baseline,
+         BM_LabToRgbIccObject, false},
+        {"LabToRgbIccBatch_vs_BareLittleCms", BM_LabToRgb_BareLittleCms_Baseline,
+         BM_LabToRgbIccBatch, false},
+        {"SpectrumToRgb_vs_LabToRgbFormulaBatch", BM_LabToRgbFormulaBatch, BM_SpectrumToRgb, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "batch of colours");
+}

@@ -7,6 +7,7 @@
 #include <sstream>
 #include <string>
 
+#include "interleaved.h"
 #include "nxbase/text.h"
 #include "test_util.h"
 
@@ -58,7 +59,6 @@ void BM_ReadAndSplitLines(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations() * kGroups * (kTextsPerGroup + 1));
 }
-BENCHMARK(BM_ReadAndSplitLines)->Unit(benchmark::kMillisecond);
 
 void LoadText(benchmark::State& state, const std::string& path) {
     for (auto _ : state) {
@@ -70,12 +70,20 @@ void LoadText(benchmark::State& state, const std::string& path) {
     state.SetItemsProcessed(state.iterations() * kGroups * (kTextsPerGroup + 1));
 }
 
-void BM_LoadTextAnsi(benchmark::State& state) { LoadText(state, Files().ansi()); }
-BENCHMARK(BM_LoadTextAnsi)->Unit(benchmark::kMillisecond);
+void BM_LoadTextAnsi(benchmark::State& state) {
+    LoadText(state, Files().ansi());
+}
 
-void BM_LoadTextUtf8(benchmark::State& state) { LoadText(state, Files().utf8()); }
-BENCHMARK(BM_LoadTextUtf8)->Unit(benchmark::kMillisecond);
+void BM_LoadTextUtf8(benchmark::State& state) {
+    LoadText(state, Files().utf8());
+}
 
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+    const std::vector<nxbench::Pair> pairs = {
+        {"LoadTextAnsi_vs_ReadAndSplitLines", BM_ReadAndSplitLines, BM_LoadTextAnsi, false},
+        {"LoadTextUtf8_vs_ReadAndSplitLines", BM_ReadAndSplitLines, BM_LoadTextUtf8, false},
+    };
+    return nxbench::RunPairs(argc, argv, pairs, "load of the file");
+}
