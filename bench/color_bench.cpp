@@ -32,7 +32,7 @@ namespace {
 
 constexpr int kSamples = 36;
 constexpr std::size_t kCacheSpectra = 4096;
-constexpr int kRounds = 5;
+constexpr int kRounds = 7;
 
 // The last-level cache in bytes (32 MiB when the system does not say).
 // The kernel's figure first: in virtual machines sysconf may report the sum

@@ -26,7 +26,7 @@
 namespace nxpy {
 namespace {
 
-constexpr py::ssize_t kBands = 36;
+constexpr py::ssize_t kBands = nxbase::kSpectrumSize;
 // From this many spectra on the work is split over the cores, in parts of at
 // least kMinPerThread (a thread costs about as much as that many spectra).
 constexpr std::size_t kParallelFrom = 1 << 16;

@@ -9,6 +9,7 @@
 #include "nxbase/lumaclient.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/postoffice.h"
+#include "nxbase/spectralgrid.h"
 
 namespace nxpy {
 namespace {
@@ -161,12 +162,13 @@ public:
         waiter.RaiseIfInterrupted();
         if (!ok) throw std::runtime_error(error);
         py::list ids;
-        py::array_t<float> spectra(std::vector<py::ssize_t>{static_cast<py::ssize_t>(measured.size()), 36});
+        py::array_t<float> spectra(
+            std::vector<py::ssize_t>{static_cast<py::ssize_t>(measured.size()), nxbase::kSpectrumSize});
         float* out = spectra.mutable_data();
         for (const nxbase::MeasuredSpectrum& spectrum : measured) {
             ids.append(spectrum.id);
             std::copy(spectrum.values.begin(), spectrum.values.end(), out);
-            out += 36;
+            out += nxbase::kSpectrumSize;
         }
         return py::make_tuple(ids, spectra);
     }

@@ -6,7 +6,7 @@ set -euo pipefail
 packages=(
     build-essential cmake ninja-build pkg-config git python3
     libboost-dev libboost-regex-dev
-    libsimpleini-dev libsqlite3-dev liblcms2-dev libpng-dev libssl-dev
+    libsimpleini-dev libsqlite3-dev sqlite3 liblcms2-dev libpng-dev libssl-dev
     libsdbus-c++-dev dbus-daemon dbus-bin procps
     libgtest-dev libgmock-dev libbenchmark-dev help2man
     python3-dev pybind11-dev python3-numpy python3-pytest

@@ -310,6 +310,7 @@ TEST_F(RegistryTest, CorruptFileGivesAnErrorNamingItAndStaysUntouched) {
     } catch (const nxbase::RegistryError& error) {
         EXPECT_NE(std::string(error.what()).find(file), std::string::npos) << error.what();
         EXPECT_NE(std::string(error.what()).find("corrupt"), std::string::npos) << error.what();
+        EXPECT_EQ(error.GetKind(), nxbase::RegistryErrorKind::kCorrupt);
     }
     EXPECT_THROW(RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Log", "Startup", "1"),
                  nxbase::RegistryError);
@@ -319,8 +320,12 @@ TEST_F(RegistryTest, CorruptFileGivesAnErrorNamingItAndStaysUntouched) {
     const std::string foreign = dir.File("foreign.sqlite");
     nxtest::ScopedEnv other("NXBASE_USER_REGISTRY", foreign);
     ASSERT_EQ(std::system(("sqlite3 '" + foreign + "' 'CREATE TABLE t(a)'").c_str()), 0);
-    EXPECT_THROW(RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup"),
-                 nxbase::RegistryError);
+    try {
+        RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup");
+        ADD_FAILURE() << "no exception";
+    } catch (const nxbase::RegistryError& error) {
+        EXPECT_EQ(error.GetKind(), nxbase::RegistryErrorKind::kCorrupt) << error.what();
+    }
 }
 
 TEST_F(RegistryTest, Regedit4ExportImportRoundTripKeepsEscapesAndDwords) {

@@ -3,6 +3,8 @@
 // "MetamerieTL1", "MetamerieTL2" (illuminant names of the metamerism test),
 // "DirectLightPart" (decimal, default "0.5") and "MeasurementDisplay" ("Eye"
 // or "Instrument"). Created on first use on the main thread; not locked.
+// Part of the colorimetry family, as it speaks of illuminants: configuration
+// code below it does not include it.
 #ifndef NXBASE_APPSETTI_H_
 #define NXBASE_APPSETTI_H_
 

@@ -19,6 +19,7 @@
 #include <cstddef>
 
 #include "nxbase/export.h"
+#include "nxbase/spectralgrid.h"
 
 class CMetryFilter;
 class MeasuringCondition;
@@ -42,7 +43,7 @@ struct BatchTables {
 // grid, with the sums the filters report for them.
 struct NXBASE_EXPORT BatchWeights {
     static constexpr int kChannels = 3;
-    static constexpr int kSamples = 36;
+    static constexpr int kSamples = kSpectrumSize;
     float weights[kChannels][kSamples] = {};
     float sums[kChannels] = {};  // sum of each table; sums[1] scales Y of white to 100
 };

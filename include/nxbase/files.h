@@ -19,20 +19,10 @@ NXBASE_EXPORT String MakeValidFileName(const String& asName);
 namespace nxbase {
 
 // Writes `content` as the whole of the file at `path`, so that the file is
-// either the old one or the complete new one, never a part:
-// - a regular file (or a missing one) is replaced through a temporary file
-//   in its directory, synced and renamed over it; an existing file keeps its
-//   permissions and its owner. The file is rewritten in place instead, which
-//   is not atomic, when it has more than one hard link (so that every name
-//   sees the new content), when its owner cannot be given to the
-//   replacement, or when the directory cannot take the temporary file but
-//   the file itself is writable.
-// - a symbolic link is followed to its final target, which is replaced as
-//   above; the link stays a link.
-// - anything else (a FIFO, a terminal, /dev/null, /dev/full) is opened and
-//   written directly, never replaced by a plain file.
-// Every write is checked; throws std::runtime_error naming the file and the
-// reason on failure, leaving no temporary file behind.
+// either the old one or the complete new one, never a part (links, owners,
+// permissions and special files as toolkit::ReplaceFile says). Throws
+// std::runtime_error "cannot write <path>: <reason>" on failure, leaving no
+// temporary file behind.
 NXBASE_EXPORT void WriteWholeFile(const std::string& path, std::string_view content);
 
 // The directory of the data files shipped with the library (the texts in

@@ -43,15 +43,26 @@ typedef HKEY__* HKEY;
 
 namespace nxbase {
 
-// A store failure: the text names the hive file and the cause; Code() is the
-// SQLite result code, or 0 when the failure is not SQLite's.
+// What went wrong in the store, independent of the database underneath.
+enum class RegistryErrorKind {
+    kNotWritable,    // the hive file or its directory may not be written (or read) by this user
+    kCorrupt,        // the file is damaged or no registry database
+    kInvalidHandle,  // a handle that names no hive
+    kOther,          // anything else: full disk, I/O error, busy for too long, ...
+};
+
+// A store failure: the text names the hive file and the cause; GetKind() says
+// what kind of failure it is, Code() the database's own result code (0 when
+// the failure is not the database's).
 class NXBASE_EXPORT RegistryError : public std::runtime_error {
   public:
-    RegistryError(long code, const std::string& message)
-        : std::runtime_error(message), amCode(code) {}
+    RegistryError(RegistryErrorKind kind, long code, const std::string& message)
+        : std::runtime_error(message), amKind(kind), amCode(code) {}
+    RegistryErrorKind GetKind() const { return amKind; }
     long Code() const { return amCode; }
 
   private:
+    RegistryErrorKind amKind = RegistryErrorKind::kOther;
     long amCode = 0;
 };
 
@@ -171,8 +182,6 @@ class NXBASE_EXPORT RegistryHandler {
     // True only inside the maker's two branches (upper-cased sub key contains
     // "SOFTWARE\VELTRAMOND" or "SOFTWARE\K-LUME").
     static bool CanDeleteEntry(const RegistryEntry& axEntry);
-    // Throws RegistryError for a non-zero result.
-    static void HandleResult(long alResult);
 
     static std::string smRootPath;
     friend class HKeyHolder;

@@ -50,12 +50,10 @@
 #include <vector>
 
 #include "nxbase/export.h"
+#include "nxbase/spectralgrid.h"
 
 namespace nxbase {
 
-constexpr int kSpectrumSize = 36;
-constexpr int kFirstWavelength = 380;
-constexpr int kWavelengthStep = 10;
 // Longest line accepted; a longer one ends the reading with an error.
 constexpr std::size_t kMaxLineLength = 64 * 1024;
 // Most id fields a row may have before its values.

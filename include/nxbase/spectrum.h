@@ -15,6 +15,7 @@
 
 #include "nxbase/export.h"
 #include "nxbase/meascond.h"
+#include "nxbase/spectralgrid.h"
 
 // Additional information a reflectance spectrum carries, one object per type.
 // Concrete kinds are defined by the applications.
@@ -32,9 +33,9 @@ public:
 
 class NXBASE_EXPORT Spectrum {
 public:
-    static constexpr int kSize = 36;
-    static constexpr int kFirstWavelength = 380;
-    static constexpr int kStep = 10;
+    static constexpr int kSize = nxbase::kSpectrumSize;
+    static constexpr int kFirstWavelength = nxbase::kFirstWavelength;
+    static constexpr int kStep = nxbase::kWavelengthStep;
 
     // All values 0.0.
     Spectrum() = default;

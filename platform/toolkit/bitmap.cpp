@@ -1,60 +1,18 @@
 #include "toolkit/bitmap.h"
 
 #include <png.h>
-#include <stdio.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
 #include <cstring>
+#include <string>
+
+#include "toolkit/fileio.h"
 
 namespace {
 
 int ClampSide(int side) {
     return std::clamp(side, 0, Bitmap::kMaxSide);
 }
-
-// A file written beside `path` and renamed over it on Commit(); removed when
-// the write is abandoned.
-class AtomicFile {
-  public:
-    explicit AtomicFile(const std::string& path) : path_(path) {
-        std::string pattern = path + ".XXXXXX";
-        std::vector<char> name(pattern.begin(), pattern.end());
-        name.push_back('\0');
-        int fd = ::mkstemp(name.data());
-        if (fd < 0) return;
-        temp_ = name.data();
-        file_ = ::fdopen(fd, "wb");
-        if (file_ == nullptr) ::close(fd);
-    }
-    ~AtomicFile() {
-        if (file_ != nullptr) std::fclose(file_);
-        if (!temp_.empty()) ::unlink(temp_.c_str());
-    }
-    AtomicFile(const AtomicFile&) = delete;
-    AtomicFile& operator=(const AtomicFile&) = delete;
-
-    FILE* Get() const { return file_; }
-
-    bool Commit() {
-        if (file_ == nullptr) return false;
-        bool ok = std::fflush(file_) == 0 && ::fsync(::fileno(file_)) == 0;
-        ok = (std::fclose(file_) == 0) && ok;
-        file_ = nullptr;
-        if (!ok) return false;
-        ::chmod(temp_.c_str(), 0644);
-        if (::rename(temp_.c_str(), path_.c_str()) != 0) return false;
-        temp_.clear();
-        return true;
-    }
-
-  private:
-    std::string path_;
-    std::string temp_;
-    FILE* file_ = nullptr;
-};
 
 }  // namespace
 
@@ -118,11 +76,15 @@ bool Bitmap::WritePNG(const std::string& path) const {
     image.height = static_cast<png_uint_32>(height_);
     image.format = alpha ? PNG_FORMAT_RGBA : PNG_FORMAT_RGB;
 
-    AtomicFile file(path);
-    if (file.Get() == nullptr) return false;
-    int ok = png_image_write_to_stdio(&image, file.Get(), 0, rows.data(), 0, nullptr);
+    // Encoded in memory first (once to learn the size), then the file is
+    // replaced as a whole: a failed write leaves the old picture.
+    png_alloc_size_t size = 0;
+    if (!png_image_write_to_memory(&image, nullptr, &size, 0, rows.data(), 0, nullptr)) return false;
+    std::string encoded(size, '\0');
+    const int ok = png_image_write_to_memory(&image, encoded.data(), &size, 0, rows.data(), 0, nullptr);
     png_image_free(&image);
-    return ok != 0 && file.Commit();
+    std::string why;
+    return ok != 0 && toolkit::ReplaceFile(path, std::string_view(encoded.data(), size), why);
 }
 
 bool Bitmap::ReadPNG(const std::string& path, Bitmap& bitmap) {

@@ -19,6 +19,7 @@
 #include <mutex>
 #include <vector>
 
+#include "toolkit/fileio.h"
 #include "toolkit/system.h"
 
 namespace {
@@ -137,21 +138,6 @@ bool ReadWhole(const std::string& path, std::string& text, FileId& id, std::stri
         text.append(buffer, static_cast<std::size_t>(n));
     }
     id = FileId::Of(st);
-    return true;
-}
-
-bool WriteAll(int fd, const std::string& bytes) {
-    const char* p = bytes.data();
-    std::size_t left = bytes.size();
-    while (left > 0) {
-        ssize_t n = ::write(fd, p, left);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return false;
-        }
-        p += n;
-        left -= static_cast<std::size_t>(n);
-    }
     return true;
 }
 
@@ -308,10 +294,11 @@ struct Config::Impl {
         return false;
     }
 
-    // The write protocol: lock, re-read, change, write a temporary file,
-    // fsync, rename over the file. The directory is not synced: after a power
-    // loss the rename may be lost, which leaves the old file, never a torn one. `change` returns
-    // false when the file needs no rewrite.
+    // The write protocol: lock, re-read, change, replace the file (a
+    // temporary file synced and renamed over it). The directory is not
+    // synced: after a power loss the rename may be lost, which leaves the old
+    // file, never a torn one. `change` returns false when the file needs no
+    // rewrite. The lock is held until the new file's identity is read.
     template <class Change>
     bool Modify(Change change) {
         lastError.clear();
@@ -352,41 +339,10 @@ struct Config::Impl {
         if (StartsWithBom(out)) out.insert(0, "\n");
         if (loose.signature) out.insert(0, kBom);
 
-        // One temporary name per file: only the holder of the lock writes it,
-        // and a leftover from a killed writer is simply overwritten.
-        const std::string temp = target + ".tmp";
-        Fd file(::open(temp.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
-        if (file.get() < 0) return Fail(ErrnoText("cannot create the temporary file"));
-        bool ok = true;
-        std::string reason;
-        if (oldId.exists) {
-            struct stat st {};
-            if (::stat(target.c_str(), &st) == 0) (void)::fchmod(file.get(), st.st_mode & 07777);
-        }
-        if (!WriteAll(file.get(), out)) {
-            ok = false;
-            reason = ErrnoText("cannot write the temporary file");
-        } else if (::fsync(file.get()) != 0) {
-            ok = false;
-            reason = ErrnoText("cannot flush the temporary file");
-        }
+        std::string why;
+        if (!toolkit::ReplaceFile(target, out, why)) return Fail(why);
         struct stat written {};
-        if (ok && ::fstat(file.get(), &written) != 0) {
-            ok = false;
-            reason = ErrnoText("fstat");
-        }
-        if (::close(file.Release()) != 0 && ok) {
-            ok = false;
-            reason = ErrnoText("cannot close the temporary file");
-        }
-        if (ok && ::rename(temp.c_str(), target.c_str()) != 0) {
-            ok = false;
-            reason = ErrnoText("cannot replace the file");
-        }
-        if (!ok) {
-            ::unlink(temp.c_str());
-            return Fail(reason);
-        }
+        if (::stat(target.c_str(), &written) != 0) return Fail(ErrnoText("cannot read the written file"));
         // Values are stored trimmed, so the saved text reads back as `fresh`.
         ini = std::move(fresh);
         id = FileId::Of(written);

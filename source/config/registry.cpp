@@ -51,7 +51,9 @@ std::string BelowRoot(const std::string& asSubKey) {
 // The hive of a handle, or a store error for anything else.
 RegistryHive RequireHive(HKEY axHKey) {
     std::optional<RegistryHive> hive = HiveOf(axHKey);
-    if (!hive) throw RegistryError(kInvalidHandle, "Not a registry hive handle");
+    if (!hive) {
+        throw RegistryError(nxbase::RegistryErrorKind::kInvalidHandle, kInvalidHandle, "Not a registry hive handle");
+    }
     return *hive;
 }
 
@@ -93,16 +95,7 @@ void CreateKeyForReading(RegistryHive axHive, const std::string& asKey) {
     try {
         RegistryStore::CreateKey(axHive, ToHive(asKey));
     } catch (const RegistryError& error) {
-        switch (error.Code() & 0xFF) {
-            case 0:   // a directory that cannot be made
-            case 3:   // SQLITE_PERM
-            case 8:   // SQLITE_READONLY
-            case 14:  // SQLITE_CANTOPEN
-            case 23:  // SQLITE_AUTH
-                return;
-            default:
-                throw;
-        }
+        if (error.GetKind() != nxbase::RegistryErrorKind::kNotWritable) throw;
     }
 }
 
@@ -327,12 +320,6 @@ bool RegistryHandler::CanDeleteEntry(const RegistryEntry& axEntry) {
     std::string subKey = nxbase::Upper(axEntry.GetSubKey());
     return subKey.find("SOFTWARE\\VELTRAMOND") != std::string::npos ||
            subKey.find("SOFTWARE\\K-LUME") != std::string::npos;
-}
-
-void RegistryHandler::HandleResult(long alResult) {
-    if (alResult == 0) return;
-    throw nxbase::RegistryError(
-        alResult, "Registry operation failed (code " + std::to_string(alResult) + ")");
 }
 
 // ---- full paths ----

@@ -204,6 +204,22 @@ class Connection {
     std::array<sqlite3_stmt*, kStatementCount> amStatements{};
 };
 
+// The kind of failure an SQLite result code stands for.
+RegistryErrorKind KindOf(int alResult) {
+    switch (alResult & 0xFF) {
+        case SQLITE_PERM:
+        case SQLITE_READONLY:
+        case SQLITE_CANTOPEN:
+        case SQLITE_AUTH:
+            return RegistryErrorKind::kNotWritable;
+        case SQLITE_CORRUPT:
+        case SQLITE_NOTADB:
+            return RegistryErrorKind::kCorrupt;
+        default:
+            return RegistryErrorKind::kOther;
+    }
+}
+
 [[noreturn]] void Fail(const Connection& axConnection, int alResult, const std::string& asWhat) {
     int primary = alResult & 0xFF;
     std::string message = "Registry database '" + axConnection.File() + "': ";
@@ -215,7 +231,7 @@ class Connection {
             axConnection.Db() ? sqlite3_errmsg(axConnection.Db()) : sqlite3_errstr(alResult);
         message += asWhat + ": " + detail;
     }
-    throw RegistryError(alResult, message);
+    throw RegistryError(KindOf(alResult), alResult, message);
 }
 
 // Resets a statement when the scope ends, so that it holds no read lock.
@@ -275,8 +291,9 @@ void PrepareSchema(Connection& axConnection) {
         applicationId = axConnection.QueryInt("PRAGMA application_id", "cannot read");
         PauseBetweenCheckAndCreate();
         if (applicationId != kApplicationId && (applicationId != 0 || tables != 0)) {
-            throw RegistryError(0, "Registry database '" + axConnection.File() +
-                                       "': the file is not a registry database");
+            throw RegistryError(RegistryErrorKind::kCorrupt, 0,
+                                "Registry database '" + axConnection.File() +
+                                    "': the file is not a registry database");
         }
         // Ours by now, or an empty file opened read-only: it reads as empty.
         if (applicationId == 0 && writable) {
@@ -355,8 +372,9 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
         std::error_code error;
         if (!parent.empty()) std::filesystem::create_directories(parent, error);
         if (error) {
-            throw RegistryError(0, "Registry database '" + asFile +
-                                       "': cannot create its directory: " + error.message());
+            throw RegistryError(RegistryErrorKind::kNotWritable, 0,
+                                "Registry database '" + asFile +
+                                    "': cannot create its directory: " + error.message());
         }
     }
     int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (abCreate ? SQLITE_OPEN_CREATE : 0);
@@ -445,7 +463,7 @@ Connection* Connect(RegistryHive axHive, bool abForWrite) {
     std::unique_ptr<Connection> connection = Open(file, axHive, abForWrite);
     if (!connection) return nullptr;
     if (abForWrite && !connection->Writable()) {
-        throw RegistryError(SQLITE_READONLY,
+        throw RegistryError(RegistryErrorKind::kNotWritable, SQLITE_READONLY,
                             "Registry database '" + file + "': the file cannot be written");
     }
     if (connections.size() >= kMaxCachedConnections) connections.erase(connections.begin());
@@ -763,7 +781,7 @@ void RegistryStore::Apply(const std::vector<Change>& axChanges) {
         } catch (const RegistryError& error) {
             if (i == 0) throw;
             // The first hive is committed already: say exactly what happened.
-            throw RegistryError(error.Code(), std::string(HiveName(hives[0])) +
+            throw RegistryError(error.GetKind(), error.Code(), std::string(HiveName(hives[0])) +
                                                   " was written; " + HiveName(hives[i]) +
                                                   " was not: " + error.what());
         }

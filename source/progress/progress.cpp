@@ -11,6 +11,7 @@
 
 #include "nxbase/check.h"
 #include "toolkit/application.h"
+#include "toolkit/fileio.h"
 
 namespace {
 
@@ -39,7 +40,7 @@ void CheckProgress(double axProgress) {
         Check::AssertFailed("axProgress >= 0.0 && axProgress <= 1.0", kSource, __LINE__);
 }
 
-// Terminal seam: the only operating-system calls of the progress family.
+// Terminal seam: the progress family's own operating-system calls.
 namespace term {
 
 bool IsTerminal(int fd) {
@@ -50,20 +51,6 @@ std::size_t Width(int fd) {
     struct winsize size {};
     if (::ioctl(fd, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) return size.ws_col;
     return kDefaultTerminalWidth;
-}
-
-void WriteAll(int fd, const std::string& bytes) {
-    const char* data = bytes.data();
-    std::size_t left = bytes.size();
-    while (left > 0) {
-        ssize_t written = ::write(fd, data, left);
-        if (written < 0) {
-            if (errno == EINTR) continue;
-            return;  // a progress bar is not worth an error
-        }
-        data += written;
-        left -= static_cast<std::size_t>(written);
-    }
 }
 
 }  // namespace term
@@ -347,7 +334,7 @@ TerminalProgressListener::TerminalProgressListener(std::string asLabel, int axFd
 
 TerminalProgressListener::~TerminalProgressListener() {
     std::lock_guard<std::mutex> lock(amMutex);
-    if (amLineOpen) term::WriteAll(amFd, "\n");
+    if (amLineOpen) (void)toolkit::WriteAll(amFd, "\n");
 }
 
 void TerminalProgressListener::SetTotal(std::uint64_t axTotal, std::string asUnit) {
@@ -364,7 +351,7 @@ void TerminalProgressListener::SetMinimalInterval(std::chrono::milliseconds axIn
 void TerminalProgressListener::ResetProgress() {
     ProgressListener::ResetProgress();
     std::lock_guard<std::mutex> lock(amMutex);
-    if (amLineOpen) term::WriteAll(amFd, "\n");
+    if (amLineOpen) (void)toolkit::WriteAll(amFd, "\n");
     amLineOpen = false;
     amStartTime = std::chrono::steady_clock::now();
     amLastDraw = {};
@@ -413,7 +400,7 @@ void TerminalProgressListener::DrawLocked(double axProgress) {
     } else {
         amLineOpen = true;
     }
-    term::WriteAll(amFd, line);
+    (void)toolkit::WriteAll(amFd, line);  // a progress bar is not worth an error
 }
 
 std::string TerminalProgressListener::FormatDuration(double axSeconds) {

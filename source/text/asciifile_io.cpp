@@ -9,7 +9,10 @@
 #include <cstring>
 #include <istream>
 #include <streambuf>
+#include <string_view>
 #include <vector>
+
+#include "toolkit/fileio.h"
 
 namespace nxbase::detail {
 
@@ -32,17 +35,6 @@ ssize_t ReadRetrying(int fd, char* data, std::size_t size) {
         n = ::read(fd, data, size);
     } while (n < 0 && errno == EINTR);
     return n;
-}
-
-bool WriteAll(int fd, const char* data, std::size_t size) {
-    while (size > 0) {
-        ssize_t n = ::write(fd, data, size);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        data += n;
-        size -= static_cast<std::size_t>(n);
-    }
-    return true;
 }
 
 bool FsyncRetrying(int fd) {
@@ -162,7 +154,7 @@ private:
 
     bool Write(const char* data, std::size_t size) {
         if (size == 0) return true;
-        if (fd_ >= 0 && WriteAll(fd_, data, size)) {
+        if (fd_ >= 0 && toolkit::WriteAll(fd_, std::string_view(data, size))) {
             written_ += size;
             return true;
         }

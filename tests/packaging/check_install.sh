@@ -14,6 +14,11 @@ cmake -S "$source_dir/examples/consumer" -B "$work/consumer" -G Ninja \
       -DCMAKE_PREFIX_PATH="$work/prefix" -DCMAKE_CXX_FLAGS="$cxx_flags" \
       -DCMAKE_EXE_LINKER_FLAGS="$cxx_flags" > "$work/configure.log"
 cmake --build "$work/consumer" > "$work/build.log"
+# A consumer that asks for C++14 gets the C++17 the headers need from the target.
+cmake -S "$source_dir/examples/consumer" -B "$work/consumer14" -G Ninja -DCMAKE_CXX_STANDARD=14 \
+      -DCMAKE_PREFIX_PATH="$work/prefix" -DCMAKE_CXX_FLAGS="$cxx_flags" \
+      -DCMAKE_EXE_LINKER_FLAGS="$cxx_flags" > "$work/configure14.log"
+cmake --build "$work/consumer14" > "$work/build14.log"
 LD_LIBRARY_PATH="$work/prefix/lib:$work/prefix/lib/x86_64-linux-gnu" NXBASE_LOG_PATH="$work/log.txt" \
     "$work/consumer/consumer"
 grep -q "consumer started" "$work/log.txt"

@@ -11,16 +11,17 @@
 #include <boost/shared_ptr.hpp>
 
 #include "nxbase/export.h"
+#include "nxbase/spectralgrid.h"
 
 namespace klume {
 namespace cmetry {
 
 // The grid on which weights and density products are delivered: 36 samples,
 // 380..730 nm in 10 nm steps (index i is 380 + 10 i nm).
-constexpr int kSampleCount = 36;
-constexpr int kFirstWavelength = 380;
-constexpr int kLastWavelength = 730;
-constexpr int kWavelengthStep = 10;
+constexpr int kSampleCount = nxbase::kSpectrumSize;
+constexpr int kFirstWavelength = nxbase::kFirstWavelength;
+constexpr int kLastWavelength = nxbase::kLastWavelength;
+constexpr int kWavelengthStep = nxbase::kWavelengthStep;
 
 using SampleTable = std::array<double, kSampleCount>;
 

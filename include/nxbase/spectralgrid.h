@@ -1,0 +1,16 @@
+// The spectral grid of the family's spectra: 36 samples, 380..730 nm in
+// 10 nm steps (sample i at 380 + 10 i nm). Every spectrum, weight table and
+// file of the library uses it; other grids are brought onto it first.
+#ifndef NXBASE_SPECTRALGRID_H_
+#define NXBASE_SPECTRALGRID_H_
+
+namespace nxbase {
+
+constexpr int kSpectrumSize = 36;
+constexpr int kFirstWavelength = 380;
+constexpr int kWavelengthStep = 10;
+constexpr int kLastWavelength = kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1);
+
+}  // namespace nxbase
+
+#endif  // NXBASE_SPECTRALGRID_H_

@@ -1,0 +1,128 @@
+#include "toolkit/fileio.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstring>
+#include <vector>
+
+namespace toolkit {
+
+bool WriteAll(int fd, std::string_view bytes) {
+    while (!bytes.empty()) {
+        const ssize_t n = ::write(fd, bytes.data(), bytes.size());
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) {
+            if (n == 0) errno = EIO;
+            return false;
+        }
+        bytes.remove_prefix(static_cast<std::size_t>(n));
+    }
+    return true;
+}
+
+namespace {
+
+// A failed step: "what: reason".
+bool Failed(std::string& why, const char* what, int error) {
+    why = std::string(what) + ": " + std::strerror(error);
+    return false;
+}
+
+// The file a path names after following every symbolic link; the path
+// itself when it is no link. A dangling link gives its (missing) target.
+bool FinalTarget(const std::string& path, std::string& target, std::string& why) {
+    target = path;
+    for (int hops = 0; hops < 40; ++hops) {
+        struct stat info {};
+        if (::lstat(target.c_str(), &info) != 0 || !S_ISLNK(info.st_mode)) return true;
+        std::vector<char> buffer(PATH_MAX + 1);
+        const ssize_t n = ::readlink(target.c_str(), buffer.data(), PATH_MAX);
+        if (n < 0) return Failed(why, "cannot read the link", errno);
+        std::string next(buffer.data(), static_cast<std::size_t>(n));
+        if (next.empty() || next[0] != '/') {
+            const std::size_t slash = target.rfind('/');
+            next = (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) + next;
+        }
+        target = next;
+    }
+    return Failed(why, "too many symbolic links", ELOOP);
+}
+
+bool WriteDirectly(const std::string& path, std::string_view content, bool truncate, std::string& why) {
+    const int fd = ::open(path.c_str(), O_WRONLY | O_CLOEXEC | O_NOCTTY | (truncate ? O_TRUNC : 0));
+    if (fd < 0) return Failed(why, "cannot open", errno);
+    bool written = WriteAll(fd, content);
+    int error = errno;
+    if (::close(fd) != 0 && written) {
+        written = false;
+        error = errno;
+    }
+    return written || Failed(why, "write failed", error);
+}
+
+mode_t DefaultMode() {
+    const mode_t mask = ::umask(0);
+    ::umask(mask);
+    return static_cast<mode_t>(0666 & ~mask);
+}
+
+}  // namespace
+
+bool ReplaceFile(const std::string& path, std::string_view content, std::string& why) {
+    std::string target;
+    if (!FinalTarget(path, target, why)) return false;
+    struct stat info {};
+    const bool exists = ::stat(target.c_str(), &info) == 0;
+    if (exists && !S_ISREG(info.st_mode)) {
+        if (S_ISDIR(info.st_mode)) return Failed(why, "it is a directory", EISDIR);
+        return WriteDirectly(target, content, false, why);
+    }
+    // A second name of the file would keep the old content after a rename:
+    // a hard-linked file is rewritten where it is.
+    if (exists && info.st_nlink > 1) return WriteDirectly(target, content, true, why);
+    const std::size_t slash = target.rfind('/');
+    const std::string temporary = (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) +
+                                  "." + target.substr(slash == std::string::npos ? 0 : slash + 1) + ".XXXXXX";
+    std::vector<char> name(temporary.begin(), temporary.end());
+    name.push_back('\0');
+    const int fd = ::mkostemp(name.data(), O_CLOEXEC);
+    if (fd < 0) {
+        // A directory closed to us can still hold a file we may write.
+        if (exists && (errno == EACCES || errno == EPERM || errno == EROFS) &&
+            ::access(target.c_str(), W_OK) == 0) {
+            return WriteDirectly(target, content, true, why);
+        }
+        return Failed(why, "cannot create a temporary file beside it", errno);
+    }
+    // The replacement belongs to whoever owned the file (root writing a
+    // user's file). Where we may not give it away, the file is rewritten in
+    // place, which keeps its owner.
+    if (exists && (info.st_uid != ::geteuid() || info.st_gid != ::getegid()) &&
+        ::fchown(fd, info.st_uid, info.st_gid) != 0) {
+        ::close(fd);
+        ::unlink(name.data());
+        return WriteDirectly(target, content, true, why);
+    }
+    const mode_t mode = exists ? (info.st_mode & 07777) : DefaultMode();
+    bool ok = ::fchmod(fd, mode) == 0 && WriteAll(fd, content) && ::fsync(fd) == 0;
+    int error = errno;
+    if (::close(fd) != 0 && ok) {
+        ok = false;
+        error = errno;
+    }
+    if (ok && ::rename(name.data(), target.c_str()) != 0) {
+        ok = false;
+        error = errno;
+    }
+    if (!ok) {
+        ::unlink(name.data());
+        return Failed(why, "write failed", error);
+    }
+    return true;
+}
+
+}  // namespace toolkit
