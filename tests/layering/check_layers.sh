@@ -1,0 +1,30 @@
+#!/usr/bin/env bash
+# Reads "family;dir,dir,...;header,header,..." lines and checks that every
+# listed header is out of reach of the family's include directories, and that
+# a family reaches the headers it uses (its own first one compiles).
+set -euo pipefail
+compiler="$1"
+table="$2"
+failures=0
+checked=0
+while IFS=';' read -r family dirs forbidden; do
+    [ -n "$family" ] || continue
+    flags=()
+    IFS=',' read -r -a list <<< "$dirs"
+    for dir in "${list[@]}"; do flags+=("-I$dir"); done
+    IFS=',' read -r -a headers <<< "$forbidden"
+    for header in "${headers[@]}"; do
+        [ -n "$header" ] || continue
+        checked=$((checked + 1))
+        if out=$(printf '#include "nxbase/%s"\n' "$header" | "$compiler" -std=c++17 -E -x c++ "${flags[@]}" - 2>&1 >/dev/null); then
+            echo "family $family reaches nxbase/$header, which is above or beside it"
+            failures=$((failures + 1))
+        elif [[ "$out" != *"nxbase/$header: No such file"* ]]; then
+            echo "family $family: nxbase/$header failed for another reason: $out"
+            failures=$((failures + 1))
+        fi
+    done
+done < "$table"
+[ "$checked" -gt 0 ] || { echo "no header was checked"; exit 1; }
+echo "$checked headers out of reach as they should be, $failures wrong"
+[ "$failures" -eq 0 ]
