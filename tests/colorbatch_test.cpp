@@ -167,10 +167,10 @@ TEST(ColorBatch, OneCallFormsAndWhitePointMatchTheFilter) {
     SpectraToLab(condition, white.data(), 1, lab);
     const ColorBatch batch(condition);
     // The A/10 degree white point of the reference weights.
-    EXPECT_NEAR(batch.WhitePoint(0), 111.14224728562849, 5e-4);
-    EXPECT_NEAR(batch.WhitePoint(2), 35.20615588398067, 5e-4);
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(xyz[i], batch.WhitePoint(i), 1e-4);
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, 1e-4);
+    EXPECT_NEAR(batch.WhitePoint(0), 111.14224728562849, nxtest::kFloatSumAgainstDouble);
+    EXPECT_NEAR(batch.WhitePoint(2), 35.20615588398067, nxtest::kFloatSumAgainstDouble);
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(xyz[i], batch.WhitePoint(i), nxtest::kFloatAtHundred);
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
 }
 
 TEST(ColorBatch, CubeRootIsAccurateOverTheLabRange) {

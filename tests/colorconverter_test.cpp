@@ -12,6 +12,7 @@
 
 #include "nxbase/iccprofile.h"
 #include "nxbase/text.h"
+#include "color_test_util.h"
 #include "test_util.h"
 
 namespace {
@@ -38,14 +39,14 @@ ReflectanceSpectrum Flat(float value) {
 
 TEST(RGBVector, WhiteAndBlackSpectraGiveFullAndNoIntensity) {
     RGBVector white(Flat(1.0f));
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(white[i], 100.0f, 1.0f) << i;
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(white[i], 100.0f, nxtest::kOneDisplayLevel) << i;
     RGBVector black(Flat(0.0f));
     for (int i = 0; i < 3; ++i) EXPECT_EQ(black[i], 0.0f) << i;
     // Components are whole display levels: level * 100/255.
     RGBVector grey(Flat(0.2f));
     for (int i = 0; i < 3; ++i) {
         float level = grey[i] / 0.3921568691730499f;
-        EXPECT_NEAR(level, std::round(level), 1e-3f);
+        EXPECT_NEAR(level, std::round(level), nxtest::kFloatTwoStagesAtHundred);
     }
     EXPECT_GT(grey[1], black[1]);
     EXPECT_LT(grey[1], white[1]);

@@ -10,6 +10,7 @@
 
 #include <lcms2.h>
 
+#include "color_test_util.h"
 #include "nxbase/adaptation.h"
 #include "nxbase/colordiff.h"
 #include "nxbase/colorvector.h"
@@ -34,8 +35,8 @@ TEST(ColorDifference, Ciede2000ReproducesTheSharmaPairs) {
         const LabValue b{v[4], v[5], v[6]};
         const double forward = nxbase::DeltaE2000(a, b);
         worst = std::max(worst, std::fabs(forward - v[7]));
-        EXPECT_NEAR(forward, v[7], 1e-4) << "pair " << v[0];
-        EXPECT_NEAR(nxbase::DeltaE2000(b, a), forward, 1e-12) << "symmetric, pair " << v[0];
+        EXPECT_NEAR(forward, v[7], nxtest::kPublished4Decimals) << "pair " << v[0];
+        EXPECT_NEAR(nxbase::DeltaE2000(b, a), forward, nxtest::kDoubleReordered) << "symmetric, pair " << v[0];
         ++pairs;
     }
     EXPECT_EQ(pairs, 34);
@@ -46,7 +47,7 @@ TEST(ColorDifference, Ciede2000ReproducesTheSharmaPairs) {
     EXPECT_EQ(parts.dL, 0.0);
     EXPECT_GT(parts.dC, 0.0) << "sample minus reference";
     EXPECT_NEAR(nxbase::DeltaE2000({60, 10, 10}, {61, 10, 10}, {2.0, 1.0, 1.0}),
-                0.5 * nxbase::DeltaE2000({60, 10, 10}, {61, 10, 10}), 1e-12);
+                0.5 * nxbase::DeltaE2000({60, 10, 10}, {61, 10, 10}), nxtest::kDoubleReordered);
 }
 
 TEST(ColorDifference, AgreesWithLittleCms) {
@@ -83,7 +84,7 @@ TEST(ColorDifference, NamesAndVectorsAndBatch) {
     EXPECT_FALSE(nxbase::ParseDeltaEMethod(nullptr, &method));
     const MeasuringCondition condition;
     const LABVector a(50.0f, 10.0f, 20.0f, condition), b(52.0f, 9.0f, 23.0f, condition);
-    EXPECT_NEAR(nxbase::DeltaEab(a, b), std::sqrt(4.0 + 1.0 + 9.0), 1e-6);
+    EXPECT_NEAR(nxbase::DeltaEab(a, b), std::sqrt(4.0 + 1.0 + 9.0), nxtest::kFloatNearTen);
     EXPECT_DOUBLE_EQ(nxbase::DeltaE2000(a, b), nxbase::DeltaE2000(nxbase::ToLabValue(a), nxbase::ToLabValue(b)));
     EXPECT_GT(nxbase::DeltaE94(a, b, nxbase::Cie94Application::kTextiles), 0.0);
 
@@ -91,7 +92,7 @@ TEST(ColorDifference, NamesAndVectorsAndBatch) {
     const float sample[6] = {50, 0, -82.7485f, 60, 0, 0};
     float out[2];
     nxbase::DeltaE2000Batch(reference, sample, 2, out);
-    EXPECT_NEAR(out[0], 2.0425, 1e-4);
+    EXPECT_NEAR(out[0], 2.0425, nxtest::kPublished4Decimals);
     EXPECT_EQ(out[1], 0.0f);
 }
 
@@ -105,27 +106,27 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
     const nxbase::Matrix3 b = nxbase::AdaptationMatrix(d65, d50, nxbase::AdaptationMethod::kBradford);
     for (int i = 0; i < 3; ++i) {
         for (int j = 0; j < 3; ++j) {
-            EXPECT_NEAR(b[i][j], bradford[i][j], 1e-6) << i << j;
+            EXPECT_NEAR(b[i][j], bradford[i][j], nxtest::kPublished7Decimals) << i << j;
         }
     }
     // The sRGB white adapted to the ICC D50 white.
     const nxbase::Tristimulus white = nxbase::Apply(
         nxbase::AdaptationMatrix(d65, {0.9642, 1.0, 0.8249}, nxbase::AdaptationMethod::kBradford), d65);
-    EXPECT_NEAR(white[0], 0.9642, 1e-4);
-    EXPECT_NEAR(white[1], 1.0, 1e-4);
-    EXPECT_NEAR(white[2], 0.8249, 1e-4);
+    EXPECT_NEAR(white[0], 0.9642, nxtest::kPublished4Decimals);
+    EXPECT_NEAR(white[1], 1.0, nxtest::kPublished4Decimals);
+    EXPECT_NEAR(white[2], 0.8249, nxtest::kPublished4Decimals);
 
     for (const char* name : {"xyz", "vonkries", "bradford", "CAT02"}) {
         nxbase::AdaptationMethod method{};
         ASSERT_TRUE(nxbase::ParseAdaptationMethod(name, &method)) << name;
         const nxbase::Matrix3 forward = nxbase::AdaptationMatrix(d65, d50, method);
         const nxbase::Tristimulus w = nxbase::Apply(forward, d65);
-        for (int c = 0; c < 3; ++c) EXPECT_NEAR(w[c], d50[c], 1e-12) << name;
+        for (int c = 0; c < 3; ++c) EXPECT_NEAR(w[c], d50[c], nxtest::kDoubleReordered) << name;
         // There and back is the identity.
         const nxbase::Tristimulus colour{0.2, 0.3, 0.4};
         const nxbase::Tristimulus back =
             nxbase::Apply(nxbase::AdaptationMatrix(d50, d65, method), nxbase::Apply(forward, colour));
-        for (int c = 0; c < 3; ++c) EXPECT_NEAR(back[c], colour[c], 1e-12) << name;
+        for (int c = 0; c < 3; ++c) EXPECT_NEAR(back[c], colour[c], nxtest::kDoubleReordered) << name;
     }
     EXPECT_THROW(nxbase::AdaptationMatrix({0, 0, 0}, d50), std::invalid_argument);
 
@@ -135,12 +136,12 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
     const MeasuringCondition underD50(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions());
     const nxbase::Tristimulus n65 = nxbase::WhitePointOf(underD65);
     const nxbase::Tristimulus n50 = nxbase::WhitePointOf(underD50);
-    EXPECT_NEAR(n65[0], 95.04, 0.05);
+    EXPECT_NEAR(n65[0], 95.04, nxtest::kWhiteOfGrid);
     const XYZVector adapted = nxbase::Adapt(
         XYZVector(static_cast<float>(n65[0]), static_cast<float>(n65[1]), static_cast<float>(n65[2]), underD65),
         underD50);
     EXPECT_TRUE(adapted.GetMeasuringCondition() == underD50);
-    for (int c = 0; c < 3; ++c) EXPECT_NEAR(adapted[c], n50[c], 1e-3);
+    for (int c = 0; c < 3; ++c) EXPECT_NEAR(adapted[c], n50[c], nxtest::kFloatTwoStagesAtHundred);
 }
 
 }  // namespace

@@ -85,16 +85,16 @@ TEST(ColorVector, ColorCheckerMatchesD50References) {
 TEST(ColorVector, WhiteSpectrumHasYOfHundredAndTheFilterWhitePoint) {
     const ReflectanceSpectrum white(1.0f, PhysicalConditions(ActualFilterClass(FILTER_POL)));
     const XYZVector xyz(white);
-    EXPECT_NEAR(xyz[1], 100.0f, 1e-4);
+    EXPECT_NEAR(xyz[1], 100.0f, nxtest::kFloatAtHundred);
     EXPECT_NEAR(xyz[0], 96.42379518406467, kXyzTolerance);
     EXPECT_NEAR(xyz[2], 82.51290003017643, kXyzTolerance);
     EXPECT_EQ(xyz.GetMeasuringCondition().GetPhysicalConditions().GetActualFilter(),
               ActualFilterClass(FILTER_POL));
     const LABVector lab(white);
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, 1e-4);
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
     const xyYVector xyY(white);
-    EXPECT_NEAR(xyY[0], 0.3457, 5e-4);  // D50 chromaticity
-    EXPECT_NEAR(xyY[1], 0.3585, 5e-4);
+    EXPECT_NEAR(xyY[0], 0.3457, nxtest::kChromaticityOfGrid);  // D50 chromaticity
+    EXPECT_NEAR(xyY[1], 0.3585, nxtest::kChromaticityOfGrid);
     EXPECT_EQ(xyY[2], xyz[1]);
 }
 
@@ -191,7 +191,7 @@ TEST(LABVector, LinearBranchesIncludeTheirBoundaries) {
     const double xn = 100.0 * filter.GetWeightSum(0) / sumY;
     const double linear = (0.206893034423 - 16.0 / 116.0) * xn / 7.787;
     const double cube = std::pow(0.206893034423, 3.0) * xn;
-    EXPECT_NEAR(back[0], linear, 5e-7);  // float rounding of a value near 0.85
+    EXPECT_NEAR(back[0], linear, nxtest::kFloatNearOne);
     EXPECT_GT(std::fabs(back[0] - cube), 3e-6) << "the cube branch differs by 4e-6";
 }
 
@@ -224,8 +224,8 @@ TEST(LChVector, HuesLieInZeroExclusiveToThreeSixtyInclusive) {
     EXPECT_FLOAT_EQ(hue(-1.0f, 0.0f), 180.0f);
     EXPECT_FLOAT_EQ(hue(-1.0f, -0.0f), 180.0f);  // atan2 gives -180, folded
     EXPECT_FLOAT_EQ(hue(0.0f, -1.0f), 270.0f);
-    EXPECT_NEAR(hue(1.0f, -0.01f), 359.427, 1e-3);
-    EXPECT_NEAR(hue(1.0f, 0.01f), 0.573, 1e-3);
+    EXPECT_NEAR(hue(1.0f, -0.01f), 359.427, nxtest::kPublished3Decimals);
+    EXPECT_NEAR(hue(1.0f, 0.01f), 0.573, nxtest::kPublished3Decimals);
 }
 
 TEST(LABVector, ValuesEnteredWhileDin99IsCurrentAreCielab) {
@@ -234,9 +234,9 @@ TEST(LABVector, ValuesEnteredWhileDin99IsCurrentAreCielab) {
     const LABVector entered(50, 10, 20, D50Condition());
     EXPECT_EQ(entered.GetLabVectorColorSpace(), LAB_CIE1976);
     const XYZVector xyz(entered);
-    EXPECT_NEAR(xyz[0], 19.70, 0.01);
-    EXPECT_NEAR(xyz[1], 18.42, 0.01);
-    EXPECT_NEAR(xyz[2], 8.51, 0.01);
+    EXPECT_NEAR(xyz[0], 19.70, nxtest::kPublished2Decimals);
+    EXPECT_NEAR(xyz[1], 18.42, nxtest::kPublished2Decimals);
+    EXPECT_NEAR(xyz[2], 8.51, nxtest::kPublished2Decimals);
 }
 
 TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
@@ -286,11 +286,11 @@ TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
 TEST(LCHmgVector, ForwardTransformHasItsFixedPoints) {
     EXPECT_FLOAT_EQ(LCHmgVector::LightnessToMg(10.0f), 10.0f / 0.511f);
     EXPECT_NEAR(LCHmgVector::LightnessToMg(50.0f),
-                (std::log(0.040975 * 50) + 0.01765 * 50) / 0.040975 + 34.7231, 1e-3);
-    EXPECT_NEAR(LCHmgVector::ChromaToMg(0.0f), 12.253 * std::log(0.638) + 5.50671, 1e-4);
+                (std::log(0.040975 * 50) + 0.01765 * 50) / 0.040975 + 34.7231, nxtest::kFloatTwoStagesAtHundred);
+    EXPECT_NEAR(LCHmgVector::ChromaToMg(0.0f), 12.253 * std::log(0.638) + 5.50671, nxtest::kFloatAtHundred);
     // The hue series is built so that 0 and 360 degrees map onto themselves.
-    EXPECT_NEAR(LCHmgVector::HueToMg(0.0f), 0.0f, 1e-3);
-    EXPECT_NEAR(LCHmgVector::HueToMg(360.0f), 360.0f, 1e-3);
+    EXPECT_NEAR(LCHmgVector::HueToMg(0.0f), 0.0f, nxtest::kFloatTwoStagesAtHundred);
+    EXPECT_NEAR(LCHmgVector::HueToMg(360.0f), 360.0f, nxtest::kFloatTwoStagesAtHundred);
     float previous = LCHmgVector::HueToMg(0.0f);
     for (int h = 1; h <= 360; ++h) {
         const float next = LCHmgVector::HueToMg(static_cast<float>(h));
@@ -299,8 +299,8 @@ TEST(LCHmgVector, ForwardTransformHasItsFixedPoints) {
     }
     const LABmgVector labmg(LCHmgVector(LChVector(60.0f, 30.0f, 90.0f, MeasuringCondition())));
     const float hmg = LCHmgVector::HueToMg(90.0f);
-    EXPECT_NEAR(labmg[1], LCHmgVector::ChromaToMg(30.0f) * std::cos(hmg * M_PI / 180.0), 1e-4);
-    EXPECT_NEAR(labmg[2], LCHmgVector::ChromaToMg(30.0f) * std::sin(hmg * M_PI / 180.0), 1e-4);
+    EXPECT_NEAR(labmg[1], LCHmgVector::ChromaToMg(30.0f) * std::cos(hmg * M_PI / 180.0), nxtest::kFloatAtHundred);
+    EXPECT_NEAR(labmg[2], LCHmgVector::ChromaToMg(30.0f) * std::sin(hmg * M_PI / 180.0), nxtest::kFloatAtHundred);
 }
 
 TEST(LChVector, ProbiereSearchesInvertTheMgTransform) {
@@ -324,21 +324,21 @@ TEST(dLCHVector, DecomposesKnownPairsWithTheHueSign) {
     const LABVector b(40.0f, 0.0f, 10.0f, mc);   // hue 90
     const dLCHVector d(a, b);
     EXPECT_FLOAT_EQ(d[0], 10.0f);
-    EXPECT_NEAR(d[1], 0.0f, 1e-6);
-    EXPECT_NEAR(d[2], -std::sqrt(200.0f), 1e-4) << "a's hue lies clockwise of b's";
+    EXPECT_NEAR(d[1], 0.0f, nxtest::kFloatNearTen);
+    EXPECT_NEAR(d[2], -std::sqrt(200.0f), nxtest::kFloatAtHundred) << "a's hue lies clockwise of b's";
     const dLCHVector swapped(b, a);
     EXPECT_FLOAT_EQ(swapped[0], -10.0f);
-    EXPECT_NEAR(swapped[2], std::sqrt(200.0f), 1e-4);
+    EXPECT_NEAR(swapped[2], std::sqrt(200.0f), nxtest::kFloatAtHundred);
     // Chroma difference only: same hue, dH vanishes.
     const dLCHVector chroma(LABVector(50.0f, 30.0f, 40.0f, mc), LABVector(50.0f, 15.0f, 20.0f, mc));
     EXPECT_FLOAT_EQ(chroma[1], 25.0f);
-    EXPECT_NEAR(chroma[2], 0.0f, 2e-3);
+    EXPECT_NEAR(chroma[2], 0.0f, nxtest::kFloatCancellation);
     // dL^2 + dC^2 + dH^2 is dE^2 (CIE76).
     const LABVector p(62.0f, -12.5f, 33.0f, mc);
     const LABVector q(58.5f, -3.0f, 41.0f, mc);
     const dLCHVector pq(p, q);
     const float dE = std::sqrt(3.5f * 3.5f + 9.5f * 9.5f + 8.0f * 8.0f);
-    EXPECT_NEAR(pq.Length(), dE, 1e-4);
+    EXPECT_NEAR(pq.Length(), dE, nxtest::kFloatAtHundred);
     EXPECT_EQ(dLCHVector(p, p).Length(), 0.0f);
 }
 
@@ -353,7 +353,7 @@ TEST(dLCHmgVector, DecomposesTheMgFormsAndFlipsWithTheArguments) {
     const LABmgVector qm{LCHmgVector(LChVector(q))};
     ColorVector diff(pm);
     diff -= qm;
-    EXPECT_NEAR(pq.Length(), diff.Length(), 1e-3);
+    EXPECT_NEAR(pq.Length(), diff.Length(), nxtest::kFloatTwoStagesAtHundred);
     EXPECT_FLOAT_EQ(pq[0], pm[0] - qm[0]);
     EXPECT_EQ(dLCHmgVector(p, p).Length(), 0.0f);
 }

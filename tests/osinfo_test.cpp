@@ -1,7 +1,6 @@
 #include "nxbase/osinfo.h"
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <thread>
 
@@ -26,9 +25,9 @@ TEST_F(OSInfoTest, AnswersWhatTheSystemReports) {
     EXPECT_LE(OSInfo::GetOSMajorVersion(), 99u);
     EXPECT_FALSE(OSInfo::IsWindowsNT());
 
-    char host[256] = {};
-    ASSERT_EQ(::gethostname(host, sizeof host - 1), 0);
-    EXPECT_EQ(OSInfo::GetMachineName(), std::string(host).substr(0, 64));
+    // A name a Windows peer can take: present and at most 64 characters.
+    EXPECT_FALSE(OSInfo::GetMachineName().empty());
+    EXPECT_LE(OSInfo::GetMachineName().size(), 64u);
 
     EXPECT_FALSE(OSInfo::GetUserName().empty());
     EXPECT_LE(OSInfo::GetUserName().size(), 255u);

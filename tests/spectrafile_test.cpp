@@ -153,7 +153,7 @@ TEST(SpectraFile, LargeGridFilesAgreeWithTheTenNanometreChart) {
             EXPECT_EQ(table.rows[i].id, chart.rows[i].id);
             for (int k = 0; k < 36; ++k) {
                 // Written with 2 decimals of percent or 5 of a fraction.
-                EXPECT_NEAR(table.rows[i].values[k], chart.rows[i].values[k], 5e-5) << name << " " << i << " " << k;
+                EXPECT_NEAR(table.rows[i].values[k], chart.rows[i].values[k], nxtest::kFileDecimals) << name << " " << i << " " << k;
             }
         }
     }
@@ -278,8 +278,8 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     const SpectraTable resampled = nxbase::ToStandardGrid(set);
     ASSERT_EQ(resampled.rows.size(), 1u);
     EXPECT_EQ(resampled.resampling, "Sprague");
-    for (int k = 0; k < 35; ++k) EXPECT_NEAR(resampled.rows[0].values[k], 0.2 + 0.01 * k, 1e-5) << k;
-    EXPECT_NEAR(resampled.rows[0].values[35], 0.2 + 0.001 * 347.5, 1e-5) << "730 nm: the last value held";
+    for (int k = 0; k < 35; ++k) EXPECT_NEAR(resampled.rows[0].values[k], 0.2 + 0.01 * k, nxtest::kFloatInterpolation) << k;
+    EXPECT_NEAR(resampled.rows[0].values[35], 0.2 + 0.001 * 347.5, nxtest::kFloatInterpolation) << "730 nm: the last value held";
 
     // Faults the CGATS parser would report far from their place, or in its
     // own words: each names its line and says what is wrong.
@@ -405,7 +405,7 @@ TEST(Resample, SpragueFollowsSmoothCurvesAndHoldsEnds) {
     EXPECT_EQ(result[0], 0.1f);
     EXPECT_EQ(result[2], 0.1f);
     EXPECT_EQ(result[3], 0.2f);
-    EXPECT_NEAR(result[4], 0.3f, 1e-7);
+    EXPECT_NEAR(result[4], 0.3f, nxtest::kFloatNearOne);
     EXPECT_EQ(result[35], 0.8f);
 
     // Many spectra at once give what one at a time gives, for copies and for

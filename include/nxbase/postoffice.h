@@ -136,6 +136,8 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
 
   private:
     explicit PostOffice(const String& asAppName);
+    template <class T, class... Args>
+    friend T* nxbase::CreateOrReplaceSingleton(T*&, Args&&...);
 
     static void TransportReceive(VELTRAEvent& axEvent);
     unsigned char CheckLock(const String& asSender);

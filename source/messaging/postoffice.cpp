@@ -87,20 +87,11 @@ String TextOr(const char* asGroup, unsigned long alIndex, const char* asFallback
 }  // namespace
 
 PostOffice* PostOffice::CreatePostOffice(String asAppName) {
-    if (smInstance != nullptr) {
-        NxSingleton::Remove(smInstance);
-        delete smInstance;
-    }
-    auto* office = new PostOffice(asAppName);
-    NxSingleton::Insert(office);
-    return office;
+    return nxbase::CreateOrReplaceSingleton(smInstance, asAppName);
 }
 
 PostOffice* PostOffice::Instance() {
-    if (smInstance == nullptr) {
-        throw std::logic_error("Please create the PostOffice-Singleton first !");
-    }
-    return smInstance;
+    return nxbase::StrictSingletonInstance(smInstance, "Please create the PostOffice-Singleton first !");
 }
 
 PostOffice::PostOffice(const String& asAppName)
