@@ -1,28 +1,31 @@
 include(CMakePackageConfigHelpers)
 
+# Components, one per Debian package (cmake/NxBasePackaging.cmake): runtime
+# (the library and its data), dev (headers, CMake package, pkg-config file),
+# tools and python.
 install(TARGETS nxbase EXPORT NxBaseTargets
-    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
-    ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR}
-    RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
-install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT runtime NAMELINK_COMPONENT dev
+    ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT dev
+    RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT runtime)
+install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
 # Shipped texts, found relative to the installed library (LibraryDataDirectory).
-install(DIRECTORY data/lng DESTINATION ${CMAKE_INSTALL_DATADIR}/nxbase)
-install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(DIRECTORY data/lng DESTINATION ${CMAKE_INSTALL_DATADIR}/nxbase COMPONENT runtime)
+install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
 if(EXISTS ${PROJECT_SOURCE_DIR}/platform/cmetry/include/klume)
-    install(DIRECTORY platform/cmetry/include/klume DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+    install(DIRECTORY platform/cmetry/include/klume DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
 endif()
 
 set(NXBASE_CMAKE_DIR ${CMAKE_INSTALL_LIBDIR}/cmake/NxBase)
-install(EXPORT NxBaseTargets NAMESPACE NxBase:: DESTINATION ${NXBASE_CMAKE_DIR})
+install(EXPORT NxBaseTargets NAMESPACE NxBase:: DESTINATION ${NXBASE_CMAKE_DIR} COMPONENT dev)
 configure_package_config_file(cmake/NxBaseConfig.cmake.in
     ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake INSTALL_DESTINATION ${NXBASE_CMAKE_DIR})
 write_basic_package_version_file(${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake
     COMPATIBILITY SameMajorVersion)
 install(FILES ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake
-    ${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake DESTINATION ${NXBASE_CMAKE_DIR})
+    ${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake DESTINATION ${NXBASE_CMAKE_DIR} COMPONENT dev)
 
 # From <prefix>/<libdir>/pkgconfig back to <prefix>: one ".." per component.
 file(RELATIVE_PATH NXBASE_PC_TO_PREFIX
     /nxbase-prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /nxbase-prefix)
 configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
-install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)

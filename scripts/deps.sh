@@ -4,7 +4,7 @@
 set -euo pipefail
 
 packages=(
-    build-essential cmake ninja-build pkg-config git python3
+    build-essential cmake ninja-build pkg-config git python3 file dpkg-dev
     libboost-dev libboost-regex-dev
     libsimpleini-dev libsqlite3-dev sqlite3 liblcms2-dev libpng-dev libssl-dev
     libsdbus-c++-dev dbus-daemon dbus-bin procps

@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Installs what is needed, builds with the given preset (default: "default")
-# and runs every test.
+# and runs every test; with the default preset also the Debian packages' test.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 preset="${1:-default}"
@@ -10,3 +10,5 @@ scripts/deps.sh
 cmake --preset "$preset" -DNXBASE_BUILD_TESTS=ON -DNXBASE_BUILD_TOOLS=ON -DNXBASE_BUILD_FUZZ=ON -DNXBASE_BUILD_BENCH=ON -DNXBASE_BUILD_PYTHON=ON
 cmake --build --preset "$preset" -j "$(nproc)"
 ctest --preset "$preset"
+# The Debian packages: built, installed, used and removed again.
+if [ "$preset" = default ]; then scripts/packages.sh test; fi

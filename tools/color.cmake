@@ -21,4 +21,4 @@ target_link_libraries(nxcolor_core PUBLIC nxbase)
 
 add_executable(nxcolor nxcolor/main.cpp)
 target_link_libraries(nxcolor PRIVATE nxcolor_core)
-install(TARGETS nxcolor RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+install(TARGETS nxcolor RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)

@@ -1,0 +1,97 @@
+#!/usr/bin/env bash
+# Builds the Debian packages in build/deb (a Release build for /usr) and puts
+# them in build/deb/packages. With "test": checks their dependencies,
+# installs them, builds the example consumer against /usr with find_package
+# and with pkg-config, runs the installed tools and imports the module with
+# Debian's python3, then removes the packages again. Needs root or sudo for
+# the test; leaves alone a machine that has NxBase packages installed already.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+root=$PWD
+build=$root/build/deb
+cmake -S . -B "$build" -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_INSTALL_PREFIX=/usr \
+      -DNXBASE_BUILD_TESTS=OFF -DNXBASE_BUILD_BENCH=OFF -DNXBASE_BUILD_FUZZ=OFF \
+      -DNXBASE_BUILD_TOOLS=ON -DNXBASE_BUILD_PYTHON=ON \
+      -DNXBASE_PYTHON_SITEARCH=lib/python3/dist-packages -DCMAKE_INTERPROCEDURAL_OPTIMIZATION=OFF \
+      > "$build.configure.log" 2>&1 ||
+    { cat "$build.configure.log"; exit 1; }
+cmake --build "$build" -j "$(nproc)"
+rm -rf "$build/packages"
+(cd "$build" && cpack -G DEB > "$build/cpack.log" 2>&1) || { cat "$build/cpack.log"; exit 1; }
+packages=(libnxbase0 libnxbase-dev nxbase-tools python3-nxbase)
+for p in "${packages[@]}"; do
+    ls "$build/packages/${p}_"*.deb > /dev/null
+done
+ls -l "$build/packages/"*.deb
+[ "${1:-}" = test ] || exit 0
+
+fail() { echo "packages: $*"; exit 1; }
+deb() { ls "$build/packages/${1}_"*.deb; }
+
+# What the runtime packages ask for: Debian 12's library packages, never a
+# -dev package; the ABI version in the library package's name and shlibs.
+for p in libnxbase0 nxbase-tools python3-nxbase; do
+    depends=$(dpkg-deb -f "$(deb "$p")" Depends)
+    echo "$p depends on: $depends"
+    case "$depends" in *-dev*) fail "$p depends on a -dev package" ;; esac
+done
+lib_depends=$(dpkg-deb -f "$(deb libnxbase0)" Depends)
+for needed in libsqlite3-0 liblcms2-2 libssl3 libpng16-16 libboost-regex1.74.0 libsdbus-c++1 libstdc++6; do
+    case "$lib_depends" in *"$needed"*) ;; *) fail "libnxbase0 does not depend on $needed" ;; esac
+done
+# (Listings are read whole first: grep -q ending a pipe early would fail it.)
+shlibs=$(dpkg-deb -I "$(deb libnxbase0)" shlibs)
+grep -q "^libnxbase 0 libnxbase0" <<< "$shlibs" || fail "no shlibs entry for libnxbase.so.0: $shlibs"
+contents=$(dpkg-deb -c "$(deb libnxbase0)")
+grep -q "libnxbase.so.0 -> " <<< "$contents" || fail "no libnxbase.so.0 in libnxbase0"
+for p in "${packages[@]}"; do
+    contents=$(dpkg-deb -c "$(deb "$p")")
+    grep -q "usr/share/doc/$p/copyright" <<< "$contents" || fail "$p has no copyright file"
+    grep -q "usr/share/doc/$p/changelog.Debian.gz" <<< "$contents" || fail "$p has no changelog"
+done
+
+for p in "${packages[@]}"; do
+    if dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed"; then
+        echo "packages: $p is installed on this machine already; the install test leaves it alone"
+        exit 0
+    fi
+done
+if [ "$(id -u)" -eq 0 ]; then sudo=""; else sudo="sudo"; fi
+work=$(mktemp -d "$root/build/packages-test.XXXXXX")
+cleanup() {
+    $sudo dpkg --purge "${packages[@]}" > /dev/null 2>&1 || true
+    rm -rf "$work"
+}
+trap cleanup EXIT
+$sudo dpkg -i "$(deb libnxbase0)" "$(deb libnxbase-dev)" "$(deb nxbase-tools)" "$(deb python3-nxbase)" > "$work/dpkg.log" ||
+    { cat "$work/dpkg.log"; fail "dpkg -i failed"; }
+
+# The consumer against /usr: CMake's package and pkg-config, nothing given.
+export NXBASE_LOG_PATH="$work"
+started=$SECONDS
+cmake -S "$root/examples/consumer" -B "$work/consumer" -G Ninja > "$work/configure.log" || { cat "$work/configure.log"; exit 1; }
+cmake --build "$work/consumer" > "$work/build.log" || { cat "$work/build.log"; exit 1; }
+echo "consumer configured and built against /usr in $((SECONDS - started)) s"
+"$work/consumer/consumer"
+c++ -std=c++17 "$root/examples/consumer/main.cpp" $(pkg-config --cflags --libs nxbase) -o "$work/consumer-pc"
+"$work/consumer-pc"
+
+# The tools from /usr/bin, with their manual pages.
+nxcolor --list-illuminants | grep -q D65 || fail "nxcolor"
+NXBASE_MACHINE_REGISTRY="$work/m.sqlite" NXBASE_USER_REGISTRY="$work/u.sqlite" nxreg files > /dev/null || fail "nxreg"
+lumaserver --version > /dev/null || fail "lumaserver"
+nxmsg --help > /dev/null || fail "nxmsg"
+for tool in nxcolor nxreg nxmsg lumaserver; do
+    test -s "/usr/share/man/man1/$tool.1" || fail "no manual page for $tool"
+done
+# The module from Debian's python3, without any path given.
+(cd "$work" && env -u PYTHONPATH /usr/bin/python3 -c \
+    "import nxbase; assert nxbase.spectra_to_Lab([0.5] * 36).shape == (3,); print('python3-nxbase', nxbase.__version__)")
+
+cleanup
+trap - EXIT
+for p in "${packages[@]}"; do
+    if dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed"; then fail "$p is still installed"; fi
+done
+test ! -e /usr/include/nxbase || fail "/usr/include/nxbase is left behind"
+echo "packages build, install, serve the consumer, the tools and python3, and uninstall"
