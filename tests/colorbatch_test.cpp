@@ -9,6 +9,7 @@
 
 #include "color_test_util.h"
 #include "nxbase/colorvector.h"
+#include "nxbase/spectrafile.h"
 
 namespace {
 
@@ -83,6 +84,15 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
              : batch.ToXYZ(floatCopy.data(), count, fromCopy.data());
         EXPECT_EQ(fromDoubles, fromCopy) << (labs ? "Lab" : "XYZ");
     }
+    // A table read from a file gives the same numbers, row by row, across
+    // the pieces it is converted in.
+    nxbase::SpectraTable table;
+    table.rows.resize(count);
+    for (std::size_t s = 0; s < count; ++s) {
+        std::copy(&spectra[36 * s], &spectra[36 * s] + 36, table.rows[s].values.begin());
+    }
+    EXPECT_EQ(batch.ToLab(table), lab);
+    EXPECT_EQ(batch.ToXYZ(table), xyz);
     const CMetryFilter filter(Lichtart(condition.GetIllum()), Observer(condition.GetObserver()));
     for (std::size_t s = 0; s < count; ++s) {
         const XYZVector object(filter, ReflectanceSpectrum(&spectra[36 * s], PhysicalConditions()));

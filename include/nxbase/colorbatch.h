@@ -17,6 +17,7 @@
 #define NXBASE_COLORBATCH_H_
 
 #include <cstddef>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "nxbase/spectralgrid.h"
@@ -25,6 +26,8 @@ class CMetryFilter;
 class MeasuringCondition;
 
 namespace nxbase {
+
+struct SpectraTable;
 
 namespace detail {
 // The weights as the kernels read them: per channel five 8-float chunks
@@ -88,6 +91,12 @@ public:
                        unsigned alThreads = 0) const;
     void ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
                        unsigned alThreads = 0) const;
+
+    // XYZ or Lab of every row of a table read from a file (its values on the
+    // 36-point grid), three floats per row in row order: the same numbers
+    // as the array forms give for the rows' values.
+    std::vector<float> ToXYZ(const SpectraTable& axTable) const;
+    std::vector<float> ToLab(const SpectraTable& axTable) const;
 
     // White point Xn, Yn (= 100), Zn of the weights.
     float WhitePoint(int alChannel) const;

@@ -11,6 +11,7 @@
 #include <boost/function.hpp>
 
 #include "nxbase/export.h"
+#include "nxbase/spectralgrid.h"
 
 class PostOffice;
 class ProgressListener;
@@ -22,7 +23,7 @@ constexpr double kLumaSpectrumScale = 100000.0;
 
 struct NXBASE_EXPORT MeasuredSpectrum {
     std::string id;                  // the patch the server measured
-    std::array<float, 36> values{};  // 380..730 nm, reflectance factors
+    std::array<float, kSpectrumSize> values{};  // 380..730 nm, reflectance factors
 };
 
 // Appends `count` measurements to *out. False, with the reason in *error,

@@ -24,6 +24,7 @@
 #endif
 
 #include "nxbase/cmetry.h"
+#include "nxbase/spectrafile.h"
 #include "nxbase/thread.h"
 #include "tristimulus.h"
 
@@ -558,6 +559,32 @@ void ColorBatch::ToLabParallel(const double* pSpectra, std::size_t alCount, floa
                                unsigned alThreads) const {
     RunParallel<true>(amTables, pSpectra, alCount, pLab, alThreads);
 }
+
+namespace {
+
+// The rows' values gathered a piece at a time into a buffer that stays in
+// the cache, each piece converted as an array.
+template <bool kLab>
+std::vector<float> RunTable(const PaddedWeights& w, const SpectraTable& axTable) {
+    constexpr std::size_t kPiece = 256;
+    std::vector<float> out(3 * axTable.rows.size());
+    std::vector<float> piece(kPiece * kSamples);
+    for (std::size_t first = 0; first < axTable.rows.size(); first += kPiece) {
+        const std::size_t n = std::min(kPiece, axTable.rows.size() - first);
+        for (std::size_t i = 0; i < n; ++i) {
+            const auto& values = axTable.rows[first + i].values;
+            std::copy(values.begin(), values.end(), piece.begin() + i * kSamples);
+        }
+        Run<kLab>(w, piece.data(), n, out.data() + 3 * first);
+    }
+    return out;
+}
+
+}  // namespace
+
+std::vector<float> ColorBatch::ToXYZ(const SpectraTable& axTable) const { return RunTable<false>(amTables, axTable); }
+
+std::vector<float> ColorBatch::ToLab(const SpectraTable& axTable) const { return RunTable<true>(amTables, axTable); }
 
 float ColorBatch::WhitePoint(int alChannel) const {
     return 100.0f * amWeights.sums[alChannel] / amWeights.sums[1];
