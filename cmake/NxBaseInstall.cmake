@@ -29,3 +29,21 @@ file(RELATIVE_PATH NXBASE_PC_TO_PREFIX
     /nxbase-prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /nxbase-prefix)
 configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
 install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)
+
+# The API reference (target "docs", with Doxygen): the public headers and
+# doc/first-hour.md as the first page; installed with the development
+# package when it was built. Any Doxygen warning fails the target.
+find_package(Doxygen QUIET)
+find_program(Python_EXECUTABLE_FOR_DOCS NAMES python3)
+if(DOXYGEN_FOUND AND Python_EXECUTABLE_FOR_DOCS)
+    set(NXBASE_DOCS_DIR ${PROJECT_BINARY_DIR}/docs)
+    configure_file(doc/api/Doxyfile.in ${PROJECT_BINARY_DIR}/Doxyfile @ONLY)
+    add_custom_target(docs
+        COMMAND ${CMAKE_COMMAND} -E remove_directory ${NXBASE_DOCS_DIR}/html
+        COMMAND ${DOXYGEN_EXECUTABLE} ${PROJECT_BINARY_DIR}/Doxyfile
+        WORKING_DIRECTORY ${PROJECT_BINARY_DIR}
+        COMMENT "API reference in ${NXBASE_DOCS_DIR}/html"
+        VERBATIM)
+    install(DIRECTORY ${NXBASE_DOCS_DIR}/html DESTINATION ${CMAKE_INSTALL_DATAROOTDIR}/doc/libnxbase-dev
+            COMPONENT dev OPTIONAL)
+endif()

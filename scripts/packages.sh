@@ -16,6 +16,7 @@ cmake -S . -B "$build" -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_INSTALL_PREFI
       > "$build.configure.log" 2>&1 ||
     { cat "$build.configure.log"; exit 1; }
 cmake --build "$build" -j "$(nproc)"
+cmake --build "$build" --target docs  # the API reference goes into libnxbase-dev
 rm -rf "$build/packages"
 (cd "$build" && cpack -G DEB > "$build/cpack.log" 2>&1) || { cat "$build/cpack.log"; exit 1; }
 packages=(libnxbase0 libnxbase-dev nxbase-tools python3-nxbase)
@@ -44,6 +45,9 @@ shlibs=$(dpkg-deb -I "$(deb libnxbase0)" shlibs)
 grep -q "^libnxbase 0 libnxbase0" <<< "$shlibs" || fail "no shlibs entry for libnxbase.so.0: $shlibs"
 contents=$(dpkg-deb -c "$(deb libnxbase0)")
 grep -q "libnxbase.so.0 -> " <<< "$contents" || fail "no libnxbase.so.0 in libnxbase0"
+contents=$(dpkg-deb -c "$(deb libnxbase-dev)")
+grep -q "usr/share/doc/libnxbase-dev/html/index.html" <<< "$contents" || fail "no API reference in libnxbase-dev"
+grep -q "usr/share/doc/libnxbase-dev/examples/batch-lab/main.cpp" <<< "$contents" || fail "no examples in libnxbase-dev"
 for p in "${packages[@]}"; do
     contents=$(dpkg-deb -c "$(deb "$p")")
     grep -q "usr/share/doc/$p/copyright" <<< "$contents" || fail "$p has no copyright file"
@@ -74,7 +78,17 @@ cmake --build "$work/consumer" > "$work/build.log" || { cat "$work/build.log"; e
 echo "consumer configured and built against /usr in $((SECONDS - started)) s"
 "$work/consumer/consumer"
 c++ -std=c++17 "$root/examples/consumer/main.cpp" $(pkg-config --cflags --libs nxbase) -o "$work/consumer-pc"
+# An installed example builds on its own against /usr as well.
+cmake -S /usr/share/doc/libnxbase-dev/examples/batch-lab -B "$work/batch-lab" -G Ninja > "$work/configure2.log" ||
+    { cat "$work/configure2.log"; exit 1; }
+cmake --build "$work/batch-lab" > "$work/build2.log" || { cat "$work/build2.log"; exit 1; }
+"$work/batch-lab/batch-lab" | grep -q "largest dE00 0.45" || fail "the installed batch-lab example"
 "$work/consumer-pc"
+# An installed example builds on its own against /usr as well.
+cmake -S /usr/share/doc/libnxbase-dev/examples/batch-lab -B "$work/batch-lab" -G Ninja > "$work/configure2.log" ||
+    { cat "$work/configure2.log"; exit 1; }
+cmake --build "$work/batch-lab" > "$work/build2.log" || { cat "$work/build2.log"; exit 1; }
+"$work/batch-lab/batch-lab" | grep -q "largest dE00 0.45" || fail "the installed batch-lab example"
 
 # The tools from /usr/bin, with their manual pages.
 nxcolor --list-illuminants | grep -q D65 || fail "nxcolor"
