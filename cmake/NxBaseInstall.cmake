@@ -46,4 +46,9 @@ if(DOXYGEN_FOUND AND Python_EXECUTABLE_FOR_DOCS)
         VERBATIM)
     install(DIRECTORY ${NXBASE_DOCS_DIR}/html DESTINATION ${CMAKE_INSTALL_DATAROOTDIR}/doc/libnxbase-dev
             COMPONENT dev OPTIONAL)
+    if(NXBASE_BUILD_TESTS)
+        add_test(NAME Docs.ApiReferenceBuildsWithoutWarnings
+                 COMMAND ${CMAKE_COMMAND} --build ${PROJECT_BINARY_DIR} --target docs)
+        set_tests_properties(Docs.ApiReferenceBuildsWithoutWarnings PROPERTIES LABELS packaging TIMEOUT 300)
+    endif()
 endif()
