@@ -12,8 +12,6 @@
 // program prints the ratio of each pair's times per round as min/median/max.
 // The peers are this program started again with "--peer MODE CPU".
 #include <benchmark/benchmark.h>
-#include <boost/asio/local/stream_protocol.hpp>
-
 #include <sched.h>
 #include <signal.h>
 #include <sys/epoll.h>
@@ -23,14 +21,15 @@
 
 #include <algorithm>
 #include <array>
+#include <boost/asio/local/stream_protocol.hpp>
 #include <chrono>
-#include <functional>
-#include <map>
-#include <vector>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <functional>
+#include <map>
 #include <string>
+#include <vector>
 
 #include "interleaved.h"
 #include "nxbase/msgcat.h"
@@ -63,7 +62,9 @@ std::string Payload() {
 enum class Placement { kSameCpu, kTwoCpus, kAnyCpu };
 
 const char* PlacementName(Placement placement) {
-    return placement == Placement::kSameCpu ? "SameCpu" : placement == Placement::kTwoCpus ? "TwoCpus" : "AnyCpu";
+    return placement == Placement::kSameCpu   ? "SameCpu"
+           : placement == Placement::kTwoCpus ? "TwoCpus"
+                                              : "AnyCpu";
 }
 
 // The CPU of the caller is 0; its peer's is 0 or 1, or any (-1).
@@ -197,14 +198,16 @@ void DdeRoundTrip(benchmark::State& state, Placement placement) {
                 ("--address=" + address).c_str(), nullptr);
         ::_exit(127);
     }
-    for (int i = 0; i < 500 && !std::filesystem::exists(scratch.directory + "/bus"); ++i) ::usleep(10000);
+    for (int i = 0; i < 500 && !std::filesystem::exists(scratch.directory + "/bus"); ++i)
+        ::usleep(10000);
     ::setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
     pid_t peer = StartPeer("server-dde", placement);
     PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
     MyMemoryBlock request, answer;
     request.Put(Payload().data(), static_cast<long>(Payload().size()));
-    for (int i = 0; i < 500 && !office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
-                                                       [] { return true; }); ++i) {
+    for (int i = 0; i < 500 && !office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request,
+                                                       answer, [] { return true; });
+         ++i) {
         ::usleep(10000);
     }
     for (auto _ : state) {
@@ -253,16 +256,18 @@ struct LoopEnd {
         Arm();
     }
     void Arm() {
-        socket.async_read_some(boost::asio::buffer(input), [this](const boost::system::error_code& error,
-                                                                  std::size_t) {
-            if (error) {
-                closed = true;
-                return;
-            }
-            ++received;
-            Arm();
-            if (!answer.empty()) ::send(socket.native_handle(), answer.data(), answer.size(), MSG_NOSIGNAL);
-        });
+        socket.async_read_some(boost::asio::buffer(input),
+                               [this](const boost::system::error_code& error, std::size_t) {
+                                   if (error) {
+                                       closed = true;
+                                       return;
+                                   }
+                                   ++received;
+                                   Arm();
+                                   if (!answer.empty())
+                                       ::send(socket.native_handle(), answer.data(), answer.size(),
+                                              MSG_NOSIGNAL);
+                               });
     }
     boost::asio::io_context context;
     boost::asio::local::stream_protocol::socket socket;
@@ -372,8 +377,11 @@ void RawServerThroughput(benchmark::State& state, int clients) {
         RunClients(clients, [&](int i) {
             std::string received(answer.size(), '\0');
             for (int k = 0; k < kRoundTripsPerClient; ++k) {
-                if (::write(clientEnds[static_cast<std::size_t>(i)], request.data(), request.size()) < 0) break;
-                ReadExactly(clientEnds[static_cast<std::size_t>(i)], received.data(), received.size());
+                if (::write(clientEnds[static_cast<std::size_t>(i)], request.data(),
+                            request.size()) < 0)
+                    break;
+                ReadExactly(clientEnds[static_cast<std::size_t>(i)], received.data(),
+                            received.size());
             }
         });
         for (int fd : clientEnds) ::close(fd);
@@ -390,12 +398,15 @@ void PostOfficeServerThroughput(benchmark::State& state, int clients) {
     WaitForSocket("LumaServer");
     for (auto _ : state) {
         RunClients(clients, [&](int i) {
-            ::setenv("NXBASE_LOG_PATH", (scratch.directory + "/log" + std::to_string(i)).c_str(), 1);
-            PostOffice* office = PostOffice::CreatePostOffice(String("BenchClient" + std::to_string(i)));
+            ::setenv("NXBASE_LOG_PATH", (scratch.directory + "/log" + std::to_string(i)).c_str(),
+                     1);
+            PostOffice* office =
+                PostOffice::CreatePostOffice(String("BenchClient" + std::to_string(i)));
             MyMemoryBlock request, answer;
             request.Put(Payload().data(), static_cast<long>(Payload().size()));
             for (int k = 0; k < kRoundTripsPerClient; ++k) {
-                office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [] { return true; });
+                office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                       [] { return true; });
             }
             NxSingleton::DeleteAllSingleton();
         });
@@ -424,16 +435,20 @@ std::vector<Pair> Pairs() {
         {"SendAndReceive_vs_RawPingPong", PostOfficeRoundTrip, raw(DefaultAnswerFrame()), both},
         {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
         {"BareLoopPingPong_vs_RawPingPong", LoopPingPong, raw(DefaultAnswerFrame()), both},
-        {"SendAndReceiveOverDBus_vs_OverSockets", DdeRoundTrip, PostOfficeRoundTrip,
+        {"SendAndReceiveOverDBus_vs_OverSockets",
+         DdeRoundTrip,
+         PostOfficeRoundTrip,
          {Placement::kTwoCpus}},
         {"ServerThroughput4Clients_vs_RawServer",
          [](benchmark::State& state, Placement) { PostOfficeServerThroughput(state, 4); },
          [](benchmark::State& state, Placement) { RawServerThroughput(state, 4); },
-         {Placement::kAnyCpu}, true},
+         {Placement::kAnyCpu},
+         true},
         {"ServerThroughput16Clients_vs_RawServer",
          [](benchmark::State& state, Placement) { PostOfficeServerThroughput(state, 16); },
          [](benchmark::State& state, Placement) { RawServerThroughput(state, 16); },
-         {Placement::kAnyCpu}, true},
+         {Placement::kAnyCpu},
+         true},
     };
 }
 
@@ -461,7 +476,8 @@ int RunPeer(const std::string& mode, int cpu) {
 }
 
 int main(int argc, char** argv) {
-    if (argc == 4 && std::strcmp(argv[1], "--peer") == 0) return RunPeer(argv[2], std::atoi(argv[3]));
+    if (argc == 4 && std::strcmp(argv[1], "--peer") == 0)
+        return RunPeer(argv[2], std::atoi(argv[3]));
     benchmark::Initialize(&argc, argv);
     const std::vector<Pair> pairs = Pairs();
     // Rounds outermost, so that the two sides of a pair run next to each
@@ -471,31 +487,33 @@ int main(int argc, char** argv) {
             for (Placement placement : pair.placements) {
                 auto contender = pair.contender;
                 auto baseline = pair.baseline;
-                benchmark::RegisterBenchmark(BaseName(pair.name, "baseline", placement, round).c_str(),
-                                             [baseline, placement](benchmark::State& state) {
-                                                 baseline(state, placement);
-                                             })
+                benchmark::RegisterBenchmark(
+                    BaseName(pair.name, "baseline", placement, round).c_str(),
+                    [baseline, placement](benchmark::State& state) { baseline(state, placement); })
                     ->UseRealTime();
-                benchmark::RegisterBenchmark(BaseName(pair.name, "contender", placement, round).c_str(),
-                                             [contender, placement](benchmark::State& state) {
-                                                 contender(state, placement);
-                                             })
+                benchmark::RegisterBenchmark(
+                    BaseName(pair.name, "contender", placement, round).c_str(),
+                    [contender, placement](benchmark::State& state) {
+                        contender(state, placement);
+                    })
                     ->UseRealTime();
             }
         }
     }
     nxbench::RoundReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf("\nRatios contender / baseline, min / median / max over %d interleaved rounds: of the real "
-                "time per message (caller on CPU 0, peer on CPU 0 for SameCpu or 1 for TwoCpus, one thread "
-                "each), and for ServerThroughput of round trips per second (one server process and 4 or 16 "
-                "client processes, all free on every CPU; %d round trips per client):\n",
-                kRounds, kRoundTripsPerClient);
+    std::printf(
+        "\nRatios contender / baseline, min / median / max over %d interleaved rounds: of the real "
+        "time per message (caller on CPU 0, peer on CPU 0 for SameCpu or 1 for TwoCpus, one thread "
+        "each), and for ServerThroughput of round trips per second (one server process and 4 or 16 "
+        "client processes, all free on every CPU; %d round trips per client):\n",
+        kRounds, kRoundTripsPerClient);
     for (const Pair& pair : pairs) {
         for (Placement placement : pair.placements) {
             std::vector<double> ratios;
             for (int round = 1; round <= kRounds; ++round) {
-                std::string base = nxbench::RealTimeName(BaseName(pair.name, "baseline", placement, round));
+                std::string base =
+                    nxbench::RealTimeName(BaseName(pair.name, "baseline", placement, round));
                 std::string contender =
                     nxbench::RealTimeName(BaseName(pair.name, "contender", placement, round));
                 // Times: contender / baseline; rates: contender / baseline too,

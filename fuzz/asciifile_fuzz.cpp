@@ -24,7 +24,9 @@ namespace {
 const char* const kKeys[] = {"Name", "Value", "", "Data", "Version", "Application", "Date", "A B"};
 const char* const kTitles[] = {"File", "Measurement", "", "Spectrum"};
 
-String KeyOf(std::uint8_t op) { return kKeys[(op >> 3) & 7]; }
+String KeyOf(std::uint8_t op) {
+    return kKeys[(op >> 3) & 7];
+}
 
 void Abort(const char* what) {
     std::fprintf(stderr, "round trip failed: %s\n", what);
@@ -67,9 +69,15 @@ void Run(ASCIIFileImpl& file, const std::uint8_t* program, std::size_t length, b
         String key = KeyOf(op);
         bool removeTabs = (op & 0x40) != 0;
         switch (op & 15) {
-            case 0: file.GetTitel(kTitles[(op >> 3) & 3]); break;
-            case 1: file.SkipToTitel(kTitles[(op >> 3) & 3]); break;
-            case 2: file.SkipLines((op >> 3) & 7); break;
+            case 0:
+                file.GetTitel(kTitles[(op >> 3) & 3]);
+                break;
+            case 1:
+                file.SkipToTitel(kTitles[(op >> 3) & 3]);
+                break;
+            case 2:
+                file.SkipLines((op >> 3) & 7);
+                break;
             case 3: {
                 bool value = false;
                 file.GetBOOL(key, value);

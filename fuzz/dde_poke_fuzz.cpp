@@ -19,11 +19,11 @@
 #include <cstdlib>
 #include <string>
 
+#include "messaging_fuzz_env.h"
 #include "nxbase/dde.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
-#include "messaging_fuzz_env.h"
 #include "toolkit/application.h"
 
 namespace {
@@ -55,7 +55,8 @@ void StopPeer() {
 void StartPeer() {
     ::setenv("NXBASE_FUZZ_PEER", "1", 1);
     char* const arguments[] = {const_cast<char*>("dde_poke_fuzz_peer"), nullptr};
-    if (::posix_spawn(&gPeer, "/proc/self/exe", nullptr, nullptr, arguments, environ) != 0) gPeer = -1;
+    if (::posix_spawn(&gPeer, "/proc/self/exe", nullptr, nullptr, arguments, environ) != 0)
+        gPeer = -1;
     ::unsetenv("NXBASE_FUZZ_PEER");
     std::atexit(StopPeer);
     for (int i = 0; i < 500 && !nxbase::IsApplicationRunning(kPeer); ++i) ::usleep(10000);

@@ -33,7 +33,8 @@ std::vector<Entry> ReadAll(Config& config) {
 // One scratch directory per process, removed at exit.
 struct ScratchDirectory {
     ScratchDirectory() {
-        std::string base = (std::filesystem::temp_directory_path() / "nxbase-ini-fuzz-XXXXXX").string();
+        std::string base =
+            (std::filesystem::temp_directory_path() / "nxbase-ini-fuzz-XXXXXX").string();
         std::vector<char> buffer(base.begin(), base.end());
         buffer.push_back('\0');
         if (::mkdtemp(buffer.data()) != nullptr) directory = buffer.data();

@@ -26,8 +26,8 @@ inline void PrepareMessagingEnvironment(const char* tag) {
     static bool done = false;
     if (done) return;
     done = true;
-    static std::string root =
-        std::filesystem::temp_directory_path() / (std::string(tag) + "-" + std::to_string(::getpid()));
+    static std::string root = std::filesystem::temp_directory_path() /
+                              (std::string(tag) + "-" + std::to_string(::getpid()));
     std::filesystem::create_directories(root);
     std::atexit([] {
         std::error_code ignored;

@@ -13,10 +13,10 @@
 #include <cstdlib>
 #include <string>
 
+#include "messaging_fuzz_env.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
-#include "messaging_fuzz_env.h"
 
 namespace {
 
@@ -46,9 +46,10 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         block.Put(data + at, static_cast<long>(length));
         at += length;
         std::string sender = who < 4 ? kSenders[who] : "";
-        std::string command = what < ANZAHL_BOTSCHAFTEN ? nxbase::MessageName(what)
-                              : what < 200 ? nxbase::CommandTextOfNumber(kAnswerOffset + what - ANZAHL_BOTSCHAFTEN)
-                                           : "NO_SUCH_MESSAGE";
+        std::string command =
+            what < ANZAHL_BOTSCHAFTEN ? nxbase::MessageName(what)
+            : what < 200 ? nxbase::CommandTextOfNumber(kAnswerOffset + what - ANZAHL_BOTSCHAFTEN)
+                         : "NO_SUCH_MESSAGE";
         // Channel numbers that are not open: answers fail at once, as to a
         // peer that has gone.
         VELTRAEvent event(sender, command, std::move(block), 1000 + who);

@@ -52,8 +52,8 @@ py::array CheckedRows(const py::handle& object, py::ssize_t size, const char* wh
                               py::str(any.dtype()).cast<std::string>());
     }
     if (any.ndim() == 0 || any.shape(any.ndim() - 1) != size) {
-        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) + "), got " +
-                              ShapeText(any));
+        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) +
+                              "), got " + ShapeText(any));
     }
     return any;
 }
@@ -94,15 +94,16 @@ SpectraRows AsSpectraRows(const py::handle& object) {
 unsigned ThreadCount(const py::object& threads) {
     if (threads.is_none()) return 0;
     const long count = threads.cast<long>();
-    if (count < 1) throw py::value_error("threads must be at least 1, got " + std::to_string(count));
+    if (count < 1)
+        throw py::value_error("threads must be at least 1, got " + std::to_string(count));
     return static_cast<unsigned>(std::min<long>(count, 1024));
 }
 
 DoubleArray AsDoubleRows(const py::handle& object, py::ssize_t size, const char* what) {
     py::array any = py::array::ensure(object);
     if (!any || any.ndim() == 0 || any.shape(any.ndim() - 1) != size) {
-        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) + "), got " +
-                              (any ? ShapeText(any) : std::string("no array")));
+        throw py::value_error(std::string(what) + " must have shape (..., " + std::to_string(size) +
+                              "), got " + (any ? ShapeText(any) : std::string("no array")));
     }
     return DoubleArray::ensure(any);
 }
@@ -116,7 +117,8 @@ std::vector<py::ssize_t> ResultShape(const py::array& input, py::ssize_t last) {
 
 std::string ObserverName(const py::object& observer) {
     const std::string name = py::str(observer).cast<std::string>();
-    if (name != "2" && name != "10") throw py::value_error("unknown observer \"" + name + "\"; use 2 or 10");
+    if (name != "2" && name != "10")
+        throw py::value_error("unknown observer \"" + name + "\"; use 2 or 10");
     return name;
 }
 
@@ -133,14 +135,17 @@ MeasuringCondition Condition(const std::string& illuminant, const py::object& ob
                              const std::string& density = "") {
     const ObserverClass observerClass{String(ObserverName(observer))};
     return MeasuringCondition(IllumClass(IlluminantName(illuminant)), observerClass,
-                              density.empty() ? DStdClass() : DStdClass(density), PhysicalConditions());
+                              density.empty() ? DStdClass() : DStdClass(density),
+                              PhysicalConditions());
 }
 
 // Batches are kept per illuminant and observer: making one costs about as
 // much as a few hundred spectra.
-std::shared_ptr<const nxbase::ColorBatch> BatchFor(const std::string& illuminant, const py::object& observer) {
+std::shared_ptr<const nxbase::ColorBatch> BatchFor(const std::string& illuminant,
+                                                   const py::object& observer) {
     static std::mutex mutex;
-    static std::map<std::pair<std::string, std::string>, std::shared_ptr<const nxbase::ColorBatch>> batches;
+    static std::map<std::pair<std::string, std::string>, std::shared_ptr<const nxbase::ColorBatch>>
+        batches;
     const std::string name = IlluminantName(illuminant);
     const std::string observerName = ObserverName(observer);
     std::lock_guard<std::mutex> lock(mutex);
@@ -195,8 +200,8 @@ void RunWithProgress(std::size_t count, const py::object& progress, Work work) {
 
 // Fine-grid weights are kept per illuminant, observer and grid, as batches are.
 std::shared_ptr<const nxbase::FineGridTristimulus> FineGridFor(const std::string& illuminant,
-                                                             const py::object& observer,
-                                                             const std::vector<double>& grid) {
+                                                               const py::object& observer,
+                                                               const std::vector<double>& grid) {
     static std::mutex mutex;
     static std::map<std::tuple<std::string, std::string, std::vector<double>>,
                     std::shared_ptr<const nxbase::FineGridTristimulus>>
@@ -205,7 +210,8 @@ std::shared_ptr<const nxbase::FineGridTristimulus> FineGridFor(const std::string
     const std::string observerName = ObserverName(observer);
     std::lock_guard<std::mutex> lock(mutex);
     auto& fine = grids[{name, observerName, grid}];
-    if (!fine) fine = std::make_shared<const nxbase::FineGridTristimulus>(Condition(name, observer), grid);
+    if (!fine)
+        fine = std::make_shared<const nxbase::FineGridTristimulus>(Condition(name, observer), grid);
     return fine;
 }
 
@@ -215,17 +221,19 @@ std::vector<double> GridOf(const py::object& wavelengths) {
     return std::vector<double>(grid.data(), grid.data() + grid.shape(0));
 }
 
-py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths, const py::object& progress,
+py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
+                             const std::string& illuminant, const py::object& observer,
+                             const py::object& wavelengths, const py::object& progress,
                              const py::object& threads = py::none());
 
 // Spectra on their own grid: summed at its interval when it is finer than
 // 10 nm, else brought onto the 36 points first.
-py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                                   const py::object& observer, const std::vector<double>& grid,
-                                   const py::object& progress) {
+py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
+                                   const std::string& illuminant, const py::object& observer,
+                                   const std::vector<double>& grid, const py::object& progress) {
     const FloatArray input = AsFloatRows(spectra, static_cast<py::ssize_t>(grid.size()), "spectra");
-    const std::size_t count = static_cast<std::size_t>(input.size() / static_cast<py::ssize_t>(grid.size()));
+    const std::size_t count =
+        static_cast<std::size_t>(input.size() / static_cast<py::ssize_t>(grid.size()));
     if (!nxbase::FineGridTristimulus::Applies(grid)) {
         const nxbase::SpectralResampler resampler(grid);
         py::array_t<float> standard(ResultShape(input, kBands));
@@ -246,19 +254,22 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
     });
     const long implausible = FirstImplausible(out, count, quantity);
     if (implausible >= 0) {
-        throw py::value_error("spectrum " + std::to_string(implausible) +
-                              " is brighter than twice the white: not reflectance factors (white = 1); divide "
-                              "percentages by 100 first");
+        throw py::value_error(
+            "spectrum " + std::to_string(implausible) +
+            " is brighter than twice the white: not reflectance factors (white = 1); divide "
+            "percentages by 100 first");
     }
     return result;
 }
 
-py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const std::string& illuminant,
-                             const py::object& observer, const py::object& wavelengths, const py::object& progress,
+py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
+                             const std::string& illuminant, const py::object& observer,
+                             const py::object& wavelengths, const py::object& progress,
                              const py::object& threadsWanted) {
     const unsigned threads = ThreadCount(threadsWanted);
     if (!wavelengths.is_none()) {
-        return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths), progress);
+        return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths),
+                               progress);
     }
     const SpectraRows input = AsSpectraRows(spectra);
     const auto batch = BatchFor(illuminant, observer);
@@ -270,7 +281,8 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
     std::atomic<long> implausible{-1};
     const auto convert = [&](const auto* in, std::size_t first, std::size_t n) {
         float* to = out + 3 * first;
-        quantity == Quantity::kXYZ ? batch->ToXYZ(in + first * kBands, n, to) : batch->ToLab(in + first * kBands, n, to);
+        quantity == Quantity::kXYZ ? batch->ToXYZ(in + first * kBands, n, to)
+                                   : batch->ToLab(in + first * kBands, n, to);
         const long bad = FirstImplausible(to, n, quantity);
         long seen = implausible.load();
         while (bad >= 0 && (seen < 0 || seen > static_cast<long>(first) + bad) &&
@@ -281,21 +293,26 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra, const
         const std::size_t n = end - begin;
         const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
         nxbase::RunInParts(n, parts, kMinPerThread, 16, [&](std::size_t first, std::size_t count) {
-            input.doubles ? convert(input.doubles, begin + first, count) : convert(input.floats, begin + first, count);
+            input.doubles ? convert(input.doubles, begin + first, count)
+                          : convert(input.floats, begin + first, count);
         });
     });
     if (implausible >= 0) {
         const float* v = out + 3 * implausible;
-        throw py::value_error("spectrum " + std::to_string(implausible.load()) + " gives " +
-                              (quantity == Quantity::kXYZ ? "Y " + std::to_string(v[1]) : "L* " + std::to_string(v[0])) +
-                              ": not reflectance factors (white = 1); divide percentages by 100 first");
+        throw py::value_error(
+            "spectrum " + std::to_string(implausible.load()) + " gives " +
+            (quantity == Quantity::kXYZ ? "Y " + std::to_string(v[1])
+                                        : "L* " + std::to_string(v[0])) +
+            ": not reflectance factors (white = 1); divide percentages by 100 first");
     }
     return result;
 }
 
-py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant, const py::object& observer,
-                                const py::object& progress, const py::object& threads) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
+py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& illuminant,
+                                const py::object& observer, const py::object& progress,
+                                const py::object& threads) {
+    py::array_t<float> lab =
+        SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
     const MeasuringCondition condition = Condition(illuminant, observer);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
@@ -309,8 +326,10 @@ py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& il
 }
 
 py::array_t<float> SpectraToDin99(const py::object& spectra, const std::string& illuminant,
-                                  const py::object& observer, const py::object& progress, const py::object& threads) {
-    py::array_t<float> lab = SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
+                                  const py::object& observer, const py::object& progress,
+                                  const py::object& threads) {
+    py::array_t<float> lab =
+        SpectraTo(Quantity::kLab, spectra, illuminant, observer, py::none(), progress, threads);
     float* v = lab.mutable_data();
     const std::size_t count = static_cast<std::size_t>(lab.size() / 3);
     py::gil_scoped_release unlocked;
@@ -351,18 +370,21 @@ py::array_t<float> LabToSRGB(const py::object& lab) {
     return result;
 }
 
-py::array_t<double> DeltaE(const py::object& reference, const py::object& sample, const std::string& method) {
+py::array_t<double> DeltaE(const py::object& reference, const py::object& sample,
+                           const std::string& method) {
     nxbase::DeltaEMethod chosen{};
     if (!nxbase::ParseDeltaEMethod(method.c_str(), &chosen)) {
-        throw py::value_error("unknown method \"" + method +
-                              "\"; use 2000, 94, 94t, cmc, cmc11 or ab (or \"CIE 2000\", \"CIE 1994\", \"CMC\", "
-                              "\"CIE 1976\")");
+        throw py::value_error(
+            "unknown method \"" + method +
+            "\"; use 2000, 94, 94t, cmc, cmc11 or ab (or \"CIE 2000\", \"CIE 1994\", \"CMC\", "
+            "\"CIE 1976\")");
     }
     AsDoubleRows(reference, 3, "lab1");
     AsDoubleRows(sample, 3, "lab2");
     // NumPy broadcasting of the leading axes.
     const py::module_ numpy = py::module_::import("numpy");
-    const py::tuple both = numpy.attr("broadcast_arrays")(py::array::ensure(reference), py::array::ensure(sample));
+    const py::tuple both =
+        numpy.attr("broadcast_arrays")(py::array::ensure(reference), py::array::ensure(sample));
     const DoubleArray a = DoubleArray::ensure(both[0]);
     const DoubleArray b = DoubleArray::ensure(both[1]);
     py::array_t<double> result(std::vector<py::ssize_t>(a.shape(), a.shape() + a.ndim() - 1));
@@ -372,7 +394,8 @@ py::array_t<double> DeltaE(const py::object& reference, const py::object& sample
     double* out = result.mutable_data();
     py::gil_scoped_release unlocked;
     for (std::size_t i = 0; i < count; ++i) {
-        out[i] = nxbase::DeltaE({p[3 * i], p[3 * i + 1], p[3 * i + 2]}, {q[3 * i], q[3 * i + 1], q[3 * i + 2]}, chosen);
+        out[i] = nxbase::DeltaE({p[3 * i], p[3 * i + 1], p[3 * i + 2]},
+                                {q[3 * i], q[3 * i + 1], q[3 * i + 2]}, chosen);
     }
     return result;
 }
@@ -383,7 +406,8 @@ nxbase::Tristimulus WhiteOf(const py::object& white, const py::object& observer)
         return nxbase::WhitePointOf(Condition(white.cast<std::string>(), observer));
     }
     const DoubleArray xyz = AsDoubleRows(white, 3, "white");
-    if (xyz.ndim() != 1) throw py::value_error("white must be an illuminant name or one XYZ triple");
+    if (xyz.ndim() != 1)
+        throw py::value_error("white must be an illuminant name or one XYZ triple");
     return {xyz.data()[0], xyz.data()[1], xyz.data()[2]};
 }
 
@@ -400,7 +424,8 @@ py::array_t<double> MapTriples(const py::object& values, const char* what, Conve
     return result;
 }
 
-py::array_t<double> XYZToLab(const py::object& xyz, const py::object& white, const py::object& observer) {
+py::array_t<double> XYZToLab(const py::object& xyz, const py::object& white,
+                             const py::object& observer) {
     const nxbase::Tristimulus w = WhiteOf(white, observer);
     return MapTriples(xyz, "XYZ", [w](const double* v, double* out) {
         const std::array<double, 3> lab = nxbase::CielabOf({v[0], v[1], v[2]}, w);
@@ -408,7 +433,8 @@ py::array_t<double> XYZToLab(const py::object& xyz, const py::object& white, con
     });
 }
 
-py::array_t<double> LabToXYZ(const py::object& lab, const py::object& white, const py::object& observer) {
+py::array_t<double> LabToXYZ(const py::object& lab, const py::object& white,
+                             const py::object& observer) {
     const nxbase::Tristimulus w = WhiteOf(white, observer);
     return MapTriples(lab, "Lab", [w](const double* v, double* out) {
         const std::array<double, 3> xyz = nxbase::XyzOfCielab({v[0], v[1], v[2]}, w);
@@ -433,21 +459,25 @@ py::array_t<double> LabToLCh(const py::object& lab) {
 nxbase::AdaptationMethod AdaptationMethodOf(const std::string& name) {
     std::string key;
     for (const char c : name) {
-        if (c != ' ' && c != '_' && c != '-') key += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+        if (c != ' ' && c != '_' && c != '-')
+            key += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
     }
     if (key == "xyzscaling") key = "xyz";
     nxbase::AdaptationMethod method{};
     if (!nxbase::ParseAdaptationMethod(key.c_str(), &method)) {
-        throw py::value_error("unknown method \"" + name + "\"; use Bradford, CAT02, Von Kries or XYZ Scaling");
+        throw py::value_error("unknown method \"" + name +
+                              "\"; use Bradford, CAT02, Von Kries or XYZ Scaling");
     }
     return method;
 }
 
-py::array_t<double> ChromaticAdaptation(const py::object& xyz, const py::object& source, const py::object& target,
-                                        const std::string& method, const py::object& observer) {
+py::array_t<double> ChromaticAdaptation(const py::object& xyz, const py::object& source,
+                                        const py::object& target, const std::string& method,
+                                        const py::object& observer) {
     nxbase::Matrix3 m{};
     try {
-        m = nxbase::AdaptationMatrix(WhiteOf(source, observer), WhiteOf(target, observer), AdaptationMethodOf(method));
+        m = nxbase::AdaptationMatrix(WhiteOf(source, observer), WhiteOf(target, observer),
+                                     AdaptationMethodOf(method));
     } catch (const std::invalid_argument& error) {
         throw py::value_error(error.what());
     }
@@ -461,13 +491,15 @@ py::array_t<double> Resample(const py::object& wavelengths, const py::object& va
     const DoubleArray grid = DoubleArray::ensure(py::array::ensure(wavelengths));
     if (!grid || grid.ndim() != 1) throw py::value_error("wavelengths must be one-dimensional");
     const DoubleArray input = AsDoubleRows(values, grid.shape(0), "values");
-    const nxbase::SpectralResampler resampler(std::vector<double>(grid.data(), grid.data() + grid.shape(0)));
+    const nxbase::SpectralResampler resampler(
+        std::vector<double>(grid.data(), grid.data() + grid.shape(0)));
     py::array_t<double> result(ResultShape(input, kBands));
     const std::size_t count = static_cast<std::size_t>(input.size() / grid.shape(0));
     const double* in = input.data();
     double* out = result.mutable_data();
     py::gil_scoped_release unlocked;
-    for (std::size_t i = 0; i < count; ++i) resampler.Resample(in + i * grid.shape(0), out + i * kBands);
+    for (std::size_t i = 0; i < count; ++i)
+        resampler.Resample(in + i * grid.shape(0), out + i * kBands);
     return result;
 }
 
@@ -482,7 +514,8 @@ void Warn(PyObject* category, const std::string& message) {
 }
 
 py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool native) {
-    const std::string path = py::str(py::module_::import("os").attr("fspath")(pathLike)).cast<std::string>();
+    const std::string path =
+        py::str(py::module_::import("os").attr("fspath")(pathLike)).cast<std::string>();
     nxbase::SpectralReadOptions options;
     if (scale == "percent") {
         options.scale = nxbase::SpectralScale::kPercent;
@@ -501,15 +534,20 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool
         if (read) table = nxbase::ToStandardGrid(set);
     }
     if (!read) throw py::value_error(error);
-    if (table.unusable) throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
+    if (table.unusable)
+        throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
     if (table.rows.empty()) {
-        throw py::value_error(table.errors.empty() ? path + ": no spectra" : path + ": no spectra; " + table.errors.front());
+        throw py::value_error(table.errors.empty()
+                                  ? path + ": no spectra"
+                                  : path + ": no spectra; " + table.errors.front());
     }
     for (const std::string& message : table.errors) Warn(gDataWarning, message);
     if (!table.scaleNote.empty()) Warn(gScaleWarning, table.scaleNote);
     py::list ids, names;
-    const py::ssize_t bands = native ? static_cast<py::ssize_t>(table.sourceWavelengths.size()) : kBands;
-    py::array_t<float> values(std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), bands});
+    const py::ssize_t bands =
+        native ? static_cast<py::ssize_t>(table.sourceWavelengths.size()) : kBands;
+    py::array_t<float> values(
+        std::vector<py::ssize_t>{static_cast<py::ssize_t>(table.rows.size()), bands});
     float* out = values.mutable_data();
     // The table holds one row per sample of the set, in order.
     for (std::size_t r = 0; r < table.rows.size(); ++r) {
@@ -531,18 +569,24 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool
 
 const char kSpectraDoc[] =
     "spectra: reflectance factors (white = 1) of shape (..., 36), 380..730 nm in 10 nm steps; "
-    "float32 or float64 (float64 is rounded to float32 as it is read, as the batch path works in single "
-    "precision; contiguous float32 and float64 are not copied), contiguous or not. illuminant: a built-in name (A, C, D50, D55, D65, D75, E, "
+    "float32 or float64 (float64 is rounded to float32 as it is read, as the batch path works in "
+    "single "
+    "precision; contiguous float32 and float64 are not copied), contiguous or not. illuminant: a "
+    "built-in name (A, C, D50, D55, D65, D75, E, "
     "FL1..FL12, any case) or one installed in $NXBASE_DATA_DIR; observer: 2 or 10. Returns float32 "
     "of shape (..., 3). A spectrum whose Y would exceed twice the white (percentages, most likely) "
     "raises ValueError. progress: a call-back taking the fraction done (0..1], called every 262144 "
-    "spectra and at the end (for tqdm: lambda f: bar.update(...)); the GIL is released between calls. "
-    "threads: None (all cores from 65536 spectra on, else the calling thread) or a count; 1 runs on the "
+    "spectra and at the end (for tqdm: lambda f: bar.update(...)); the GIL is released between "
+    "calls. "
+    "threads: None (all cores from 65536 spectra on, else the calling thread) or a count; 1 runs "
+    "on the "
     "calling thread. ";
 
 const char kGridDoc[] =
-    "wavelengths: the spectra's own grid (shape (N,), spectra (..., N)) instead of the 36 points: a "
-    "regular grid finer than 10 nm (1 nm, 5 nm) is summed at its own interval (nxbase::FineGridTristimulus, "
+    "wavelengths: the spectra's own grid (shape (N,), spectra (..., N)) instead of the 36 points: "
+    "a "
+    "regular grid finer than 10 nm (1 nm, 5 nm) is summed at its own interval "
+    "(nxbase::FineGridTristimulus, "
     "CIE 15), any other is brought onto the 36 points first. ";
 
 }  // namespace
@@ -552,70 +596,102 @@ void RegisterColour(py::module_& m) {
     gDataWarning = PyErr_NewExceptionWithDoc("nxbase.SpectralDataWarning",
                                              "Spectra of a file that were rejected (read_spectra).",
                                              PyExc_UserWarning, nullptr);
-    gScaleWarning = PyErr_NewExceptionWithDoc("nxbase.SpectralScaleWarning",
-                                              "read_spectra guessed whether a file holds percentages or "
-                                              "reflectance factors; the message says which and why.",
-                                              gDataWarning, nullptr);
+    gScaleWarning =
+        PyErr_NewExceptionWithDoc("nxbase.SpectralScaleWarning",
+                                  "read_spectra guessed whether a file holds percentages or "
+                                  "reflectance factors; the message says which and why.",
+                                  gDataWarning, nullptr);
     if (gDataWarning == nullptr || gScaleWarning == nullptr) throw py::error_already_set();
     m.attr("SpectralDataWarning") = py::handle(gDataWarning);
     m.attr("SpectralScaleWarning") = py::handle(gScaleWarning);
     m.def(
         "spectra_to_XYZ",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p,
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w,
+           const py::object& p,
            const py::object& t) { return SpectraTo(Quantity::kXYZ, s, i, o, w, p, t); },
-        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
-        py::arg("progress") = py::none(), py::arg("threads") = py::none(),
-        (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") + kSpectraDoc + kGridDoc).c_str());
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+        py::arg("wavelengths") = py::none(), py::arg("progress") = py::none(),
+        py::arg("threads") = py::none(),
+        (std::string("CIE XYZ (white Y = 100), equal to nxbase::ColorBatch::ToXYZ. ") +
+         kSpectraDoc + kGridDoc)
+            .c_str());
     m.def(
         "spectra_to_Lab",
-        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w, const py::object& p,
+        [](const py::object& s, const std::string& i, const py::object& o, const py::object& w,
+           const py::object& p,
            const py::object& t) { return SpectraTo(Quantity::kLab, s, i, o, w, p, t); },
-        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two, py::arg("wavelengths") = py::none(),
-        py::arg("progress") = py::none(), py::arg("threads") = py::none(),
-        (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc + kGridDoc).c_str());
-    m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
-          py::arg("progress") = py::none(), py::arg("threads") = py::none(),
-          (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") + kSpectraDoc).c_str());
+        py::arg("spectra"), py::arg("illuminant") = "D50", py::arg("observer") = two,
+        py::arg("wavelengths") = py::none(), py::arg("progress") = py::none(),
+        py::arg("threads") = py::none(),
+        (std::string("CIE 1976 L*a*b*, equal to nxbase::ColorBatch::ToLab. ") + kSpectraDoc +
+         kGridDoc)
+            .c_str());
+    m.def("spectra_to_LCh", &SpectraToLCh, py::arg("spectra"), py::arg("illuminant") = "D50",
+          py::arg("observer") = two, py::arg("progress") = py::none(),
+          py::arg("threads") = py::none(),
+          (std::string("L*, C*, h (degrees in (0, 360], grey 360) from the batch Lab. ") +
+           kSpectraDoc)
+              .c_str());
     m.def("spectra_to_DIN99", &SpectraToDin99, py::arg("spectra"), py::arg("illuminant") = "D50",
-          py::arg("observer") = two, py::arg("progress") = py::none(), py::arg("threads") = py::none(),
+          py::arg("observer") = two, py::arg("progress") = py::none(),
+          py::arg("threads") = py::none(),
           (std::string("DIN 6176 L99, a99, b99 from the batch Lab. ") + kSpectraDoc).c_str());
-    m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"), py::arg("density_standard") = "Status E",
-          "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status A\", \"Status E\", "
-          "\"Status M\", \"Status T\" or an installed standard; \"Status E\" by default, as everywhere in NxBase. NaN "
+    m.def("spectra_to_density", &SpectraToDensity, py::arg("spectra"),
+          py::arg("density_standard") = "Status E",
+          "ISO 5-3 densities (red, green, blue filter) of spectra of shape (..., 36): \"Status "
+          "A\", \"Status E\", "
+          "\"Status M\", \"Status T\" or an installed standard; \"Status E\" by default, as "
+          "everywhere in NxBase. NaN "
           "where nothing is reflected. float32 (..., 3).");
     m.def("Lab_to_sRGB", &LabToSRGB, py::arg("lab"),
-          "Screen sRGB components 0..100 of CIE 1976 Lab values of shape (..., 3), by the formula path of "
+          "Screen sRGB components 0..100 of CIE 1976 Lab values of shape (..., 3), by the formula "
+          "path of "
           "nxbase::LabToScreenRGB (no ICC profile). float32 (..., 3).");
-    m.def("delta_E", &DeltaE, py::arg("lab1"), py::arg("lab2"), py::arg("method") = "2000",
-          "Colour difference of Lab arrays of shape (..., 3), broadcast against each other; lab1 is the "
-          "reference. method: \"2000\" (CIEDE2000), \"94\" (graphic arts), \"94t\" (textiles), \"cmc\" (2:1), "
-          "\"cmc11\", \"ab\" (CIE76), or colour-science's \"CIE 2000\", \"CIE 1994\", \"CMC\" (2:1), "
-          "\"CIE 1976\" (any case). float64 of the broadcast shape without the last axis.");
+    m.def(
+        "delta_E", &DeltaE, py::arg("lab1"), py::arg("lab2"), py::arg("method") = "2000",
+        "Colour difference of Lab arrays of shape (..., 3), broadcast against each other; lab1 is "
+        "the "
+        "reference. method: \"2000\" (CIEDE2000), \"94\" (graphic arts), \"94t\" (textiles), "
+        "\"cmc\" (2:1), "
+        "\"cmc11\", \"ab\" (CIE76), or colour-science's \"CIE 2000\", \"CIE 1994\", \"CMC\" (2:1), "
+        "\"CIE 1976\" (any case). float64 of the broadcast shape without the last axis.");
     const py::object d50 = py::str("D50");
-    m.def("XYZ_to_Lab", &XYZToLab, py::arg("XYZ"), py::arg("white") = d50, py::arg("observer") = two,
-          "CIE 1976 L*a*b* of XYZ (white Y = 100) of shape (..., 3). white: an illuminant name (its white "
-          "point for the observer) or an XYZ triple. The library's constants (t > 0.008856). float64.");
-    m.def("Lab_to_XYZ", &LabToXYZ, py::arg("Lab"), py::arg("white") = d50, py::arg("observer") = two,
-          "The inverse of XYZ_to_Lab. float64 (..., 3).");
+    m.def("XYZ_to_Lab", &XYZToLab, py::arg("XYZ"), py::arg("white") = d50,
+          py::arg("observer") = two,
+          "CIE 1976 L*a*b* of XYZ (white Y = 100) of shape (..., 3). white: an illuminant name "
+          "(its white "
+          "point for the observer) or an XYZ triple. The library's constants (t > 0.008856). "
+          "float64.");
+    m.def("Lab_to_XYZ", &LabToXYZ, py::arg("Lab"), py::arg("white") = d50,
+          py::arg("observer") = two, "The inverse of XYZ_to_Lab. float64 (..., 3).");
     m.def("Lab_to_LCh", &LabToLCh, py::arg("Lab"),
-          "L, C*, h of Lab values (..., 3); h in degrees within (0, 360], grey 360, as nxcolor prints. float64.");
-    m.def("chromatic_adaptation", &ChromaticAdaptation, py::arg("XYZ"), py::arg("source"), py::arg("target"),
-          py::arg("method") = "Bradford", py::arg("observer") = two,
-          "XYZ seen under the source white as the corresponding colour under the target white, (..., 3). "
-          "source, target: illuminant names or XYZ triples; method: \"Bradford\", \"CAT02\", \"Von Kries\" or "
+          "L, C*, h of Lab values (..., 3); h in degrees within (0, 360], grey 360, as nxcolor "
+          "prints. float64.");
+    m.def("chromatic_adaptation", &ChromaticAdaptation, py::arg("XYZ"), py::arg("source"),
+          py::arg("target"), py::arg("method") = "Bradford", py::arg("observer") = two,
+          "XYZ seen under the source white as the corresponding colour under the target white, "
+          "(..., 3). "
+          "source, target: illuminant names or XYZ triples; method: \"Bradford\", \"CAT02\", \"Von "
+          "Kries\" or "
           "\"XYZ Scaling\" (any case). float64.");
     m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),
-          "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm steps: the "
-          "values themselves where the grid has the wavelength, Sprague interpolation on equal steps, linear "
+          "Spectra of shape (..., N) on the N increasing wavelengths onto 380..730 nm in 10 nm "
+          "steps: the "
+          "values themselves where the grid has the wavelength, Sprague interpolation on equal "
+          "steps, linear "
           "on uneven ones, end values held outside the range. float64 (..., 36).");
-    m.def("read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto", py::arg("native") = false,
-          "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, spectra) "
-          "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows become "
-          "SpectralDataWarning; a scale that was guessed (the file does not say, scale=\"auto\") a "
-          "SpectralScaleWarning saying which and why; an unreadable or unusable file, or one without "
-          "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\". native=True returns "
-          "(ids, names, spectra, wavelengths) with the spectra as read, on the file's own grid, for "
-          "spectra_to_XYZ/Lab(..., wavelengths=wavelengths).");
+    m.def(
+        "read_spectra", &ReadSpectra, py::arg("path"), py::arg("scale") = "auto",
+        py::arg("native") = false,
+        "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, "
+        "spectra) "
+        "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows become "
+        "SpectralDataWarning; a scale that was guessed (the file does not say, scale=\"auto\") a "
+        "SpectralScaleWarning saying which and why; an unreadable or unusable file, or one without "
+        "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\". native=True "
+        "returns "
+        "(ids, names, spectra, wavelengths) with the spectra as read, on the file's own grid, for "
+        "spectra_to_XYZ/Lab(..., wavelengths=wavelengths).");
 }
 
 }  // namespace nxpy

@@ -26,7 +26,8 @@ int MessageNumber(const py::object& message) {
     }
     const std::string name = py::str(message).cast<std::string>();
     const int number = nxbase::NumberOfCommandText(name);
-    if (number < 0 || number >= ANZAHL_BOTSCHAFTEN) throw py::value_error("unknown message \"" + name + "\"");
+    if (number < 0 || number >= ANZAHL_BOTSCHAFTEN)
+        throw py::value_error("unknown message \"" + name + "\"");
     return number;
 }
 
@@ -61,11 +62,13 @@ void Pack(MyMemoryBlock& block, const py::handle& item) {
     } else if (py::isinstance<py::bool_>(item)) {
         block << static_cast<unsigned char>(item.cast<bool>() ? 1 : 0);
     } else if (py::isinstance<py::int_>(item)) {
-        block << static_cast<int>(Checked(py::reinterpret_borrow<py::object>(item), -2147483648L, 4294967295L, "i"));
+        block << static_cast<int>(
+            Checked(py::reinterpret_borrow<py::object>(item), -2147483648L, 4294967295L, "i"));
     } else if (py::isinstance<py::str>(item)) {
         block << String(item.cast<std::string>());
     } else if (py::isinstance<py::bytes>(item) || py::isinstance<py::bytearray>(item)) {
-        const std::string bytes = py::bytes(py::reinterpret_borrow<py::object>(item)).cast<std::string>();
+        const std::string bytes =
+            py::bytes(py::reinterpret_borrow<py::object>(item)).cast<std::string>();
         block.Put(bytes.data(), static_cast<long>(bytes.size()));
     } else {
         throw py::type_error("cannot pack " + py::repr(item).cast<std::string>() +
@@ -76,9 +79,10 @@ void Pack(MyMemoryBlock& block, const py::handle& item) {
 // Asked while an answer is awaited: lets Python handle Ctrl-C and ends the
 // wait at the deadline.
 class Waiter {
-public:
-    explicit Waiter(double timeout) : amDeadline(Clock::now() + std::chrono::duration_cast<Clock::duration>(
-                                                                     std::chrono::duration<double>(timeout))) {}
+  public:
+    explicit Waiter(double timeout)
+        : amDeadline(Clock::now() + std::chrono::duration_cast<Clock::duration>(
+                                        std::chrono::duration<double>(timeout))) {}
 
     bool KeepWaiting() {
         // Once interrupted the error is pending: no more Python calls.
@@ -96,13 +100,13 @@ public:
         if (amInterrupted) throw py::error_already_set();
     }
 
-private:
+  private:
     Clock::time_point amDeadline;
     bool amInterrupted = false;
 };
 
 class Client {
-public:
+  public:
     explicit Client(const std::string& name) {
         try {
             pOffice = PostOffice::CreatePostOffice(String(name));
@@ -112,7 +116,8 @@ public:
     }
     ~Client() { Close(); }
 
-    py::tuple Send(const std::string& target, const py::object& message, const py::iterable& values, double timeout) {
+    py::tuple Send(const std::string& target, const py::object& message, const py::iterable& values,
+                   double timeout) {
         Office();
         const int number = MessageNumber(message);
         MyMemoryBlock request, answer;
@@ -121,17 +126,19 @@ public:
         unsigned char sent = 0;
         {
             py::gil_scoped_release unlocked;
-            sent = pOffice->SendAndReceive(target, number, request, answer, [&waiter] { return waiter.KeepWaiting(); });
+            sent = pOffice->SendAndReceive(target, number, request, answer,
+                                           [&waiter] { return waiter.KeepWaiting(); });
         }
         waiter.RaiseIfInterrupted();
         if (!sent) {
-            throw std::runtime_error("no answer from " + target + " to " + nxbase::MessageName(number) + ": " +
-                                     pOffice->GetLastError());
+            throw std::runtime_error("no answer from " + target + " to " +
+                                     nxbase::MessageName(number) + ": " + pOffice->GetLastError());
         }
         const char* data = answer.GetDatenZeiger();
         const long length = answer.Len();
         const int status = length > 0 ? static_cast<signed char>(data[0]) : -1;
-        return py::make_tuple(status, py::bytes(length > 1 ? data + 1 : "", length > 1 ? length - 1 : 0));
+        return py::make_tuple(status,
+                              py::bytes(length > 1 ? data + 1 : "", length > 1 ? length - 1 : 0));
     }
 
     void Post(const std::string& target, const py::object& message, const py::iterable& values) {
@@ -144,7 +151,9 @@ public:
             py::gil_scoped_release unlocked;
             sent = pOffice->Send(target, static_cast<PO_Botschaften>(number), request);
         }
-        if (!sent) throw std::runtime_error("cannot send " + std::string(nxbase::MessageName(number)) + " to " + target);
+        if (!sent)
+            throw std::runtime_error("cannot send " + std::string(nxbase::MessageName(number)) +
+                                     " to " + target);
     }
 
     py::tuple Measure(int count, double timeout) {
@@ -162,8 +171,8 @@ public:
         waiter.RaiseIfInterrupted();
         if (!ok) throw std::runtime_error(error);
         py::list ids;
-        py::array_t<float> spectra(
-            std::vector<py::ssize_t>{static_cast<py::ssize_t>(measured.size()), nxbase::kSpectrumSize});
+        py::array_t<float> spectra(std::vector<py::ssize_t>{
+            static_cast<py::ssize_t>(measured.size()), nxbase::kSpectrumSize});
         float* out = spectra.mutable_data();
         for (const nxbase::MeasuredSpectrum& spectrum : measured) {
             ids.append(spectrum.id);
@@ -179,7 +188,7 @@ public:
         NxSingleton::DeleteAllSingleton();
     }
 
-private:
+  private:
     void Office() const {
         if (pOffice == nullptr) throw std::runtime_error("the client is closed");
     }
@@ -190,59 +199,72 @@ private:
 }  // namespace
 
 void RegisterMessaging(py::module_& m) {
-    py::class_<Client>(m, "Client",
-                       "A post office under an application name. Peers registered in the machine registry are "
-                       "started when a message goes to them. One client per process.")
+    py::class_<Client>(
+        m, "Client",
+        "A post office under an application name. Peers registered in the machine registry are "
+        "started when a message goes to them. One client per process.")
         .def(py::init<const std::string&>(), py::arg("name") = "python")
-        .def("send", &Client::Send, py::arg("target"), py::arg("message"), py::arg("values") = py::tuple(),
-             py::arg("timeout") = 30.0,
-             "Sends `message` (a name such as \"GET_DEVICE_NAME\", or its number) with `values` packed into the "
-             "data block (int: 32-bit, str: string with its zero byte, bytes: as they are, or (type, value) with "
-             "type b, s, i, str or bytes), waits with the event loop turning and returns (status, answer bytes "
-             "after the status). RuntimeError without an answer within `timeout` seconds; Ctrl-C interrupts.")
-        .def("post", &Client::Post, py::arg("target"), py::arg("message"), py::arg("values") = py::tuple(),
-             "Sends without waiting for an answer.")
+        .def("send", &Client::Send, py::arg("target"), py::arg("message"),
+             py::arg("values") = py::tuple(), py::arg("timeout") = 30.0,
+             "Sends `message` (a name such as \"GET_DEVICE_NAME\", or its number) with `values` "
+             "packed into the "
+             "data block (int: 32-bit, str: string with its zero byte, bytes: as they are, or "
+             "(type, value) with "
+             "type b, s, i, str or bytes), waits with the event loop turning and returns (status, "
+             "answer bytes "
+             "after the status). RuntimeError without an answer within `timeout` seconds; Ctrl-C "
+             "interrupts.")
+        .def("post", &Client::Post, py::arg("target"), py::arg("message"),
+             py::arg("values") = py::tuple(), "Sends without waiting for an answer.")
         .def("measure", &Client::Measure, py::arg("count"), py::arg("timeout") = 30.0,
-             "Measures `count` patches through LumaServer (connect, lock, measure, unlock, disconnect) and "
+             "Measures `count` patches through LumaServer (connect, lock, measure, unlock, "
+             "disconnect) and "
              "returns (ids, spectra) with spectra float32 of shape (count, 36).")
         .def("close", &Client::Close, "Closes the post office.")
-        .def("__enter__", [](Client& c) -> Client& { return c; }, py::return_value_policy::reference)
+        .def(
+            "__enter__", [](Client& c) -> Client& { return c; }, py::return_value_policy::reference)
         .def("__exit__", [](Client& c, const py::args&) { c.Close(); });
-    m.def("unpack", [](const py::bytes& data, const std::string& types) {
-        const std::string bytes = data;
-        MyMemoryBlock block;
-        block.Put(bytes.data(), static_cast<long>(bytes.size()));
-        py::list values;
-        std::size_t start = 0;
-        while (start <= types.size()) {
-            const std::size_t comma = types.find(',', start);
-            const std::string type = types.substr(start, comma == std::string::npos ? std::string::npos : comma - start);
-            if (type == "b") {
-                unsigned char v = 0;
-                block >> v;
-                values.append(v);
-            } else if (type == "s") {
-                short v = 0;
-                block >> v;
-                values.append(v);
-            } else if (type == "i") {
-                int v = 0;
-                block >> v;
-                values.append(v);
-            } else if (type == "str") {
-                String v;
-                block >> v;
-                values.append(py::bytes(v.str()).attr("decode")("cp1252", "replace"));
-            } else {
-                throw py::value_error("unknown type \"" + type + "\"; use b, s, i or str");
+    m.def(
+        "unpack",
+        [](const py::bytes& data, const std::string& types) {
+            const std::string bytes = data;
+            MyMemoryBlock block;
+            block.Put(bytes.data(), static_cast<long>(bytes.size()));
+            py::list values;
+            std::size_t start = 0;
+            while (start <= types.size()) {
+                const std::size_t comma = types.find(',', start);
+                const std::string type = types.substr(
+                    start, comma == std::string::npos ? std::string::npos : comma - start);
+                if (type == "b") {
+                    unsigned char v = 0;
+                    block >> v;
+                    values.append(v);
+                } else if (type == "s") {
+                    short v = 0;
+                    block >> v;
+                    values.append(v);
+                } else if (type == "i") {
+                    int v = 0;
+                    block >> v;
+                    values.append(v);
+                } else if (type == "str") {
+                    String v;
+                    block >> v;
+                    values.append(py::bytes(v.str()).attr("decode")("cp1252", "replace"));
+                } else {
+                    throw py::value_error("unknown type \"" + type + "\"; use b, s, i or str");
+                }
+                if (block.ReadPastEnd())
+                    throw py::value_error("the data ends before the value of type \"" + type +
+                                          "\"");
+                if (comma == std::string::npos) break;
+                start = comma + 1;
             }
-            if (block.ReadPastEnd()) throw py::value_error("the data ends before the value of type \"" + type + "\"");
-            if (comma == std::string::npos) break;
-            start = comma + 1;
-        }
-        return values;
-    }, py::arg("data"), py::arg("types"),
-          "Reads values from answer bytes: `types` is a comma-separated list of b, s, i and str.");
+            return values;
+        },
+        py::arg("data"), py::arg("types"),
+        "Reads values from answer bytes: `types` is a comma-separated list of b, s, i and str.");
 }
 
 }  // namespace nxpy

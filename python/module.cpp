@@ -1,7 +1,6 @@
 // The Python module "nxbase": the library's colour science over NumPy arrays
 // and a post-office client. Importing does no work beyond registering names.
 #include "common.h"
-
 #include "nxbase/version.h"
 
 PYBIND11_MODULE(nxbase, module) {

@@ -8,7 +8,7 @@ packages=(
     libboost-dev libboost-regex-dev
     libsimpleini-dev libsqlite3-dev sqlite3 liblcms2-dev libpng-dev libssl-dev
     libsdbus-c++-dev dbus-daemon dbus-bin procps
-    libgtest-dev libgmock-dev libbenchmark-dev help2man doxygen
+    libgtest-dev libgmock-dev libbenchmark-dev help2man doxygen clang-format
     python3-dev pybind11-dev python3-numpy python3-pytest
     argyll
     # NumPy's vectorised BLAS, so that bench/python_bench.py compares with a fair peer

@@ -1,4 +1,6 @@
 // The application's name, directories, configuration files and settings.
+#include "nxbase/appconfig.h"
+
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -9,7 +11,6 @@
 #include <memory>
 #include <string>
 
-#include "nxbase/appconfig.h"
 #include "nxbase/appsetti.h"
 #include "nxbase/files.h"
 #include "test_util.h"
@@ -97,7 +98,8 @@ TEST_F(AppConfigTest, TheUserDirectoryFollowsXdgThenHomeAndIsCreated) {
     {
         ScopedEnv relative("XDG_CONFIG_HOME", "relative/dir");
         ScopedEnv home("HOME", dir.File("home"));
-        EXPECT_EQ(UserConfig::GetConfigDirectoryPath(), String(dir.File("home") + "/.config/K-Lume"));
+        EXPECT_EQ(UserConfig::GetConfigDirectoryPath(),
+                  String(dir.File("home") + "/.config/K-Lume"));
         EXPECT_TRUE(std::filesystem::is_directory(dir.File("home") + "/.config/K-Lume"));
     }
 }
@@ -164,7 +166,9 @@ TEST_F(AppConfigTest, WholeFileWritesKeepHardLinksAndTheFilesOwner) {
     ::chmod(closed.c_str(), 0755);
     EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
     EXPECT_EQ(ReadFile(data), "new\n");
-    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(closed), std::filesystem::directory_iterator()), 1);
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(closed),
+                            std::filesystem::directory_iterator()),
+              1);
 }
 
 TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults) {
@@ -177,7 +181,8 @@ TEST_F(AppConfigTest, TheUserFileIsNamedAfterTheApplicationAndSeededFromDefaults
     // An existing user file is never replaced by the defaults.
     user->WriteKey("Settings", "DirectLightPart", "0.75");
     UserConfig::CreateUserConfig("Color:Check.INI", "", String(defaults));
-    EXPECT_EQ(UserConfig::Instance()->GetPath(), String(dir.path().string() + "/K-Lume/Color_Check.INI"));
+    EXPECT_EQ(UserConfig::Instance()->GetPath(),
+              String(dir.path().string() + "/K-Lume/Color_Check.INI"));
     UserConfig::CreateUserConfig("Color:Check", "", String(defaults));
     EXPECT_EQ(UserConfig::Instance()->ReadKey("Settings", "DirectLightPart"), "0.75");
     EXPECT_FALSE(std::filesystem::exists(path + ".copy." + std::to_string(::getpid())));
@@ -211,8 +216,12 @@ TEST_F(AppConfigTest, VeltraGroupsAndChromaLinkApplicationsByIndex) {
               "[ChromaLink Applications]\nColorCheck = 1\nProfiler = 1\n"
               "[LPM-Server]\nPath = /opt/k-lume/bin/lumaserver\n");
     VELTRAConfig* veltra = VELTRAConfig::CreateVELTRAConfig(String(path));
-    const char* names[] = {"LPM-Server",          "Gradus",          "ChromaLink Applications",
-                           "Compatibility",       "32-Bit Applications", "Color Libraries",
+    const char* names[] = {"LPM-Server",
+                           "Gradus",
+                           "ChromaLink Applications",
+                           "Compatibility",
+                           "32-Bit Applications",
+                           "Color Libraries",
                            "Licenses"};
     for (int i = 0; i < 7; ++i) {
         EXPECT_EQ(VELTRAConfig::GetGroupName(static_cast<VELTRAiniGroup>(i)), names[i]);

@@ -100,7 +100,8 @@ TEST_F(ASCIIFileTest, EveryValueTypeReadsBackAsWrittenInBothSeparatorModes) {
         EXPECT_TRUE(valid);
         EXPECT_FALSE(stale);
         EXPECT_EQ(s, -123);
-        EXPECT_EQ(std::vector<short>(shortsBack, shortsBack + 4), std::vector<short>(shorts, shorts + 4));
+        EXPECT_EQ(std::vector<short>(shortsBack, shortsBack + 4),
+                  std::vector<short>(shorts, shorts + 4));
         EXPECT_EQ(i, -2147483647 - 1);
         EXPECT_EQ(std::vector<int>(intsBack, intsBack + 3), std::vector<int>(ints, ints + 3));
         EXPECT_NEAR(r, -0.045123, kDecimalTolerance);
@@ -110,7 +111,9 @@ TEST_F(ASCIIFileTest, EveryValueTypeReadsBackAsWrittenInBothSeparatorModes) {
         EXPECT_EQ(lines, (std::vector<String>{"first", "\tsecond", ""}));
         // The caret is written as "^" 0x9E and reads back as a caret followed
         // by 0x9E: the format's own asymmetry.
-        EXPECT_EQ(caret.str(), "a^\x9E" "b");
+        EXPECT_EQ(caret.str(),
+                  "a^\x9E"
+                  "b");
     }
 }
 
@@ -212,7 +215,7 @@ TEST_F(ASCIIFileTest, NumbersAreReadAndWrittenWithoutTheUsersLocale) {
     int c = 1, e = 0, h = 0, i = 0;
     EXPECT_TRUE(file.GetReal("A", a));
     EXPECT_TRUE(file.GetReal("B", b));
-    EXPECT_TRUE(file.GetInt("C", c));  // a lone minus reads as 0
+    EXPECT_TRUE(file.GetInt("C", c));   // a lone minus reads as 0
     EXPECT_TRUE(file.GetReal("D", d));  // a lone separator reads as 0
     EXPECT_FALSE(file.GetInt("E", e));  // no plus sign
     ASSERT_TRUE(file.SkipLines(1));
@@ -314,8 +317,9 @@ TEST_F(ASCIIFileTest, LinesAroundTheReadChunkSizeAreKeptWhole) {
 }
 
 TEST_F(ASCIIFileTest, CarriageReturnsAreDroppedSoCrLfFilesReadLikeLfFiles) {
-    std::string path = Write("crlf.dat", "[File]\r\nApplication=K-Lume\r\nVersion=3\r\n"
-                                         "Date=2026 - 11 -22   10 : 15:\r30\r\nName=a\rb\r\n");
+    std::string path = Write("crlf.dat",
+                             "[File]\r\nApplication=K-Lume\r\nVersion=3\r\n"
+                             "Date=2026 - 11 -22   10 : 15:\r30\r\nName=a\rb\r\n");
     auto file = ASCIIFile::Get(String(path), true);
     EXPECT_TRUE(file->CheckVersion(3));
     int d[6] = {};
@@ -374,7 +378,8 @@ TEST_F(ASCIIFileTest, PercentDoneGrowsWithScanningUpToOne) {
     for (int i = 0; i < 100; ++i) content += "Value=" + std::to_string(1000 + i) + "\n";
     auto file = ASCIIFile::Get(String(Write("values.dat", content)), true);
     float last = file->GetPercentDone();
-    EXPECT_FLOAT_EQ(last, 1.0f / static_cast<float>(content.size())) << "the first line read counts one byte";
+    EXPECT_FLOAT_EQ(last, 1.0f / static_cast<float>(content.size()))
+        << "the first line read counts one byte";
     int value = 0;
     while (file->GetInt("Value", value)) {
         float now = file->GetPercentDone();
@@ -394,7 +399,9 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
         ASSERT_GE(child, 0);
         if (child == 0) {
             ::signal(SIGXFSZ, SIG_IGN);
-            struct rlimit limit {1000, 1000};
+            struct rlimit limit {
+                1000, 1000
+            };
             ::setrlimit(RLIMIT_FSIZE, &limit);
             ASCIIFileImpl file(String(limited), false);
             for (int i = 0; i < 10; ++i) {
@@ -477,7 +484,8 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
     std::string closed = dir.File("closed");
     std::filesystem::create_directory(closed);
     nxtest::WriteFile(closed + "/data.dat", "old\n");
-    std::filesystem::permissions(closed, std::filesystem::perms::owner_read | std::filesystem::perms::owner_exec);
+    std::filesystem::permissions(
+        closed, std::filesystem::perms::owner_read | std::filesystem::perms::owner_exec);
     {
         ASCIIFileImpl file(String(closed + "/data.dat"), false);
         file.PutInt("Value", 4);

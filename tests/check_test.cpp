@@ -2,15 +2,16 @@
 
 #include <gtest/gtest.h>
 
-#include "nxbase/logfile.h"
 #include "log_test_util.h"
+#include "nxbase/logfile.h"
 #include "test_util.h"
 #include "toolkit/userinterface.h"
 
 namespace {
 
 // The assertion test reads the log back: a log of this process's own.
-::testing::Environment* const kLogDir = ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
 
 TEST(Check, PoetAcceptsZeroTo1999AndReportsTheRest) {
     auto ui = std::make_shared<RecordingUserInterface>();

@@ -60,7 +60,7 @@ std::string D65Table() {
 }
 
 class CMetryProviderInDataDir : public ::testing::Test {
-protected:
+  protected:
     void SetUp() override {
         std::filesystem::create_directories(dir.path() / "illuminants");
         std::filesystem::create_directories(dir.path() / "density");
@@ -118,8 +118,7 @@ TEST(CMetryProvider, RepositoriesKnowTheirNamesAndFallBackToTheDefaults) {
     EXPECT_EQ(fl1->GetPower(360.0), fl1->GetPower(380.0));
     const auto d65 = cm::IlluminantRepository::Get("D65");
     EXPECT_EQ(d65->GetPower(830.0), d65->GetPowers().back());
-    EXPECT_DOUBLE_EQ(d65->GetPower(562.0),
-                     0.6 * d65->GetPower(560.0) + 0.4 * d65->GetPower(565.0));
+    EXPECT_DOUBLE_EQ(d65->GetPower(562.0), 0.6 * d65->GetPower(560.0) + 0.4 * d65->GetPower(565.0));
 }
 
 TEST(CMetryProvider, StatusDensitiesAreBuiltInAndTheNarrowBandOnesAreNot) {
@@ -193,9 +192,9 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
         EXPECT_EQ(cm::IlluminantRepository::Get(c.name)->GetName(), "D50");
         EXPECT_FALSE(cm::CMetryFilter::Find(c.name, "2"));
     }
-    EXPECT_NE(log.Text().find("Illuminant \"Text\" not available (" + Illuminant("Text") +
-                              ": line 3"),
-              std::string::npos)
+    EXPECT_NE(
+        log.Text().find("Illuminant \"Text\" not available (" + Illuminant("Text") + ": line 3"),
+        std::string::npos)
         << log.Text();
     // A byte-order mark and CRLF line ends are accepted.
     nxtest::WriteFile(Illuminant("Bom"), "\xEF\xBB\xBFwavelength,value\r\n380,1\r\n780,1\r\n");

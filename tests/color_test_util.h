@@ -85,7 +85,8 @@ inline std::vector<CsvRow> ReadPatchCsv(const std::string& asPath) {
 }
 
 inline std::string ChartPath() {
-    return std::string(NXBASE_SOURCE_DIR) + "/tools/nxcolor/data/colorchecker_babelcolor_average.csv";
+    return std::string(NXBASE_SOURCE_DIR) +
+           "/tools/nxcolor/data/colorchecker_babelcolor_average.csv";
 }
 
 inline std::string ChartReferencePath() {
@@ -98,8 +99,8 @@ inline std::string ChartReferencePath() {
 inline int RunNxcolor(const std::string& args, std::string* out, std::string* err) {
     TempDir dir;
     ScopedEnv config("XDG_CONFIG_HOME", dir.path().string());
-    const std::string command = std::string(NXCOLOR_PATH) + " " + args + " >" + dir.File("out") +
-                                " 2>" + dir.File("err");
+    const std::string command =
+        std::string(NXCOLOR_PATH) + " " + args + " >" + dir.File("out") + " 2>" + dir.File("err");
     const int status = std::system(command.c_str());
     *out = ReadFile(dir.File("out"));
     *err = ReadFile(dir.File("err"));

@@ -24,7 +24,8 @@ constexpr double kBatchRelative = 1e-5;
 constexpr double kCbrtRelative = 4e-7;
 
 double Scale(const float* v) {
-    return std::max(1.0, std::sqrt(double(v[0]) * v[0] + double(v[1]) * v[1] + double(v[2]) * v[2]));
+    return std::max(1.0,
+                    std::sqrt(double(v[0]) * v[0] + double(v[1]) * v[1] + double(v[2]) * v[2]));
 }
 
 // The ColorChecker chart followed by random spectra: smooth ones, dark ones
@@ -45,7 +46,8 @@ std::vector<float> TestSpectra() {
                 spectra.push_back(level);
                 continue;
             }
-            value = std::clamp(value + (unit(random) - 0.5f) * (kind == 1 ? 0.001f : 0.1f), 0.0f, 1.2f);
+            value =
+                std::clamp(value + (unit(random) - 0.5f) * (kind == 1 ? 0.001f : 0.1f), 0.0f, 1.2f);
             spectra.push_back(kind == 3 ? unit(random) : value);
         }
     }
@@ -67,13 +69,15 @@ void ExpectBatchEqualsObjects(const MeasuringCondition& condition) {
         const float* b = &lab[3 * s];
         const double scale = Scale(object.getV());
         for (int i = 0; i < 3; ++i)
-            ASSERT_NEAR(b[i], object[i], kBatchRelative * scale) << "spectrum " << s << " Lab " << i;
+            ASSERT_NEAR(b[i], object[i], kBatchRelative * scale)
+                << "spectrum " << s << " Lab " << i;
     }
     // Doubles (here with bits below float resolution) are rounded to float as
     // they are read: the same results as from a float copy, including the
     // tail after the last block of sixteen.
     std::vector<double> doubles(spectra.begin(), spectra.end());
-    for (std::size_t i = 0; i < doubles.size(); ++i) doubles[i] += 3e-9 * static_cast<double>(i % 11);
+    for (std::size_t i = 0; i < doubles.size(); ++i)
+        doubles[i] += 3e-9 * static_cast<double>(i % 11);
     const std::vector<float> floatCopy(doubles.begin(), doubles.end());
     for (const bool labs : {true, false}) {
         std::vector<float> fromDoubles(3 * count);
@@ -180,7 +184,8 @@ TEST(ColorBatch, OneCallFormsAndWhitePointMatchTheFilter) {
     EXPECT_NEAR(batch.WhitePoint(0), 111.14224728562849, nxtest::kFloatSumAgainstDouble);
     EXPECT_NEAR(batch.WhitePoint(2), 35.20615588398067, nxtest::kFloatSumAgainstDouble);
     for (int i = 0; i < 3; ++i) EXPECT_NEAR(xyz[i], batch.WhitePoint(i), nxtest::kFloatAtHundred);
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
+    for (int i = 0; i < 3; ++i)
+        EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
 }
 
 TEST(ColorBatch, CubeRootIsAccurateOverTheLabRange) {

@@ -3,16 +3,16 @@
 #include <gtest/gtest.h>
 #include <lcms2.h>
 
+#include <atomic>
 #include <cmath>
 #include <fstream>
-#include <atomic>
 #include <map>
-#include <tuple>
 #include <thread>
+#include <tuple>
 
+#include "color_test_util.h"
 #include "nxbase/iccprofile.h"
 #include "nxbase/text.h"
-#include "color_test_util.h"
 #include "test_util.h"
 
 namespace {
@@ -50,7 +50,8 @@ TEST(RGBVector, WhiteAndBlackSpectraGiveFullAndNoIntensity) {
     }
     EXPECT_GT(grey[1], black[1]);
     EXPECT_LT(grey[1], white[1]);
-    EXPECT_EQ(ColorConverter::RGBToColor(white), Color(65535, 65535, 65535));  // 100 * 655.36 = 65536 clamps
+    EXPECT_EQ(ColorConverter::RGBToColor(white),
+              Color(65535, 65535, 65535));  // 100 * 655.36 = 65536 clamps
 }
 
 TEST(RGBVector, RGBToColorTruncatesAndClamps) {
@@ -69,8 +70,10 @@ TEST(RGBVector, GammaBisectionAtTableEdgesAndForNegatives) {
     EXPECT_FLOAT_EQ(table[510], 1.0f);  // (0.5 * 510 / 255)^(1/0.45)
     // The search never returns the last entry (511): lo stops one below hi.
     const std::pair<float, int> edges[] = {
-        {-0.5f, -1}, {0.0f, 0}, {table[1], 1}, {std::nextafter(table[1], 0.0f), 0},
-        {table[256], 256}, {std::nextafter(table[256], 0.0f), 255}, {table[511], 510}, {5.0f, 510}};
+        {-0.5f, -1},       {0.0f, 0},
+        {table[1], 1},     {std::nextafter(table[1], 0.0f), 0},
+        {table[256], 256}, {std::nextafter(table[256], 0.0f), 255},
+        {table[511], 510}, {5.0f, 510}};
     for (const auto& [value, index] : edges)
         EXPECT_EQ(nxbase::detail::GammaIndex(table, value), index) << value;
     // Every value between two entries lands on the lower one.
@@ -119,13 +122,13 @@ TEST(RGBVector, IccPathAgreesWithTheFormulasForLittleCmsOwnSrgbProfile) {
     ASSERT_TRUE(cmsSaveProfileToFile(srgb, path.c_str()));
     cmsCloseProfile(srgb);
     std::map<std::string, std::string> settings = {{"ICCProfile", "1"}, {"ICCProfilePath", path}};
-    auto previous = nxbase::SetICCSettingsReader(
-        [&](const std::string& key, const std::string& def) {
+    auto previous =
+        nxbase::SetICCSettingsReader([&](const std::string& key, const std::string& def) {
             auto it = settings.find(key);
             return it == settings.end() ? def : it->second;
         });
 
-    const float labs[][3] = {{100, 0, 0}, {50, 0, 0}, {20, 0, 0},     {53.24f, 80.09f, 67.2f},
+    const float labs[][3] = {{100, 0, 0},   {50, 0, 0},    {20, 0, 0},  {53.24f, 80.09f, 67.2f},
                              {70, -30, 40}, {40, 20, -50}, {60, 10, 30}};
     std::vector<RGBVector> formula;
     for (const auto& l : labs) formula.emplace_back(Lab(l[0], l[1], l[2]));
@@ -197,8 +200,10 @@ TEST(ColorConverter, IconShapesFillOutlineAndLeaveTheRestTransparent) {
     // Opaque pixel ranges around the rough areas: square 225, disc 177,
     // diamond 113, triangle 113, stripe 75.
     const std::tuple<decltype(ColorConverter::ICON_SQUARE), int, int> shapes[] = {
-        {ColorConverter::ICON_SQUARE, 225, 225}, {ColorConverter::ICON_CIRCLE, 160, 195},
-        {ColorConverter::ICON_DIAMOND, 100, 130}, {ColorConverter::ICON_TRIANGLE, 95, 130},
+        {ColorConverter::ICON_SQUARE, 225, 225},
+        {ColorConverter::ICON_CIRCLE, 160, 195},
+        {ColorConverter::ICON_DIAMOND, 100, 130},
+        {ColorConverter::ICON_TRIANGLE, 95, 130},
         {ColorConverter::ICON_STRIPE, 60, 90}};
     for (const auto& [shape, low, high] : shapes) {
         Bitmap icon = ColorConverter::LabToBitmap(red, size, shape);
@@ -258,7 +263,8 @@ TEST(ColorConverter, ShippedTextFilesNameEveryColourNumber) {
     for (const auto& [file, whiteName, brownName] : languages) {
         Text::FreeResources();
         ASSERT_TRUE(Text::LoadText(String(dir + file)));
-        EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")), static_cast<unsigned long>(FARBE_ANZAHL));
+        EXPECT_EQ(Text::GetEntryCount(String("FarbTexte")),
+                  static_cast<unsigned long>(FARBE_ANZAHL));
         for (int n = 0; n < FARBE_ANZAHL; ++n)
             EXPECT_FALSE(Text::GetText(String("FarbTexte"), n).Len() == 0) << file << " " << n;
         EXPECT_EQ(std::string(ColorConverter::Farbzuordnung(white).str()), whiteName);

@@ -1,6 +1,9 @@
 // Colour differences against published data and LittleCMS, and chromatic
 // adaptation against the published Bradford and von Kries matrices.
+#include "nxbase/colordiff.h"
+
 #include <gtest/gtest.h>
+#include <lcms2.h>
 
 #include <cmath>
 #include <fstream>
@@ -8,11 +11,8 @@
 #include <sstream>
 #include <string>
 
-#include <lcms2.h>
-
 #include "color_test_util.h"
 #include "nxbase/adaptation.h"
-#include "nxbase/colordiff.h"
 #include "nxbase/colorvector.h"
 
 namespace {
@@ -36,7 +36,8 @@ TEST(ColorDifference, Ciede2000ReproducesTheSharmaPairs) {
         const double forward = nxbase::DeltaE2000(a, b);
         worst = std::max(worst, std::fabs(forward - v[7]));
         EXPECT_NEAR(forward, v[7], nxtest::kPublished4Decimals) << "pair " << v[0];
-        EXPECT_NEAR(nxbase::DeltaE2000(b, a), forward, nxtest::kDoubleReordered) << "symmetric, pair " << v[0];
+        EXPECT_NEAR(nxbase::DeltaE2000(b, a), forward, nxtest::kDoubleReordered)
+            << "symmetric, pair " << v[0];
         ++pairs;
     }
     EXPECT_EQ(pairs, 34);
@@ -52,17 +53,22 @@ TEST(ColorDifference, Ciede2000ReproducesTheSharmaPairs) {
 
 TEST(ColorDifference, AgreesWithLittleCms) {
     std::mt19937 random(11);
-    std::uniform_real_distribution<double> lightness(0.0, 100.0), axis(-120.0, 120.0), near(-4.0, 4.0);
+    std::uniform_real_distribution<double> lightness(0.0, 100.0), axis(-120.0, 120.0),
+        near(-4.0, 4.0);
     double worst[4] = {};
     for (int i = 0; i < 20000; ++i) {
         const LabValue a{lightness(random), axis(random), axis(random)};
         // Half near pairs (where the formulas are meant to be used), half far.
-        const LabValue b = i % 2 ? LabValue{a.L + near(random), a.a + near(random), a.b + near(random)}
-                                 : LabValue{lightness(random), axis(random), axis(random)};
+        const LabValue b =
+            i % 2 ? LabValue{a.L + near(random), a.a + near(random), a.b + near(random)}
+                  : LabValue{lightness(random), axis(random), axis(random)};
         const cmsCIELab la{a.L, a.a, a.b}, lb{b.L, b.a, b.b};
-        const double ours[4] = {nxbase::DeltaEab(a, b), nxbase::DeltaE94(a, b, nxbase::Cie94Parameters{1.0, 0.048, 0.014, true}), nxbase::DeltaECMC(a, b, 2.0, 1.0),
-                                nxbase::DeltaE2000(a, b)};
-        const double theirs[4] = {cmsDeltaE(&la, &lb), cmsCIE94DeltaE(&la, &lb), cmsCMCdeltaE(&la, &lb, 2.0, 1.0),
+        const double ours[4] = {
+            nxbase::DeltaEab(a, b),
+            nxbase::DeltaE94(a, b, nxbase::Cie94Parameters{1.0, 0.048, 0.014, true}),
+            nxbase::DeltaECMC(a, b, 2.0, 1.0), nxbase::DeltaE2000(a, b)};
+        const double theirs[4] = {cmsDeltaE(&la, &lb), cmsCIE94DeltaE(&la, &lb),
+                                  cmsCMCdeltaE(&la, &lb, 2.0, 1.0),
                                   cmsCIE2000DeltaE(&la, &lb, 1.0, 1.0, 1.0)};
         for (int f = 0; f < 4; ++f) {
             const double error = std::fabs(ours[f] - theirs[f]) / std::max(1.0, theirs[f]);
@@ -85,7 +91,8 @@ TEST(ColorDifference, NamesAndVectorsAndBatch) {
     const MeasuringCondition condition;
     const LABVector a(50.0f, 10.0f, 20.0f, condition), b(52.0f, 9.0f, 23.0f, condition);
     EXPECT_NEAR(nxbase::DeltaEab(a, b), std::sqrt(4.0 + 1.0 + 9.0), nxtest::kFloatNearTen);
-    EXPECT_DOUBLE_EQ(nxbase::DeltaE2000(a, b), nxbase::DeltaE2000(nxbase::ToLabValue(a), nxbase::ToLabValue(b)));
+    EXPECT_DOUBLE_EQ(nxbase::DeltaE2000(a, b),
+                     nxbase::DeltaE2000(nxbase::ToLabValue(a), nxbase::ToLabValue(b)));
     EXPECT_GT(nxbase::DeltaE94(a, b, nxbase::Cie94Application::kTextiles), 0.0);
 
     const float reference[6] = {50, 2.6772f, -79.7751f, 60, 0, 0};
@@ -103,7 +110,8 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
     const double bradford[3][3] = {{1.0478112, 0.0228866, -0.0501270},
                                    {0.0295424, 0.9904844, -0.0170491},
                                    {-0.0092345, 0.0150436, 0.7521316}};
-    const nxbase::Matrix3 b = nxbase::AdaptationMatrix(d65, d50, nxbase::AdaptationMethod::kBradford);
+    const nxbase::Matrix3 b =
+        nxbase::AdaptationMatrix(d65, d50, nxbase::AdaptationMethod::kBradford);
     for (int i = 0; i < 3; ++i) {
         for (int j = 0; j < 3; ++j) {
             EXPECT_NEAR(b[i][j], bradford[i][j], nxtest::kPublished7Decimals) << i << j;
@@ -111,7 +119,8 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
     }
     // The sRGB white adapted to the ICC D50 white.
     const nxbase::Tristimulus white = nxbase::Apply(
-        nxbase::AdaptationMatrix(d65, {0.9642, 1.0, 0.8249}, nxbase::AdaptationMethod::kBradford), d65);
+        nxbase::AdaptationMatrix(d65, {0.9642, 1.0, 0.8249}, nxbase::AdaptationMethod::kBradford),
+        d65);
     EXPECT_NEAR(white[0], 0.9642, nxtest::kPublished4Decimals);
     EXPECT_NEAR(white[1], 1.0, nxtest::kPublished4Decimals);
     EXPECT_NEAR(white[2], 0.8249, nxtest::kPublished4Decimals);
@@ -124,22 +133,26 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
         for (int c = 0; c < 3; ++c) EXPECT_NEAR(w[c], d50[c], nxtest::kDoubleReordered) << name;
         // There and back is the identity.
         const nxbase::Tristimulus colour{0.2, 0.3, 0.4};
-        const nxbase::Tristimulus back =
-            nxbase::Apply(nxbase::AdaptationMatrix(d50, d65, method), nxbase::Apply(forward, colour));
-        for (int c = 0; c < 3; ++c) EXPECT_NEAR(back[c], colour[c], nxtest::kDoubleReordered) << name;
+        const nxbase::Tristimulus back = nxbase::Apply(nxbase::AdaptationMatrix(d50, d65, method),
+                                                       nxbase::Apply(forward, colour));
+        for (int c = 0; c < 3; ++c)
+            EXPECT_NEAR(back[c], colour[c], nxtest::kDoubleReordered) << name;
     }
     EXPECT_THROW(nxbase::AdaptationMatrix({0, 0, 0}, d50), std::invalid_argument);
 
     // On vectors: a D65 colour adapted to D50 carries D50 and the white
     // point of D65 lands on that of D50.
-    const MeasuringCondition underD65(IllumClass("D65"), ObserverClass(OBSERVER_2DEG), PhysicalConditions());
-    const MeasuringCondition underD50(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions());
+    const MeasuringCondition underD65(IllumClass("D65"), ObserverClass(OBSERVER_2DEG),
+                                      PhysicalConditions());
+    const MeasuringCondition underD50(IllumClass("D50"), ObserverClass(OBSERVER_2DEG),
+                                      PhysicalConditions());
     const nxbase::Tristimulus n65 = nxbase::WhitePointOf(underD65);
     const nxbase::Tristimulus n50 = nxbase::WhitePointOf(underD50);
     EXPECT_NEAR(n65[0], 95.04, nxtest::kWhiteOfGrid);
-    const XYZVector adapted = nxbase::Adapt(
-        XYZVector(static_cast<float>(n65[0]), static_cast<float>(n65[1]), static_cast<float>(n65[2]), underD65),
-        underD50);
+    const XYZVector adapted =
+        nxbase::Adapt(XYZVector(static_cast<float>(n65[0]), static_cast<float>(n65[1]),
+                                static_cast<float>(n65[2]), underD65),
+                      underD50);
     EXPECT_TRUE(adapted.GetMeasuringCondition() == underD50);
     for (int c = 0; c < 3; ++c) EXPECT_NEAR(adapted[c], n50[c], nxtest::kFloatTwoStagesAtHundred);
 }

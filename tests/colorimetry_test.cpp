@@ -31,11 +31,13 @@ constexpr double kXyzTolerance = 1e-4;
 // Densities are summed in double from float weights and reflectances.
 constexpr float kDensityTolerance = 1e-5f;
 
-ReflectanceSpectrum Flat(float value) { return ReflectanceSpectrum(value, PhysicalConditions()); }
+ReflectanceSpectrum Flat(float value) {
+    return ReflectanceSpectrum(value, PhysicalConditions());
+}
 
 // Resets the facade to its state at creation when a test ends.
 class CMetryFacade : public ::testing::Test {
-protected:
+  protected:
     void TearDown() override {
         CMetry& cmetry = *CMetry::Instance();
         cmetry.SetMeasuringConditions(MeasuringCondition());
@@ -47,9 +49,9 @@ protected:
 
 TEST(IllumClass, TypesSelectTheirTableNameAndOthersTheDefault) {
     const std::pair<int, const char*> table[] = {
-        {0, "A"},      {1, "C"},      {2, "D65"},    {3, "D50"},    {24, "FL1"},
-        {28, "FL5"},   {32, "FL9"},   {33, "FL10"},  {34, "FL11"},  {35, "FL12"},
-        {40, "D55"},   {41, "D75"},   {50, "E"},
+        {0, "A"},    {1, "C"},    {2, "D65"},   {3, "D50"},   {24, "FL1"},
+        {28, "FL5"}, {32, "FL9"}, {33, "FL10"}, {34, "FL11"}, {35, "FL12"},
+        {40, "D55"}, {41, "D75"}, {50, "E"},
     };
     for (const auto& entry : table) {
         const IllumClass illuminant(static_cast<IllumType>(entry.first), 0);
@@ -66,8 +68,8 @@ TEST(IllumClass, TypesSelectTheirTableNameAndOthersTheDefault) {
     std::unique_ptr<IllumClass> kept;
     {
         const auto d65 = klume::cmetry::IlluminantRepository::Get("D65");
-        const auto own = klume::cmetry::MakeIlluminant("Mine", "test", d65->GetWavelengths(),
-                                                       d65->GetPowers());
+        const auto own =
+            klume::cmetry::MakeIlluminant("Mine", "test", d65->GetWavelengths(), d65->GetPowers());
         kept.reset(new IllumClass(*own));
         EXPECT_EQ(IllumClass(*d65).GetIlluminant(), d65);
     }
@@ -125,7 +127,8 @@ TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
     for (unsigned short c = 0; c < 3; ++c) {
         for (int i = 0; i < Filter::kSize; ++i) {
             EXPECT_EQ(defaults[c].GetWeights()[i], static_cast<float>(provider->GetWeights(c)[i]));
-            EXPECT_EQ(defaults.GetWeightTable()[c * Filter::kSize + i], defaults[c].GetWeights()[i]);
+            EXPECT_EQ(defaults.GetWeightTable()[c * Filter::kSize + i],
+                      defaults[c].GetWeights()[i]);
         }
     }
     EXPECT_NEAR(defaults.GetWeightSum(1), 100.0f, nxtest::kFloatAtHundred);
@@ -137,7 +140,8 @@ TEST(CMetryFilter, HoldsTheProvidersWeightsAsFloatTables) {
 TEST(CMetryFilter, ColorCheckerTristimulusValuesMatchTheReference) {
     const auto samples =
         nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_babelcolor_average.csv"));
-    const auto reference = nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
+    const auto reference =
+        nxtest::ReadPatchCsv(nxtest::ColorimetryData("colorchecker_D50_2deg.csv"));
     ASSERT_EQ(samples.size(), 24u);
     ASSERT_EQ(reference.size(), 24u);
     const CMetryFilter filter(Lichtart(IllumClass(ILLUM_D50, 0)), Observer(OBSERVER_2DEG));
@@ -168,8 +172,7 @@ TEST(CMetryFilter, ConcurrentFirstUseFromSeveralThreadsGivesOneTable) {
         threads.emplace_back([&, t] {
             ++ready;
             while (ready.load() < kThreads) std::this_thread::yield();
-            const CMetryFilter filter(Lichtart(IllumClass(ILLUM_FL3, 0)),
-                                      Observer(OBSERVER_10DEG));
+            const CMetryFilter filter(Lichtart(IllumClass(ILLUM_FL3, 0)), Observer(OBSERVER_10DEG));
             seen[t] = filter.GetProviderFilter();
         });
     }
@@ -180,11 +183,11 @@ TEST(CMetryFilter, ConcurrentFirstUseFromSeveralThreadsGivesOneTable) {
 TEST(ActualFilterClass, NamesGeometriesAndDisplayNames) {
     EXPECT_EQ(ActualFilterClass().GetType(), 0x1FFFFFFF);
     const std::pair<const char*, ActualFilterClass::Geometry> names[] = {
-        {"No", ActualFilterClass::GEOMETRY_45_0},     {"Pol", ActualFilterClass::GEOMETRY_45_0},
-        {"D65", ActualFilterClass::GEOMETRY_45_0},    {"UV", ActualFilterClass::GEOMETRY_45_0},
-        {"UVCut", ActualFilterClass::GEOMETRY_45_0},  {"Custom", ActualFilterClass::GEOMETRY_45_0},
-        {"Repro", ActualFilterClass::GEOMETRY_45_0},  {"D8t", ActualFilterClass::GEOMETRY_D8T},
-        {"D8e", ActualFilterClass::GEOMETRY_D8E},     {"D8i", ActualFilterClass::GEOMETRY_D8I},
+        {"No", ActualFilterClass::GEOMETRY_45_0},    {"Pol", ActualFilterClass::GEOMETRY_45_0},
+        {"D65", ActualFilterClass::GEOMETRY_45_0},   {"UV", ActualFilterClass::GEOMETRY_45_0},
+        {"UVCut", ActualFilterClass::GEOMETRY_45_0}, {"Custom", ActualFilterClass::GEOMETRY_45_0},
+        {"Repro", ActualFilterClass::GEOMETRY_45_0}, {"D8t", ActualFilterClass::GEOMETRY_D8T},
+        {"D8e", ActualFilterClass::GEOMETRY_D8E},    {"D8i", ActualFilterClass::GEOMETRY_D8I},
     };
     for (const auto& entry : names) {
         const ActualFilterClass filter{String(entry.first)};
@@ -256,8 +259,8 @@ TEST(MeasuringCondition, StringShowsIlluminantAndObserverOrQuestionMarks) {
     EXPECT_EQ(static_cast<String>(d65), String("D65,10deg,Status E,Default,Absolute,0"));
 
     const auto d50 = klume::cmetry::IlluminantRepository::Get("D50");
-    const auto custom = klume::cmetry::MakeIlluminant("Lamp", "test", d50->GetWavelengths(),
-                                                      d50->GetPowers());
+    const auto custom =
+        klume::cmetry::MakeIlluminant("Lamp", "test", d50->GetWavelengths(), d50->GetPowers());
     const MeasuringCondition unknown(IllumClass(custom), ObserverClass(String("7")),
                                      PhysicalConditions());
     EXPECT_EQ(unknown.GetMeasuringConditionString(), "?,?");
@@ -284,8 +287,7 @@ TEST_F(CMetryFacade, SetCMetryRebuildsTheSumFilterButNotTheRgbFilter) {
     EXPECT_EQ(CMetry::GetRGBFilter().GetIllum().GetName(), "D65");
 
     const MeasuringCondition condition(IllumClass(ILLUM_A, 0), ObserverClass(OBSERVER_2DEG),
-                                       DStdClass(DSTD_STATUS_T),
-                                       PhysicalConditions(FILTER_UVCUT));
+                                       DStdClass(DSTD_STATUS_T), PhysicalConditions(FILTER_UVCUT));
     cmetry.SetMeasuringConditions(condition);
     EXPECT_EQ(cmetry.GetDichteFilter().GetDStd().GetName(), "Status T");
 }
@@ -379,13 +381,13 @@ namespace {
 
 // An application's own light source that gives no light at all.
 class DarkLamp : public klume::cmetry::IIlluminant {
-public:
+  public:
     const std::string& GetName() const override { return amName; }
     const std::string& GetDescription() const override { return amName; }
     const std::vector<double>& GetWavelengths() const override { return amWavelengths; }
     const std::vector<double>& GetPowers() const override { return amPowers; }
 
-private:
+  private:
     std::string amName = "Dark";
     std::vector<double> amWavelengths{300.0, 900.0};
     std::vector<double> amPowers{0.0, 0.0};
@@ -396,7 +398,8 @@ private:
 TEST(CMetryFilter, AnIlluminantWithoutLightFallsBackToTheDefaultWithALogLine) {
     nxtest::LogCapture log;
     const boost::shared_ptr<klume::cmetry::IIlluminant> dark(new DarkLamp);
-    EXPECT_FALSE(klume::cmetry::CMetryFilter::Find(dark, klume::cmetry::ObserverRepository::Get("2")));
+    EXPECT_FALSE(
+        klume::cmetry::CMetryFilter::Find(dark, klume::cmetry::ObserverRepository::Get("2")));
     const CMetryFilter filter{Lichtart(IllumClass(dark)), Observer(OBSERVER_2DEG)};
     EXPECT_EQ(filter.GetIllum().GetName(), "D50");
     EXPECT_NEAR(filter.GetWeightSum(1), 100.0f, nxtest::kFloatAtHundred);
@@ -439,9 +442,12 @@ std::array<double, 3> IndependentXyz(const std::string& illuminant, const std::v
     const auto light = ReadTable(cie + "illuminants/" + illuminant + ".csv");
     const double step = grid[1] - grid[0];
     long double sums[3] = {}, norm = 0;
-    for (double nm = grid[0] - step * std::floor((grid[0] - 360.0) / step + 1e-9); nm <= 830.0 + 1e-9; nm += step) {
-        const std::size_t k = nm < grid.front() ? 0 : nm > grid.back() ? grid.size() - 1
-                                                                        : static_cast<std::size_t>(std::lround((nm - grid[0]) / step));
+    for (double nm = grid[0] - step * std::floor((grid[0] - 360.0) / step + 1e-9);
+         nm <= 830.0 + 1e-9; nm += step) {
+        const std::size_t k = nm < grid.front() ? 0
+                              : nm > grid.back()
+                                  ? grid.size() - 1
+                                  : static_cast<std::size_t>(std::lround((nm - grid[0]) / step));
         const long double s = At(light, nm, 1);
         for (int c = 0; c < 3; ++c) sums[c] += s * At(cmf, nm, 1 + c) * r[k];
         norm += s * At(cmf, nm, 2);
@@ -467,8 +473,8 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
     // A lamp line: a narrow peak between the 10 nm points, on 1 nm and 5 nm
     // grids, against an independent summation of the CIE tables.
     for (const char* illuminant : {"D65", "FL2"}) {
-        const MeasuringCondition condition(IllumClass(illuminant), ObserverClass(String("2")), DStdClass(),
-                                           PhysicalConditions());
+        const MeasuringCondition condition(IllumClass(illuminant), ObserverClass(String("2")),
+                                           DStdClass(), PhysicalConditions());
         for (double step : {1.0, 5.0}) {
             const std::vector<double> grid = Grid(380, 730, step);
             std::vector<float> line(grid.size(), 0.1f);
@@ -478,7 +484,9 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
             const nxbase::FineGridTristimulus fine(condition, grid);
             const std::array<double, 3> xyz = fine.ToXYZ(line.data());
             const std::array<double, 3> expected = IndependentXyz(illuminant, grid, line);
-            for (int c = 0; c < 3; ++c) EXPECT_NEAR(xyz[c], expected[c], nxtest::kDoubleSumReordered) << illuminant << " " << step << " " << c;
+            for (int c = 0; c < 3; ++c)
+                EXPECT_NEAR(xyz[c], expected[c], nxtest::kDoubleSumReordered)
+                    << illuminant << " " << step << " " << c;
             EXPECT_NEAR(fine.White()[1], 100.0, nxtest::kDoubleSumReordered);
         }
     }
@@ -489,7 +497,8 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
     const nxbase::SpectraTable chart = [] {
         nxbase::SpectraTable t;
         std::string error;
-        nxbase::ReadSpectraFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t, &error);
+        nxbase::ReadSpectraFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t,
+                                &error);
         return t;
     }();
     ASSERT_EQ(chart.rows.size(), 24u);
@@ -502,8 +511,10 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
             std::vector<float> values(grid.size());
             finer.Resample(row.values.data(), values.data());
             const std::array<double, 3> lab = fine.ToLab(values.data());
-            const LABVector tenNm(ReflectanceSpectrum(row.values.data(), PhysicalConditions()), d50);
-            worst = std::max(worst, nxbase::DeltaE2000({lab[0], lab[1], lab[2]}, nxbase::ToLabValue(tenNm)));
+            const LABVector tenNm(ReflectanceSpectrum(row.values.data(), PhysicalConditions()),
+                                  d50);
+            worst = std::max(
+                worst, nxbase::DeltaE2000({lab[0], lab[1], lab[2]}, nxbase::ToLabValue(tenNm)));
         }
     }
     EXPECT_LT(worst, 0.05);

@@ -3,17 +3,17 @@
 #ifndef NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 #define NXBASE_TESTS_COLORIMETRY_TEST_UTIL_H_
 
+#include <gtest/gtest.h>
+
+#include <boost/make_shared.hpp>
 #include <cstdlib>
 #include <memory>
 #include <sstream>
 #include <string>
 #include <vector>
 
-#include <boost/make_shared.hpp>
-#include <gtest/gtest.h>
-
-#include "nxbase/logfile.h"
 #include "log_test_util.h"
+#include "nxbase/logfile.h"
 #include "test_util.h"
 
 namespace nxtest {
@@ -36,11 +36,13 @@ inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path
     return rows;
 }
 
-inline double ToDouble(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
+inline double ToDouble(const std::string& text) {
+    return std::strtod(text.c_str(), nullptr);
+}
 
 // Records the log lines written while it exists ("key|text" each).
 class LogCapture {
-public:
+  public:
     LogCapture() { LogFile::Instance()->AddLogListener(amLog); }
     ~LogCapture() { LogFile::Instance()->RemoveLogListener(amLog); }
     LogCapture(const LogCapture&) = delete;
@@ -52,7 +54,7 @@ public:
         return text;
     }
 
-private:
+  private:
     boost::shared_ptr<RecordingLog> amLog = boost::make_shared<RecordingLog>();
 };
 

@@ -18,8 +18,12 @@
 namespace {
 std::atomic<long> gAllocations{0};
 
-__attribute__((noinline)) void* Allocate(std::size_t size) { return std::malloc(size ? size : 1); }
-__attribute__((noinline)) void Release(void* p) { std::free(p); }
+__attribute__((noinline)) void* Allocate(std::size_t size) {
+    return std::malloc(size ? size : 1);
+}
+__attribute__((noinline)) void Release(void* p) {
+    std::free(p);
+}
 }  // namespace
 
 void* operator new(std::size_t size) {
@@ -27,8 +31,12 @@ void* operator new(std::size_t size) {
     if (void* p = Allocate(size)) return p;
     throw std::bad_alloc();
 }
-void operator delete(void* p) noexcept { Release(p); }
-void operator delete(void* p, std::size_t) noexcept { Release(p); }
+void operator delete(void* p) noexcept {
+    Release(p);
+}
+void operator delete(void* p, std::size_t) noexcept {
+    Release(p);
+}
 
 namespace {
 
@@ -47,7 +55,8 @@ constexpr double kDinTolerance = 2e-4;
 constexpr double kSearchTolerance = 0.01;
 
 MeasuringCondition D50Condition() {
-    return MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions());
+    return MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG),
+                              PhysicalConditions());
 }
 
 ReflectanceSpectrum SpectrumOf(const nxtest::CsvRow& row) {
@@ -75,7 +84,8 @@ TEST(ColorVector, ColorCheckerMatchesD50References) {
         const LABVector labCurrent(spectrum);  // the facade starts with D50, type 0
         for (int i = 0; i < 3; ++i) {
             EXPECT_NEAR(xyz[i], refs[p].values[i], kXyzTolerance) << chart[p].name << " XYZ " << i;
-            EXPECT_NEAR(lab[i], refs[p].values[3 + i], kLabTolerance) << chart[p].name << " Lab " << i;
+            EXPECT_NEAR(lab[i], refs[p].values[3 + i], kLabTolerance)
+                << chart[p].name << " Lab " << i;
             EXPECT_EQ(labCurrent[i], lab[i]) << "same filter, same float operations";
         }
         EXPECT_EQ(labCurrent.GetMeasuringCondition().GetIllum().GetName(), "D50");
@@ -91,7 +101,8 @@ TEST(ColorVector, WhiteSpectrumHasYOfHundredAndTheFilterWhitePoint) {
     EXPECT_EQ(xyz.GetMeasuringCondition().GetPhysicalConditions().GetActualFilter(),
               ActualFilterClass(FILTER_POL));
     const LABVector lab(white);
-    for (int i = 0; i < 3; ++i) EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
+    for (int i = 0; i < 3; ++i)
+        EXPECT_NEAR(lab[i], i == 0 ? 100.0f : 0.0f, nxtest::kFloatAtHundred);
     const xyYVector xyY(white);
     EXPECT_NEAR(xyY[0], 0.3457, nxtest::kChromaticityOfGrid);  // D50 chromaticity
     EXPECT_NEAR(xyY[1], 0.3585, nxtest::kChromaticityOfGrid);
@@ -173,7 +184,8 @@ TEST(LABVector, LinearBranchesIncludeTheirBoundaries) {
     // Find a Y whose t is exactly 0.008856 with the formulas' float steps.
     const CMetryFilter& filter = *CMetry::Instance()->GetLXYZFilter();
     const float sumY = filter.GetWeightSum(1);
-    const float y = FloatNear(0.8856f, [&](float v) { return v * sumY / sumY / 100.0f == 0.008856f; });
+    const float y =
+        FloatNear(0.8856f, [&](float v) { return v * sumY / sumY / 100.0f == 0.008856f; });
     ASSERT_FALSE(std::isnan(y));
     const LABVector lab(filter, XYZVector(0.0f, y, 0.0f, D50Condition()));
     const float linearL = 116.0f * (7.787f * 0.008856f + 0.13793103f) - 16.0f;
@@ -218,7 +230,8 @@ TEST(LChVector, HuesLieInZeroExclusiveToThreeSixtyInclusive) {
     const MeasuringCondition mc;
     auto hue = [&](float a, float b) { return LChVector(LABVector(50.0f, a, b, mc))[2]; };
     // Grey, below the neutral threshold, exactly 0 degrees (both zero signs).
-    const std::pair<float, float> zeroHues[] = {{0.0f, 0.0f}, {0.000009f, -0.000009f}, {1.0f, 0.0f}, {1.0f, -0.0f}};
+    const std::pair<float, float> zeroHues[] = {
+        {0.0f, 0.0f}, {0.000009f, -0.000009f}, {1.0f, 0.0f}, {1.0f, -0.0f}};
     for (auto [a, b] : zeroHues) EXPECT_EQ(hue(a, b), 360.0f) << a << " " << b;
     EXPECT_FLOAT_EQ(hue(0.0f, 1.0f), 90.0f);
     EXPECT_FLOAT_EQ(hue(-1.0f, 0.0f), 180.0f);
@@ -286,8 +299,10 @@ TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
 TEST(LCHmgVector, ForwardTransformHasItsFixedPoints) {
     EXPECT_FLOAT_EQ(LCHmgVector::LightnessToMg(10.0f), 10.0f / 0.511f);
     EXPECT_NEAR(LCHmgVector::LightnessToMg(50.0f),
-                (std::log(0.040975 * 50) + 0.01765 * 50) / 0.040975 + 34.7231, nxtest::kFloatTwoStagesAtHundred);
-    EXPECT_NEAR(LCHmgVector::ChromaToMg(0.0f), 12.253 * std::log(0.638) + 5.50671, nxtest::kFloatAtHundred);
+                (std::log(0.040975 * 50) + 0.01765 * 50) / 0.040975 + 34.7231,
+                nxtest::kFloatTwoStagesAtHundred);
+    EXPECT_NEAR(LCHmgVector::ChromaToMg(0.0f), 12.253 * std::log(0.638) + 5.50671,
+                nxtest::kFloatAtHundred);
     // The hue series is built so that 0 and 360 degrees map onto themselves.
     EXPECT_NEAR(LCHmgVector::HueToMg(0.0f), 0.0f, nxtest::kFloatTwoStagesAtHundred);
     EXPECT_NEAR(LCHmgVector::HueToMg(360.0f), 360.0f, nxtest::kFloatTwoStagesAtHundred);
@@ -299,8 +314,10 @@ TEST(LCHmgVector, ForwardTransformHasItsFixedPoints) {
     }
     const LABmgVector labmg(LCHmgVector(LChVector(60.0f, 30.0f, 90.0f, MeasuringCondition())));
     const float hmg = LCHmgVector::HueToMg(90.0f);
-    EXPECT_NEAR(labmg[1], LCHmgVector::ChromaToMg(30.0f) * std::cos(hmg * M_PI / 180.0), nxtest::kFloatAtHundred);
-    EXPECT_NEAR(labmg[2], LCHmgVector::ChromaToMg(30.0f) * std::sin(hmg * M_PI / 180.0), nxtest::kFloatAtHundred);
+    EXPECT_NEAR(labmg[1], LCHmgVector::ChromaToMg(30.0f) * std::cos(hmg * M_PI / 180.0),
+                nxtest::kFloatAtHundred);
+    EXPECT_NEAR(labmg[2], LCHmgVector::ChromaToMg(30.0f) * std::sin(hmg * M_PI / 180.0),
+                nxtest::kFloatAtHundred);
 }
 
 TEST(LChVector, ProbiereSearchesInvertTheMgTransform) {
@@ -320,12 +337,13 @@ TEST(LChVector, ProbiereSearchesInvertTheMgTransform) {
 
 TEST(dLCHVector, DecomposesKnownPairsWithTheHueSign) {
     const MeasuringCondition mc;
-    const LABVector a(50.0f, 10.0f, 0.0f, mc);   // hue 0 (360)
-    const LABVector b(40.0f, 0.0f, 10.0f, mc);   // hue 90
+    const LABVector a(50.0f, 10.0f, 0.0f, mc);  // hue 0 (360)
+    const LABVector b(40.0f, 0.0f, 10.0f, mc);  // hue 90
     const dLCHVector d(a, b);
     EXPECT_FLOAT_EQ(d[0], 10.0f);
     EXPECT_NEAR(d[1], 0.0f, nxtest::kFloatNearTen);
-    EXPECT_NEAR(d[2], -std::sqrt(200.0f), nxtest::kFloatAtHundred) << "a's hue lies clockwise of b's";
+    EXPECT_NEAR(d[2], -std::sqrt(200.0f), nxtest::kFloatAtHundred)
+        << "a's hue lies clockwise of b's";
     const dLCHVector swapped(b, a);
     EXPECT_FLOAT_EQ(swapped[0], -10.0f);
     EXPECT_NEAR(swapped[2], std::sqrt(200.0f), nxtest::kFloatAtHundred);

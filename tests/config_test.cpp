@@ -1,4 +1,6 @@
 // INI files (toolkit Config), the configuration stores and their cascade.
+#include "toolkit/config.h"
+
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/resource.h>
@@ -6,6 +8,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdio>
 #include <map>
@@ -15,13 +18,10 @@
 #include <thread>
 #include <vector>
 
-#include <boost/make_shared.hpp>
-
 #include "nxbase/appconfig.h"
 #include "nxbase/configuration.h"
 #include "nxbase/logfile.h"
 #include "test_util.h"
-#include "toolkit/config.h"
 
 namespace {
 
@@ -46,7 +46,9 @@ std::vector<std::string> Keys(Config& config, const char* group) {
     return keys;
 }
 
-bool HavePython() { return std::system("python3 -c 'import configparser' >/dev/null 2>&1") == 0; }
+bool HavePython() {
+    return std::system("python3 -c 'import configparser' >/dev/null 2>&1") == 0;
+}
 
 std::string RunCapture(const std::string& command) {
     std::string out;
@@ -128,7 +130,8 @@ TEST(IniFile, WritesKeepCommentsAndFileOrderAndAppendNewKeysToTheirGroup) {
     EXPECT_EQ(ReadFile(path), withC("4"));
     EXPECT_EQ(Keys(config, "Alpha"), (std::vector<std::string>{"b=2", "a=1", "c=4"}));
     std::vector<std::string> bulk;
-    for (const auto& [key, value] : config.ReadGroup()) bulk.push_back(key.str() + "=" + value.str());
+    for (const auto& [key, value] : config.ReadGroup())
+        bulk.push_back(key.str() + "=" + value.str());
     EXPECT_EQ(bulk, Keys(config, "Alpha"));
     EXPECT_EQ(config.GetGroupName(0), "Zeta");
     EXPECT_EQ(config.GetGroupName(1), "Alpha");
@@ -345,7 +348,9 @@ TEST(IniFile, AFailedWriteKeepsTheOldFileAndReportsALine) {
     ASSERT_GE(pid, 0);
     if (pid == 0) {
         ::signal(SIGXFSZ, SIG_IGN);
-        struct rlimit limit {64, 64};
+        struct rlimit limit {
+            64, 64
+        };
         ::setrlimit(RLIMIT_FSIZE, &limit);
         std::vector<std::string> reported;
         Config::SetErrorSink([&](const std::string& line) { reported.push_back(line); });
@@ -386,7 +391,8 @@ TEST(IniConfigStore, AnUnwritableDirectoryKeepsTheOldFileAndLogsTheFailure) {
         child.WriteKey("G", "Key", "new");
         bool logged = false;
         for (const auto& line : recorder->lines) {
-            if (line.find("|Cannot write configuration file \"" + path + "\"") != std::string::npos) {
+            if (line.find("|Cannot write configuration file \"" + path + "\"") !=
+                std::string::npos) {
                 logged = true;
             }
         }
@@ -419,7 +425,8 @@ TEST(IniFile, PythonConfigparserReadsOurFilesAndWeReadItsFiles) {
         "for s in c.sections():\n"
         "  for k,v in c.items(s): print(s+'|'+k+'|'+v)\n";
     WriteFile(dir.File("dump.py"), dump);
-    std::string out = RunCapture("PYTHONIOENCODING=utf-8 python3 " + dir.File("dump.py") + " " + ours);
+    std::string out =
+        RunCapture("PYTHONIOENCODING=utf-8 python3 " + dir.File("dump.py") + " " + ours);
     EXPECT_EQ(out,
               "LPM-Server|Path|/opt/k-lume/bin/lumaserver\n"
               "LPM-Server|Version|2.10\n"

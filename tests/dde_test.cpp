@@ -31,7 +31,8 @@ std::string Shell(const std::string& command) {
     std::string output;
     FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
     char buffer[4096];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        output.append(buffer, n);
     ::pclose(pipe);
     return output;
 }
@@ -104,9 +105,10 @@ TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
               data);
 
     // Connects only for the service and one of the receiver's own topics.
-    std::string call = "dbus-send --session --print-reply --dest=" +
-                       nxbase::DdeBusName("EchoPeer") + " " + nxbase::kDdeObjectPath + " " +
-                       nxbase::kDdeInterface + ".Connect string:VELTRAApplication string:";
+    std::string call =
+        "dbus-send --session --print-reply --dest=" + nxbase::DdeBusName("EchoPeer") + " " +
+        nxbase::kDdeObjectPath + " " + nxbase::kDdeInterface +
+        ".Connect string:VELTRAApplication string:";
     EXPECT_NE(Shell(call + "EchoPeer").find("boolean true"), std::string::npos);
     EXPECT_NE(Shell(call + "SomeoneElse").find("boolean false"), std::string::npos);
     EXPECT_FALSE(dde->IsAppRunning(nxbase::kDdeService, "SomeoneElse"));
@@ -117,10 +119,10 @@ TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
     dde->SetExecuteFunction([&](const std::string& text) { executed = text; });
     std::string bytes;
     for (int i = 0; i < 600; ++i) bytes += (i ? ",0x" : "0x") + std::string(i % 2 ? "41" : "42");
-    std::string execute = "dbus-send --session --print-reply --dest=" +
-                          nxbase::DdeBusName("DdeTester") + " " + nxbase::kDdeObjectPath + " " +
-                          nxbase::kDdeInterface + ".Execute string:DdeTester array:byte:" + bytes +
-                          " > /dev/null 2>&1 &";
+    std::string execute =
+        "dbus-send --session --print-reply --dest=" + nxbase::DdeBusName("DdeTester") + " " +
+        nxbase::kDdeObjectPath + " " + nxbase::kDdeInterface +
+        ".Execute string:DdeTester array:byte:" + bytes + " > /dev/null 2>&1 &";
     ASSERT_EQ(std::system(execute.c_str()), 0);
     ASSERT_TRUE(RunUntil([&] { return !executed.empty(); }));
     EXPECT_EQ(executed.size(), 500u);
@@ -130,7 +132,8 @@ TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
 TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSend) {
     ASSERT_EQ(std::system((server + " --dde-only &").c_str()), 0);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");  // with its socket
-    ASSERT_TRUE(RunUntil([&] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }));
+    ASSERT_TRUE(
+        RunUntil([&] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }));
     EXPECT_FALSE(std::filesystem::exists(sandbox.runtime() + "/PipeRequest-LumaServer"));
     MyMemoryBlock request, answer;
     ASSERT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,

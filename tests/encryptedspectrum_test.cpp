@@ -1,22 +1,21 @@
 // Enciphered spectra: exact round trips, and every wrong key or altered byte
 // refused rather than turned into a wrong spectrum.
+#include "nxbase/encryptedspectrum.h"
+
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
-#include <fstream>
-#include <string>
-
 #include <cmath>
+#include <cstdio>
 #include <cstring>
+#include <fstream>
 #include <limits>
 #include <random>
 #include <stdexcept>
+#include <string>
 #include <vector>
-
-#include "nxbase/encryptedspectrum.h"
 
 namespace {
 
@@ -28,7 +27,8 @@ EncryptedSpectralData::Key KeyOf(unsigned char seed) {
 
 std::vector<double> Spectrum() {
     std::vector<double> values;
-    for (int i = 0; i < 36; ++i) values.push_back(0.05 + 0.9 * std::sin(i * 0.3) * std::sin(i * 0.3));
+    for (int i = 0; i < 36; ++i)
+        values.push_back(0.05 + 0.9 * std::sin(i * 0.3) * std::sin(i * 0.3));
     // Values whose bits must survive: negative zero, a denormal, extremes.
     values[3] = -0.0;
     values[4] = std::numeric_limits<double>::denorm_min();
@@ -53,7 +53,8 @@ TEST(EncryptedSpectralData, RoundTripsBitForBitAndNeverRepeatsItsBytes) {
     // Empty and large spectra too; too large is refused.
     EXPECT_TRUE(EncryptedSpectralData::Encrypt({}, key).GetDecryptedSpectrum(key).empty());
     std::vector<double> big(EncryptedSpectralData::kMaxValues, 0.5);
-    EXPECT_EQ(EncryptedSpectralData::Encrypt(big, key).GetDecryptedSpectrum(key).size(), big.size());
+    EXPECT_EQ(EncryptedSpectralData::Encrypt(big, key).GetDecryptedSpectrum(key).size(),
+              big.size());
     big.push_back(0.5);
     EXPECT_THROW(EncryptedSpectralData::Encrypt(big, key), std::invalid_argument);
 
@@ -103,7 +104,8 @@ std::vector<std::string> PlacesHolding(const SecretKey& secret) {
         unsigned long start = 0, end = 0;
         char permissions[5] = {};
         if (std::sscanf(line.c_str(), "%lx-%lx %4s", &start, &end, permissions) != 3) continue;
-        if (permissions[0] != 'r' || permissions[1] != 'w' || line.find("[v") != std::string::npos) continue;
+        if (permissions[0] != 'r' || permissions[1] != 'w' || line.find("[v") != std::string::npos)
+            continue;
         // Reservations of sanitizers (terabytes of shadow memory) hold no key.
         if (end - start > (1ul << 30)) continue;
         for (unsigned long at = start; at < end; at += buffer.size() - 32) {
@@ -143,17 +145,20 @@ TEST(EncryptedSpectralData, NoCopyOfTheProcessKeyOutlivesItsUse) {
 
 TEST(EncryptedSpectralData, RefusesWrongKeysAlteredTruncatedAndForeignBytes) {
     const auto key = KeyOf(1);
-    const std::vector<unsigned char> good = EncryptedSpectralData::Encrypt(Spectrum(), key).GetEncryptedData();
+    const std::vector<unsigned char> good =
+        EncryptedSpectralData::Encrypt(Spectrum(), key).GetEncryptedData();
     EXPECT_THROW(EncryptedSpectralData(good).GetDecryptedSpectrum(KeyOf(2)), std::runtime_error);
     // Every single bit of the bytes is covered: header, nonce, text and tag.
     for (std::size_t byte = 0; byte < good.size(); ++byte) {
         std::vector<unsigned char> bad = good;
         bad[byte] ^= static_cast<unsigned char>(1u << (byte % 8));
-        EXPECT_THROW(EncryptedSpectralData(bad).GetDecryptedSpectrum(key), std::runtime_error) << "byte " << byte;
+        EXPECT_THROW(EncryptedSpectralData(bad).GetDecryptedSpectrum(key), std::runtime_error)
+            << "byte " << byte;
     }
     for (std::size_t size : {std::size_t{0}, std::size_t{5}, std::size_t{36}, good.size() - 1}) {
         std::vector<unsigned char> cut(good.begin(), good.begin() + static_cast<long>(size));
-        EXPECT_THROW(EncryptedSpectralData(cut).GetDecryptedSpectrum(key), std::runtime_error) << size;
+        EXPECT_THROW(EncryptedSpectralData(cut).GetDecryptedSpectrum(key), std::runtime_error)
+            << size;
     }
     std::vector<unsigned char> longer = good;
     longer.push_back(0);

@@ -1,14 +1,13 @@
 #include "nxbase/iccprofile.h"
 
-#include "nxbase/appconfig.h"
-#include "nxbase/colorconverter.h"
-#include "nxbase/logfile.h"
-
 #include <gtest/gtest.h>
 #include <lcms2.h>
 
 #include <map>
 
+#include "nxbase/appconfig.h"
+#include "nxbase/colorconverter.h"
+#include "nxbase/logfile.h"
 #include "test_util.h"
 
 namespace {
@@ -35,8 +34,8 @@ class IccTest : public ::testing::Test {
   protected:
     void Configure(const std::string& enable, const std::string& path) {
         settings_ = {{ICCEngine::kEnableKey, enable}, {ICCEngine::kPathKey, path}};
-        previous_ = nxbase::SetICCSettingsReader(
-            [this](const std::string& key, const std::string& def) {
+        previous_ =
+            nxbase::SetICCSettingsReader([this](const std::string& key, const std::string& def) {
                 auto it = settings_.find(key);
                 return it == settings_.end() ? def : it->second;
             });
@@ -140,7 +139,7 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         std::size_t before = fallbackLines();
         EXPECT_NO_THROW(Configure("1", path));
         RGBVector converted(LABVector(50, 0, 0, MeasuringCondition()));  // formulas, no new line
-        ICCProfile::EnableProfile(true);                                // tried already: no retry
+        ICCProfile::EnableProfile(true);                                 // tried already: no retry
         EXPECT_EQ(fallbackLines(), before + 1) << path;
         EXPECT_GT(converted[0], 0.0f);
         ICCEngine* engine = ICCEngine::Instance();
@@ -157,8 +156,8 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
 TEST_F(IccTest, ReadsBothKeysFromTheUserConfiguration) {
     std::string profile = WriteProfile("display.icc", cmsCreate_sRGBProfile());
     nxbase::SetICCSettingsReader(nullptr);
-    UserConfig* config = UserConfig::CreateUserConfig(String("IccTest"), String(dir_.path().string()),
-                                                      String());
+    UserConfig* config =
+        UserConfig::CreateUserConfig(String("IccTest"), String(dir_.path().string()), String());
     config->WriteKey(String("Settings"), String("ICCProfile"), String("1"));
     config->WriteKey(String("Settings"), String("ICCProfilePath"), String(profile));
     ICCEngine::CreateICCEngine();

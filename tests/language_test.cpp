@@ -40,14 +40,22 @@ class OfferAll : public LanguageAccessChecker {
 };
 
 TEST(LanguageTable, CountryCodesKeepTheirShortNamesAndLanguages) {
-    const std::pair<int, const char*> shortNames[] = {
-        {2, ""},   {0, ""},   {kLanguageChineseSimplified, "zh-CN"}, {kLanguageChineseTraditional, "zh"},
-        {42, "cz"}, {81, "jp"}, {35, "fi"}, {96, "ar"}, {972, "he"}};
+    const std::pair<int, const char*> shortNames[] = {{2, ""},
+                                                      {0, ""},
+                                                      {kLanguageChineseSimplified, "zh-CN"},
+                                                      {kLanguageChineseTraditional, "zh"},
+                                                      {42, "cz"},
+                                                      {81, "jp"},
+                                                      {35, "fi"},
+                                                      {96, "ar"},
+                                                      {972, "he"}};
     for (const auto& [code, name] : shortNames) {
         EXPECT_EQ(Language::CountryCodeToShortLanguageName(static_cast<LanguageCode>(code)), name)
             << code;
     }
-    EXPECT_EQ(Language::CountryCodeToDisplayName(kLanguageFrench), "Fran\xE7" "ais");
+    EXPECT_EQ(Language::CountryCodeToDisplayName(kLanguageFrench),
+              "Fran\xE7"
+              "ais");
     EXPECT_EQ(Language::CountryCodeToDisplayName(kLanguageSpanish), "Espa\xF1ol");
 
     // Every listed code has one internal number and comes back from it.
@@ -67,18 +75,26 @@ TEST(LanguageTable, CountryCodesKeepTheirShortNamesAndLanguages) {
 
 TEST(LanguageTable, WindowsIdentifiersAndWinIniNamesMapToInternalNumbers) {
     // 3079 (Austria) is not listed; WIN.INI names are lower case.
-    const std::pair<int, int> windowsIds[] = {
-        {1031, Language::kGerman},  {2055, Language::kGerman}, {4103, Language::kGerman},
-        {3079, Language::kEnglish}, {1028, Language::kChineseTraditional},
-        {2052, Language::kChineseSimplified}, {1041, Language::kJapanese},
-        {1051, Language::kSlovak},  {1037, Language::kHebrew}, {3082, Language::kSpanish},
-        {4108, Language::kFrench},  {2070, Language::kPortuguese}, {1025, Language::kArabic},
-        {1033, Language::kEnglish}, {0xFFFF, Language::kEnglish}};
+    const std::pair<int, int> windowsIds[] = {{1031, Language::kGerman},
+                                              {2055, Language::kGerman},
+                                              {4103, Language::kGerman},
+                                              {3079, Language::kEnglish},
+                                              {1028, Language::kChineseTraditional},
+                                              {2052, Language::kChineseSimplified},
+                                              {1041, Language::kJapanese},
+                                              {1051, Language::kSlovak},
+                                              {1037, Language::kHebrew},
+                                              {3082, Language::kSpanish},
+                                              {4108, Language::kFrench},
+                                              {2070, Language::kPortuguese},
+                                              {1025, Language::kArabic},
+                                              {1033, Language::kEnglish},
+                                              {0xFFFF, Language::kEnglish}};
     for (const auto& [id, language] : windowsIds) {
         EXPECT_EQ(nxbase::LanguageFromWindowsLangId(id), language) << id;
     }
     const std::pair<const char*, int> winIniNames[] = {
-        {"deu", Language::kGerman}, {"frc", Language::kFrench}, {"esn", Language::kSpanish},
+        {"deu", Language::kGerman},     {"frc", Language::kFrench}, {"esn", Language::kSpanish},
         {"ptg", Language::kPortuguese}, {"heb", Language::kHebrew}, {"DEU", Language::kEnglish},
         {"jpn", Language::kEnglish}};
     for (const auto& [name, language] : winIniNames) {
@@ -90,15 +106,22 @@ TEST(LanguageTable, PosixLocalesLandWhereTheWindowsIdentifiersDid) {
     using nxbase::LanguageFromPosixLocale;
     EXPECT_EQ(nxbase::WindowsLangIdFromPosixLocale("de_CH.UTF-8"), 2055u);
     // de_BE: a territory Windows lacked takes the language's main identifier.
-    const std::pair<const char*, int> locales[] = {
-        {"de_CH.UTF-8", Language::kGerman}, {"de_DE@euro", Language::kGerman},
-        {"de_BE.UTF-8", Language::kGerman}, {"de_AT.UTF-8", Language::kEnglish},
-        {"fr_FR.ISO-8859-1", Language::kFrench}, {"fr_CA", Language::kFrench},
-        {"fr_LU", Language::kEnglish}, {"zh_CN.GB18030", Language::kChineseSimplified},
-        {"zh_TW.UTF-8", Language::kChineseTraditional}, {"ja_JP.eucJP", Language::kJapanese},
-        {"es_AR", Language::kEnglish}, {"es_ES", Language::kSpanish},
-        {"pt_BR.UTF-8", Language::kPortuguese}, {"nn_NO", Language::kNorwegian},
-        {"ru_UA.UTF-8", Language::kRussian}, {"sk_SK", Language::kSlovak}};
+    const std::pair<const char*, int> locales[] = {{"de_CH.UTF-8", Language::kGerman},
+                                                   {"de_DE@euro", Language::kGerman},
+                                                   {"de_BE.UTF-8", Language::kGerman},
+                                                   {"de_AT.UTF-8", Language::kEnglish},
+                                                   {"fr_FR.ISO-8859-1", Language::kFrench},
+                                                   {"fr_CA", Language::kFrench},
+                                                   {"fr_LU", Language::kEnglish},
+                                                   {"zh_CN.GB18030", Language::kChineseSimplified},
+                                                   {"zh_TW.UTF-8", Language::kChineseTraditional},
+                                                   {"ja_JP.eucJP", Language::kJapanese},
+                                                   {"es_AR", Language::kEnglish},
+                                                   {"es_ES", Language::kSpanish},
+                                                   {"pt_BR.UTF-8", Language::kPortuguese},
+                                                   {"nn_NO", Language::kNorwegian},
+                                                   {"ru_UA.UTF-8", Language::kRussian},
+                                                   {"sk_SK", Language::kSlovak}};
     for (const auto& [locale, language] : locales) {
         EXPECT_EQ(LanguageFromPosixLocale(locale), language) << locale;
     }
@@ -192,9 +215,12 @@ TEST_F(LanguageTest, ListBoxOffersLanguagesWithTextFiles) {
     language->InitListBox(names, &codes);
     ASSERT_EQ(names.size(), 3u);
     EXPECT_EQ(names[0].str(), "English");
-    EXPECT_EQ(names[1].str(), "Fran\xE7" "ais");
+    EXPECT_EQ(names[1].str(),
+              "Fran\xE7"
+              "ais");
     EXPECT_EQ(names[2].str(), "Deutsch");
-    EXPECT_EQ(codes, (std::vector<LanguageCode>{kLanguageEnglish, kLanguageFrench, kLanguageGerman}));
+    EXPECT_EQ(codes,
+              (std::vector<LanguageCode>{kLanguageEnglish, kLanguageFrench, kLanguageGerman}));
 
     FileLanguageAccessChecker checker(String(dir.File("Other")));
     EXPECT_TRUE(checker.IsAccessible(kLanguageJapanese));

@@ -4,9 +4,9 @@
 #ifndef NXBASE_TESTS_LOG_TEST_UTIL_H_
 #define NXBASE_TESTS_LOG_TEST_UTIL_H_
 
-#include <memory>
-
 #include <gtest/gtest.h>
+
+#include <memory>
 
 #include "test_util.h"
 
@@ -15,7 +15,7 @@ namespace nxtest {
 // Sends the process log into a temporary directory for the whole test
 // program (the log is a process singleton and keeps its first path).
 class LogDirEnvironment : public ::testing::Environment {
-public:
+  public:
     void SetUp() override {
         dir.reset(new TempDir());
         logPath.reset(new ScopedEnv("NXBASE_LOG_PATH", dir->File("log")));
@@ -25,7 +25,7 @@ public:
         dir.reset();
     }
 
-private:
+  private:
     std::unique_ptr<TempDir> dir;
     std::unique_ptr<ScopedEnv> logPath;
 };

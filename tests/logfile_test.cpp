@@ -4,11 +4,11 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
-#include <csignal>
 #include <unistd.h>
 
 #include <atomic>
 #include <boost/make_shared.hpp>
+#include <csignal>
 #include <map>
 #include <regex>
 #include <set>

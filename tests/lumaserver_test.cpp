@@ -2,29 +2,29 @@
 // process: every message byte for byte, notices to subscribers only, start
 // on demand and the end one second after the last peer, nxmsg, and a soak of
 // four client processes.
-#include <gtest/gtest.h>
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cmath>
-#include <fstream>
-#include <cstring>
 #include <algorithm>
+#include <cmath>
+#include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <iterator>
 #include <sstream>
 #include <thread>
 
+#include "messaging_test_util.h"
 #include "nxbase/lumaclient.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
-#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/application.h"
 
@@ -67,9 +67,11 @@ class LumaServerTest : public ::testing::Test {
   protected:
     void SetUp() override {
         root = sandbox.root();
-        std::string server = sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "lumaserver");
+        std::string server =
+            sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "lumaserver");
         serverExecutable = server.substr(server.rfind('/') + 1);
-        ASSERT_EQ(std::system((root + "/bin/" + serverExecutable + " --register >/dev/null").c_str()), 0);
+        ASSERT_EQ(
+            std::system((root + "/bin/" + serverExecutable + " --register >/dev/null").c_str()), 0);
         Application::Get().ResetQuit();
     }
     void TearDown() override {
@@ -120,9 +122,10 @@ TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
 
     // The chart's patches in turn, and the first again after the last.
     std::vector<std::vector<std::string>> chart;
-    for (const std::string& line :
-         nxtest::ReadLines(NXBASE_SOURCE_DIR "/tools/nxcolor/data/colorchecker_babelcolor_average.csv")) {
-        if (line.empty() || line[0] == '#' || !std::isdigit(static_cast<unsigned char>(line[0]))) continue;
+    for (const std::string& line : nxtest::ReadLines(
+             NXBASE_SOURCE_DIR "/tools/nxcolor/data/colorchecker_babelcolor_average.csv")) {
+        if (line.empty() || line[0] == '#' || !std::isdigit(static_cast<unsigned char>(line[0])))
+            continue;
         std::vector<std::string> fields;
         std::stringstream in(line);
         for (std::string field; std::getline(in, field, ',');) fields.push_back(field);
@@ -148,8 +151,8 @@ TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
             int value = 0;
             spectrum >> value;
             double expected = std::stod(row[row.size() - 36 + static_cast<std::size_t>(k)]);
-            EXPECT_EQ(value, static_cast<int>(std::lround(static_cast<double>(
-                                 static_cast<float>(expected)) * 100000.0)))
+            EXPECT_EQ(value, static_cast<int>(std::lround(
+                                 static_cast<double>(static_cast<float>(expected)) * 100000.0)))
                 << i << " " << k;
         }
         EXPECT_FALSE(spectrum.ReadPastEnd());
@@ -237,9 +240,11 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
 TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     auto run = [&](const std::string& arguments, int& status) {
         std::string output;
-        FILE* pipe = ::popen((NXBASE_BINARY_DIR "/tools/nxmsg " + arguments + " 2>&1").c_str(), "r");
+        FILE* pipe =
+            ::popen((NXBASE_BINARY_DIR "/tools/nxmsg " + arguments + " 2>&1").c_str(), "r");
         char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+            output.append(buffer, n);
         int result = ::pclose(pipe);
         status = WIFEXITED(result) ? WEXITSTATUS(result) : -1;
         return output;
@@ -252,12 +257,14 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     EXPECT_EQ(run("--expect s LumaServer 13", status), "status 0\nbytes  00 01 00\nvalues 1\n");
     run("LumaServer MOVE_HOME b:5 s:49 i:-3 str:x hex:0a0b", status);
     EXPECT_EQ(status, 1);  // answered with status 2
-    for (const char* usage : {"LumaServer", "LumaServer IS_READY q:1", "LumaServer IS_READY hex:abc",
-                              "LumaServer IS_READY b:300", "LumaServer 135"}) {
+    for (const char* usage :
+         {"LumaServer", "LumaServer IS_READY q:1", "LumaServer IS_READY hex:abc",
+          "LumaServer IS_READY b:300", "LumaServer 135"}) {
         run(usage, status);
         EXPECT_EQ(status, 2) << usage;
     }
-    EXPECT_NE(run("LumaServer NO_SUCH", status).find("not a message name: NO_SUCH"), std::string::npos);
+    EXPECT_NE(run("LumaServer NO_SUCH", status).find("not a message name: NO_SUCH"),
+              std::string::npos);
     EXPECT_EQ(status, 2);
     // Every argument is checked before anything is sent: a bad --expect type
     // must not let the measurement run first.
@@ -265,8 +272,9 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     EXPECT_EQ(status, 2);
     EXPECT_NE(badType.find("unknown type in --expect: \"q\""), std::string::npos) << badType;
     EXPECT_EQ(badType.find("status"), std::string::npos) << badType;
-    EXPECT_NE(run("--timeout 1 Nobody IS_READY", status).find("Nobody is not registered and not running"),
-              std::string::npos);
+    EXPECT_NE(
+        run("--timeout 1 Nobody IS_READY", status).find("Nobody is not registered and not running"),
+        std::string::npos);
     EXPECT_EQ(status, 3);
 }
 
@@ -276,7 +284,8 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
     std::string output;
     FILE* pipe = ::popen(NXBASE_BINARY_DIR "/tools/nxcolor --measure 3 -f csv -p 2 2>&1", "r");
     char buffer[4096];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, n);
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        output.append(buffer, n);
     const int result = ::pclose(pipe);
     ASSERT_TRUE(WIFEXITED(result)) << output;
     EXPECT_EQ(WEXITSTATUS(result), 0) << output;
@@ -284,7 +293,8 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
     EXPECT_NE(output.find("id,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
     // The emulator measures the built-in chart: dark skin's values, to the
     // 1e-5 the server's integers keep.
-    EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos) << output;
+    EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos)
+        << output;
 }
 
 // The server's highest resident memory so far, in KiB.
@@ -342,7 +352,8 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     // One legal message just under the limit, with no byte to stuff.
     int client = RawClient("Large");
     ASSERT_GE(client, 0);
-    std::string body = nxbase::MessageBody("Large", "GET_DEVICE_TYPE", std::string(nxbase::kMaxFrameLength - 32, 'a'));
+    std::string body = nxbase::MessageBody("Large", "GET_DEVICE_TYPE",
+                                           std::string(nxbase::kMaxFrameLength - 32, 'a'));
     ASSERT_TRUE(SendAll(client, nxbase::EncodeFrame(body)));
     body.clear();
     body.shrink_to_fit();
@@ -379,15 +390,17 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
         }
     } peersReaper{peers};
     std::size_t ended = 0;
-    RunUntil([&] {
-        for (pid_t& peer : peers) {
-            if (peer > 0 && ::waitpid(peer, nullptr, WNOHANG) == peer) {
-                peer = -1;
-                ++ended;
+    RunUntil(
+        [&] {
+            for (pid_t& peer : peers) {
+                if (peer > 0 && ::waitpid(peer, nullptr, WNOHANG) == peer) {
+                    peer = -1;
+                    ++ended;
+                }
             }
-        }
-        return ended >= 4;
-    }, 30s);
+            return ended >= 4;
+        },
+        30s);
     EXPECT_GE(ended, 4u);
     if (!nxtest::kSanitized) {
         EXPECT_LT(HighWaterKiB(server) - base, 400 * 1024) << "KiB with eight partial frames";
@@ -395,7 +408,8 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     int other = RawClient("Other");
     ASSERT_GE(other, 0);
     auto start = std::chrono::steady_clock::now();
-    ASSERT_TRUE(SendAll(other, nxbase::EncodeFrame(nxbase::MessageBody("Other", "GET_DEVICE_TYPE", ""))));
+    ASSERT_TRUE(
+        SendAll(other, nxbase::EncodeFrame(nxbase::MessageBody("Other", "GET_DEVICE_TYPE", ""))));
     EXPECT_GT(::recv(other, answer, sizeof answer, 0), 4);
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
     ::close(other);
@@ -434,14 +448,16 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
         std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
-        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) idle.push_back(fd);
+        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0)
+            idle.push_back(fd);
     }
     RunUntil([] { return false; }, 300ms);
     double before = CpuSeconds(server);
     RunUntil([] { return false; }, 1s);
     EXPECT_LT(CpuSeconds(server) - before, 0.2) << "the accept loop spins";
     // The log cannot open its file without descriptors; stderr says it.
-    EXPECT_NE(nxtest::ReadFile(root + "/server.err").find("accepting a connection failed"), std::string::npos);
+    EXPECT_NE(nxtest::ReadFile(root + "/server.err").find("accepting a connection failed"),
+              std::string::npos);
     for (int fd : idle) ::close(fd);
     // The closed ones free their descriptors; a new peer is served.
     int client = RawClient("Later");
@@ -497,7 +513,8 @@ TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePe
     level << static_cast<unsigned char>(2);
     EXPECT_FALSE(PostOffice::Instance()->SendAndReceive("LumaServer", CONNECT, level, answer));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 2s);
-    EXPECT_NE(PostOffice::Instance()->GetLastError().find("exited with status 3"), std::string::npos)
+    EXPECT_NE(PostOffice::Instance()->GetLastError().find("exited with status 3"),
+              std::string::npos)
         << PostOffice::Instance()->GetLastError();
     EXPECT_EQ(nxtest::ReadLines(root + "/starts").size(), 1u);
 }

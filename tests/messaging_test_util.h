@@ -79,7 +79,8 @@ inline pid_t FindProcess(const std::string& name) {
         ssize_t n = ::readlink(link.c_str(), target, sizeof target - 1);
         if (n <= 0) continue;
         std::string path(target, static_cast<std::size_t>(n));
-        if (path.size() > 10 && path.compare(path.size() - 10, 10, " (deleted)") == 0) path.resize(path.size() - 10);
+        if (path.size() > 10 && path.compare(path.size() - 10, 10, " (deleted)") == 0)
+            path.resize(path.size() - 10);
         if (path.substr(path.rfind('/') + 1) == name) {
             found = static_cast<pid_t>(std::atoi(entry->d_name));
             break;

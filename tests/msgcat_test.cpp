@@ -129,7 +129,8 @@ TEST_F(ApplicationTable, PeersWithTheirPathsAndMissingExecutablesSkipped) {
     AddPeer("Gone", dir.File("gone"));
     AddPeer("Empty", "");
     PostOfficeApplications table("Tester");
-    EXPECT_EQ(table.GetApplications(), (std::vector<std::string>{"ColorLab", "LumaServer", "Printer"}));
+    EXPECT_EQ(table.GetApplications(),
+              (std::vector<std::string>{"ColorLab", "LumaServer", "Printer"}));
     PostOfficeApplication server = table.GetApplicationInfo("LumaServer");
     EXPECT_EQ(server.GetName(), "lumaserver");
     EXPECT_EQ(server.GetExecutable(), "lumaserver");

@@ -76,8 +76,8 @@ TEST(MyMemoryBlock, ReadsBackEveryTypeInWritingOrder) {
     // Writing the values read gives the same image (the writer's bytes are
     // pinned by the test above), so every value came back exactly.
     MyMemoryBlock again;
-    again << minChar << c << uc << s << us << i1 << i2 << l << text << empty << longRead
-          << readWide << readEmpty << after;
+    again << minChar << c << uc << s << us << i1 << i2 << l << text << empty << longRead << readWide
+          << readEmpty << after;
     EXPECT_EQ(Image(again), Image(block));
     EXPECT_EQ(l, -1L) << "a long is written as its low 32 bits, so sign extension is checked here";
     EXPECT_EQ(block.Remaining(), 0);
@@ -321,10 +321,10 @@ TEST(FlagSet, TwoIntsAreARangeThatSerialisesByIndexAndReadsBackFromZero) {
     Bytes bytes = Image(block);
     ASSERT_EQ(bytes.size(), 4u + 137u);
     EXPECT_EQ(bytes[0], 137);
-    EXPECT_EQ(bytes[4], 1);   // -2
-    EXPECT_EQ(bytes[5], 1);   // -1
-    EXPECT_EQ(bytes[6], 1);   // 0
-    EXPECT_EQ(bytes[7], 0);   // 1
+    EXPECT_EQ(bytes[4], 1);        // -2
+    EXPECT_EQ(bytes[5], 1);        // -1
+    EXPECT_EQ(bytes[6], 1);        // 0
+    EXPECT_EQ(bytes[7], 0);        // 1
     EXPECT_EQ(bytes[4 + 136], 1);  // 134
     FlagSet back;
     block >> back;

@@ -72,7 +72,8 @@ TEST(NxcolorScreen, IccProfileAgreesWithTheFormulasAndBadOnesFallBack) {
         ASSERT_TRUE(std::regex_match(f[patch], a, row));
         ASSERT_TRUE(std::regex_match(i[patch], b, row));
         for (int c = 1; c <= 3; ++c)
-            EXPECT_NEAR(std::stoi(a[c]), std::stoi(b[c]), kNeutralLevels) << f[patch] << " / " << i[patch];
+            EXPECT_NEAR(std::stoi(a[c]), std::stoi(b[c]), kNeutralLevels)
+                << f[patch] << " / " << i[patch];
     }
 
     std::string junk = dir.File("junk.icc");
@@ -148,8 +149,11 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     EXPECT_NE(text.find("gr\xC3\xBCn"), std::string::npos);
     EXPECT_NE(text.find("messung-\xC3\xA9t\xC3\xA9.csv"), std::string::npos);
     if (std::system("python3 -c 'import xml.etree.ElementTree' 2>/dev/null") == 0) {
-        EXPECT_EQ(std::system(("python3 -c 'import sys, xml.etree.ElementTree as E; E.parse(sys.argv[1])' " + svg).c_str()),
-                  0);
+        EXPECT_EQ(
+            std::system(
+                ("python3 -c 'import sys, xml.etree.ElementTree as E; E.parse(sys.argv[1])' " + svg)
+                    .c_str()),
+            0);
     }
     EXPECT_FALSE(nxcolor::WriteSvgReport(report, MeasuringCondition(),
                                          dir.File("no/such/dir/x.svg"), &error));

@@ -1,15 +1,14 @@
 // nxcolor: its CSV reader, its report, and the program on good and bad files.
 #include <gtest/gtest.h>
+#include <lcms2.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
-
-#include <lcms2.h>
-#include <algorithm>
 #include <fstream>
-#include <sstream>
 #include <random>
+#include <sstream>
 #include <string>
 
 #include "color_test_util.h"
@@ -58,7 +57,8 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     nxcolor::Writers().at("csv")(report, csv);
     const std::string text = csv.str();
     EXPECT_EQ(text.substr(0, text.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
-    EXPECT_NE(text.find("\n1 dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"), std::string::npos)
+    EXPECT_NE(text.find("\n1 dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"),
+              std::string::npos)
         << text.substr(0, 200);
     std::ostringstream aligned;
     nxcolor::Writers().at("table")(report, aligned);
@@ -67,7 +67,8 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     // finds the data format (colour fields, no spectral ones).
     std::ostringstream cgats;
     nxcolor::Writers().at("cgats")(report, cgats);
-    EXPECT_NE(cgats.str().find("SAMPLE_ID SAMPLE_NAME XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
+    EXPECT_NE(cgats.str().find(
+                  "SAMPLE_ID SAMPLE_NAME XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
               std::string::npos);
     const auto back = nxcolor::ParseSpectra(cgats.str(), "out.cgats");
     ASSERT_EQ(back.errors.size(), 1u);
@@ -117,7 +118,8 @@ TEST(NxcolorProgram, ReportsBadFilesClearly) {
 TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     std::string out;
     std::string err;
-    ASSERT_EQ(RunNxcolor("--illuminant D65 --observer 10 --format csv --din99", &out, &err), 0) << err;
+    ASSERT_EQ(RunNxcolor("--illuminant D65 --observer 10 --format csv --din99", &out, &err), 0)
+        << err;
     EXPECT_EQ(out.substr(0, out.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 25);
     // Densities of a flat 10% reflector are 1 in every channel.
@@ -132,14 +134,16 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     EXPECT_NE(out.find("Usage: nxcolor"), std::string::npos);
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);
     EXPECT_NE(out.find("\n1 dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"),
-              std::string::npos) << out.substr(0, 200);
+              std::string::npos)
+        << out.substr(0, 200);
 }
 
 TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
     nxtest::TempDir dir;
     const std::string rows = dir.File("rows.csv");
-    std::ofstream(rows) << Header() << "\n1,huge," << Values(1e30f) << "\n2,black," << Values(0.0f) << "\n3,tiny,"
-                        << Values(0.5f, 35) << ",1e-45" << "\n4,ok," << Values(0.5f) << "\n";
+    std::ofstream(rows) << Header() << "\n1,huge," << Values(1e30f) << "\n2,black," << Values(0.0f)
+                        << "\n3,tiny," << Values(0.5f, 35) << ",1e-45"
+                        << "\n4,ok," << Values(0.5f) << "\n";
     std::string out;
     std::string err;
     EXPECT_EQ(RunNxcolor(rows + " --fraction --xyy -f csv", &out, &err), 1);
@@ -158,14 +162,17 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
         table << "wavelength,value\n";
         for (int nm = 300; nm <= 830; nm += 5) table << nm << ",3e38\n";
     }
-    EXPECT_EQ(RunNxcolor("NXBASE_DATA_DIR=" + data + " -f csv", &out, &err), 2) << "an option is not a file";
+    EXPECT_EQ(RunNxcolor("NXBASE_DATA_DIR=" + data + " -f csv", &out, &err), 2)
+        << "an option is not a file";
     const std::string program = std::string("NXBASE_DATA_DIR=") + data + " " + NXCOLOR_PATH;
-    const std::string command = program + " -i HOT -f csv >" + dir.File("o") + " 2>" + dir.File("e");
+    const std::string command =
+        program + " -i HOT -f csv >" + dir.File("o") + " 2>" + dir.File("e");
     const int status = std::system(command.c_str());
     EXPECT_EQ(WEXITSTATUS(status), 0) << nxtest::ReadFile(dir.File("e"));
     EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("inf"), std::string::npos);
     EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("nan"), std::string::npos);
-    EXPECT_EQ(std::system((program + " --list-illuminants | grep -qx 'HOT (installed)'").c_str()), 0);
+    EXPECT_EQ(std::system((program + " --list-illuminants | grep -qx 'HOT (installed)'").c_str()),
+              0);
     // The same table named by its path.
     std::string byPath;
     EXPECT_EQ(RunNxcolor("-i " + data + "/illuminants/HOT.csv -f csv", &byPath, &err), 0) << err;
@@ -183,12 +190,16 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
 TEST(NxcolorProgram, ReadsOtherGridsScalesAndNames) {
     std::string out;
     std::string err;
-    const std::string five = std::string(NXBASE_TEST_DATA_DIR) + "/spectra/colorchecker_5nm_percent.csv";
+    const std::string five =
+        std::string(NXBASE_TEST_DATA_DIR) + "/spectra/colorchecker_5nm_percent.csv";
     ASSERT_EQ(RunNxcolor(five + " -f csv -p 2 -i d50 -v", &out, &err), 0) << err;
     // A 5 nm file: colour summed at 5 nm (the 10 nm path gives 11.81,10.33,
     // 5.17,38.42,13.69,... for the same patch).
-    EXPECT_NE(out.find("\n1 dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"), std::string::npos) << out;
-    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's own interval"),
+    EXPECT_NE(out.find("\n1 dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"),
+              std::string::npos)
+        << out;
+    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's "
+                       "own interval"),
               std::string::npos)
         << err;
     std::string f2, fl2;
@@ -204,9 +215,10 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
     const std::string written = dir.File("chart.ti3");
     std::string out;
     std::string err;
-    ASSERT_EQ(RunNxcolor("-f cgats --keep-spectra -d 'Status T' -i D65 > " + written + "; cat " + written, &out,
-                         &err),
-              0)
+    ASSERT_EQ(
+        RunNxcolor("-f cgats --keep-spectra -d 'Status T' -i D65 > " + written + "; cat " + written,
+                   &out, &err),
+        0)
         << err;
     EXPECT_NE(out.find("\nCREATED \""), std::string::npos);
     EXPECT_NE(out.find("\nWEIGHTING_FUNCTION \"ILLUMINANT, D65\"\n"), std::string::npos);
@@ -238,13 +250,16 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
     ASSERT_EQ(back.rows.size(), 24u);
     EXPECT_TRUE(back.scaleNote.empty()) << "a CTI3 file states its scale";
     for (std::size_t i = 0; i < 24; ++i) {
-        for (int k = 0; k < 36; ++k) EXPECT_NEAR(back.rows[i].values[k], chart.rows[i].values[k], nxtest::kFloatNearOne) << i;
+        for (int k = 0; k < 36; ++k)
+            EXPECT_NEAR(back.rows[i].values[k], chart.rows[i].values[k], nxtest::kFloatNearOne)
+                << i;
     }
     if (std::system("command -v spec2cie >/dev/null 2>&1") != 0) {
         GTEST_SKIP() << "ArgyllCMS (package argyll) is not installed: spec2cie not run";
     }
     const std::string converted = dir.File("spec2cie.ti3");
-    ASSERT_EQ(std::system(("spec2cie -i D65 " + ti3 + " " + converted + " >/dev/null 2>&1").c_str()), 0);
+    ASSERT_EQ(
+        std::system(("spec2cie -i D65 " + ti3 + " " + converted + " >/dev/null 2>&1").c_str()), 0);
     cmsHANDLE ours = cmsIT8LoadFromFile(nullptr, ti3.c_str());
     cmsHANDLE theirs = cmsIT8LoadFromFile(nullptr, converted.c_str());
     ASSERT_NE(ours, nullptr);
@@ -255,8 +270,8 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
             const int ourColumn = cmsIT8FindDataFormat(ours, field);
             const int theirColumn = cmsIT8FindDataFormat(theirs, field);
             // ASTM E308 10 nm tables here, ArgyllCMS's own integration there.
-            EXPECT_NEAR(cmsIT8GetDataRowColDbl(theirs, set, theirColumn), cmsIT8GetDataRowColDbl(ours, set, ourColumn),
-                        nxtest::kOtherIntegration)
+            EXPECT_NEAR(cmsIT8GetDataRowColDbl(theirs, set, theirColumn),
+                        cmsIT8GetDataRowColDbl(ours, set, ourColumn), nxtest::kOtherIntegration)
                 << set << " " << field;
         }
     }
@@ -268,10 +283,11 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
     nxtest::TempDir dir;
     const std::string reference = dir.File("ref.csv");
     const std::string sample = dir.File("sample.csv");
-    std::ofstream(reference) << Header() << "\nA,paper," << Values(0.9f) << "\nB,grey," << Values(0.5f) << "\n";
+    std::ofstream(reference) << Header() << "\nA,paper," << Values(0.9f) << "\nB,grey,"
+                             << Values(0.5f) << "\n";
     // In another order, one sample darker, and one without a reference.
-    std::ofstream(sample) << Header() << "\nB,grey," << Values(0.45f) << "\nA,paper," << Values(0.9f) << "\nC,x,"
-                          << Values(0.2f) << "\n";
+    std::ofstream(sample) << Header() << "\nB,grey," << Values(0.45f) << "\nA,paper,"
+                          << Values(0.9f) << "\nC,x," << Values(0.2f) << "\n";
     std::string out;
     std::string err;
     EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " -f csv", &out, &err), 1);
@@ -279,12 +295,17 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
     EXPECT_NE(out.find("\nA paper,0.00,0.00,0.00,0.00\n"), std::string::npos) << out;
     EXPECT_NE(err.find("sample \"C x\" has no reference"), std::string::npos) << err;
     EXPECT_NE(err.find("# 2 pairs: mean dE00 "), std::string::npos) << err;
-    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 1", &out, &err), 3);
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 1", &out, &err),
+              3);
     EXPECT_NE(out.find("# worst: B grey ("), std::string::npos) << out;
     EXPECT_NE(out.find("# 1 of 2 pairs above the tolerance 1.00"), std::string::npos) << out;
-    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 5 --de ab", &out, &err), 1);
+    EXPECT_EQ(
+        RunNxcolor("--compare " + reference + " " + sample + " --tolerance 5 --de ab", &out, &err),
+        1);
     // By order: A against B and B against A.
-    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --by-order --de cmc -f csv", &out, &err), 1);
+    EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --by-order --de cmc -f csv",
+                         &out, &err),
+              1);
     EXPECT_NE(out.find("id,dL*,dC*,dH*,dE CMC(2:1)\nB grey,-"), std::string::npos) << out;
     EXPECT_EQ(RunNxcolor("--compare " + reference, &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--compare --de 77 " + reference + " " + sample, &out, &err), 2);

@@ -4,11 +4,10 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 
-#include <filesystem>
-#include <thread>
-
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
+#include <thread>
 
 #include "test_util.h"
 
@@ -48,7 +47,8 @@ TEST_F(NxregTest, RegistersTheServerAndPeersAndShowsThem) {
     const std::string server = "'HKLM\\Software\\K-Lume\\LumaServer'";
     for (const std::string& set :
          {"set " + server + " Path /opt/k-lume/bin",
-          "set " + server + " Executable /opt/k-lume/bin/LumaServer", "set " + server + " Version 3.2",
+          "set " + server + " Executable /opt/k-lume/bin/LumaServer",
+          "set " + server + " Version 3.2",
           std::string("set 'HKEY_LOCAL_MACHINE\\Software\\K-Lume\\ChromaLink\\Applications' "
                       "ColorLab '/opt/k-lume/bin/ColorLab'")}) {
         EXPECT_EQ(Run(set).status, 0) << set;
@@ -94,8 +94,8 @@ TEST_F(NxregTest, ExportDeleteImportRestoresTheKeys) {
 
 TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     EXPECT_EQ(Run("--help").status, 0);
-    for (const char* usage :
-         {"", "frobnicate", "get 'HKEY_USERS\\x' y", "set --dword 'HKCU\\x' y 12z", "delete HKCU"}) {
+    for (const char* usage : {"", "frobnicate", "get 'HKEY_USERS\\x' y",
+                              "set --dword 'HKCU\\x' y 12z", "delete HKCU"}) {
         EXPECT_EQ(Run(usage).status, 2) << usage;
     }
 
@@ -110,10 +110,12 @@ TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     // bounded: endless inputs are refused instead of filling the memory.
     Result zeros = Run("import /dev/zero");
     EXPECT_EQ(zeros.status, 3);
-    EXPECT_NE(zeros.out.find("/dev/zero:1: the first line must be REGEDIT4"), std::string::npos) << zeros.out;
+    EXPECT_NE(zeros.out.find("/dev/zero:1: the first line must be REGEDIT4"), std::string::npos)
+        << zeros.out;
     Result binary = Run("import -", "printf '\\177ELF\\002\\001\\n...'");
     EXPECT_EQ(binary.status, 3);
-    EXPECT_NE(binary.out.find("<stdin>:1: the first line must be REGEDIT4"), std::string::npos) << binary.out;
+    EXPECT_NE(binary.out.find("<stdin>:1: the first line must be REGEDIT4"), std::string::npos)
+        << binary.out;
     Result huge = Run("import -", "{ printf 'REGEDIT4\\n'; cat /dev/zero; }");
     EXPECT_EQ(huge.status, 3);
     EXPECT_NE(huge.out.find("<stdin>: more than 64 MiB"), std::string::npos) << huge.out;
@@ -181,7 +183,8 @@ TEST_F(NxregTest, HivesOnAReadOnlyMountAreRead) {
     }
     ASSERT_EQ(Run("set 'HKCU\\Software\\K-Lume\\Ro' u user").status, 0);
     ASSERT_EQ(Run("set 'HKLM\\Software\\K-Lume\\Ro' m machine").status, 0);
-    const std::string mount = "mount --bind -o ro '" + dir.path().string() + "' '" + dir.path().string() + "'";
+    const std::string mount =
+        "mount --bind -o ro '" + dir.path().string() + "' '" + dir.path().string() + "'";
     Result readOnly = Shell("unshare -rm sh -c \"" + mount + " && " + Nxreg() +
                             " get 'HKCU\\Software\\K-Lume\\Ro' u && " + Nxreg() +
                             " get 'HKLM\\Software\\K-Lume\\Ro' m\" 2>&1");

@@ -10,17 +10,17 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <filesystem>
 #include <cstring>
+#include <filesystem>
 #include <functional>
 #include <thread>
 
+#include "messaging_test_util.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/poapps.h"
 #include "nxbase/registry.h"
-#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/application.h"
 #include "toolkit/unixsocket.h"
@@ -160,7 +160,8 @@ class PipeTest : public ::testing::Test {
         std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
         EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
         std::string request = nxbase::EncodeFrame(name + "_1");
-        EXPECT_EQ(::write(fd, request.data(), request.size()), static_cast<ssize_t>(request.size()));
+        EXPECT_EQ(::write(fd, request.data(), request.size()),
+                  static_cast<ssize_t>(request.size()));
         EXPECT_TRUE(RunUntil([&] { return pipe->HasChannel(name); }));
         char reply[256];
         ssize_t n = ::recv(fd, reply, sizeof reply, 0);
@@ -261,8 +262,7 @@ TEST_F(PipeTest, ALostPeerIsReportedAndTheNextSendStartsItAgain) {
     ASSERT_TRUE(RunUntil([&] { return !lost.empty(); }));
     EXPECT_EQ(lost, std::vector<std::string>{"EchoPeer"});
     EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
-    RunUntil([&] { return !nxbase::IsApplicationRunning("EchoPeer"); },
-             5s);
+    RunUntil([&] { return !nxbase::IsApplicationRunning("EchoPeer"); }, 5s);
     EXPECT_EQ(RoundTrip("two"), "two");
     // An application nobody registered is not started and the send fails.
     EXPECT_FALSE(pipe->Send("Nobody", "IS_READY", none));
@@ -283,7 +283,8 @@ TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
     int silent = connect();
     int nameless = connect();
     std::string request = nxbase::EncodeFrame("NoProcessId");
-    ASSERT_EQ(::write(nameless, request.data(), request.size()), static_cast<ssize_t>(request.size()));
+    ASSERT_EQ(::write(nameless, request.data(), request.size()),
+              static_cast<ssize_t>(request.size()));
     ASSERT_TRUE(RunUntil([&] { return pipe->ChannelCount() == channels + 1; }, 2s));
     auto start = std::chrono::steady_clock::now();
     ASSERT_TRUE(RunUntil([&] { return pipe->ChannelCount() == channels; }, 8s));
@@ -342,7 +343,8 @@ TEST_F(PipeTest, AFailedWriteClosesOnlyItsChannelAndSaysWhy) {
     failing.failSends = 1;
     MyMemoryBlock none;
     EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
-    EXPECT_NE(pipe->GetLastError().find("Input/output error"), std::string::npos) << pipe->GetLastError();
+    EXPECT_NE(pipe->GetLastError().find("Input/output error"), std::string::npos)
+        << pipe->GetLastError();
     EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
     // The next send opens a new channel to the peer, which still runs.
     EXPECT_EQ(RoundTrip("after"), "after");
@@ -356,7 +358,8 @@ TEST_F(PipeTest, AFailedWriteClosesOnlyItsChannelAndSaysWhy) {
     std::this_thread::sleep_for(20ms);  // a start now would show in the time
     auto start = std::chrono::steady_clock::now();
     {
-        Pipe::SendScope scope(pipe, [&] { return std::chrono::steady_clock::now() - start < 500ms; });
+        Pipe::SendScope scope(pipe,
+                              [&] { return std::chrono::steady_clock::now() - start < 500ms; });
         EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
     }
     EXPECT_GE(std::chrono::steady_clock::now() - start, 450ms);  // it waited for the running one
@@ -377,7 +380,8 @@ TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {
     ASSERT_EQ(::chmod(runtime.c_str(), 0755), 0);
     pipe = Pipe::CreatePipe("PipeTestClient");
     EXPECT_FALSE(pipe->IsListening());
-    EXPECT_NE(pipe->GetRefusal().find("open to other users"), std::string::npos) << pipe->GetRefusal();
+    EXPECT_NE(pipe->GetRefusal().find("open to other users"), std::string::npos)
+        << pipe->GetRefusal();
     MyMemoryBlock none;
     EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
     EXPECT_NE(pipe->GetLastError().find("runtime directory refused"), std::string::npos)

@@ -11,16 +11,16 @@
 
 #include <cstring>
 #include <filesystem>
-#include <functional>
 #include <fstream>
+#include <functional>
 #include <thread>
 
+#include "messaging_test_util.h"
 #include "nxbase/applock.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/registry.h"
-#include "messaging_test_util.h"
 #include "test_util.h"
 #include "toolkit/userinterface.h"
 
@@ -220,7 +220,8 @@ TEST_F(PostOfficeTest, SendAndReceiveStartsThePeerAndGetsItsAnswer) {
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     MyMemoryBlock request, answer;
     request << String("hello") << 42;
-    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer, DisEnableWindow));
+    ASSERT_TRUE(
+        office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer, DisEnableWindow));
     String text;
     int number = 0;
     answer >> text >> number;
@@ -244,22 +245,25 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
     // The peer dies without answering: the wait fails at once.
     auto start = std::chrono::steady_clock::now();
-    EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer,
-                                        [] { return true; }));
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer, [] { return true; }));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 3s);
     // Gone from /proc is not yet gone: an exiting process drops its memory
     // before its descriptors, its socket and name lock among them.
-    RunUntil([&] { return !nxtest::ProcessRunning(peerExecutable) && !nxbase::IsApplicationRunning("EchoPeer"); },
-             5s);
+    RunUntil(
+        [&] {
+            return !nxtest::ProcessRunning(peerExecutable) &&
+                   !nxbase::IsApplicationRunning("EchoPeer");
+        },
+        5s);
     // The next send starts it again.
     ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
 
     // A peer that never answers: the keep-waiting function ends the wait ...
     start = std::chrono::steady_clock::now();
     auto stopAt = start + 200ms;
-    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer, [&] {
-        return std::chrono::steady_clock::now() < stopAt;
-    }));
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer,
+                                        [&] { return std::chrono::steady_clock::now() < stopAt; }));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
     // ... and without one, the time-out of a handler that cannot ask a person.
     nxtest::ScopedEnv timeout("NXBASE_WAIT_TIMEOUT", "1");
@@ -327,7 +331,7 @@ TEST_F(PostOfficeTest, TheLockOwnersCommandsPassThoseQueuedBeforeThem) {
     office->ChangeMessageHdl(IS_APP_READY, handler);
     RawPeer busy("Busy", path), other("Other", path), locker("Locker", path);
     busy.Send("IS_APP_READY", "");
-    other.Send("GET_DEVICE_TYPE", "");  // queued while the handler runs
+    other.Send("GET_DEVICE_TYPE", "");            // queued while the handler runs
     locker.Send("LOCK", std::string("\x00", 1));  // queued behind it
     EXPECT_EQ(busy.Next().first, "ANSWER!IS_APP_READY");
     EXPECT_EQ(locker.Next(1s), Answer("ANSWER!LOCK", std::string("\x00", 1)));
@@ -380,8 +384,11 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
         if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(1);
         std::string bytes = nxbase::EncodeFrame("Flooder_1");
         char reply[256];
-        if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0 || ::recv(fd, reply, sizeof reply, 0) <= 0) ::_exit(2);
-        bytes = nxbase::EncodeFrame(nxbase::MessageBody("Flooder", "ANSWER!GET_APP_VERSION", std::string(4096, 'a')));
+        if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0 ||
+            ::recv(fd, reply, sizeof reply, 0) <= 0)
+            ::_exit(2);
+        bytes = nxbase::EncodeFrame(
+            nxbase::MessageBody("Flooder", "ANSWER!GET_APP_VERSION", std::string(4096, 'a')));
         for (int i = 0; i < 20000; ++i) {
             if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) ::_exit(3);
         }
@@ -401,7 +408,8 @@ void Forward(VELTRAEvent& event) {
     PostOffice::Instance()->CommunicationReceiveFunction(event);
 }
 void DropDeviceTypeRequests(VELTRAEvent& event) {
-    if (event.GetCommand() != "GET_DEVICE_TYPE") PostOffice::Instance()->CommunicationReceiveFunction(event);
+    if (event.GetCommand() != "GET_DEVICE_TYPE")
+        PostOffice::Instance()->CommunicationReceiveFunction(event);
 }
 
 TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefused) {
@@ -426,7 +434,8 @@ TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefuse
     EXPECT_EQ(sent, 0);
     EXPECT_NE(office->GetLastError().find("another thread"), std::string::npos);
     ASSERT_FALSE(ui->Boxes().empty());
-    EXPECT_NE(ui->Boxes().back().text.find("PostOffice used from another thread"), std::string::npos);
+    EXPECT_NE(ui->Boxes().back().text.find("PostOffice used from another thread"),
+              std::string::npos);
     EXPECT_EQ(peer.Next(300ms).first, "<none>");
 }
 

@@ -1,8 +1,7 @@
 #include "nxbase/progress.h"
 
-#include <gtest/gtest.h>
-
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -192,9 +191,9 @@ TEST(CurrentWaitVisualizer, ScopesNestAndRestoreThePreviousListener) {
         EXPECT_TRUE(first->values.empty());
         {
             CurrentWaitVisualizer c(nullptr, String("Title"), String("Text"), true);
-            EXPECT_NE(dynamic_cast<nxbase::TerminalProgressListener*>(
-                          CurrentWaitVisualizer::Get().get()),
-                      nullptr);
+            EXPECT_NE(
+                dynamic_cast<nxbase::TerminalProgressListener*>(CurrentWaitVisualizer::Get().get()),
+                nullptr);
         }
     }
     EXPECT_FALSE(CurrentWaitVisualizer::Get());

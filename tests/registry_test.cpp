@@ -259,7 +259,7 @@ TEST_F(RegistryTest, TheMachineHiveKeepsNoSideFilesAndReadsFromAReadOnlyPlace) {
     pid_t child = ::fork();
     if (child == 0) {
         if (::geteuid() == 0 && ::setuid(65534) != 0) ::_exit(3);  // a user without rights
-        if (::access(file.c_str(), R_OK) != 0) ::_exit(4);  // the build tree is closed to it
+        if (::access(file.c_str(), R_OK) != 0) ::_exit(4);         // the build tree is closed to it
         int code = 1;
         try {
             auto value = RegistryStore::Read(RegistryHive::LocalMachine,
@@ -274,7 +274,8 @@ TEST_F(RegistryTest, TheMachineHiveKeepsNoSideFilesAndReadsFromAReadOnlyPlace) {
     ::waitpid(child, &status, 0);
     ::chmod(dir.File("machine").c_str(), 0755);
     ASSERT_TRUE(WIFEXITED(status));
-    if (WEXITSTATUS(status) == 4) GTEST_SKIP() << "the test directory is not readable by user 65534";
+    if (WEXITSTATUS(status) == 4)
+        GTEST_SKIP() << "the test directory is not readable by user 65534";
     EXPECT_EQ(WEXITSTATUS(status), 0);
 }
 
@@ -421,7 +422,9 @@ TEST_F(RegistryTest, RegeditFiveInUtf16WithHexValuesImportsTypedAndInUtf8) {
         u"  00,00\r\n";
     auto changes = nxbase::ParseRegedit4(Utf16Le(file), "v5.reg");
     RegistryStore::Apply(changes);
-    const std::string key = "Software\\K-Lume\\Gr\xC3\xBC\xC3\x9F" "e";  // UTF-8 in the hive
+    const std::string key =
+        "Software\\K-Lume\\Gr\xC3\xBC\xC3\x9F"
+        "e";  // UTF-8 in the hive
     auto name = RegistryStore::Read(RegistryHive::CurrentUser, key, "Name");
     ASSERT_TRUE(name);
     EXPECT_EQ(name->text, "Wei\xC3\x9F \xE2\x82\xAC");
@@ -436,13 +439,18 @@ TEST_F(RegistryTest, RegeditFiveInUtf16WithHexValuesImportsTypedAndInUtf8) {
     auto multi = RegistryStore::Read(RegistryHive::CurrentUser, key, "Multi");
     ASSERT_TRUE(multi);
     EXPECT_EQ(multi->type, nxbase::RegistryType::MultiString);
-    EXPECT_EQ(multi->text, std::string("a\0\xC3\x84" "b\0", 6));
+    EXPECT_EQ(multi->text, std::string("a\0\xC3\x84"
+                                       "b\0",
+                                       6));
 
     // The application's ANSI view: Windows-1252 bytes, and the key-type error
     // for the typed values.
-    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF" "e", "Name"),
+    EXPECT_EQ(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF"
+                                      "e",
+                                      "Name"),
               "Wei\xDF \x80");
-    EXPECT_THROW(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF" "e",
+    EXPECT_THROW(NxReadRegistryKeyString("HKEY_CURRENT_USER\\Software\\K-Lume\\Gr\xFC\xDF"
+                                         "e",
                                          "Multi"),
                  nxbase::RegistryKeyTypeError);
 
@@ -454,9 +462,10 @@ TEST_F(RegistryTest, RegeditFiveInUtf16WithHexValuesImportsTypedAndInUtf8) {
     for (const char* value : {"Name", "Blob", "Expand", "Multi"}) {
         auto back = RegistryStore::Read(RegistryHive::CurrentUser, key, value);
         ASSERT_TRUE(back) << value;
-        auto original = value == std::string("Name") ? name : value == std::string("Blob") ? blob
-                        : value == std::string("Expand")                          ? expand
-                                                                                   : multi;
+        auto original = value == std::string("Name")     ? name
+                        : value == std::string("Blob")   ? blob
+                        : value == std::string("Expand") ? expand
+                                                         : multi;
         EXPECT_EQ(back->type, original->type) << value;
         EXPECT_EQ(back->text, original->text) << value;
     }

@@ -1,4 +1,6 @@
 // Spectral files of any grid, their scale, and resampling onto 380..730/10 nm.
+#include "nxbase/spectrafile.h"
+
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -9,10 +11,9 @@
 
 #include "color_test_util.h"
 #include "nxbase/colorbatch.h"
-#include "nxbase/meascond.h"
 #include "nxbase/colordiff.h"
+#include "nxbase/meascond.h"
 #include "nxbase/resample.h"
-#include "nxbase/spectrafile.h"
 #include "test_util.h"
 
 namespace {
@@ -29,7 +30,8 @@ std::string Values(double v, int count = 36, char separator = ',') {
 
 std::string Header(int first = 380, int last = 730, int step = 10, const char* prefix = "r") {
     std::string text = "patch_index,patch_name";
-    for (int nm = first; nm <= last; nm += step) text += "," + std::string(prefix) + std::to_string(nm);
+    for (int nm = first; nm <= last; nm += step)
+        text += "," + std::string(prefix) + std::to_string(nm);
     return text;
 }
 
@@ -57,10 +59,11 @@ TEST(SpectraFile, ReadsCsvRowsAndReportsBadOnesWithTheirLine) {
     EXPECT_EQ(chart.resampling, "as read");
     EXPECT_FALSE(chart.percent);
 
-    const std::string text = Header() + "\n" + "1,good," + Values(0.5) + "\n" + "2,short," + Values(0.5, 30) + "\n" +
-                             "3,text,0.1,abc," + Values(0.5, 34) + "\n" + "4,nan," + Values(0.5, 35) + ",nan\n" +
-                             "5,\"quoted, name\"," + Values(0.25) + "\r\n" + "6,huge,1e300," + Values(0.5, 35) + "\n" +
-                             "7,wild,900," + Values(0.5, 35) + "\n" + "8,black," + Values(0.0) + "\n";
+    const std::string text =
+        Header() + "\n" + "1,good," + Values(0.5) + "\n" + "2,short," + Values(0.5, 30) + "\n" +
+        "3,text,0.1,abc," + Values(0.5, 34) + "\n" + "4,nan," + Values(0.5, 35) + ",nan\n" +
+        "5,\"quoted, name\"," + Values(0.25) + "\r\n" + "6,huge,1e300," + Values(0.5, 35) + "\n" +
+        "7,wild,900," + Values(0.5, 35) + "\n" + "8,black," + Values(0.0) + "\n";
     const SpectraTable table = nxbase::ParseSpectraCsv(text, "bad.csv", {SpectralScale::kFraction});
     ASSERT_EQ(table.rows.size(), 2u);
     EXPECT_EQ(table.rows[1].id, "5 quoted, name");
@@ -125,12 +128,15 @@ TEST(SpectraFile, TakesAnyIncreasingGridAndNumericHeaders) {
         EXPECT_EQ(t.rows[0].values[7], 0.4512f);
         EXPECT_NE(t.rows[0].id.find(", hell"), std::string::npos) << t.rows[0].id;
         ASSERT_FALSE(t.notes.empty());
-        EXPECT_NE(t.notes[0].find("eu.csv: CSV with fields separated by"), std::string::npos) << t.notes[0];
+        EXPECT_NE(t.notes[0].find("eu.csv: CSV with fields separated by"), std::string::npos)
+            << t.notes[0];
     }
 
-    for (const std::string& bad : {std::string("id,r400,r390,r410"), std::string("id,r380,r380,r390"),
-                                   std::string("id,SPEC_380,SPEC_385"), std::string("a,b,c")}) {
-        const SpectraTable t = nxbase::ParseSpectraCsv("# c\n" + bad + "\n1," + Values(0.5, 3) + "\n", "g.csv");
+    for (const std::string& bad :
+         {std::string("id,r400,r390,r410"), std::string("id,r380,r380,r390"),
+          std::string("id,SPEC_380,SPEC_385"), std::string("a,b,c")}) {
+        const SpectraTable t =
+            nxbase::ParseSpectraCsv("# c\n" + bad + "\n1," + Values(0.5, 3) + "\n", "g.csv");
         EXPECT_TRUE(t.unusable) << bad;
         EXPECT_TRUE(t.rows.empty()) << bad;
         ASSERT_EQ(t.errors.size(), 1u) << bad;
@@ -153,7 +159,8 @@ TEST(SpectraFile, LargeGridFilesAgreeWithTheTenNanometreChart) {
             EXPECT_EQ(table.rows[i].id, chart.rows[i].id);
             for (int k = 0; k < 36; ++k) {
                 // Written with 2 decimals of percent or 5 of a fraction.
-                EXPECT_NEAR(table.rows[i].values[k], chart.rows[i].values[k], nxtest::kFileDecimals) << name << " " << i << " " << k;
+                EXPECT_NEAR(table.rows[i].values[k], chart.rows[i].values[k], nxtest::kFileDecimals)
+                    << name << " " << i << " " << k;
             }
         }
     }
@@ -165,7 +172,8 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     ASSERT_EQ(detected.rows.size(), 1u);
     EXPECT_TRUE(detected.percent);
     EXPECT_EQ(detected.rows[0].values[3], 0.5f);
-    EXPECT_NE(detected.scaleNote.find("p.csv: read as percentages: 1 of 1 spectra"), std::string::npos)
+    EXPECT_NE(detected.scaleNote.find("p.csv: read as percentages: 1 of 1 spectra"),
+              std::string::npos)
         << detected.scaleNote;
 
     // The whole file decides, never one row. A typo (50 for 0.50) in a file
@@ -178,12 +186,15 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     EXPECT_FALSE(mixed.percent);
     ASSERT_EQ(mixed.rows.size(), 5u);
     EXPECT_EQ(mixed.rows[0].values[3], 0.5f);
-    ExpectOnlyError(mixed, "t.csv:7: a value of 50.00 fits only percentages, while the other spectra read as "
-                           "reflectance factors; --percent or --fraction");
+    ExpectOnlyError(
+        mixed,
+        "t.csv:7: a value of 50.00 fits only percentages, while the other spectra read as "
+        "reflectance factors; --percent or --fraction");
     // Rows beyond both scales take no part in the vote: one row of 1e4 does
     // not outvote the single percent row.
     const SpectraTable beyond = nxbase::ParseSpectraCsv(
-        Header() + "\n1,p," + Values(40.0) + "\n2,x," + Values(1e4) + "\n3,y," + Values(1e4) + "\n", "b.csv");
+        Header() + "\n1,p," + Values(40.0) + "\n2,x," + Values(1e4) + "\n3,y," + Values(1e4) + "\n",
+        "b.csv");
     EXPECT_TRUE(beyond.percent);
     EXPECT_EQ(beyond.rows.size(), 1u);
     // Dark patches in percent without SPECTRAL_NORM: every value at most 1.5
@@ -192,23 +203,28 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     std::string dark = Header() + "\n1,d," + Values(1.18) + "\n2,e," + Values(0.9) + "\n";
     const SpectraTable guessed = nxbase::ParseSpectraCsv(dark, "d.csv");
     EXPECT_FALSE(guessed.percent);
-    ExpectOnlyError(guessed, "d.csv:2: as reflectance factors this is brighter than any reflectance (Y about 118 % "
-                             "of the white); if the file holds percentages, --percent");
-    EXPECT_NE(guessed.scaleNote.find("read as reflectance factors (white = 1): no value is above 1.5"),
-              std::string::npos)
+    ExpectOnlyError(
+        guessed,
+        "d.csv:2: as reflectance factors this is brighter than any reflectance (Y about 118 % "
+        "of the white); if the file holds percentages, --percent");
+    EXPECT_NE(
+        guessed.scaleNote.find("read as reflectance factors (white = 1): no value is above 1.5"),
+        std::string::npos)
         << guessed.scaleNote;
     const SpectraTable told = nxbase::ParseSpectraCsv(dark, "d.csv", {SpectralScale::kPercent});
     EXPECT_EQ(told.rows.size(), 2u);
     EXPECT_TRUE(told.scaleNote.empty());
     // Forced fraction: 50 is not a reflectance factor.
-    const SpectraTable forced = nxbase::ParseSpectraCsv(percent, "p.csv", {SpectralScale::kFraction});
+    const SpectraTable forced =
+        nxbase::ParseSpectraCsv(percent, "p.csv", {SpectralScale::kFraction});
     EXPECT_TRUE(forced.rows.empty());
     ASSERT_EQ(forced.errors.size(), 1u);
     EXPECT_NE(forced.errors[0].find("p.csv:2: value 50"), std::string::npos) << forced.errors[0];
     // A fraction file stays as it is: 1.25 in the blue is a fluorescent
     // paper's brightener, not percent, and its Y stays below the limit.
     const std::string paper = Values(1.25, 11) + "," + Values(0.92, 25);
-    const SpectraTable fraction = nxbase::ParseSpectraCsv(Header() + "\n1,f," + paper + "\n", "f.csv");
+    const SpectraTable fraction =
+        nxbase::ParseSpectraCsv(Header() + "\n1,f," + paper + "\n", "f.csv");
     ASSERT_EQ(fraction.rows.size(), 1u);
     EXPECT_FALSE(fraction.percent);
     EXPECT_EQ(fraction.rows[0].values[0], 1.25f);
@@ -216,10 +232,11 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     // CGATS: SPECTRAL_NORM, and ArgyllCMS's CTI3 convention of percent even
     // for a dark set whose values stay below 1.5.
     auto cgats = [](const std::string& identifier, const std::string& extra, double value) {
-        std::string text = identifier + "\n" + extra + "NUMBER_OF_FIELDS 38\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
+        std::string text = identifier + "\n" + extra +
+                           "NUMBER_OF_FIELDS 38\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
         for (int nm = 380; nm <= 730; nm += 10) text += " SPEC_" + std::to_string(nm);
-        return text + "\nEND_DATA_FORMAT\nNUMBER_OF_SETS 1\nBEGIN_DATA\nA1 dark " + Values(value, 36, ' ') +
-               "\nEND_DATA\n";
+        return text + "\nEND_DATA_FORMAT\nNUMBER_OF_SETS 1\nBEGIN_DATA\nA1 dark " +
+               Values(value, 36, ' ') + "\nEND_DATA\n";
     };
     const SpectraTable ti3 = nxbase::ParseSpectra(cgats("CTI3", "", 1.2), "m.ti3");
     ASSERT_EQ(ti3.rows.size(), 1u);
@@ -227,7 +244,8 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     EXPECT_EQ(ti3.rows[0].values[0], 0.012f);
     EXPECT_EQ(ti3.rows[0].sampleId, "A1");
     EXPECT_EQ(ti3.rows[0].sampleName, "dark");
-    const SpectraTable norm = nxbase::ParseSpectra(cgats("CGATS.17", "SPECTRAL_NORM \"100.0\"\n", 40.0), "n.txt");
+    const SpectraTable norm =
+        nxbase::ParseSpectra(cgats("CGATS.17", "SPECTRAL_NORM \"100.0\"\n", 40.0), "n.txt");
     ASSERT_EQ(norm.rows.size(), 1u);
     EXPECT_EQ(norm.rows[0].values[0], 0.4f);
     const SpectraTable plain = nxbase::ParseSpectra(cgats("CGATS.17", "", 0.4), "f.txt");
@@ -236,10 +254,11 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
 }
 
 // A CGATS file as ArgyllCMS or X-Rite software writes it.
-std::string Cgats(const std::vector<std::string>& sets, const std::string& prefix = "SPECTRAL_NM", int first = 380,
-                  int last = 730, int step = 10, const std::string& extra = "") {
+std::string Cgats(const std::vector<std::string>& sets, const std::string& prefix = "SPECTRAL_NM",
+                  int first = 380, int last = 730, int step = 10, const std::string& extra = "") {
     std::string text = "CGATS.17\nORIGINATOR \"test\"\n" + extra + "NUMBER_OF_FIELDS " +
-                       std::to_string(2 + (last - first) / step + 1) + "\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
+                       std::to_string(2 + (last - first) / step + 1) +
+                       "\nBEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
     for (int nm = first; nm <= last; nm += step) text += " " + prefix + std::to_string(nm);
     text += "\nEND_DATA_FORMAT\nNUMBER_OF_SETS " + std::to_string(sets.size()) + "\nBEGIN_DATA\n";
     for (const std::string& set : sets) text += set + "\n";
@@ -247,9 +266,9 @@ std::string Cgats(const std::vector<std::string>& sets, const std::string& prefi
 }
 
 TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
-    const std::string text =
-        Cgats({"A1 \"paper white\" " + Values(0.9, 36, ' '), "A2 \"bad\" 0.5 abc " + Values(0.5, 34, ' '),
-               "A3 \"grey\" " + Values(0.2, 36, ' ')});
+    const std::string text = Cgats({"A1 \"paper white\" " + Values(0.9, 36, ' '),
+                                    "A2 \"bad\" 0.5 abc " + Values(0.5, 34, ' '),
+                                    "A3 \"grey\" " + Values(0.2, 36, ' ')});
     const SpectraTable table = nxbase::ParseSpectra(text, "m.cgats");
     ASSERT_EQ(table.rows.size(), 2u);
     EXPECT_EQ(table.rows[0].id, "A1 paper white");
@@ -258,13 +277,15 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     EXPECT_EQ(table.errors[0], "m.cgats:10: SPECTRAL_NM390: \"abc\" is not a number");
 
     for (const char* prefix : {"SPEC_", "nm", "SPECTRAL_NM_"}) {
-        const SpectraTable t = nxbase::ParseSpectra(Cgats({"1 x " + Values(0.5, 36, ' ')}, prefix), "s");
+        const SpectraTable t =
+            nxbase::ParseSpectra(Cgats({"1 x " + Values(0.5, 36, ' ')}, prefix), "s");
         EXPECT_EQ(t.rows.size(), 1u) << prefix;
     }
     // 5 nm steps at x.5 nm named by rounded wavelengths: the declared range
     // gives the grid, and no 10 nm point is on it.
-    std::string argyll = "SPECT\nSPECTRAL_BANDS \"71\"\nSPECTRAL_START_NM \"377.5\"\nSPECTRAL_END_NM \"727.5\"\n"
-                         "NUMBER_OF_FIELDS 72\nBEGIN_DATA_FORMAT\nSAMPLE_ID";
+    std::string argyll =
+        "SPECT\nSPECTRAL_BANDS \"71\"\nSPECTRAL_START_NM \"377.5\"\nSPECTRAL_END_NM \"727.5\"\n"
+        "NUMBER_OF_FIELDS 72\nBEGIN_DATA_FORMAT\nSAMPLE_ID";
     std::string values;
     for (int i = 0; i < 71; ++i) {
         const double nm = 377.5 + 5.0 * i;
@@ -278,13 +299,18 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     const SpectraTable resampled = nxbase::ToStandardGrid(set);
     ASSERT_EQ(resampled.rows.size(), 1u);
     EXPECT_EQ(resampled.resampling, "Sprague");
-    for (int k = 0; k < 35; ++k) EXPECT_NEAR(resampled.rows[0].values[k], 0.2 + 0.01 * k, nxtest::kFloatInterpolation) << k;
-    EXPECT_NEAR(resampled.rows[0].values[35], 0.2 + 0.001 * 347.5, nxtest::kFloatInterpolation) << "730 nm: the last value held";
+    for (int k = 0; k < 35; ++k)
+        EXPECT_NEAR(resampled.rows[0].values[k], 0.2 + 0.01 * k, nxtest::kFloatInterpolation) << k;
+    EXPECT_NEAR(resampled.rows[0].values[35], 0.2 + 0.001 * 347.5, nxtest::kFloatInterpolation)
+        << "730 nm: the last value held";
 
     // Faults the CGATS parser would report far from their place, or in its
     // own words: each names its line and says what is wrong.
-    const std::string format = "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME R380 R390 R400\nEND_DATA_FORMAT\n";
-    const std::string rows = "BEGIN_DATA\n1 a 0.1 0.2 0.3\n2 \"\" 0.1 0.2 0.3\n3 c 0.1 0.2 0.3 \"\"\n4 d 0.1 0.2 0.3\nEND_DATA\n";
+    const std::string format =
+        "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME R380 R390 R400\nEND_DATA_FORMAT\n";
+    const std::string rows =
+        "BEGIN_DATA\n1 a 0.1 0.2 0.3\n2 \"\" 0.1 0.2 0.3\n3 c 0.1 0.2 0.3 \"\"\n4 d 0.1 0.2 "
+        "0.3\nEND_DATA\n";
     const std::pair<std::string, std::string> faults[] = {
         {"CGATS.17\n" + format + "NUMBER_OF_SETS 4\n" + rows, "c:2: NUMBER_OF_FIELDS is missing"},
         {"CGATS.17\nNUMBER_OF_FIELDS x\n" + format + "NUMBER_OF_SETS 4\n" + rows,
@@ -294,7 +320,8 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
         // A trailing "" on line 10 is a sixth value, not a fault at END_DATA.
         {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format + "NUMBER_OF_SETS 4\n" + rows,
          "c:10: 6 values where the data format has 5 fields"},
-        {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format + "NUMBER_OF_SETS 3\nBEGIN_DATA\n1 a 0.1 0.2 0.3\nEND_DATA\n",
+        {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format +
+             "NUMBER_OF_SETS 3\nBEGIN_DATA\n1 a 0.1 0.2 0.3\nEND_DATA\n",
          "c:6: NUMBER_OF_SETS says 3, the data holds 1 sets"},
         // LittleCMS's limit, said in words instead of "AllocateDataSet: too much data".
         {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format + "NUMBER_OF_SETS 40000\n" + rows,
@@ -305,8 +332,10 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     contradicted.replace(contradicted.find("\"71\""), 4, "\"36\"");
     const SpectraTable refused = nxbase::ParseSpectra(contradicted, "x.sp");
     EXPECT_TRUE(refused.unusable);
-    ExpectOnlyError(refused, "x.sp: the header (SPECTRAL_BANDS 36, SPECTRAL_START_NM 377.5, SPECTRAL_END_NM 727.5) "
-                             "contradicts the 71 spectral fields");
+    ExpectOnlyError(
+        refused,
+        "x.sp: the header (SPECTRAL_BANDS 36, SPECTRAL_START_NM 377.5, SPECTRAL_END_NM 727.5) "
+        "contradicts the 71 spectral fields");
     for (const auto& [text, expected] : faults) {
         const SpectraTable t = nxbase::ParseSpectra(text, "c");
         EXPECT_TRUE(t.unusable) << expected;
@@ -321,13 +350,15 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
 
 TEST(SpectraFile, StreamsAreBoundedAndAgreeWithText) {
     std::string text = Header() + "\n";
-    for (int i = 0; i < 2000; ++i) text += std::to_string(i) + ",p," + Values(0.001 * (i % 900 + 1)) + "\n";
+    for (int i = 0; i < 2000; ++i)
+        text += std::to_string(i) + ",p," + Values(0.001 * (i % 900 + 1)) + "\n";
     std::istringstream stream(text);
     const nxbase::SpectralSet streamed = nxbase::ReadSpectralStream(stream, "s");
     const nxbase::SpectralSet whole = nxbase::ReadSpectralText(text, "s");
     ASSERT_EQ(streamed.samples.size(), 2000u);
     ASSERT_EQ(whole.samples.size(), 2000u);
-    for (std::size_t i = 0; i < 2000; i += 97) EXPECT_EQ(streamed.samples[i].values, whole.samples[i].values);
+    for (std::size_t i = 0; i < 2000; i += 97)
+        EXPECT_EQ(streamed.samples[i].values, whole.samples[i].values);
 
     SpectralReadOptions few;
     few.maxSamples = 10;
@@ -350,7 +381,8 @@ TEST(SpectraFile, StreamsAreBoundedAndAgreeWithText) {
     // Errors are bounded too.
     std::string junk;
     for (int i = 0; i < 1000; ++i) junk += "x,1,2\n";
-    const nxbase::SpectralSet many = nxbase::ReadSpectralText(junk, "j", {SpectralScale::kFraction});
+    const nxbase::SpectralSet many =
+        nxbase::ReadSpectralText(junk, "j", {SpectralScale::kFraction});
     EXPECT_EQ(many.errors.size(), nxbase::kMaxErrorMessages);
     EXPECT_EQ(many.suppressedErrors, 1000u - nxbase::kMaxErrorMessages);
 }
@@ -418,7 +450,8 @@ TEST(Resample, SpragueFollowsSmoothCurvesAndHoldsEnds) {
         for (std::size_t i = 0; i < in.size(); ++i) in[i] = 0.001f * static_cast<float>(i % 997);
         std::vector<float> together(3 * 36), single(3 * 36);
         many.ResampleMany(in.data(), 3, together.data());
-        for (int s = 0; s < 3; ++s) many.Resample(in.data() + s * fine.size(), single.data() + 36 * s);
+        for (int s = 0; s < 3; ++s)
+            many.Resample(in.data() + s * fine.size(), single.data() + 36 * s);
         EXPECT_EQ(together, single) << step;
     }
 
@@ -456,8 +489,8 @@ TEST(Resample, TwentyNanometreChartComesBackCloseToItsTenNanometreValues) {
         linearSquares += std::pow(viaLinear[i] - original[i], 2);
     }
     EXPECT_LT(spragueSquares, linearSquares);
-    const nxbase::ColorBatch batch(MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG),
-                                                      PhysicalConditions()));
+    const nxbase::ColorBatch batch(
+        MeasuringCondition(IllumClass("D50"), ObserverClass(OBSERVER_2DEG), PhysicalConditions()));
     std::vector<float> labOriginal(3 * 24), labSprague(3 * 24);
     batch.ToLab(original.data(), 24, labOriginal.data());
     batch.ToLab(viaSprague.data(), 24, labSprague.data());

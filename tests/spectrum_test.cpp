@@ -1,22 +1,22 @@
 // Spectra: value semantics, the size check, maximum and deviation rules, and
 // the copy-versus-assignment asymmetry of reflectance spectra.
+#include "nxbase/spectrum.h"
+
 #include <gtest/gtest.h>
 
 #include <limits>
 #include <stdexcept>
 #include <vector>
 
-#include "nxbase/spectrum.h"
-
 namespace {
 
 class Note : public IAdditionalSpectrumInfo {
-public:
+  public:
     Note(InfoType type, int value) : amType(type), amValue(value) {}
     InfoType GetType() const override { return amType; }
     int Value() const { return amValue; }
 
-private:
+  private:
     InfoType amType;
     int amValue;
 };

@@ -50,7 +50,8 @@ class TempDir {
         std::filesystem::path at = std::filesystem::absolute(path, error);
         for (; !at.empty(); at = at.parent_path()) {
             const auto permissions = std::filesystem::status(at, error).permissions();
-            if (error || (permissions & std::filesystem::perms::others_exec) == std::filesystem::perms::none) {
+            if (error || (permissions & std::filesystem::perms::others_exec) ==
+                             std::filesystem::perms::none) {
                 return false;
             }
             if (at == at.root_path()) break;

@@ -75,9 +75,10 @@ TEST_F(TextTest, GroupAndTextLinesFollowTheLineExpressions) {
     ASSERT_TRUE(Text::LoadText(String(path)));
 
     // "[:space:]" after the closing bracket is the set ":space", not blanks.
-    EXPECT_EQ(Group("Main"), (Texts{"Hello", "a [nested] text", "", "bar and digits", "colon suffix"}));
-    EXPECT_EQ(Group("Numbered"), (Texts{"first", "still Numbered",
-                                        "after a group line that does not match"}));
+    EXPECT_EQ(Group("Main"),
+              (Texts{"Hello", "a [nested] text", "", "bar and digits", "colon suffix"}));
+    EXPECT_EQ(Group("Numbered"),
+              (Texts{"first", "still Numbered", "after a group line that does not match"}));
     EXPECT_EQ(Text::GetEntryCount("Open"), 0u);
     EXPECT_EQ(Text::GetEntryCount("Blank"), 0u);
     EXPECT_EQ(Text::GetEntryCount("Blank} "), 0u);
@@ -127,15 +128,24 @@ TEST_F(TextTest, Utf8MarkerBeforeTheFirstGroupConvertsToWindows1252) {
 
     // A second line for a known group opens nothing: a marker below it counts.
     Text::FreeResources();
-    std::string reopened = Write("reopened.lng", "{G}\n[x]\n{G}\nEncoding=UTF-8\n{H}\n[\xC3\xA4]\n");
+    std::string reopened =
+        Write("reopened.lng", "{G}\n[x]\n{G}\nEncoding=UTF-8\n{H}\n[\xC3\xA4]\n");
     ASSERT_TRUE(Text::LoadText(String(reopened)));
     EXPECT_EQ(Text::GetText("H", 0).str(), "\xE4");
 
     Text::FreeResources();
-    std::string ansi = Write("ansi.lng", "{G}\n[Gr\xFC\xDF" "e]\n");
+    std::string ansi = Write("ansi.lng",
+                             "{G}\n[Gr\xFC\xDF"
+                             "e]\n");
     ASSERT_TRUE(Text::LoadText(String(ansi)));
-    EXPECT_EQ(Text::GetText("G", 0).str(), "Gr\xFC\xDF" "e") << "ANSI files are taken as they are";
-    EXPECT_EQ(Text::GetTextUtf8("G", 0), "Gr\xC3\xBC\xC3\x9F" "e") << "the same text for GTK or Qt";
+    EXPECT_EQ(Text::GetText("G", 0).str(),
+              "Gr\xFC\xDF"
+              "e")
+        << "ANSI files are taken as they are";
+    EXPECT_EQ(Text::GetTextUtf8("G", 0),
+              "Gr\xC3\xBC\xC3\x9F"
+              "e")
+        << "the same text for GTK or Qt";
     std::string everyByte;
     for (int byte = 1; byte < 256; ++byte) everyByte += static_cast<char>(byte);
     EXPECT_EQ(nxbase::detail::Utf8ToAnsi(nxbase::detail::AnsiToUtf8(everyByte)), everyByte);
@@ -146,8 +156,8 @@ TEST_F(TextTest, Utf8MarkerBeforeTheFirstGroupConvertsToWindows1252) {
 }
 
 TEST_F(TextTest, WindowsLineEndsReadAsInTextMode) {
-    std::string path = Write("crlf.lng",
-                             "{G}\r\n[one]\r\n2 [two]\r\n[lone CR]\r\r\n[last without newline]");
+    std::string path =
+        Write("crlf.lng", "{G}\r\n[one]\r\n2 [two]\r\n[lone CR]\r\r\n[last without newline]");
     ASSERT_TRUE(Text::LoadText(String(path)));
     // A CR not followed by LF stays in the line, which then matches no
     // expression; a Ctrl-Z ends the file as Windows text mode did.
@@ -229,7 +239,8 @@ TEST_F(TextTest, ErrorReportersSpeakGermanForLanguage49) {
               "Fehler in Textdatei 'T49.lng'\nFehlendes Zeichen '}' in Textgruppe 'Main'"
               "\n\nweiterfahren?");
     EXPECT_EQ(boxes[1].text,
-              "Fehler in Textdatei 'T49.lng'\nEs ist nicht m\xF6glich die Textdatei zu \xF6" "ffnen");
+              "Fehler in Textdatei 'T49.lng'\nEs ist nicht m\xF6glich die Textdatei zu \xF6"
+              "ffnen");
     EXPECT_EQ(boxes[2].kind, UserInterface::BoxKind::kError);
     EXPECT_EQ(boxes[2].text, "error in text file 'T1.lng'\nmore then 10000 text groups");
     EXPECT_EQ(boxes[3].text, "error in text file 'T1.lng'\ngeneral error");

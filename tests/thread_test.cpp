@@ -10,8 +10,8 @@
 
 #include "nxbase/logfile.h"
 #include "test_util.h"
-#include "toolkit/userinterface.h"
 #include "toolkit/system.h"
+#include "toolkit/userinterface.h"
 
 namespace {
 
@@ -160,7 +160,10 @@ class CarelessWorker : public Thread {
 TEST(Thread, DestroyingARunningThreadIsReportedWithItsName) {
     auto ui = std::make_shared<RecordingUserInterface>(false);
     ScopedUserInterface scoped(ui);
-    { CarelessWorker worker; worker.StartThread(); }
+    {
+        CarelessWorker worker;
+        worker.StartThread();
+    }
     auto boxes = ui->Boxes();
     ASSERT_EQ(boxes.size(), 1u);
     EXPECT_NE(boxes[0].text.find("*****ASSERT*****"), std::string::npos);

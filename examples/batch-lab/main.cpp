@@ -4,16 +4,16 @@
 //   batch-lab REFERENCE SAMPLE   two spectra files (CSV or CGATS, any grid)
 //   batch-lab                    built-in spectra: a ramp of greys and the
 //                                same greys measured a little warmer
+#include <nxbase/colorbatch.h>
+#include <nxbase/colordiff.h>
+#include <nxbase/meascond.h>
+#include <nxbase/spectrafile.h>
+
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <string>
 #include <vector>
-
-#include <nxbase/colorbatch.h>
-#include <nxbase/colordiff.h>
-#include <nxbase/meascond.h>
-#include <nxbase/spectrafile.h>
 
 namespace {
 
@@ -62,23 +62,26 @@ int main(int argc, char** argv) {
 
     // The condition names the illuminant and the observer; the batch holds
     // their weight tables (make it once, use it for many spectra).
-    const MeasuringCondition condition(IllumClass("D65"), ObserverClass(OBSERVER_10DEG), PhysicalConditions());
+    const MeasuringCondition condition(IllumClass("D65"), ObserverClass(OBSERVER_10DEG),
+                                       PhysicalConditions());
     const nxbase::ColorBatch batch(condition);
     const std::vector<float> labReference = batch.ToLab(reference);
     const std::vector<float> labSample = batch.ToLab(sample);
     std::vector<float> deltaE(count);
     nxbase::DeltaE2000Batch(labReference.data(), labSample.data(), count, deltaE.data());
 
-    std::printf("%-24s %8s %8s %8s   %8s %8s %8s   %6s\n", "patch", "L*", "a*", "b*", "L*", "a*", "b*", "dE00");
+    std::printf("%-24s %8s %8s %8s   %8s %8s %8s   %6s\n", "patch", "L*", "a*", "b*", "L*", "a*",
+                "b*", "dE00");
     for (std::size_t i = 0; i < count; ++i) {
         const float* r = &labReference[3 * i];
         const float* s = &labSample[3 * i];
-        std::printf("%-24s %8.2f %8.2f %8.2f   %8.2f %8.2f %8.2f   %6.2f\n", reference.rows[i].id.c_str(), r[0], r[1],
-                    r[2], s[0], s[1], s[2], deltaE[i]);
+        std::printf("%-24s %8.2f %8.2f %8.2f   %8.2f %8.2f %8.2f   %6.2f\n",
+                    reference.rows[i].id.c_str(), r[0], r[1], r[2], s[0], s[1], s[2], deltaE[i]);
     }
     const auto worst = std::max_element(deltaE.begin(), deltaE.end());
     if (worst != deltaE.end()) {
-        std::printf("largest dE00 %.2f (%s)\n", *worst, reference.rows[worst - deltaE.begin()].id.c_str());
+        std::printf("largest dE00 %.2f (%s)\n", *worst,
+                    reference.rows[worst - deltaE.begin()].id.c_str());
     }
     return 0;
 }

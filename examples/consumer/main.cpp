@@ -2,13 +2,13 @@
 // named lock, and the Lab value of a flat 50 % grey under the default
 // illuminant D50 and the 2° observer, and a colour name from the library's
 // shipped texts.
-#include <cstdio>
-
 #include <nxbase/colorvector.h>
 #include <nxbase/logfile.h>
 #include <nxbase/spectrum.h>
 #include <nxbase/text.h>
 #include <nxbase/thread.h>
+
+#include <cstdio>
 
 int main() {
     CriticalSection section("ConsumerStart");

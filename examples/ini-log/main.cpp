@@ -3,13 +3,13 @@
 // and the settings are written back.
 //
 //   ini-log DIRECTORY    settings.ini and the log go into DIRECTORY
+#include <nxbase/configuration.h>
+#include <nxbase/logfile.h>
+
 #include <cstdio>
 #include <fstream>
 #include <iostream>
 #include <string>
-
-#include <nxbase/configuration.h>
-#include <nxbase/logfile.h>
 
 int main(int argc, char** argv) {
     if (argc != 2) {
@@ -31,12 +31,14 @@ int main(int argc, char** argv) {
         AutoLog run("calibration", "Measure");  // "calibration" begins ... ends, timed
         const int runs = std::stoi(settings.ReadKey("Measure", "Runs", "0")) + 1;
         run.Log("white tile read, run " + std::to_string(runs));
-        settings.WriteKey("Measure", "Runs", std::to_string(runs));  // written at once, as a whole file
+        settings.WriteKey("Measure", "Runs",
+                          std::to_string(runs));  // written at once, as a whole file
         LogFile::WriteToLog("a line under a key that is off is not written", "Quiet");
     }
     settings.WriteKey("Log", "Path", logPath);
 
-    std::cout << "settings " << settings.GetPath() << ":\n" << std::ifstream(settings.GetPath()).rdbuf();
+    std::cout << "settings " << settings.GetPath() << ":\n"
+              << std::ifstream(settings.GetPath()).rdbuf();
     std::cout << "log " << log->GetFileName() << ":\n" << std::ifstream(log->GetFileName()).rdbuf();
     return 0;
 }

@@ -5,16 +5,16 @@
 //
 //   measure [N]     N patches (default 4)
 // The server must be registered (lumaserver --register does it).
-#include <cstdio>
-#include <cstdlib>
-#include <string>
-#include <vector>
-
 #include <nxbase/colorbatch.h>
 #include <nxbase/lumaclient.h>
 #include <nxbase/postoffice.h>
 #include <nxbase/progress.h>
 #include <nxbase/singleton.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+#include <vector>
 
 namespace {
 
@@ -40,7 +40,8 @@ int main(int argc, char** argv) {
     for (const nxbase::MeasuredSpectrum& spectrum : measured) {
         float lab[3];
         batch.ToLab(spectrum.values.data(), 1, lab);
-        std::printf("%-12s L* %6.2f  a* %7.2f  b* %7.2f\n", spectrum.id.c_str(), lab[0], lab[1], lab[2]);
+        std::printf("%-12s L* %6.2f  a* %7.2f  b* %7.2f\n", spectrum.id.c_str(), lab[0], lab[1],
+                    lab[2]);
     }
     NxSingleton::DeleteAllSingleton();  // the post office with the rest
     return ok && static_cast<int>(measured.size()) == count ? 0 : 1;

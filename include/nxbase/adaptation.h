@@ -30,7 +30,8 @@ NXBASE_EXPORT Matrix3 ConeResponseMatrix(AdaptationMethod axMethod);
 // The matrix taking XYZ seen under axSource's white to the corresponding
 // colour under axDestination's white. Throws std::invalid_argument for a white
 // point with a zero or non-finite cone response.
-NXBASE_EXPORT Matrix3 AdaptationMatrix(const Tristimulus& axSource, const Tristimulus& axDestination,
+NXBASE_EXPORT Matrix3 AdaptationMatrix(const Tristimulus& axSource,
+                                       const Tristimulus& axDestination,
                                        AdaptationMethod axMethod = AdaptationMethod::kBradford);
 
 NXBASE_EXPORT Tristimulus Apply(const Matrix3& axMatrix, const Tristimulus& axXYZ);

@@ -6,13 +6,12 @@
 #ifndef NXBASE_ASCIIFILE_H_
 #define NXBASE_ASCIIFILE_H_
 
+#include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <iosfwd>
 #include <memory>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "nxbase/export.h"
 #include "toolkit/string.h"
@@ -21,7 +20,7 @@
 // current line holds the expected title or key. On success the file moves to
 // the next line; on failure the line stays for another attempt.
 class NXBASE_EXPORT ASCIIFile {
-public:
+  public:
     // An ASCIIFileImpl on a file opened by name ("\" or "/" separators).
     static boost::shared_ptr<ASCIIFile> Get(const String& asFileName, bool axForReading,
                                             bool axTabMode = false);
@@ -129,7 +128,7 @@ NXBASE_EXPORT void WriteVersionSection(ASCIIFile& axFile, int alVersion,
 
 // The full implementation over an input or an output stream.
 class NXBASE_EXPORT ASCIIFileImpl : public ASCIIFile {
-public:
+  public:
     // Longest line kept; the rest of a longer line is skipped.
     static constexpr std::size_t kMaxLineLength = 64u << 20;
     // Bytes probed for a line feed when a file is opened by name.
@@ -199,7 +198,7 @@ public:
     const std::vector<String>& GetMessages() const override { return amMessages; }
     void AddMessages(const String& asMessage) override { amMessages.push_back(asMessage); }
 
-private:
+  private:
     // Line input.
     void ScanLine();
     bool Fail();
@@ -249,7 +248,7 @@ private:
 // std::logic_error("ASCIIFile 2 does not support write"); each writer throws
 // std::logic_error("Unsupported operation").
 class NXBASE_EXPORT ASCIIFile2 : public ASCIIFileImpl {
-public:
+  public:
     ASCIIFile2(const String& asFileName, bool axForReading, bool axTabMode = false);
     ASCIIFile2(std::iostream* pStream, bool axForReading, bool axTabMode = false);
     ~ASCIIFile2() override;

@@ -17,7 +17,7 @@
 #include "nxbase/spectrum.h"
 
 class NXBASE_EXPORT CMetry {
-public:
+  public:
     // The facade; made on the first call with illuminant D50 and observer
     // type 0. The reference stays valid for the life of the process.
     static const boost::shared_ptr<CMetry>& Instance();
@@ -80,7 +80,7 @@ public:
     // converts back to reflectance. The reference is not changed.
     static void ToEqualStrength(ReflectanceSpectrum& sample, const ReflectanceSpectrum& reference);
 
-private:
+  private:
     CMetry();
 
     Filter amSumFilter;

@@ -12,10 +12,9 @@
 #ifndef NXBASE_CMETRYFILTER_H_
 #define NXBASE_CMETRYFILTER_H_
 
+#include <boost/shared_ptr.hpp>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "klume/cmetry/cmetry.h"
 #include "nxbase/export.h"
@@ -48,14 +47,14 @@ enum IllumType : int {
 // Standard observers. Type 0 is the observer used for screen colours.
 enum ObserverType : int {
     OBSERVER_UNKNOWN = -1,
-    OBSERVER_2DEG = 0,   // CIE 1931, provider name "2"
-    OBSERVER_10DEG = 1   // CIE 1964, provider name "10"
+    OBSERVER_2DEG = 0,  // CIE 1931, provider name "2"
+    OBSERVER_10DEG = 1  // CIE 1964, provider name "10"
 };
 
 // An illuminant of the provider. Never empty: unknown types and names fall
 // back to the provider's default (D50).
 class NXBASE_EXPORT IllumClass {
-public:
+  public:
     IllumClass();
     // Types outside the table give the default illuminant. The variant is kept
     // for callers that pass a colour temperature hint (IllumClass(ILLUM_D65,
@@ -78,14 +77,14 @@ public:
     bool operator==(const IllumClass& other) const { return GetName() == other.GetName(); }
     bool operator!=(const IllumClass& other) const { return !(*this == other); }
 
-private:
+  private:
     boost::shared_ptr<klume::cmetry::IIlluminant> amIlluminant;
 };
 
 // A standard observer. An unknown name gives type OBSERVER_UNKNOWN; its
 // filters then use the 2 degree observer.
 class NXBASE_EXPORT ObserverClass {
-public:
+  public:
     ObserverClass(ObserverType type = OBSERVER_2DEG);  // NOLINT: implicit, as callers expect
     // "2" or "10"; a trailing degree string or "deg" is ignored.
     explicit ObserverClass(const String& name);
@@ -112,7 +111,7 @@ public:
     }
     bool operator!=(const ObserverClass& other) const { return !(*this == other); }
 
-private:
+  private:
     ObserverType amType = OBSERVER_2DEG;
     String amName;
     boost::shared_ptr<klume::cmetry::IObserver> amObserver;
@@ -120,13 +119,13 @@ private:
 
 // The illuminant as used to build a filter.
 class NXBASE_EXPORT Lichtart : public IllumClass {
-public:
+  public:
     explicit Lichtart(const IllumClass& illuminant) : IllumClass(illuminant) {}
 };
 
 // The observer as used to build a filter.
 class NXBASE_EXPORT Observer : public ObserverClass {
-public:
+  public:
     explicit Observer(const ObserverClass& observer) : ObserverClass(observer) {}
 };
 
@@ -136,7 +135,7 @@ public:
 // again; a Filter shared between threads must therefore be read through const
 // access only (the const forms never write).
 class NXBASE_EXPORT Filter {
-public:
+  public:
     static constexpr int kSize = klume::cmetry::kSampleCount;
 
     // All weights 0.0, undefined.
@@ -170,7 +169,7 @@ public:
     operator const float*() const { return amWeights; }  // NOLINT
     const float* GetWeights() const { return amWeights; }
 
-private:
+  private:
     unsigned char amSumValid = 0;
     float amSumme = 0.0f;
     float amWeights[kSize] = {};
@@ -180,7 +179,7 @@ private:
 // The X, Y, Z weights of one illuminant and observer (index 0 = X, 1 = Y,
 // 2 = Z). Copies share the provider's table and the three Filters.
 class NXBASE_EXPORT CMetryFilter {
-public:
+  public:
     // Illuminant "D65", observer "2".
     CMetryFilter();
     // The provider's filter of that illuminant and observer.
@@ -210,9 +209,11 @@ public:
 
     ObserverClass GetObserver() const;
     IllumClass GetIllum() const;
-    boost::shared_ptr<const klume::cmetry::CMetryFilter> GetProviderFilter() const { return amFilter; }
+    boost::shared_ptr<const klume::cmetry::CMetryFilter> GetProviderFilter() const {
+        return amFilter;
+    }
 
-private:
+  private:
     void Build(boost::shared_ptr<klume::cmetry::IIlluminant> illuminant,
                boost::shared_ptr<klume::cmetry::IObserver> observer);
 

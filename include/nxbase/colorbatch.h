@@ -36,7 +36,7 @@ namespace detail {
 struct BatchTables {
     static constexpr int kChunks = 5;
     alignas(32) float chunks[3][kChunks][8] = {};
-    float sumY = 0.0f;   // XYZ = S / sumY * 100
+    float sumY = 0.0f;  // XYZ = S / sumY * 100
     float sums[3] = {};
     float labScale[3] = {};  // Lab: t = XYZ * (sumY / sums[c] / 100)
 };
@@ -52,7 +52,7 @@ struct NXBASE_EXPORT BatchWeights {
 };
 
 class NXBASE_EXPORT ColorBatch {
-public:
+  public:
     // The weights of the current colorimetric filter of the CMetry facade.
     ColorBatch();
     // The weights of `axFilter`.
@@ -102,7 +102,7 @@ public:
     float WhitePoint(int alChannel) const;
     const BatchWeights& Weights() const { return amWeights; }
 
-private:
+  private:
     BatchWeights amWeights;
     detail::BatchTables amTables;
 };

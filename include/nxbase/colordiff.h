@@ -64,7 +64,8 @@ struct DeltaE2000Weights {
     double kC = 1.0;
     double kH = 1.0;
 };
-NXBASE_EXPORT DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& axSample,
+NXBASE_EXPORT DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference,
+                                                 const LabValue& axSample,
                                                  const DeltaE2000Weights& axWeights = {});
 NXBASE_EXPORT double DeltaE2000(const LabValue& axReference, const LabValue& axSample,
                                 const DeltaE2000Weights& axWeights = {});
@@ -75,15 +76,17 @@ NXBASE_EXPORT double DeltaE94(const LABVector& axReference, const LABVector& axS
                               Cie94Application axApplication = Cie94Application::kGraphicArts);
 NXBASE_EXPORT double DeltaECMC(const LABVector& axReference, const LABVector& axSample,
                                double axLightness = 2.0, double axChroma = 1.0);
-NXBASE_EXPORT DeltaE2000Parts DeltaE2000Detailed(const LABVector& axReference, const LABVector& axSample,
+NXBASE_EXPORT DeltaE2000Parts DeltaE2000Detailed(const LABVector& axReference,
+                                                 const LABVector& axSample,
                                                  const DeltaE2000Weights& axWeights = {});
 NXBASE_EXPORT double DeltaE2000(const LABVector& axReference, const LABVector& axSample,
                                 const DeltaE2000Weights& axWeights = {});
 
 // CIEDE2000 of alCount pairs of L, a, b triples (pReference[3i..3i+2] against
 // pSample[3i..3i+2]) into pDeltaE[i]; the arrays may be any alignment.
-NXBASE_EXPORT void DeltaE2000Batch(const float* pReference, const float* pSample, std::size_t alCount,
-                                   float* pDeltaE, const DeltaE2000Weights& axWeights = {});
+NXBASE_EXPORT void DeltaE2000Batch(const float* pReference, const float* pSample,
+                                   std::size_t alCount, float* pDeltaE,
+                                   const DeltaE2000Weights& axWeights = {});
 
 // A formula by name, for tools and scripts: "ab" (or "76"), "94" (graphic
 // arts), "94t" (textiles), "cmc" (2:1), "cmc11" (1:1), "2000" (or "00"), and
@@ -91,7 +94,8 @@ NXBASE_EXPORT void DeltaE2000Batch(const float* pReference, const float* pSample
 enum class DeltaEMethod { kCie76, kCie94, kCie94Textiles, kCmc21, kCmc11, kCiede2000 };
 NXBASE_EXPORT bool ParseDeltaEMethod(const char* pName, DeltaEMethod* pMethod);
 NXBASE_EXPORT const char* DeltaEMethodName(DeltaEMethod axMethod);
-NXBASE_EXPORT double DeltaE(const LabValue& axReference, const LabValue& axSample, DeltaEMethod axMethod);
+NXBASE_EXPORT double DeltaE(const LabValue& axReference, const LabValue& axSample,
+                            DeltaEMethod axMethod);
 
 }  // namespace nxbase
 

@@ -24,7 +24,7 @@ enum LabColorSpaceType : int {
 };
 
 class NXBASE_EXPORT ColorVector {
-public:
+  public:
     // Zero components, default measuring condition.
     ColorVector() = default;
     ColorVector(float ax0, float ax1, float ax2, const MeasuringCondition& axCondition);
@@ -55,7 +55,7 @@ public:
     // ("12.34 -5.67 89.01"); "." is the decimal separator whatever the locale.
     operator String() const;  // NOLINT: the toolkit's display conversion
 
-protected:
+  protected:
     explicit ColorVector(const MeasuringCondition& axCondition);
     // Raw weighted sums S_i = sum of W_i * R over the 36 samples, formed in
     // eight pairwise-added lanes (the order of the batch path, so that both
@@ -75,7 +75,7 @@ class LABVector;
 
 // CIE XYZ tristimulus values, white Y = 100 (CIE 15:2004; ASTM E308 weights).
 class NXBASE_EXPORT XYZVector : public ColorVector {
-public:
+  public:
     XYZVector() = default;
     XYZVector(float axX, float axY, float axZ, const MeasuringCondition& axCondition);
     // With the current filter of the CMetry facade.
@@ -91,7 +91,7 @@ public:
 
 // CIE xyY: x = X/(X+Y+Z), y = Y/(X+Y+Z), Y. No guard for X+Y+Z = 0.
 class NXBASE_EXPORT xyYVector : public ColorVector {
-public:
+  public:
     xyYVector() = default;
     xyYVector(float axx, float axy, float axY, const MeasuringCondition& axCondition);
     // Via the XYZVector of the spectrum (current CMetry filter).
@@ -109,7 +109,7 @@ class LChVector;
 // a = 500 (f(X/Xn) - f(Y/Yn)), b = 200 (f(Y/Yn) - f(Z/Zn)). DIN99 (kE = kCH = 1)
 // then maps L, a, b with the 16 degree rotation computed from pi = 3.1415926.
 class NXBASE_EXPORT LABVector : public ColorVector {
-public:
+  public:
     LABVector() = default;
     // Stored as given, as CIE 1976 values: only vectors computed from
     // tristimulus values take the process-wide type.
@@ -142,7 +142,7 @@ public:
     // "L*=52.31 a*=-3.12 b*=10.54", or "L99=... a99=... b99=..." for DIN99.
     String ToString() const;
 
-private:
+  private:
     // CIELAB (then DIN99 when current) of pXYZ against a filter whose weight
     // sums are axSums.
     void FromXYZ(const float axSums[3], const float* pXYZ);
@@ -155,7 +155,7 @@ class LCHmgVector;
 // CIE 1976 LCh: C = sqrt(a^2 + b^2); h = atan2(b, a) in degrees within
 // (0, 360]; an exact 0 degrees and grey (|a|, |b| < 0.00001) give 360.
 class NXBASE_EXPORT LChVector : public ColorVector {
-public:
+  public:
     LChVector() = default;
     LChVector(float axL, float axC, float axh, const MeasuringCondition& axCondition);
     // Via the LABVector of the spectrum (current CMetry filter).
@@ -166,7 +166,7 @@ public:
     // transform is that steep, else to a search step of 0.001.
     explicit LChVector(const LCHmgVector& axMg);
 
-private:
+  private:
     void ProbiereL(const LCHmgVector& axTarget, double axLo, double axHi);
     void ProbiereC(const LCHmgVector& axTarget, double axLo, double axHi);
     void ProbiereH(const LCHmgVector& axTarget, double axLo, double axHi);
@@ -179,7 +179,7 @@ private:
 // hmg = degrees of hr + 0.17914 + a four-term Fourier series in hr (not
 // folded into 0..360).
 class NXBASE_EXPORT LCHmgVector : public ColorVector {
-public:
+  public:
     LCHmgVector() = default;
     LCHmgVector(float axL, float axC, float axh, const MeasuringCondition& axCondition);
     explicit LCHmgVector(const LABVector& axLab);
@@ -193,7 +193,7 @@ public:
 
 // amg = Cmg cos hmg, bmg = Cmg sin hmg (hmg in degrees), Lmg unchanged.
 class NXBASE_EXPORT LABmgVector : public ColorVector {
-public:
+  public:
     LABmgVector() = default;
     LABmgVector(float axL, float axa, float axb, const MeasuringCondition& axCondition);
     explicit LABmgVector(const LCHmgVector& axMg);
@@ -203,7 +203,7 @@ public:
 // dH = sqrt(|dE^2 - dL^2 - dC^2|) with dE the length of a - b, negative when
 // a_a b_b - a_b b_a > 0. The result carries a's measuring condition.
 class NXBASE_EXPORT dLCHVector : public ColorVector {
-public:
+  public:
     dLCHVector() = default;
     dLCHVector(float axdL, float axdC, float axdH, const MeasuringCondition& axCondition);
     dLCHVector(const LABVector& axA, const LABVector& axB);
@@ -214,7 +214,7 @@ public:
 
 // The same decomposition applied to the LABmg forms of both vectors.
 class NXBASE_EXPORT dLCHmgVector : public ColorVector {
-public:
+  public:
     dLCHmgVector() = default;
     dLCHmgVector(float axdL, float axdC, float axdH, const MeasuringCondition& axCondition);
     dLCHmgVector(const LABVector& axA, const LABVector& axB);

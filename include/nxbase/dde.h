@@ -44,7 +44,8 @@ NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
 // Takes a poke's data apart: the sender before the first ":", then the
 // encoded block, decoded into `axBlock`. Without a ":" the sender is empty
 // and all of it is the block.
-NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock);
+NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender,
+                             MyMemoryBlock& axBlock);
 }  // namespace nxbase
 
 class NXBASE_EXPORT DDE {
@@ -71,7 +72,9 @@ class NXBASE_EXPORT DDE {
     }
     // Asked while Send waits for an application it started (empty: wait
     // the full time).
-    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) { fmKeepWaiting = std::move(fKeepWaiting); }
+    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) {
+        fmKeepWaiting = std::move(fKeepWaiting);
+    }
 
     // Pokes `asCommand` with the encoded block to the application `asApp`,
     // starting it first when it is known but not on the bus.

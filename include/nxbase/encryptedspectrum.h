@@ -24,7 +24,7 @@
 #include "nxbase/export.h"
 
 class NXBASE_EXPORT EncryptedSpectralData {
-public:
+  public:
     static constexpr std::size_t kKeySize = 32;
     // Most values one spectrum may hold.
     static constexpr std::size_t kMaxValues = 4096;
@@ -54,7 +54,7 @@ public:
     // Wipes the process key; GetDecryptedSpectrum() then throws.
     static void ClearProcessKey();
 
-private:
+  private:
     std::vector<unsigned char> amEncrypted;
 };
 

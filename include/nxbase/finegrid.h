@@ -38,7 +38,7 @@ NXBASE_EXPORT std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axL
                                                 const std::array<double, 3>& axWhite);
 
 class NXBASE_EXPORT FineGridTristimulus {
-public:
+  public:
     // True when `wavelengths` is a regular grid (equal steps within 0.01 nm)
     // with a step below 10 nm and at least three points: the grids this
     // class is for.
@@ -63,7 +63,7 @@ public:
     void ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const;
     void ToLab(const float* pSpectra, std::size_t alCount, float* pOut) const;
 
-private:
+  private:
     std::vector<double> amWavelengths;
     std::array<std::vector<double>, 3> amWeights;
     std::array<double, 3> amWhite{};

@@ -115,7 +115,8 @@ class NXBASE_EXPORT Language : public NxSingleton {
     // without a directory part is looked up in the application's language
     // directory.
     static Language* CreateLanguage(ConfigInterface* pConfig, String& asTextBase);
-    static Language* CreateLanguage(ConfigInterface* pConfig, const LanguageAccessChecker& axChecker);
+    static Language* CreateLanguage(ConfigInterface* pConfig,
+                                    const LanguageAccessChecker& axChecker);
     // The singleton; std::logic_error "Please create the Language-Singleton
     // first !" when none was created.
     static Language* Instance();
@@ -143,7 +144,8 @@ class NXBASE_EXPORT Language : public NxSingleton {
     // Replaces the list's entries by the display names of the languages the
     // checker allows, in the order of their country codes; `pCodes`, when
     // given, receives the matching codes.
-    void InitListBox(std::vector<String>& axList, std::vector<LanguageCode>* pCodes = nullptr) const;
+    void InitListBox(std::vector<String>& axList,
+                     std::vector<LanguageCode>* pCodes = nullptr) const;
     // The country codes the checker allows, ascending.
     std::vector<LanguageCode> GetAccessibleLanguages() const;
 

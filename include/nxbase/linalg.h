@@ -13,7 +13,7 @@
 #include "nxbase/export.h"
 
 class NXBASE_EXPORT LinAlg {
-public:
+  public:
     LinAlg() = default;
     LinAlg(const LinAlg&) = default;
     LinAlg& operator=(const LinAlg&) = default;
@@ -58,8 +58,8 @@ public:
     // pDest[i] = axK1 * pA[i] + axK2 * pB[i].
     static void KVAddKV(float* pDest, float axK1, const float* pA, float axK2, const float* pB,
                         int alN);
-    static void KVAddKV(double* pDest, double axK1, const double* pA, double axK2,
-                        const double* pB, int alN);
+    static void KVAddKV(double* pDest, double axK1, const double* pA, double axK2, const double* pB,
+                        int alN);
 
     // pDest[i] = axK * pA[i]; in-place form pDest[i] *= axK.
     static void KxV(float* pDest, float axK, const float* pA, int alN);
@@ -117,8 +117,8 @@ public:
     // counts as singular: then axSingular = 1 and the routine returns at once,
     // leaving pX as it was. Otherwise axSingular = 0 and pX holds the result.
     // pA and pB are overwritten (the eliminated entries are not cleared).
-    static void GaussEl(float* pB, float* pA, float* pX, int alN, int& axSingular,
-                        int* pRowStart, int* pRowIndex);
+    static void GaussEl(float* pB, float* pA, float* pX, int alN, int& axSingular, int* pRowStart,
+                        int* pRowIndex);
     static void GaussEl(double* pB, double* pA, double* pX, int alN, int& axSingular,
                         int* pRowStart, int* pRowIndex);
     // As above; allocates the two index arrays itself.
@@ -137,8 +137,7 @@ public:
     static void LeastSquareFit(float* pW, float* pY, float* pA, float* pX, int alM, int alN,
                                float* pN, float* pR, int* pRowStart, int* pRowIndex, int& axOk);
     static void LeastSquareFit(double* pW, double* pY, double* pA, double* pX, int alM, int alN,
-                               double* pN, double* pR, int* pRowStart, int* pRowIndex,
-                               int& axOk);
+                               double* pN, double* pR, int* pRowStart, int* pRowIndex, int& axOk);
 };
 
 #endif  // NXBASE_LINALG_H_

@@ -11,16 +11,16 @@
 #define NXBASE_LOGFILE_H_
 
 #include <atomic>
-#include <mutex>
-#include <unordered_map>
-#include <vector>
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <list>
 #include <map>
 #include <memory>
+#include <mutex>
 #include <set>
 #include <string>
+#include <unordered_map>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "toolkit/string.h"

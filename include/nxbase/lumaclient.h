@@ -5,10 +5,9 @@
 #define NXBASE_LUMACLIENT_H_
 
 #include <array>
+#include <boost/function.hpp>
 #include <string>
 #include <vector>
-
-#include <boost/function.hpp>
 
 #include "nxbase/export.h"
 #include "nxbase/spectralgrid.h"
@@ -22,7 +21,7 @@ namespace nxbase {
 constexpr double kLumaSpectrumScale = 100000.0;
 
 struct NXBASE_EXPORT MeasuredSpectrum {
-    std::string id;                  // the patch the server measured
+    std::string id;                             // the patch the server measured
     std::array<float, kSpectrumSize> values{};  // 380..730 nm, reflectance factors
 };
 
@@ -36,8 +35,9 @@ struct NXBASE_EXPORT MeasuredSpectrum {
 // application's CONNECTs and ends one second after the last is matched, so a
 // part of the same application that subscribes to notices (NOTIFY_MESSUNG)
 // sends its own CONNECT and keeps the server for as long as it stays.
-NXBASE_EXPORT bool MeasureWithLumaServer(PostOffice& axOffice, int alCount, std::vector<MeasuredSpectrum>* pOut,
-                                         std::string* pError, ProgressListener* pProgress = nullptr,
+NXBASE_EXPORT bool MeasureWithLumaServer(PostOffice& axOffice, int alCount,
+                                         std::vector<MeasuredSpectrum>* pOut, std::string* pError,
+                                         ProgressListener* pProgress = nullptr,
                                          boost::function<bool()> fKeepWaiting = {});
 
 }  // namespace nxbase

@@ -7,11 +7,10 @@
 #ifndef NXBASE_MEASCOND_H_
 #define NXBASE_MEASCOND_H_
 
+#include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "klume/cmetry/cmetry.h"
 #include "nxbase/cmetryfilter.h"
@@ -23,21 +22,21 @@ class Spectrum;
 // Measurement filters and geometries. Values below 0x100 are filters of a
 // 45/0 instrument; 0x100 and above name a sphere (d/8) geometry.
 enum ValueFilterType : std::int32_t {
-    FILTER_NO = 0,         // "No": no filter
-    FILTER_POL = 1,        // "Pol": polarisation filter
-    FILTER_D65 = 2,        // "D65": daylight filter
-    FILTER_UV = 3,         // "UV": UV included
-    FILTER_UVCUT = 4,      // "UVCut": UV cut
-    FILTER_CUSTOM = 5,     // "Custom" (also "Cust")
-    FILTER_REPRO = 6,      // "Repro"
-    FILTER_D8T = 0x100,    // "D8t"
-    FILTER_D8E = 0x101,    // "D8e": d/8, specular component excluded
-    FILTER_D8I = 0x102,    // "D8i": d/8, specular component included
+    FILTER_NO = 0,               // "No": no filter
+    FILTER_POL = 1,              // "Pol": polarisation filter
+    FILTER_D65 = 2,              // "D65": daylight filter
+    FILTER_UV = 3,               // "UV": UV included
+    FILTER_UVCUT = 4,            // "UVCut": UV cut
+    FILTER_CUSTOM = 5,           // "Custom" (also "Cust")
+    FILTER_REPRO = 6,            // "Repro"
+    FILTER_D8T = 0x100,          // "D8t"
+    FILTER_D8E = 0x101,          // "D8e": d/8, specular component excluded
+    FILTER_D8I = 0x102,          // "D8i": d/8, specular component included
     FILTER_DEFAULT = 0x1FFFFFFF  // the filter of a default-made spectrum
 };
 
 class NXBASE_EXPORT ActualFilterClass {
-public:
+  public:
     enum Geometry : std::int32_t {
         GEOMETRY_UNDEFINED = -1,  // FILTER_DEFAULT and unknown values
         GEOMETRY_45_0 = 0,        // FILTER_NO .. FILTER_REPRO
@@ -69,7 +68,7 @@ public:
     bool operator==(const ActualFilterClass& other) const { return amType == other.amType; }
     bool operator!=(const ActualFilterClass& other) const { return amType != other.amType; }
 
-private:
+  private:
     ValueFilterType amType = FILTER_DEFAULT;
 };
 
@@ -81,7 +80,7 @@ enum StoredWBaseType : std::int32_t {
 };
 
 class NXBASE_EXPORT WBaseClass {
-public:
+  public:
     WBaseClass(StoredWBaseType type = WBASE_ABSOLUTE);  // NOLINT: implicit
     // "Absolute" or "Paper" (ignoring ASCII case); anything else is absolute.
     explicit WBaseClass(const String& name);
@@ -93,12 +92,12 @@ public:
     bool operator==(const WBaseClass& other) const { return amType == other.amType; }
     bool operator!=(const WBaseClass& other) const { return amType != other.amType; }
 
-private:
+  private:
     StoredWBaseType amType = WBASE_ABSOLUTE;
 };
 
 class NXBASE_EXPORT PhysicalConditions {
-public:
+  public:
     enum SurfaceType : std::int32_t {
         SURFACE_UNDEFINED = 0,
         SURFACE_DRY = 1,  // dry ink or coating
@@ -129,7 +128,7 @@ public:
     }
     bool operator!=(const PhysicalConditions& other) const { return !(*this == other); }
 
-private:
+  private:
     ActualFilterClass amFilter;
     WBaseClass amWBase;
     SurfaceType amSurface = SURFACE_UNDEFINED;
@@ -152,7 +151,7 @@ enum DStdType : int {
 // an unknown name and a standard without installed table give the default
 // standard ("Status E"); the last two are logged.
 class NXBASE_EXPORT DStdClass {
-public:
+  public:
     DStdClass();
     DStdClass(DStdType type);  // NOLINT: implicit
     explicit DStdClass(const std::string& name);
@@ -171,12 +170,12 @@ public:
     bool operator==(const DStdClass& other) const { return GetName() == other.GetName(); }
     bool operator!=(const DStdClass& other) const { return !(*this == other); }
 
-private:
+  private:
     boost::shared_ptr<klume::cmetry::IDensityStandard> amStandard;
 };
 
 class NXBASE_EXPORT MeasuringCondition {
-public:
+  public:
     // Default illuminant (D50), 2 degree observer, default density standard,
     // default physical conditions.
     MeasuringCondition() = default;
@@ -203,7 +202,7 @@ public:
     bool operator==(const MeasuringCondition& other) const;
     bool operator!=(const MeasuringCondition& other) const { return !(*this == other); }
 
-private:
+  private:
     IllumClass amIllum;
     ObserverClass amObserver;
     DStdClass amDStd;
@@ -218,7 +217,7 @@ private:
 // and R the reflectance factor (0..1): the form colormath and ArgyllCMS use
 // for spectral data. Product values outside 380..730 nm are not used.
 class NXBASE_EXPORT DichteFilter {
-public:
+  public:
     // The filters of the default standard.
     DichteFilter();
     explicit DichteFilter(const DStdClass& standard);
@@ -226,9 +225,7 @@ public:
     // REQUIRES: channel < GetChannelCount().
     Filter& operator[](unsigned short channel) { return amFilters[channel]; }
     const Filter& operator[](unsigned short channel) const { return amFilters[channel]; }
-    unsigned short GetChannelCount() const {
-        return static_cast<unsigned short>(amFilters.size());
-    }
+    unsigned short GetChannelCount() const { return static_cast<unsigned short>(amFilters.size()); }
     const DStdClass& GetDStd() const { return amDStd; }
 
     // The density of a channel as defined above, summed in double precision.
@@ -236,7 +233,7 @@ public:
     // positive or the channel does not exist.
     bool GetDensity(const Spectrum& spectrum, unsigned short channel, float& density) const;
 
-private:
+  private:
     DStdClass amDStd;
     std::vector<Filter> amFilters;
 };

@@ -14,6 +14,7 @@
 #ifndef NXBASE_PIPE_H_
 #define NXBASE_PIPE_H_
 
+#include <boost/system/error_code.hpp>
 #include <chrono>
 #include <cstdint>
 #include <deque>
@@ -25,8 +26,6 @@
 #include <string_view>
 #include <thread>
 #include <vector>
-
-#include <boost/system/error_code.hpp>
 
 #include "nxbase/export.h"
 #include "nxbase/frame.h"
@@ -118,7 +117,8 @@ class NXBASE_EXPORT Pipe {
     // for DISCONNECT). False on failure; GetLastError() then says why.
     bool Send(const std::string& asApp, const std::string& asCommand,
               const MyMemoryBlock& axEncodedData);
-    bool Send(const std::string& asApp, const std::string& asCommand, std::string_view asEncodedData);
+    bool Send(const std::string& asApp, const std::string& asCommand,
+              std::string_view asEncodedData);
     // The same on the connection a received event came in on
     // (VELTRAEvent::GetChannel()); false when it is closed.
     bool SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
@@ -161,7 +161,8 @@ class NXBASE_EXPORT Pipe {
     bool KeepWaiting() const;
     void AddChannel(const ChannelPtr& axChannel);
     void ArmRead(const ChannelPtr& axChannel);
-    void OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError, std::size_t alRead);
+    void OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError,
+                std::size_t alRead);
     void LimitPartialFrames();
     void Deliver(const ChannelPtr& axChannel);
     void HandleBody(const ChannelPtr& axChannel, std::string&& asBody);
@@ -193,8 +194,8 @@ class NXBASE_EXPORT Pipe {
     SendScope* pmScope = nullptr;
     struct Listener;
     std::unique_ptr<Listener> pmListener;
-    std::map<std::string, ChannelPtr> amChannels;         // by peer name
-    std::map<std::uint64_t, ChannelPtr> amAllChannels;    // every open connection, by id
+    std::map<std::string, ChannelPtr> amChannels;       // by peer name
+    std::map<std::uint64_t, ChannelPtr> amAllChannels;  // every open connection, by id
     std::uint64_t amNextChannelId = 1;
     std::size_t amPartialBytes = 0;
     std::unique_ptr<DDE> pmDDE;  // the older transport, for peers on the bus

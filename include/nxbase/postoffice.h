@@ -99,7 +99,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     void UnlockApplication();
 
     std::size_t GetAnzahlApp() const { return amApplications.GetApplicationCount(); }
-    bool HasApplication(const std::string& asId) const { return amApplications.HasApplication(asId); }
+    bool HasApplication(const std::string& asId) const {
+        return amApplications.HasApplication(asId);
+    }
     std::vector<std::string> GetApplications() const { return amApplications.GetApplications(); }
     const PostOfficeApplications::ApplicationMap& GetApplicationsMap() const {
         return amApplications.GetApplicationsMap();
@@ -141,9 +143,11 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
 
     static void TransportReceive(VELTRAEvent& axEvent);
     unsigned char CheckLock(const String& asSender);
-    bool TryOnce(const std::string& asApp, const std::string& asCommand, std::string_view asEncoded);
+    bool TryOnce(const std::string& asApp, const std::string& asCommand,
+                 std::string_view asEncoded);
     unsigned char SendCommand(const std::string& asApp, const std::string& asCommand,
-                              const MyMemoryBlock& axData, const boost::function<bool()>& fKeepTrying);
+                              const MyMemoryBlock& axData,
+                              const boost::function<bool()>& fKeepTrying);
     bool OnOwnThread(const char* asCall);
     void AnswerStatus(VELTRAEvent& axEvent, signed char axStatus);
     void HandleConnect(VELTRAEvent& axEvent);
@@ -177,7 +181,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     bool amHandlerBusy = false;
     bool amHandlerScheduled = false;
     ReceiveFunction fmReceiveFunction = &PostOffice::DummyReceiveFunction;
-    std::set<std::string> amLostPeers;  // channels lost since a wait began
+    std::set<std::string> amLostPeers;            // channels lost since a wait began
     std::map<std::string, int> amConnectedPeers;  // CONNECTs not yet matched, per peer
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
     std::string amLastError;

@@ -26,7 +26,7 @@ namespace nxbase {
 NXBASE_EXPORT std::vector<double> StandardWavelengths();
 
 class NXBASE_EXPORT SpectralResampler {
-public:
+  public:
     enum class Method {
         kSelection,  // every target inside the data is a source wavelength
         kSprague,
@@ -52,7 +52,7 @@ public:
     void ResampleMany(const float* pIn, std::size_t alCount, float* pOut) const;
     void Resample(const double* pIn, double* pOut) const;
 
-private:
+  private:
     static constexpr int kMaxTaps = 6;
     struct Taps {
         int first = 0;  // first source index

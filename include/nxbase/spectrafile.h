@@ -77,8 +77,8 @@ enum class SpectralScale {
 
 // One spectrum as the file gives it, on the file's own grid.
 struct NXBASE_EXPORT SpectralSample {
-    std::string id;    // SAMPLE_ID or the first id field; the row number if none
-    std::string name;  // SAMPLE_NAME or the further id fields joined by " "
+    std::string id;             // SAMPLE_ID or the first id field; the row number if none
+    std::string name;           // SAMPLE_NAME or the further id fields joined by " "
     std::vector<float> values;  // one per wavelength of the set, scaled to white = 1
     int line = 0;               // 1-based line in the source; 0 unknown
 };
@@ -91,13 +91,13 @@ struct NXBASE_EXPORT SpectralSet {
     std::size_t suppressedErrors = 0;  // errors beyond kMaxErrorMessages
     // Remarks that are not errors, e.g. how the scale was chosen.
     std::vector<std::string> notes;
-    bool unusable = false;   // nothing could be read (no grid, a file the parser rejects)
-    bool percent = false;    // the values were read as percentages
+    bool unusable = false;  // nothing could be read (no grid, a file the parser rejects)
+    bool percent = false;   // the values were read as percentages
     // How the scale was chosen when neither the caller nor the file said:
     // "<source>: read as ...: <why>; <the option that reads the other>".
     // Empty when the scale was given. Worth showing every time.
     std::string scaleNote;
-    std::string format;      // "CSV" or "CGATS"
+    std::string format;  // "CSV" or "CGATS"
 
     bool HasErrors() const { return !errors.empty() || suppressedErrors > 0; }
 };
@@ -125,9 +125,9 @@ NXBASE_EXPORT bool LooksLikeCgats(std::string_view text);
 // ---- The 36-point grid ----------------------------------------------------
 
 struct NXBASE_EXPORT SpectrumRow {
-    std::string id;    // id and name joined by " "
+    std::string id;  // id and name joined by " "
     std::array<float, kSpectrumSize> values{};
-    int line = 0;      // 1-based line in the source; 0 unknown
+    int line = 0;  // 1-based line in the source; 0 unknown
     std::string sampleId;
     std::string sampleName;
     // The values as read, on the table's sourceWavelengths, kept when that

@@ -8,10 +8,9 @@
 #ifndef NXBASE_SPECTRUM_H_
 #define NXBASE_SPECTRUM_H_
 
+#include <boost/shared_ptr.hpp>
 #include <map>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "nxbase/export.h"
 #include "nxbase/meascond.h"
@@ -20,7 +19,7 @@
 // Additional information a reflectance spectrum carries, one object per type.
 // Concrete kinds are defined by the applications.
 class NXBASE_EXPORT IAdditionalSpectrumInfo {
-public:
+  public:
     // Applications define their own keys; the library only orders them.
     enum InfoType : int {};
 
@@ -32,7 +31,7 @@ public:
 };
 
 class NXBASE_EXPORT Spectrum {
-public:
+  public:
     static constexpr int kSize = nxbase::kSpectrumSize;
     static constexpr int kFirstWavelength = nxbase::kFirstWavelength;
     static constexpr int kStep = nxbase::kWavelengthStep;
@@ -89,7 +88,7 @@ public:
     bool operator==(const Spectrum& other) const;
     bool operator!=(const Spectrum& other) const { return !(*this == other); }
 
-private:
+  private:
     float amValues[kSize] = {};
 };
 
@@ -100,9 +99,9 @@ NXBASE_EXPORT Spectrum operator*(double factor, const Spectrum& a);
 NXBASE_EXPORT Spectrum operator/(const Spectrum& a, double divisor);
 
 class NXBASE_EXPORT ReflectanceSpectrum : public Spectrum {
-public:
-    using InfoMap = std::map<IAdditionalSpectrumInfo::InfoType,
-                             boost::shared_ptr<IAdditionalSpectrumInfo>>;
+  public:
+    using InfoMap =
+        std::map<IAdditionalSpectrumInfo::InfoType, boost::shared_ptr<IAdditionalSpectrumInfo>>;
 
     // Values 0.0, physical conditions with the default filter (FILTER_DEFAULT).
     ReflectanceSpectrum() = default;
@@ -152,7 +151,7 @@ public:
     bool operator==(const ReflectanceSpectrum& other) const;
     bool operator!=(const ReflectanceSpectrum& other) const { return !(*this == other); }
 
-private:
+  private:
     PhysicalConditions amPhysical;
     InfoMap amInfo;
 };

@@ -111,7 +111,8 @@ namespace nxbase {
 // the call returns when all are done. With one thread, or when no thread can
 // be started, the work is done on the calling thread. fPart must not throw.
 NXBASE_EXPORT void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread,
-                              std::size_t alGranule, const std::function<void(std::size_t, std::size_t)>& fPart);
+                              std::size_t alGranule,
+                              const std::function<void(std::size_t, std::size_t)>& fPart);
 
 }  // namespace nxbase
 

@@ -22,8 +22,8 @@ constexpr std::size_t kMaxTableRows = 10000;
 constexpr std::size_t kMaxTableColumns = 16;
 
 struct CsvTable {
-    std::vector<std::string> columns;   // header names, column 0 "wavelength"
-    std::vector<double> wavelengths;    // strictly ascending, finite
+    std::vector<std::string> columns;         // header names, column 0 "wavelength"
+    std::vector<double> wavelengths;          // strictly ascending, finite
     std::vector<std::vector<double>> values;  // values[column - 1][row], finite
 };
 

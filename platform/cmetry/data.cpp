@@ -1,8 +1,9 @@
+#include "klume/cmetry/data.h"
+
 #include <algorithm>
 #include <cmath>
 #include <utility>
 
-#include "klume/cmetry/data.h"
 #include "objects.h"
 
 namespace klume {
@@ -18,8 +19,8 @@ double IIlluminant::GetPower(double nm) const {
     if (nm <= x.front()) return y.front();
     if (nm >= x.back()) return y.back();
     // First point above nm; x[j - 1] <= nm < x[j].
-    const std::size_t j = static_cast<std::size_t>(std::upper_bound(x.begin(), x.end(), nm) -
-                                                   x.begin());
+    const std::size_t j =
+        static_cast<std::size_t>(std::upper_bound(x.begin(), x.end(), nm) - x.begin());
     const double slope = (y[j] - y[j - 1]) / (x[j] - x[j - 1]);
     return slope * (nm - x[j - 1]) + y[j - 1];
 }
@@ -27,7 +28,7 @@ double IIlluminant::GetPower(double nm) const {
 namespace {
 
 class TableIlluminant final : public IIlluminant {
-public:
+  public:
     TableIlluminant(std::string name, std::string description, std::vector<double> wavelengths,
                     std::vector<double> powers)
         : amName(std::move(name)),
@@ -40,7 +41,7 @@ public:
     const std::vector<double>& GetWavelengths() const override { return amWavelengths; }
     const std::vector<double>& GetPowers() const override { return amPowers; }
 
-private:
+  private:
     std::string amName;
     std::string amDescription;
     std::vector<double> amWavelengths;
@@ -48,7 +49,7 @@ private:
 };
 
 class TableObserver final : public IObserver {
-public:
+  public:
     TableObserver(std::string name, std::string description, int fieldSize, int first,
                   std::vector<double> cmf[3])
         : amName(std::move(name)),
@@ -65,7 +66,7 @@ public:
     int GetSampleCount() const override { return static_cast<int>(amCmf[0].size()); }
     const double* GetCMF(int channel) const override { return amCmf[channel].data(); }
 
-private:
+  private:
     std::string amName;
     std::string amDescription;
     int amFieldSize = 2;
@@ -74,7 +75,7 @@ private:
 };
 
 class ProductDensityStandard final : public IDensityStandard {
-public:
+  public:
     ProductDensityStandard(std::string name, std::vector<std::string> channelNames,
                            std::vector<SampleTable> products)
         : amName(std::move(name)),
@@ -88,7 +89,7 @@ public:
     }
     const SampleTable& GetProducts(int channel) const override { return amProducts[channel]; }
 
-private:
+  private:
     std::string amName;
     std::vector<std::string> amChannelNames;
     std::vector<SampleTable> amProducts;
@@ -136,8 +137,8 @@ boost::shared_ptr<IIlluminant> MakeIlluminant(const std::string& name,
             return {};
         }
     }
-    boost::shared_ptr<IIlluminant> illuminant(new TableIlluminant(
-        name, description, std::move(wavelengths), std::move(powers)));
+    boost::shared_ptr<IIlluminant> illuminant(
+        new TableIlluminant(name, description, std::move(wavelengths), std::move(powers)));
     bool lit = false;
     for (int nm = kPowerRangeStart; nm <= kPowerRangeEnd && !lit; ++nm) {
         lit = illuminant->GetPower(nm) > 0.0;

@@ -8,9 +8,9 @@ namespace cmetry {
 namespace embedded {
 
 struct EmbeddedTable {
-    const char* key;     // repository name
-    const char* file;    // source file below data/
-    const char* header;  // the CSV header row
+    const char* key;       // repository name
+    const char* file;      // source file below data/
+    const char* header;    // the CSV header row
     const double* values;  // rows x columns, row-major, column 0 the wavelength
     int rows;
     int columns;

@@ -16,7 +16,7 @@ namespace {
 constexpr int kRangeStart = 360;
 constexpr int kRangeEnd = 780;
 constexpr int kInterval = 10;
-constexpr int kOneNmCount = kRangeEnd - kRangeStart + 1;            // 421
+constexpr int kOneNmCount = kRangeEnd - kRangeStart + 1;                // 421
 constexpr int kPointCount = (kRangeEnd - kRangeStart) / kInterval + 1;  // 43
 constexpr int kInnerCount = kInterval - 1;  // interpolated points per interval
 // Rows of the 43-row table that the E308 adjustment folds into the first and

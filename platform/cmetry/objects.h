@@ -2,10 +2,9 @@
 #ifndef KLUME_CMETRY_OBJECTS_H_
 #define KLUME_CMETRY_OBJECTS_H_
 
+#include <boost/shared_ptr.hpp>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "embedded.h"
 #include "klume/cmetry/data.h"

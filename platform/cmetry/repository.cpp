@@ -2,9 +2,9 @@
 
 #include <algorithm>
 #include <atomic>
-#include <filesystem>
 #include <cctype>
 #include <cstdlib>
+#include <filesystem>
 #include <map>
 #include <mutex>
 #include <utility>
@@ -217,8 +217,8 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
     }
     std::string message;
     boost::shared_ptr<IIlluminant> illuminant =
-        MakeIlluminant(name, "Illuminant " + name + " (" + path + ")",
-                       std::move(table.wavelengths), std::move(table.values[0]), &message);
+        MakeIlluminant(name, "Illuminant " + name + " (" + path + ")", std::move(table.wavelengths),
+                       std::move(table.values[0]), &message);
     if (!illuminant) {
         SetError(error, path + ": " + message);
         return {};
@@ -230,7 +230,8 @@ boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& nam
 bool IlluminantRepository::AddFile(const std::string& path, std::string* name, std::string* error) {
     detail::CsvTable table;
     if (!LoadTable(path, 2, table, error)) return false;
-    if (table.columns.size() != 2) return SetError(error, path + ": expected the columns wavelength,value");
+    if (table.columns.size() != 2)
+        return SetError(error, path + ": expected the columns wavelength,value");
     const std::string stem = std::filesystem::path(path).stem().string();
     std::string message;
     boost::shared_ptr<IIlluminant> illuminant =
@@ -247,7 +248,8 @@ bool IlluminantRepository::AddFile(const std::string& path, std::string* name, s
 std::string IlluminantRepository::CanonicalName(const std::string& name) {
     std::string upper;
     for (char c : name) upper += static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
-    if (upper.size() >= 2 && upper[0] == 'F' && std::isdigit(static_cast<unsigned char>(upper[1]))) {
+    if (upper.size() >= 2 && upper[0] == 'F' &&
+        std::isdigit(static_cast<unsigned char>(upper[1]))) {
         upper.insert(1, "L");
     }
     const BuiltIns& b = GetBuiltIns();
@@ -261,7 +263,8 @@ std::vector<std::string> IlluminantRepository::GetInstalledNames() {
     if (dir.empty() || !std::filesystem::is_directory(dir + "/illuminants", ignored)) return names;
     for (const auto& entry : std::filesystem::directory_iterator(dir + "/illuminants", ignored)) {
         const std::filesystem::path& file = entry.path();
-        if (file.extension() == ".csv" && IsSafeFileName(file.stem().string())) names.push_back(file.stem().string());
+        if (file.extension() == ".csv" && IsSafeFileName(file.stem().string()))
+            names.push_back(file.stem().string());
     }
     std::sort(names.begin(), names.end());
     return names;
@@ -298,7 +301,9 @@ boost::shared_ptr<IObserver> ObserverRepository::GetDefault() {
     return Unowned(GetBuiltIns().observers.at(kDefaultObserver));
 }
 
-std::vector<std::string> ObserverRepository::GetNames() { return GetBuiltIns().observerNames; }
+std::vector<std::string> ObserverRepository::GetNames() {
+    return GetBuiltIns().observerNames;
+}
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::string& name,
                                                                     std::string* error) {
@@ -317,8 +322,8 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
     }
     const std::string dir = DataDirectory();
     if (dir.empty()) {
-        SetError(error, "density standard \"" + name + "\" is not installed (" +
-                            kDataDirVariable + " not set)");
+        SetError(error, "density standard \"" + name + "\" is not installed (" + kDataDirVariable +
+                            " not set)");
         return {};
     }
     const std::string path = dir + "/density/" + DensityFileStem(name) + "_log10.csv";
@@ -340,12 +345,14 @@ boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::s
     return Unowned(standard);
 }
 
-bool DensityStandardRepository::AddFile(const std::string& path, std::string* name, std::string* error) {
+bool DensityStandardRepository::AddFile(const std::string& path, std::string* name,
+                                        std::string* error) {
     detail::CsvTable table;
     if (!LoadTable(path, 2, table, error)) return false;
     std::string stem = std::filesystem::path(path).stem().string();
     const std::string suffix = "_log10";
-    if (stem.size() > suffix.size() && stem.compare(stem.size() - suffix.size(), suffix.size(), suffix) == 0) {
+    if (stem.size() > suffix.size() &&
+        stem.compare(stem.size() - suffix.size(), suffix.size(), suffix) == 0) {
         stem.resize(stem.size() - suffix.size());
     }
     std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());

@@ -79,9 +79,11 @@ bool Bitmap::WritePNG(const std::string& path) const {
     // Encoded in memory first (once to learn the size), then the file is
     // replaced as a whole: a failed write leaves the old picture.
     png_alloc_size_t size = 0;
-    if (!png_image_write_to_memory(&image, nullptr, &size, 0, rows.data(), 0, nullptr)) return false;
+    if (!png_image_write_to_memory(&image, nullptr, &size, 0, rows.data(), 0, nullptr))
+        return false;
     std::string encoded(size, '\0');
-    const int ok = png_image_write_to_memory(&image, encoded.data(), &size, 0, rows.data(), 0, nullptr);
+    const int ok =
+        png_image_write_to_memory(&image, encoded.data(), &size, 0, rows.data(), 0, nullptr);
     png_image_free(&image);
     std::string why;
     return ok != 0 && toolkit::ReplaceFile(path, std::string_view(encoded.data(), size), why);

@@ -141,7 +141,9 @@ bool ReadWhole(const std::string& path, std::string& text, FileId& id, std::stri
     return true;
 }
 
-bool IsBlank(char c) { return c == ' ' || c == '\t'; }
+bool IsBlank(char c) {
+    return c == ' ' || c == '\t';
+}
 
 // Whether one line (without its terminator) is blank, a comment, a group
 // header or a key line. Anything else is malformed: a header without "]", a
@@ -168,7 +170,9 @@ struct LooseComments {
 // anywhere else (even at the start of a key name).
 const char kBom[] = "\xEF\xBB\xBF";
 
-bool StartsWithBom(const std::string& text) { return text.compare(0, 3, kBom) == 0; }
+bool StartsWithBom(const std::string& text) {
+    return text.compare(0, 3, kBom) == 0;
+}
 
 bool IsEntry(const std::string& line) {
     std::size_t first = line.find_first_not_of(" \t");
@@ -342,7 +346,8 @@ struct Config::Impl {
         std::string why;
         if (!toolkit::ReplaceFile(target, out, why)) return Fail(why);
         struct stat written {};
-        if (::stat(target.c_str(), &written) != 0) return Fail(ErrnoText("cannot read the written file"));
+        if (::stat(target.c_str(), &written) != 0)
+            return Fail(ErrnoText("cannot read the written file"));
         // Values are stored trimmed, so the saved text reads back as `fresh`.
         ini = std::move(fresh);
         id = FileId::Of(written);
@@ -359,11 +364,17 @@ Config::Config(const String& path) : pImpl(new Impl) {
 
 Config::~Config() = default;
 
-const String& Config::GetPathName() const { return pImpl->pathName; }
+const String& Config::GetPathName() const {
+    return pImpl->pathName;
+}
 
-void Config::SetGroup(const String& group) { pImpl->group = group; }
+void Config::SetGroup(const String& group) {
+    pImpl->group = group;
+}
 
-const String& Config::GetGroup() const { return pImpl->group; }
+const String& Config::GetGroup() const {
+    return pImpl->group;
+}
 
 String Config::ReadKey(const String& key, const String& defaultValue) {
     pImpl->Refresh();
@@ -373,9 +384,12 @@ String Config::ReadKey(const String& key, const String& defaultValue) {
 
 bool Config::WriteKey(const String& key, const String& value) {
     const std::string group = pImpl->group.str();
-    if (!IsStorableGroup(group)) return pImpl->Fail("the group name \"" + group + "\" cannot be stored");
-    if (!IsStorableKey(key.str())) return pImpl->Fail("the key name \"" + key.str() + "\" cannot be stored");
-    if (HasLineBreakOrNul(value.str())) return pImpl->Fail("the value of \"" + key.str() + "\" has a line break");
+    if (!IsStorableGroup(group))
+        return pImpl->Fail("the group name \"" + group + "\" cannot be stored");
+    if (!IsStorableKey(key.str()))
+        return pImpl->Fail("the key name \"" + key.str() + "\" cannot be stored");
+    if (HasLineBreakOrNul(value.str()))
+        return pImpl->Fail("the value of \"" + key.str() + "\" has a line break");
     std::string trimmed = value.str();
     trimmed.erase(0, trimmed.find_first_not_of(" \t"));
     trimmed.erase(trimmed.find_last_not_of(" \t") + 1);
@@ -452,7 +466,9 @@ bool Config::HasGroup(const String& group) {
     return pImpl->ini->GetSection(group.GetBuffer()) != nullptr;
 }
 
-const std::string& Config::GetLastError() const { return pImpl->lastError; }
+const std::string& Config::GetLastError() const {
+    return pImpl->lastError;
+}
 
 Config::ErrorSink Config::SetErrorSink(ErrorSink sink) {
     std::lock_guard<std::mutex> lock(SinkMutex());

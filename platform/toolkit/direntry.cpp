@@ -32,11 +32,17 @@ DirEntry::DirEntry(const std::string& path) : amPath(Clean(path)) {}
 DirEntry::DirEntry(const char* path) : amPath(Clean(path ? path : "")) {}
 DirEntry::DirEntry(const std::filesystem::path& path) : amPath(Clean(path.string())) {}
 
-String DirEntry::GetFull() const { return String(amPath.string()); }
+String DirEntry::GetFull() const {
+    return String(amPath.string());
+}
 
-String DirEntry::GetName() const { return String(amPath.filename().string()); }
+String DirEntry::GetName() const {
+    return String(amPath.filename().string());
+}
 
-String DirEntry::GetBase() const { return String(amPath.stem().string()); }
+String DirEntry::GetBase() const {
+    return String(amPath.stem().string());
+}
 
 String DirEntry::GetExtension() const {
     std::string ext = amPath.extension().string();

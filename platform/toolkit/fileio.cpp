@@ -45,14 +45,16 @@ bool FinalTarget(const std::string& path, std::string& target, std::string& why)
         std::string next(buffer.data(), static_cast<std::size_t>(n));
         if (next.empty() || next[0] != '/') {
             const std::size_t slash = target.rfind('/');
-            next = (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) + next;
+            next =
+                (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) + next;
         }
         target = next;
     }
     return Failed(why, "too many symbolic links", ELOOP);
 }
 
-bool WriteDirectly(const std::string& path, std::string_view content, bool truncate, std::string& why) {
+bool WriteDirectly(const std::string& path, std::string_view content, bool truncate,
+                   std::string& why) {
     const int fd = ::open(path.c_str(), O_WRONLY | O_CLOEXEC | O_NOCTTY | (truncate ? O_TRUNC : 0));
     if (fd < 0) return Failed(why, "cannot open", errno);
     bool written = WriteAll(fd, content);
@@ -85,8 +87,9 @@ bool ReplaceFile(const std::string& path, std::string_view content, std::string&
     // a hard-linked file is rewritten where it is.
     if (exists && info.st_nlink > 1) return WriteDirectly(target, content, true, why);
     const std::size_t slash = target.rfind('/');
-    const std::string temporary = (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) +
-                                  "." + target.substr(slash == std::string::npos ? 0 : slash + 1) + ".XXXXXX";
+    const std::string temporary =
+        (slash == std::string::npos ? std::string() : target.substr(0, slash + 1)) + "." +
+        target.substr(slash == std::string::npos ? 0 : slash + 1) + ".XXXXXX";
     std::vector<char> name(temporary.begin(), temporary.end());
     name.push_back('\0');
     const int fd = ::mkostemp(name.data(), O_CLOEXEC);

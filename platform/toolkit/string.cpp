@@ -193,10 +193,9 @@ namespace {
 
 // Code points of the bytes 0x80..0x9F; the rest of the code page is Latin-1.
 constexpr char32_t kHighControls[32] = {
-    0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021,
-    0x02C6, 0x2030, 0x0160, 0x2039, 0x0152, 0x008D, 0x017D, 0x008F,
-    0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022, 0x2013, 0x2014,
-    0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
+    0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021, 0x02C6, 0x2030, 0x0160,
+    0x2039, 0x0152, 0x008D, 0x017D, 0x008F, 0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022,
+    0x2013, 0x2014, 0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
 
 bool IsAscii(std::string_view text) {
     for (char c : text) {
@@ -235,7 +234,11 @@ std::size_t DecodeUtf8(std::string_view text, std::size_t at, char32_t& code) {
 // a single stray byte.
 std::size_t MalformedLength(std::string_view text, std::size_t at) {
     unsigned char lead = static_cast<unsigned char>(text[at]);
-    std::size_t expected = lead < 0xC2 ? 1 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 1;
+    std::size_t expected = lead < 0xC2   ? 1
+                           : lead < 0xE0 ? 2
+                           : lead < 0xF0 ? 3
+                           : lead < 0xF5 ? 4
+                                         : 1;
     std::size_t length = 1;
     while (length < expected && at + length < text.size() &&
            (static_cast<unsigned char>(text[at + length]) & 0xC0) == 0x80) {
@@ -267,13 +270,18 @@ void AppendUtf8(std::string& out, char32_t code) {
 bool IsValidUtf8(std::string_view text) {
     for (std::size_t at = 0; at < text.size();) {
         const unsigned char lead = static_cast<unsigned char>(text[at]);
-        const std::size_t length = lead < 0x80 ? 1 : lead < 0xC2 ? 0 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 0;
+        const std::size_t length = lead < 0x80   ? 1
+                                   : lead < 0xC2 ? 0
+                                   : lead < 0xE0 ? 2
+                                   : lead < 0xF0 ? 3
+                                   : lead < 0xF5 ? 4
+                                                 : 0;
         if (length == 0 || at + length > text.size()) return false;
         // The second byte's range where the lead alone does not rule out
         // overlong forms, surrogates and code points above U+10FFFF.
         const unsigned char second = static_cast<unsigned char>(text[at + (length > 1 ? 1 : 0)]);
-        if ((lead == 0xE0 && second < 0xA0) || (lead == 0xED && second > 0x9F) || (lead == 0xF0 && second < 0x90) ||
-            (lead == 0xF4 && second > 0x8F)) {
+        if ((lead == 0xE0 && second < 0xA0) || (lead == 0xED && second > 0x9F) ||
+            (lead == 0xF0 && second < 0x90) || (lead == 0xF4 && second > 0x8F)) {
             return false;
         }
         for (std::size_t i = 1; i < length; ++i) {

@@ -91,7 +91,8 @@ int SocketCalls::LockName(const std::string& lockPath, std::string& why) {
         }
         // The owner before us removes the file when it stops: a lock on a
         // file that is no longer there holds nothing, so take the new one.
-        struct stat held {}, named {};
+        struct stat held {
+        }, named{};
         if (::fstat(fd, &held) == 0 && ::stat(lockPath.c_str(), &named) == 0 &&
             held.st_ino == named.st_ino && held.st_dev == named.st_dev) {
             return fd;

@@ -1,10 +1,11 @@
 // Chromatic adaptation transforms; see nxbase/adaptation.h.
 #include "nxbase/adaptation.h"
 
+#include <strings.h>
+
 #include <cmath>
 #include <stdexcept>
 #include <string>
-#include <strings.h>
 
 #include "nxbase/colorbatch.h"
 #include "nxbase/colorvector.h"
@@ -14,9 +15,12 @@ namespace {
 
 constexpr Matrix3 kIdentity = {{{1.0, 0.0, 0.0}, {0.0, 1.0, 0.0}, {0.0, 0.0, 1.0}}};
 // Hunt-Pointer-Estevez, normalised to equal-energy white.
-constexpr Matrix3 kVonKries = {{{0.40024, 0.70760, -0.08081}, {-0.22630, 1.16532, 0.04570}, {0.0, 0.0, 0.91822}}};
-constexpr Matrix3 kBradford = {{{0.8951, 0.2664, -0.1614}, {-0.7502, 1.7135, 0.0367}, {0.0389, -0.0685, 1.0296}}};
-constexpr Matrix3 kCat02 = {{{0.7328, 0.4296, -0.1624}, {-0.7036, 1.6975, 0.0061}, {0.0030, 0.0136, 0.9834}}};
+constexpr Matrix3 kVonKries = {
+    {{0.40024, 0.70760, -0.08081}, {-0.22630, 1.16532, 0.04570}, {0.0, 0.0, 0.91822}}};
+constexpr Matrix3 kBradford = {
+    {{0.8951, 0.2664, -0.1614}, {-0.7502, 1.7135, 0.0367}, {0.0389, -0.0685, 1.0296}}};
+constexpr Matrix3 kCat02 = {
+    {{0.7328, 0.4296, -0.1624}, {-0.7036, 1.6975, 0.0061}, {0.0030, 0.0136, 0.9834}}};
 
 Matrix3 Multiply(const Matrix3& a, const Matrix3& b) {
     Matrix3 product{};
@@ -35,12 +39,10 @@ bool ParseAdaptationMethod(const char* pName, AdaptationMethod* pMethod) {
         const char* name;
         AdaptationMethod method;
     };
-    static const Entry kNames[] = {{"xyz", AdaptationMethod::kXYZScaling},
-                                   {"scaling", AdaptationMethod::kXYZScaling},
-                                   {"vonkries", AdaptationMethod::kVonKries},
-                                   {"von-kries", AdaptationMethod::kVonKries},
-                                   {"bradford", AdaptationMethod::kBradford},
-                                   {"cat02", AdaptationMethod::kCat02}};
+    static const Entry kNames[] = {
+        {"xyz", AdaptationMethod::kXYZScaling},    {"scaling", AdaptationMethod::kXYZScaling},
+        {"vonkries", AdaptationMethod::kVonKries}, {"von-kries", AdaptationMethod::kVonKries},
+        {"bradford", AdaptationMethod::kBradford}, {"cat02", AdaptationMethod::kCat02}};
     for (const Entry& entry : kNames) {
         if (pName && strcasecmp(pName, entry.name) == 0) {
             *pMethod = entry.method;
@@ -52,10 +54,14 @@ bool ParseAdaptationMethod(const char* pName, AdaptationMethod* pMethod) {
 
 Matrix3 ConeResponseMatrix(AdaptationMethod axMethod) {
     switch (axMethod) {
-        case AdaptationMethod::kXYZScaling: return kIdentity;
-        case AdaptationMethod::kVonKries: return kVonKries;
-        case AdaptationMethod::kBradford: return kBradford;
-        case AdaptationMethod::kCat02: return kCat02;
+        case AdaptationMethod::kXYZScaling:
+            return kIdentity;
+        case AdaptationMethod::kVonKries:
+            return kVonKries;
+        case AdaptationMethod::kBradford:
+            return kBradford;
+        case AdaptationMethod::kCat02:
+            return kCat02;
     }
     return kIdentity;
 }
@@ -97,11 +103,11 @@ Matrix3 AdaptationMatrix(const Tristimulus& axSource, const Tristimulus& axDesti
     for (int i = 0; i < 3; ++i) {
         gain[i][i] = destination[i] / source[i];
         if (source[i] == 0.0 || !std::isfinite(gain[i][i])) {
-            throw std::invalid_argument("white point " + std::to_string(axSource[0]) + " " +
-                                        std::to_string(axSource[1]) + " " + std::to_string(axSource[2]) +
-                                        " or " + std::to_string(axDestination[0]) + " " +
-                                        std::to_string(axDestination[1]) + " " +
-                                        std::to_string(axDestination[2]) + " cannot be adapted");
+            throw std::invalid_argument(
+                "white point " + std::to_string(axSource[0]) + " " + std::to_string(axSource[1]) +
+                " " + std::to_string(axSource[2]) + " or " + std::to_string(axDestination[0]) +
+                " " + std::to_string(axDestination[1]) + " " + std::to_string(axDestination[2]) +
+                " cannot be adapted");
         }
     }
     return Multiply(Invert(cone), Multiply(gain, cone));
@@ -112,9 +118,10 @@ Tristimulus WhitePointOf(const MeasuringCondition& axCondition) {
     return {batch.WhitePoint(0), batch.WhitePoint(1), batch.WhitePoint(2)};
 }
 
-XYZVector Adapt(const XYZVector& axXYZ, const MeasuringCondition& axDestination, AdaptationMethod axMethod) {
-    const Matrix3 matrix =
-        AdaptationMatrix(WhitePointOf(axXYZ.GetMeasuringCondition()), WhitePointOf(axDestination), axMethod);
+XYZVector Adapt(const XYZVector& axXYZ, const MeasuringCondition& axDestination,
+                AdaptationMethod axMethod) {
+    const Matrix3 matrix = AdaptationMatrix(WhitePointOf(axXYZ.GetMeasuringCondition()),
+                                            WhitePointOf(axDestination), axMethod);
     const Tristimulus adapted = Apply(matrix, {axXYZ[0], axXYZ[1], axXYZ[2]});
     return XYZVector(static_cast<float>(adapted[0]), static_cast<float>(adapted[1]),
                      static_cast<float>(adapted[2]), axDestination);

@@ -40,14 +40,19 @@ namespace {
 constexpr int kSamples = BatchWeights::kSamples;
 constexpr int kLanes = 8;
 using PaddedWeights = detail::BatchTables;
-static_assert(detail::BatchTables::kChunks * kLanes - 4 == kSamples, "five chunks, the last overlapping");
+static_assert(detail::BatchTables::kChunks * kLanes - 4 == kSamples,
+              "five chunks, the last overlapping");
 
 typedef float V8 __attribute__((vector_size(kLanes * sizeof(float))));
 typedef std::int32_t I8 __attribute__((vector_size(kLanes * sizeof(std::int32_t))));
 
 // The integer vector of the same width as a float vector.
-template <class V> struct IntOf;
-template <> struct IntOf<V8> { using type = I8; };
+template <class V>
+struct IntOf;
+template <>
+struct IntOf<V8> {
+    using type = I8;
+};
 
 using detail::kLabEpsilon;
 using detail::kLabKappa;
@@ -67,7 +72,9 @@ using detail::kLabOffset;
 #endif
 
 template <class V = V8>
-NXBASE_BATCH_INLINE V Splat(float v) { return V{} + v; }
+NXBASE_BATCH_INLINE V Splat(float v) {
+    return V{} + v;
+}
 
 NXBASE_BATCH_INLINE V8 Load(const float* p) {
     V8 v;
@@ -75,7 +82,9 @@ NXBASE_BATCH_INLINE V8 Load(const float* p) {
     return v;
 }
 
-NXBASE_BATCH_INLINE void Store(float* p, V8 v) { std::memcpy(p, &v, sizeof v); }
+NXBASE_BATCH_INLINE void Store(float* p, V8 v) {
+    std::memcpy(p, &v, sizeof v);
+}
 
 // Cube root of positive normal floats: an exponent-thirding first guess
 // (relative error below 4%) refined by two Halley steps (cubic convergence:
@@ -203,12 +212,12 @@ NXBASE_BATCH_INLINE void LabBlock(const PaddedWeights& w, const float* src, V8 l
 // (Streaming the stores past the cache measured no faster for results far
 // larger than the cache: the input dominates the memory traffic.)
 NXBASE_BATCH_INLINE void InterleaveVectors(const V8 v[3], V8 o[3]) {
-    const V8 t0 = NXBASE_SHUFFLE(v[0], v[1], 0, 8, 0, 1, 9, 1, 2, 10);   // x0 y0 . x1 y1 . x2 y2
-    o[0] = NXBASE_SHUFFLE(t0, v[2], 0, 1, 8, 3, 4, 9, 6, 7);             // z0, z1 in
-    const V8 t1 = NXBASE_SHUFFLE(v[0], v[1], 2, 3, 11, 3, 4, 12, 4, 5);  // . x3 y3 . x4 y4 . x5
-    o[1] = NXBASE_SHUFFLE(t1, v[2], 10, 1, 2, 11, 4, 5, 12, 7);          // z2, z3, z4 in
-    const V8 t2 = NXBASE_SHUFFLE(v[0], v[1], 13, 5, 6, 14, 6, 7, 15, 7); // y5 . x6 y6 . x7 y7 .
-    o[2] = NXBASE_SHUFFLE(t2, v[2], 0, 13, 2, 3, 14, 5, 6, 15);          // z5, z6, z7 in
+    const V8 t0 = NXBASE_SHUFFLE(v[0], v[1], 0, 8, 0, 1, 9, 1, 2, 10);    // x0 y0 . x1 y1 . x2 y2
+    o[0] = NXBASE_SHUFFLE(t0, v[2], 0, 1, 8, 3, 4, 9, 6, 7);              // z0, z1 in
+    const V8 t1 = NXBASE_SHUFFLE(v[0], v[1], 2, 3, 11, 3, 4, 12, 4, 5);   // . x3 y3 . x4 y4 . x5
+    o[1] = NXBASE_SHUFFLE(t1, v[2], 10, 1, 2, 11, 4, 5, 12, 7);           // z2, z3, z4 in
+    const V8 t2 = NXBASE_SHUFFLE(v[0], v[1], 13, 5, 6, 14, 6, 7, 15, 7);  // y5 . x6 y6 . x7 y7 .
+    o[2] = NXBASE_SHUFFLE(t2, v[2], 0, 13, 2, 3, 14, 5, 6, 15);           // z5, z6, z7 in
 }
 
 NXBASE_BATCH_INLINE void InterleaveFull(const V8 v[3], float* out) {
@@ -230,7 +239,8 @@ NXBASE_BATCH_INLINE void Interleave(const V8 v[3], float* out, int lanes) {
 }
 
 template <bool kLab>
-NXBASE_BATCH_INLINE void RunBlocks(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+NXBASE_BATCH_INLINE void RunBlocks(const PaddedWeights& w, const float* src, std::size_t count,
+                                   float* out) {
     V8 v[3];
     std::size_t i = 0;
     for (; i + kLanes <= count; i += kLanes) {
@@ -310,14 +320,17 @@ NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE __m512 AddNeighbours(__m512 a, __m512 b) 
 }
 
 // The lane SumBlock16 leaves spectrum s in.
-constexpr int SumLane(int s) { return (s / 8) * 8 + (s % 2) * 4 + (s % 8) / 2; }
+constexpr int SumLane(int s) {
+    return (s / 8) * 8 + (s % 2) * 4 + (s % 8) / 2;
+}
 
 using WideWeights = __m512[3][detail::BatchTables::kChunks];
 
 // The eight partial sums per channel of spectra a (low half) and a + 36
 // (high half), in the order of the eight-lane kernel.
 template <class T>
-NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumPair(const WideWeights& weights, const T* a, __m512 acc[3]) {
+NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumPair(const WideWeights& weights, const T* a,
+                                                    __m512 acc[3]) {
     const T* b = a + kSamples;
     const __m512 r0 = LoadPair(a, b);
     const __m512 r1 = LoadPair(a + 8, b + 8);
@@ -326,8 +339,10 @@ NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumPair(const WideWeights& weights, 
     const __m512 r4 = LoadPair(a + 28, b + 28);
 #pragma GCC unroll 3
     for (int c = 0; c < 3; ++c) {
-        const __m512 low = _mm512_add_ps(_mm512_mul_ps(r0, weights[c][0]), _mm512_mul_ps(r1, weights[c][1]));
-        const __m512 high = _mm512_add_ps(_mm512_mul_ps(r2, weights[c][2]), _mm512_mul_ps(r3, weights[c][3]));
+        const __m512 low =
+            _mm512_add_ps(_mm512_mul_ps(r0, weights[c][0]), _mm512_mul_ps(r1, weights[c][1]));
+        const __m512 high =
+            _mm512_add_ps(_mm512_mul_ps(r2, weights[c][2]), _mm512_mul_ps(r3, weights[c][3]));
         acc[c] = _mm512_add_ps(_mm512_add_ps(low, high), _mm512_mul_ps(r4, weights[c][4]));
     }
 }
@@ -337,7 +352,8 @@ NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumPair(const WideWeights& weights, 
 // Groups 0 and 1 of out[c] hold the sums of lanes 0..3 and 4..7 of spectra
 // 0, 2, 4, 6; groups 2 and 3 those of spectra 1, 3, 5, 7.
 template <class T>
-NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumEight(const WideWeights& weights, const T* src, __m512 out[3]) {
+NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumEight(const WideWeights& weights, const T* src,
+                                                     __m512 out[3]) {
     __m512 quad[2][3];
 #pragma GCC unroll 2
     for (int k = 0; k < 2; ++k) {
@@ -356,14 +372,17 @@ NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumEight(const WideWeights& weights,
 // additions per spectrum are those of SumLanes, ((0+1) + (2+3)) + ((4+5) +
 // (6+7)), so the results agree with the eight-lane kernel bit for bit.
 template <class T>
-NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumBlock16(const WideWeights& weights, const T* src, __m512 sums[3]) {
+NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void SumBlock16(const WideWeights& weights, const T* src,
+                                                       __m512 sums[3]) {
     __m512 half[2][3];
     SumEight(weights, src, half[0]);
     SumEight(weights, src + kLanes * kSamples, half[1]);
 #pragma GCC unroll 3
     for (int c = 0; c < 3; ++c) {
-        const __m512 low = _mm512_shuffle_f32x4(half[0][c], half[1][c], 0x88);   // groups 0, 2 of each
-        const __m512 high = _mm512_shuffle_f32x4(half[0][c], half[1][c], 0xdd);  // groups 1, 3 of each
+        const __m512 low =
+            _mm512_shuffle_f32x4(half[0][c], half[1][c], 0x88);  // groups 0, 2 of each
+        const __m512 high =
+            _mm512_shuffle_f32x4(half[0][c], half[1][c], 0xdd);  // groups 1, 3 of each
         sums[c] = _mm512_add_ps(low, high);
     }
 }
@@ -389,14 +408,19 @@ constexpr WideInterleave kWideInterleave;
 
 NXBASE_WIDE_TARGET NXBASE_BATCH_INLINE void InterleaveSixteen(const __m512 v[3], float* out) {
     for (int k = 0; k < 3; ++k) {
-        const __m512 xy = _mm512_permutex2var_ps(v[0], _mm512_load_si512(kWideInterleave.xy[k]), v[1]);
-        _mm512_storeu_ps(out + 16 * k, _mm512_permutex2var_ps(xy, _mm512_load_si512(kWideInterleave.z[k]), v[2]));
+        const __m512 xy =
+            _mm512_permutex2var_ps(v[0], _mm512_load_si512(kWideInterleave.xy[k]), v[1]);
+        _mm512_storeu_ps(out + 16 * k,
+                         _mm512_permutex2var_ps(xy, _mm512_load_si512(kWideInterleave.z[k]), v[2]));
     }
 }
 
 typedef float V16 __attribute__((vector_size(16 * sizeof(float))));
 typedef std::int32_t I16 __attribute__((vector_size(16 * sizeof(std::int32_t))));
-template <> struct IntOf<V16> { using type = I16; };
+template <>
+struct IntOf<V16> {
+    using type = I16;
+};
 
 // How far ahead of the block being summed its successors are fetched: far
 // enough to cover the memory latency at the rate the kernel consumes them
@@ -404,7 +428,8 @@ template <> struct IntOf<V16> { using type = I16; };
 constexpr std::size_t kPrefetchSpectra = 64;
 
 template <bool kLab, class T>
-NXBASE_WIDE_TARGET void RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
+NXBASE_WIDE_TARGET void RunWide(const PaddedWeights& w, const T* src, std::size_t count,
+                                float* out) {
     WideWeights weights;
     for (int c = 0; c < 3; ++c) {
         for (int k = 0; k < detail::BatchTables::kChunks; ++k) {
@@ -416,7 +441,8 @@ NXBASE_WIDE_TARGET void RunWide(const PaddedWeights& w, const T* src, std::size_
         // Every line of a block some way ahead: the hardware's stream
         // prefetcher alone leaves compute and memory taking turns.
         const char* ahead = reinterpret_cast<const char*>(src + (i + kPrefetchSpectra) * kSamples);
-        for (std::size_t line = 0; line < kBlockBytes; line += 64) __builtin_prefetch(ahead + line, 0, 3);
+        for (std::size_t line = 0; line < kBlockBytes; line += 64)
+            __builtin_prefetch(ahead + line, 0, 3);
         __m512 sums[3];
         SumBlock16(weights, src + i * kSamples, sums);
         V16 v[3];
@@ -432,7 +458,8 @@ NXBASE_WIDE_TARGET void RunWide(const PaddedWeights& w, const T* src, std::size_
 }
 
 bool HasWideKernel() {
-    static const bool wide = __builtin_cpu_supports("avx512f") && __builtin_cpu_supports("avx512dq") &&
+    static const bool wide = __builtin_cpu_supports("avx512f") &&
+                             __builtin_cpu_supports("avx512dq") &&
                              __builtin_cpu_supports("avx512vl");
     return wide;
 }
@@ -492,8 +519,8 @@ ColorBatch::ColorBatch() : ColorBatch(WeightsOf(*CMetry::Instance()->GetLXYZFilt
 ColorBatch::ColorBatch(const CMetryFilter& axFilter) : ColorBatch(WeightsOf(axFilter)) {}
 
 ColorBatch::ColorBatch(const MeasuringCondition& axCondition)
-    : ColorBatch(WeightsOf(CMetryFilter(Lichtart(axCondition.GetIllum()),
-                                        Observer(axCondition.GetObserver())))) {}
+    : ColorBatch(WeightsOf(
+          CMetryFilter(Lichtart(axCondition.GetIllum()), Observer(axCondition.GetObserver())))) {}
 
 ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {
     for (int c = 0; c < BatchWeights::kChannels; ++c) {
@@ -530,7 +557,8 @@ namespace {
 constexpr std::size_t kMinPerThread = 16384;
 
 template <bool kLab, class T>
-void RunParallel(const PaddedWeights& w, const T* src, std::size_t count, float* out, unsigned threads) {
+void RunParallel(const PaddedWeights& w, const T* src, std::size_t count, float* out,
+                 unsigned threads) {
     // Parts start at multiples of sixteen: every part but the last runs on
     // the wide kernel only.
     RunInParts(count, threads, kMinPerThread, 2 * kLanes, [&](std::size_t first, std::size_t n) {
@@ -582,9 +610,13 @@ std::vector<float> RunTable(const PaddedWeights& w, const SpectraTable& axTable)
 
 }  // namespace
 
-std::vector<float> ColorBatch::ToXYZ(const SpectraTable& axTable) const { return RunTable<false>(amTables, axTable); }
+std::vector<float> ColorBatch::ToXYZ(const SpectraTable& axTable) const {
+    return RunTable<false>(amTables, axTable);
+}
 
-std::vector<float> ColorBatch::ToLab(const SpectraTable& axTable) const { return RunTable<true>(amTables, axTable); }
+std::vector<float> ColorBatch::ToLab(const SpectraTable& axTable) const {
+    return RunTable<true>(amTables, axTable);
+}
 
 float ColorBatch::WhitePoint(int alChannel) const {
     return 100.0f * amWeights.sums[alChannel] / amWeights.sums[1];
@@ -602,7 +634,9 @@ void SpectraToLab(const MeasuringCondition& axCondition, const float* pSpectra, 
 
 namespace detail {
 
-void BatchCbrt(const float* pIn, std::size_t alCount, float* pOut) { RunCbrt(pIn, alCount, pOut); }
+void BatchCbrt(const float* pIn, std::size_t alCount, float* pOut) {
+    RunCbrt(pIn, alCount, pOut);
+}
 
 }  // namespace detail
 }  // namespace nxbase

@@ -38,7 +38,7 @@ void BuildGammaTable() {
 }
 
 // EBU Tech. 3213 primaries with D65 white, for XYZ on 0..100, row by row.
-constexpr float kEbuMatrix[9] = {0.03065f, -0.01394f, -0.00476f,   //
+constexpr float kEbuMatrix[9] = {0.03065f,  -0.01394f, -0.00476f,  //
                                  -0.00969f, 0.01876f,  0.00042f,   //
                                  0.00068f,  -0.00229f, 0.0107f};
 
@@ -84,8 +84,8 @@ inline float InverseF(float f) {
 
 // sRGB companding (IEC 61966-2-1), scaled to 0..100.
 inline float Compand(float v) {
-    return 100.0f * (v > 0.0031308f ? 1.055f * std::pow(v, 0.4166666666666667f) - 0.055f
-                                    : 12.92f * v);
+    return 100.0f *
+           (v > 0.0031308f ? 1.055f * std::pow(v, 0.4166666666666667f) - 0.055f : 12.92f * v);
 }
 
 inline void LabToSrgb(const float* lab, float* rgb, const WhitePoint& white) {
@@ -128,12 +128,12 @@ Color OutlineFor(const Color& color) {
 // with the group "FarbTexte" is loaded. The shipped files data/lng/NxBase1.lng
 // and NxBase49.lng hold the same list in English and German.
 const char* const kBuiltinNames[FARBE_ANZAHL] = {
-    "black",          "dark grey",      "grey",        "light grey",     "white",
-    "dark red",       "red",            "pink",        "brown",          "orange",
-    "light orange",   "olive",          "yellow",      "light yellow",   "dark green",
-    "green",          "light green",    "dark turquoise", "turquoise",   "light turquoise",
-    "dark blue",      "blue",           "light blue",  "dark violet",    "violet",
-    "lilac",          "dark magenta",   "magenta",     "light magenta"};
+    "black",        "dark grey",    "grey",           "light grey",   "white",
+    "dark red",     "red",          "pink",           "brown",        "orange",
+    "light orange", "olive",        "yellow",         "light yellow", "dark green",
+    "green",        "light green",  "dark turquoise", "turquoise",    "light turquoise",
+    "dark blue",    "blue",         "light blue",     "dark violet",  "violet",
+    "lilac",        "dark magenta", "magenta",        "light magenta"};
 
 // The text of a colour number from the loaded text files, or the built-in
 // English name while no file holding it is loaded.
@@ -320,7 +320,8 @@ Bitmap ColorConverter::BuildIcon(const Color& axColor, const Size_t<short>& axSi
                                  IconShape axShape) {
     Bitmap bitmap(axSize);
     const int w = bitmap.GetWidth(), h = bitmap.GetHeight();
-    const Color frame = axShape == ICON_SQUARE ? Color(0x8000, 0x8000, 0x8000) : OutlineFor(axColor);
+    const Color frame =
+        axShape == ICON_SQUARE ? Color(0x8000, 0x8000, 0x8000) : OutlineFor(axColor);
     // Inside test at pixel centres, in units where the bitmap spans 0..w, 0..h.
     auto inside = [&](int x, int y) {
         double px = x + 0.5, py = y + 0.5;
@@ -376,8 +377,7 @@ Bitmap ColorConverter::SpectrumToBitmap(const ReflectanceSpectrum& axSpectrum,
 }
 
 Bitmap ColorConverter::SpectrumToBitmap(const ReflectanceSpectrum& axSpectrum,
-                                        const CMetryFilter& axFilter,
-                                        const Size_t<short>& axSize) {
+                                        const CMetryFilter& axFilter, const Size_t<short>& axSize) {
     return BuildBitmap(SpectrumToBrush(axSpectrum, axFilter), axSize);
 }
 

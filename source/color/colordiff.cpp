@@ -15,7 +15,9 @@ constexpr double kPi = 3.14159265358979323846;
 constexpr double kDegree = kPi / 180.0;
 constexpr double k25Pow7 = 6103515625.0;  // 25^7
 
-double Chroma(const LabValue& axLab) { return std::sqrt(axLab.a * axLab.a + axLab.b * axLab.b); }
+double Chroma(const LabValue& axLab) {
+    return std::sqrt(axLab.a * axLab.a + axLab.b * axLab.b);
+}
 
 // ΔH² from Δa, Δb and ΔC; rounding can take it a hair below zero.
 double HueDifferenceSquared(const LabValue& axA, const LabValue& axB, double axDeltaC) {
@@ -49,13 +51,15 @@ double HueWeighting(double axCos, double axSin) {
     const double cos2 = c * c - s * s, sin2 = 2.0 * s * c;
     const double cos3 = c * (4.0 * c * c - 3.0), sin3 = s * (3.0 - 4.0 * s * s);
     const double cos4 = cos2 * cos2 - sin2 * sin2, sin4 = 2.0 * sin2 * cos2;
-    return 1.0 - 0.17 * (c * kCos30 + s * kSin30) + 0.24 * cos2 + 0.32 * (cos3 * kCos6 - sin3 * kSin6) -
-           0.20 * (cos4 * kCos63 + sin4 * kSin63);
+    return 1.0 - 0.17 * (c * kCos30 + s * kSin30) + 0.24 * cos2 +
+           0.32 * (cos3 * kCos6 - sin3 * kSin6) - 0.20 * (cos4 * kCos63 + sin4 * kSin63);
 }
 
 }  // namespace
 
-LabValue ToLabValue(const LABVector& axLab) { return {axLab[0], axLab[1], axLab[2]}; }
+LabValue ToLabValue(const LABVector& axLab) {
+    return {axLab[0], axLab[1], axLab[2]};
+}
 
 double DeltaEab(const LabValue& axReference, const LabValue& axSample) {
     const double dL = axSample.L - axReference.L;
@@ -64,13 +68,16 @@ double DeltaEab(const LabValue& axReference, const LabValue& axSample) {
     return std::sqrt(dL * dL + da * da + db * db);
 }
 
-double DeltaE94(const LabValue& axReference, const LabValue& axSample, Cie94Application axApplication) {
+double DeltaE94(const LabValue& axReference, const LabValue& axSample,
+                Cie94Application axApplication) {
     const bool textiles = axApplication == Cie94Application::kTextiles;
     return DeltaE94(axReference, axSample,
-                    textiles ? Cie94Parameters{2.0, 0.048, 0.014, false} : Cie94Parameters{1.0, 0.045, 0.015, false});
+                    textiles ? Cie94Parameters{2.0, 0.048, 0.014, false}
+                             : Cie94Parameters{1.0, 0.045, 0.015, false});
 }
 
-double DeltaE94(const LabValue& axReference, const LabValue& axSample, const Cie94Parameters& axParameters) {
+double DeltaE94(const LabValue& axReference, const LabValue& axSample,
+                const Cie94Parameters& axParameters) {
     const double c1 = Chroma(axReference);
     const double c2 = Chroma(axSample);
     const double dC = c1 - c2;
@@ -82,7 +89,8 @@ double DeltaE94(const LabValue& axReference, const LabValue& axSample, const Cie
     return std::sqrt(dL * dL + (dC / sc) * (dC / sc) + dh2 / (sh * sh));
 }
 
-double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double axLightness, double axChroma) {
+double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double axLightness,
+                 double axChroma) {
     const double l1 = axReference.L;
     const double c1 = Chroma(axReference);
     const double h1 = HueDegrees(axReference.b, axReference.a);
@@ -92,12 +100,14 @@ double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double a
     const double sc = 0.0638 * c1 / (1.0 + 0.0131 * c1) + 0.638;
     const double c4 = c1 * c1 * c1 * c1;
     const double f = std::sqrt(c4 / (c4 + 1900.0));
-    const double t = (h1 >= 164.0 && h1 <= 345.0) ? 0.56 + std::fabs(0.2 * std::cos((h1 + 168.0) * kDegree))
-                                                  : 0.36 + std::fabs(0.4 * std::cos((h1 + 35.0) * kDegree));
+    const double t = (h1 >= 164.0 && h1 <= 345.0)
+                         ? 0.56 + std::fabs(0.2 * std::cos((h1 + 168.0) * kDegree))
+                         : 0.36 + std::fabs(0.4 * std::cos((h1 + 35.0) * kDegree));
     const double sh = sc * (f * t + 1.0 - f);
     const double tl = dL / (axLightness * sl);
     const double tc = dC / (axChroma * sc);
-    return std::sqrt(tl * tl + tc * tc + HueDifferenceSquared(axReference, axSample, dC) / (sh * sh));
+    return std::sqrt(tl * tl + tc * tc +
+                     HueDifferenceSquared(axReference, axSample, dC) / (sh * sh));
 }
 
 namespace {
@@ -169,8 +179,8 @@ DeltaE2000Parts DeltaE2000ByAngles(const LabValue& axReference, const LabValue& 
 
 // The weighting and the total from ΔL', ΔC', ΔH' and the mean L', C', hue.
 // `rotation` is the rotation term's -sin(2 Δθ) (without RC).
-double Ciede2000Total(const DeltaE2000Parts& parts, double lMean, double cpMean, double cosHue, double sinHue,
-                      double rotation, const DeltaE2000Weights& axWeights) {
+double Ciede2000Total(const DeltaE2000Parts& parts, double lMean, double cpMean, double cosHue,
+                      double sinHue, double rotation, const DeltaE2000Weights& axWeights) {
     const double l50 = (lMean - 50.0) * (lMean - 50.0);
     const double sl = 1.0 + 0.015 * l50 / std::sqrt(20.0 + l50);
     const double sc = 1.0 + 0.045 * cpMean;
@@ -224,14 +234,17 @@ DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& 
         constexpr double kCos275 = 0.087155742747658166, kSin275 = -0.99619469809174553;
         constexpr double kRadiansTo25Degrees = 180.0 / kPi / 25.0;
         const double x =
-            std::atan2(sinHue * kCos275 - cosHue * kSin275, cosHue * kCos275 + sinHue * kSin275) * kRadiansTo25Degrees;
+            std::atan2(sinHue * kCos275 - cosHue * kSin275, cosHue * kCos275 + sinHue * kSin275) *
+            kRadiansTo25Degrees;
         rotation = -std::sin(2.0 * 30.0 * std::exp(-x * x) * kDegree);
     }
-    parts.dE = Ciede2000Total(parts, 0.5 * (p1.L + p2.L), 0.5 * (c1 + c2), cosHue, sinHue, rotation, axWeights);
+    parts.dE = Ciede2000Total(parts, 0.5 * (p1.L + p2.L), 0.5 * (c1 + c2), cosHue, sinHue, rotation,
+                              axWeights);
     return parts;
 }
 
-double DeltaE2000(const LabValue& axReference, const LabValue& axSample, const DeltaE2000Weights& axWeights) {
+double DeltaE2000(const LabValue& axReference, const LabValue& axSample,
+                  const DeltaE2000Weights& axWeights) {
     return DeltaE2000Detailed(axReference, axSample, axWeights).dE;
 }
 
@@ -239,11 +252,13 @@ double DeltaEab(const LABVector& axReference, const LABVector& axSample) {
     return DeltaEab(ToLabValue(axReference), ToLabValue(axSample));
 }
 
-double DeltaE94(const LABVector& axReference, const LABVector& axSample, Cie94Application axApplication) {
+double DeltaE94(const LABVector& axReference, const LABVector& axSample,
+                Cie94Application axApplication) {
     return DeltaE94(ToLabValue(axReference), ToLabValue(axSample), axApplication);
 }
 
-double DeltaECMC(const LABVector& axReference, const LABVector& axSample, double axLightness, double axChroma) {
+double DeltaECMC(const LABVector& axReference, const LABVector& axSample, double axLightness,
+                 double axChroma) {
     return DeltaECMC(ToLabValue(axReference), ToLabValue(axSample), axLightness, axChroma);
 }
 
@@ -252,16 +267,18 @@ DeltaE2000Parts DeltaE2000Detailed(const LABVector& axReference, const LABVector
     return DeltaE2000Detailed(ToLabValue(axReference), ToLabValue(axSample), axWeights);
 }
 
-double DeltaE2000(const LABVector& axReference, const LABVector& axSample, const DeltaE2000Weights& axWeights) {
+double DeltaE2000(const LABVector& axReference, const LABVector& axSample,
+                  const DeltaE2000Weights& axWeights) {
     return DeltaE2000Detailed(ToLabValue(axReference), ToLabValue(axSample), axWeights).dE;
 }
 
-void DeltaE2000Batch(const float* pReference, const float* pSample, std::size_t alCount, float* pDeltaE,
-                     const DeltaE2000Weights& axWeights) {
+void DeltaE2000Batch(const float* pReference, const float* pSample, std::size_t alCount,
+                     float* pDeltaE, const DeltaE2000Weights& axWeights) {
     for (std::size_t i = 0; i < alCount; ++i) {
         const float* r = pReference + 3 * i;
         const float* s = pSample + 3 * i;
-        pDeltaE[i] = static_cast<float>(DeltaE2000({r[0], r[1], r[2]}, {s[0], s[1], s[2]}, axWeights));
+        pDeltaE[i] =
+            static_cast<float>(DeltaE2000({r[0], r[1], r[2]}, {s[0], s[1], s[2]}, axWeights));
     }
 }
 
@@ -271,11 +288,19 @@ struct MethodName {
     DeltaEMethod method;
 };
 constexpr MethodName kMethodNames[] = {
-    {"2000", DeltaEMethod::kCiede2000}, {"00", DeltaEMethod::kCiede2000},   {"ab", DeltaEMethod::kCie76},
-    {"76", DeltaEMethod::kCie76},       {"94", DeltaEMethod::kCie94},       {"94t", DeltaEMethod::kCie94Textiles},
-    {"cmc", DeltaEMethod::kCmc21},      {"cmc21", DeltaEMethod::kCmc21},    {"cmc11", DeltaEMethod::kCmc11},
+    {"2000", DeltaEMethod::kCiede2000},
+    {"00", DeltaEMethod::kCiede2000},
+    {"ab", DeltaEMethod::kCie76},
+    {"76", DeltaEMethod::kCie76},
+    {"94", DeltaEMethod::kCie94},
+    {"94t", DeltaEMethod::kCie94Textiles},
+    {"cmc", DeltaEMethod::kCmc21},
+    {"cmc21", DeltaEMethod::kCmc21},
+    {"cmc11", DeltaEMethod::kCmc11},
     // colour-science's names (CMC there defaults to l = 2, c = 1).
-    {"CIE 1976", DeltaEMethod::kCie76}, {"CIE 1994", DeltaEMethod::kCie94}, {"CIE 2000", DeltaEMethod::kCiede2000},
+    {"CIE 1976", DeltaEMethod::kCie76},
+    {"CIE 1994", DeltaEMethod::kCie94},
+    {"CIE 2000", DeltaEMethod::kCiede2000},
 };
 }  // namespace
 
@@ -291,24 +316,36 @@ bool ParseDeltaEMethod(const char* pName, DeltaEMethod* pMethod) {
 
 const char* DeltaEMethodName(DeltaEMethod axMethod) {
     switch (axMethod) {
-        case DeltaEMethod::kCie76: return "dE*ab";
-        case DeltaEMethod::kCie94: return "dE94";
-        case DeltaEMethod::kCie94Textiles: return "dE94(textiles)";
-        case DeltaEMethod::kCmc21: return "dE CMC(2:1)";
-        case DeltaEMethod::kCmc11: return "dE CMC(1:1)";
-        case DeltaEMethod::kCiede2000: return "dE00";
+        case DeltaEMethod::kCie76:
+            return "dE*ab";
+        case DeltaEMethod::kCie94:
+            return "dE94";
+        case DeltaEMethod::kCie94Textiles:
+            return "dE94(textiles)";
+        case DeltaEMethod::kCmc21:
+            return "dE CMC(2:1)";
+        case DeltaEMethod::kCmc11:
+            return "dE CMC(1:1)";
+        case DeltaEMethod::kCiede2000:
+            return "dE00";
     }
     return "?";
 }
 
 double DeltaE(const LabValue& axReference, const LabValue& axSample, DeltaEMethod axMethod) {
     switch (axMethod) {
-        case DeltaEMethod::kCie76: return DeltaEab(axReference, axSample);
-        case DeltaEMethod::kCie94: return DeltaE94(axReference, axSample);
-        case DeltaEMethod::kCie94Textiles: return DeltaE94(axReference, axSample, Cie94Application::kTextiles);
-        case DeltaEMethod::kCmc21: return DeltaECMC(axReference, axSample, 2.0, 1.0);
-        case DeltaEMethod::kCmc11: return DeltaECMC(axReference, axSample, 1.0, 1.0);
-        case DeltaEMethod::kCiede2000: return DeltaE2000(axReference, axSample);
+        case DeltaEMethod::kCie76:
+            return DeltaEab(axReference, axSample);
+        case DeltaEMethod::kCie94:
+            return DeltaE94(axReference, axSample);
+        case DeltaEMethod::kCie94Textiles:
+            return DeltaE94(axReference, axSample, Cie94Application::kTextiles);
+        case DeltaEMethod::kCmc21:
+            return DeltaECMC(axReference, axSample, 2.0, 1.0);
+        case DeltaEMethod::kCmc11:
+            return DeltaECMC(axReference, axSample, 1.0, 1.0);
+        case DeltaEMethod::kCiede2000:
+            return DeltaE2000(axReference, axSample);
     }
     return 0.0;
 }

@@ -64,7 +64,8 @@ const CMetryFilter& FilterFor(const IllumClass& axIllum, const ObserverClass& ax
 // axPhysical: the filter's illuminant and observer. The illuminant, observer
 // and density standard of the last filter are kept per thread, so that the
 // object path copies three shared pointers and takes no lock.
-MeasuringCondition ConditionFor(const CMetryFilter& axFilter, const PhysicalConditions& axPhysical) {
+MeasuringCondition ConditionFor(const CMetryFilter& axFilter,
+                                const PhysicalConditions& axPhysical) {
     struct Cache {
         boost::shared_ptr<const klume::cmetry::CMetryFilter> key;
         std::optional<MeasuringCondition> condition;
@@ -82,7 +83,9 @@ MeasuringCondition ConditionFor(const CMetryFilter& axFilter, const PhysicalCond
     return MeasuringCondition(c.GetIllum(), c.GetObserver(), c.GetDStd(), axPhysical);
 }
 
-const CMetryFilter& CurrentFilter() { return *CMetry::Instance()->GetLXYZFilter(); }
+const CMetryFilter& CurrentFilter() {
+    return *CMetry::Instance()->GetLXYZFilter();
+}
 
 void WeightSums(const CMetryFilter& axFilter, float pSums[3]) {
     for (unsigned short c = 0; c < 3; ++c) pSums[c] = axFilter.GetWeightSum(c);
@@ -144,7 +147,9 @@ float HueDegrees(float a, float b) {
     return static_cast<float>(h);
 }
 
-float Chroma(float a, float b) { return std::sqrt(a * a + b * b); }
+float Chroma(float a, float b) {
+    return std::sqrt(a * a + b * b);
+}
 
 void LabToLCh(const float* pLab, float* pLCh) {
     pLCh[0] = pLab[0];
@@ -183,8 +188,8 @@ float Probiere(float axTarget, double axLo, double axHi, Forward fForward) {
         for (int k = 0; k <= kSteps; ++k) {
             const double x = lo + k * step;
             if (x < 0.0) continue;
-            const double error = std::fabs(static_cast<double>(axTarget) -
-                                           fForward(static_cast<float>(x)));
+            const double error =
+                std::fabs(static_cast<double>(axTarget) - fForward(static_cast<float>(x)));
             if (error < bestError) {
                 bestError = error;
                 bestX = x;
@@ -216,11 +221,14 @@ ColorVector::ColorVector(const MeasuringCondition& axCondition) : amCondition(ax
 
 ColorVector::ColorVector(const CMetryFilter& axFilter, const ReflectanceSpectrum& axSpectrum)
     : amCondition(ConditionFor(axFilter, axSpectrum.GetPhysicalConditions())) {
-    const float* weights[3] = {axFilter.GetWeights(0), axFilter.GetWeights(1), axFilter.GetWeights(2)};
+    const float* weights[3] = {axFilter.GetWeights(0), axFilter.GetWeights(1),
+                               axFilter.GetWeights(2)};
     nxbase::detail::LaneSums(weights, axSpectrum.GetData(), amV);
 }
 
-float ColorVector::Length() const { return std::sqrt(amV[0] * amV[0] + amV[1] * amV[1] + amV[2] * amV[2]); }
+float ColorVector::Length() const {
+    return std::sqrt(amV[0] * amV[0] + amV[1] * amV[1] + amV[2] * amV[2]);
+}
 
 ColorVector& ColorVector::operator+=(const ColorVector& axOther) {
     for (int i = 0; i < 3; ++i) amV[i] += axOther.amV[i];
@@ -266,14 +274,17 @@ bool operator==(const ColorVector& axA, const ColorVector& axB) {
            axA.GetMeasuringCondition() == axB.GetMeasuringCondition();
 }
 
-bool operator!=(const ColorVector& axA, const ColorVector& axB) { return !(axA == axB); }
+bool operator!=(const ColorVector& axA, const ColorVector& axB) {
+    return !(axA == axB);
+}
 
 // --- XYZVector ---------------------------------------------------------------
 
 XYZVector::XYZVector(float axX, float axY, float axZ, const MeasuringCondition& axCondition)
     : ColorVector(axX, axY, axZ, axCondition) {}
 
-XYZVector::XYZVector(const ReflectanceSpectrum& axSpectrum) : XYZVector(CurrentFilter(), axSpectrum) {}
+XYZVector::XYZVector(const ReflectanceSpectrum& axSpectrum)
+    : XYZVector(CurrentFilter(), axSpectrum) {}
 
 XYZVector::XYZVector(const CMetryFilter& axFilter, const ReflectanceSpectrum& axSpectrum)
     : ColorVector(axFilter, axSpectrum) {
@@ -316,7 +327,8 @@ xyYVector::xyYVector(const XYZVector& axXYZ) : ColorVector(axXYZ.GetMeasuringCon
 LABVector::LABVector(float axL, float axa, float axb, const MeasuringCondition& axCondition)
     : ColorVector(axL, axa, axb, axCondition), amType(LAB_CIE1976) {}
 
-LABVector::LABVector(const ReflectanceSpectrum& axSpectrum) : LABVector(CurrentFilter(), axSpectrum) {}
+LABVector::LABVector(const ReflectanceSpectrum& axSpectrum)
+    : LABVector(CurrentFilter(), axSpectrum) {}
 
 LABVector::LABVector(const ReflectanceSpectrum& axSpectrum, const MeasuringCondition& axCondition)
     : LABVector(FilterFor(axCondition.GetIllum(), axCondition.GetObserver()), axSpectrum) {
@@ -496,7 +508,8 @@ void dLCHVector::Decompose(const float* pA, const float* pB, float pResult[3]) {
     pResult[2] = dH;
 }
 
-dLCHmgVector::dLCHmgVector(float axdL, float axdC, float axdH, const MeasuringCondition& axCondition)
+dLCHmgVector::dLCHmgVector(float axdL, float axdC, float axdH,
+                           const MeasuringCondition& axCondition)
     : ColorVector(axdL, axdC, axdH, axCondition) {}
 
 dLCHmgVector::dLCHmgVector(const LABVector& axA, const LABVector& axB)

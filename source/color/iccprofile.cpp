@@ -154,14 +154,14 @@ void ICCEngine::LoadProfile() {
     }
     if (amTransform == nullptr) {
         amEnabled = false;
-        LogFile::WriteToLog(String("ICC profile not used, colours from the built-in formulas: " +
-                                   amProblem),
-                            String());
+        LogFile::WriteToLog(
+            String("ICC profile not used, colours from the built-in formulas: " + amProblem),
+            String());
     } else {
-        LogFile::WriteToLog(String("ICC profile \"" + std::string(amProfileName.str()) +
-                                   "\" from \"" + amProfilePath + "\", LittleCMS " +
-                                   amVersion.str()),
-                            String("ColorConverter"));
+        LogFile::WriteToLog(
+            String("ICC profile \"" + std::string(amProfileName.str()) + "\" from \"" +
+                   amProfilePath + "\", LittleCMS " + amVersion.str()),
+            String("ColorConverter"));
     }
 }
 

@@ -112,7 +112,8 @@ void MxMT(T* c, const T* a, const T* b, int n, int m, int p) {
     for (int i = 0; i < n; ++i) {
         for (int j = 0; j < p; ++j) {
             T s = 0;
-            for (int k = 0; k < m; ++k) s += a[static_cast<long>(i) * m + k] * b[static_cast<long>(k) * p + j];
+            for (int k = 0; k < m; ++k)
+                s += a[static_cast<long>(i) * m + k] * b[static_cast<long>(k) * p + j];
             c[static_cast<long>(i) * p + j] = s;
         }
     }
@@ -121,7 +122,8 @@ void MxMT(T* c, const T* a, const T* b, int n, int m, int p) {
 template <typename T>
 void TranspMT(T* t, const T* m, int rows, int cols) {
     for (int i = 0; i < rows; ++i) {
-        for (int j = 0; j < cols; ++j) t[static_cast<long>(j) * rows + i] = m[static_cast<long>(i) * cols + j];
+        for (int j = 0; j < cols; ++j)
+            t[static_cast<long>(j) * rows + i] = m[static_cast<long>(i) * cols + j];
     }
 }
 
@@ -212,60 +214,92 @@ void LeastSquareFitT(T* w, T* y, T* a, T* x, int m, int n, T* nm, T* r, int* row
 
 }  // namespace
 
-#define NXBASE_LINALG_BOTH(T)                                                                  \
-    void LinAlg::InitV(T* pV, T axK, int alN) { InitVT(pV, axK, alN); }                        \
-    void LinAlg::CopyVector(T* pDest, const T* pSrc, int alN) { CopyVectorT(pDest, pSrc, alN); } \
-    void LinAlg::CopyMatrix(T* pDest, const T* pSrc, int alRows, int alCols) {                 \
-        CopyVectorT(pDest, pSrc, alRows * alCols);                                             \
-    }                                                                                          \
-    void LinAlg::VAddV(T* pDest, const T* pA, const T* pB, int alN) { VAddVT(pDest, pA, pB, alN); } \
-    void LinAlg::VAddV(T* pDest, const T* pA, int alN) { VAddVT(pDest, pA, alN); }             \
-    void LinAlg::VSubV(T* pDest, const T* pA, const T* pB, int alN) { VSubVT(pDest, pA, pB, alN); } \
-    void LinAlg::VSubV(T* pDest, const T* pA, int alN) { VSubVT(pDest, pA, alN); }             \
-    void LinAlg::VxV(T* pDest, const T* pA, const T* pB, int alN) { VxVT(pDest, pA, pB, alN); } \
-    void LinAlg::VxV(T* pDest, const T* pA, int alN) { VxVT(pDest, pA, alN); }                 \
-    void LinAlg::VdivV(T* pDest, const T* pA, const T* pB, int alN) { VdivVT(pDest, pA, pB, alN); } \
-    void LinAlg::VAddKxV(T* pDest, T axK, const T* pA, int alN) { VAddKxVT(pDest, axK, pA, alN); } \
+#define NXBASE_LINALG_BOTH(T)                                                                 \
+    void LinAlg::InitV(T* pV, T axK, int alN) {                                               \
+        InitVT(pV, axK, alN);                                                                 \
+    }                                                                                         \
+    void LinAlg::CopyVector(T* pDest, const T* pSrc, int alN) {                               \
+        CopyVectorT(pDest, pSrc, alN);                                                        \
+    }                                                                                         \
+    void LinAlg::CopyMatrix(T* pDest, const T* pSrc, int alRows, int alCols) {                \
+        CopyVectorT(pDest, pSrc, alRows* alCols);                                             \
+    }                                                                                         \
+    void LinAlg::VAddV(T* pDest, const T* pA, const T* pB, int alN) {                         \
+        VAddVT(pDest, pA, pB, alN);                                                           \
+    }                                                                                         \
+    void LinAlg::VAddV(T* pDest, const T* pA, int alN) {                                      \
+        VAddVT(pDest, pA, alN);                                                               \
+    }                                                                                         \
+    void LinAlg::VSubV(T* pDest, const T* pA, const T* pB, int alN) {                         \
+        VSubVT(pDest, pA, pB, alN);                                                           \
+    }                                                                                         \
+    void LinAlg::VSubV(T* pDest, const T* pA, int alN) {                                      \
+        VSubVT(pDest, pA, alN);                                                               \
+    }                                                                                         \
+    void LinAlg::VxV(T* pDest, const T* pA, const T* pB, int alN) {                           \
+        VxVT(pDest, pA, pB, alN);                                                             \
+    }                                                                                         \
+    void LinAlg::VxV(T* pDest, const T* pA, int alN) {                                        \
+        VxVT(pDest, pA, alN);                                                                 \
+    }                                                                                         \
+    void LinAlg::VdivV(T* pDest, const T* pA, const T* pB, int alN) {                         \
+        VdivVT(pDest, pA, pB, alN);                                                           \
+    }                                                                                         \
+    void LinAlg::VAddKxV(T* pDest, T axK, const T* pA, int alN) {                             \
+        VAddKxVT(pDest, axK, pA, alN);                                                        \
+    }                                                                                         \
     void LinAlg::KVAddKV(T* pDest, T axK1, const T* pA, T axK2, const T* pB, int alN) {       \
-        KVAddKVT(pDest, axK1, pA, axK2, pB, alN);                                              \
-    }                                                                                          \
-    void LinAlg::KxV(T* pDest, T axK, const T* pA, int alN) { KxVT(pDest, axK, pA, alN); }     \
-    void LinAlg::KxV(T* pDest, T axK, int alN) { KxVT(pDest, axK, alN); }                      \
-    void LinAlg::KxM(T* pDest, T axK, const T* pA, int alRows, int alCols) {                   \
-        KxVT(pDest, axK, pA, alRows * alCols);                                                 \
-    }                                                                                          \
-    void LinAlg::KxM(T* pDest, T axK, int alRows, int alCols) { KxVT(pDest, axK, alRows * alCols); } \
-    T LinAlg::SumV(const T* pV, int alN) { return SumVT(pV, alN); }                            \
-    T LinAlg::DotProd(const T* pA, const T* pB, int alN) { return DotProdT(pA, pB, alN); }     \
-    T LinAlg::BetragV(const T* pV, int alN) { return BetragVT(pV, alN); }                      \
-    void LinAlg::MxV(T* pR, const T* pM, const T* pV, int alRows, int alCols, int alStride) {  \
-        MxVT(pR, pM, pV, alRows, alCols, alStride);                                            \
-    }                                                                                          \
-    void LinAlg::MxV(T* pR, const T* pM, const T* pV, int alRows, int alCols) {                \
-        MxVT(pR, pM, pV, alRows, alCols, alCols);                                              \
-    }                                                                                          \
-    void LinAlg::MtxV(T* pR, const T* pM, const T* pV, int alRows, int alCols) {               \
-        MtxVT(pR, pM, pV, alRows, alCols);                                                     \
-    }                                                                                          \
-    void LinAlg::MxM(T* pC, const T* pA, const T* pB, int alN, int alM, int alP) {             \
-        MxMT(pC, pA, pB, alN, alM, alP);                                                       \
-    }                                                                                          \
-    void LinAlg::TranspM(T* pT, const T* pM, int alRows, int alCols) {                         \
-        TranspMT(pT, pM, alRows, alCols);                                                      \
-    }                                                                                          \
-    void LinAlg::MaTxMa(const T* pA, int alRows, int alCols, T* pN) {                          \
-        MaTxMaT(pA, alRows, alCols, pN);                                                       \
-    }                                                                                          \
-    void LinAlg::GaussEl(T* pB, T* pA, T* pX, int alN, int& axSingular, int* pRowStart,        \
-                         int* pRowIndex) {                                                     \
-        GaussElT(pB, pA, pX, alN, axSingular, pRowStart, pRowIndex);                           \
-    }                                                                                          \
-    void LinAlg::GaussEl(T* pB, T* pA, T* pX, int alN, int& axSingular) {                      \
-        GaussElT(pB, pA, pX, alN, axSingular);                                                 \
-    }                                                                                          \
+        KVAddKVT(pDest, axK1, pA, axK2, pB, alN);                                             \
+    }                                                                                         \
+    void LinAlg::KxV(T* pDest, T axK, const T* pA, int alN) {                                 \
+        KxVT(pDest, axK, pA, alN);                                                            \
+    }                                                                                         \
+    void LinAlg::KxV(T* pDest, T axK, int alN) {                                              \
+        KxVT(pDest, axK, alN);                                                                \
+    }                                                                                         \
+    void LinAlg::KxM(T* pDest, T axK, const T* pA, int alRows, int alCols) {                  \
+        KxVT(pDest, axK, pA, alRows* alCols);                                                 \
+    }                                                                                         \
+    void LinAlg::KxM(T* pDest, T axK, int alRows, int alCols) {                               \
+        KxVT(pDest, axK, alRows* alCols);                                                     \
+    }                                                                                         \
+    T LinAlg::SumV(const T* pV, int alN) {                                                    \
+        return SumVT(pV, alN);                                                                \
+    }                                                                                         \
+    T LinAlg::DotProd(const T* pA, const T* pB, int alN) {                                    \
+        return DotProdT(pA, pB, alN);                                                         \
+    }                                                                                         \
+    T LinAlg::BetragV(const T* pV, int alN) {                                                 \
+        return BetragVT(pV, alN);                                                             \
+    }                                                                                         \
+    void LinAlg::MxV(T* pR, const T* pM, const T* pV, int alRows, int alCols, int alStride) { \
+        MxVT(pR, pM, pV, alRows, alCols, alStride);                                           \
+    }                                                                                         \
+    void LinAlg::MxV(T* pR, const T* pM, const T* pV, int alRows, int alCols) {               \
+        MxVT(pR, pM, pV, alRows, alCols, alCols);                                             \
+    }                                                                                         \
+    void LinAlg::MtxV(T* pR, const T* pM, const T* pV, int alRows, int alCols) {              \
+        MtxVT(pR, pM, pV, alRows, alCols);                                                    \
+    }                                                                                         \
+    void LinAlg::MxM(T* pC, const T* pA, const T* pB, int alN, int alM, int alP) {            \
+        MxMT(pC, pA, pB, alN, alM, alP);                                                      \
+    }                                                                                         \
+    void LinAlg::TranspM(T* pT, const T* pM, int alRows, int alCols) {                        \
+        TranspMT(pT, pM, alRows, alCols);                                                     \
+    }                                                                                         \
+    void LinAlg::MaTxMa(const T* pA, int alRows, int alCols, T* pN) {                         \
+        MaTxMaT(pA, alRows, alCols, pN);                                                      \
+    }                                                                                         \
+    void LinAlg::GaussEl(T* pB, T* pA, T* pX, int alN, int& axSingular, int* pRowStart,       \
+                         int* pRowIndex) {                                                    \
+        GaussElT(pB, pA, pX, alN, axSingular, pRowStart, pRowIndex);                          \
+    }                                                                                         \
+    void LinAlg::GaussEl(T* pB, T* pA, T* pX, int alN, int& axSingular) {                     \
+        GaussElT(pB, pA, pX, alN, axSingular);                                                \
+    }                                                                                         \
     void LinAlg::LeastSquareFit(T* pW, T* pY, T* pA, T* pX, int alM, int alN, T* pN, T* pR,   \
-                                int* pRowStart, int* pRowIndex, int& axOk) {                   \
-        LeastSquareFitT(pW, pY, pA, pX, alM, alN, pN, pR, pRowStart, pRowIndex, axOk);         \
+                                int* pRowStart, int* pRowIndex, int& axOk) {                  \
+        LeastSquareFitT(pW, pY, pA, pX, alM, alN, pN, pR, pRowStart, pRowIndex, axOk);        \
     }
 
 NXBASE_LINALG_BOTH(float)

@@ -30,9 +30,9 @@ inline void LaneSums(const float* const pW[3], const float* pR, float pOut[3]) {
 
 // CIE 15:2004 CIELAB constants in single precision.
 constexpr float kLabExponent = 0.33333334f;
-constexpr float kLabEpsilon = 0.008856f;               // t at or below: linear branch
+constexpr float kLabEpsilon = 0.008856f;  // t at or below: linear branch
 constexpr float kLabKappa = 7.787f;
-constexpr float kLabOffset = 0.13793103448275862f;     // 16/116
+constexpr float kLabOffset = 0.13793103448275862f;  // 16/116
 
 }  // namespace detail
 }  // namespace nxbase

@@ -32,8 +32,8 @@ double ParseDouble(const std::string& text, double fallback) {
 
 std::string FormatFixed2(double value) {
     char buffer[64];
-    auto [end, error] = std::to_chars(buffer, buffer + sizeof buffer, value,
-                                      std::chars_format::fixed, 2);
+    auto [end, error] =
+        std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed, 2);
     if (error != std::errc()) return "0.50";
     return std::string(buffer, end);
 }
@@ -61,9 +61,8 @@ void NxSetting::LoadProperties() {
     UserConfig* user = UserConfig::Instance();
     amIllum1 = IllumClass(user->ReadKey(kGroup, kIllum1, String()).str());
     amIllum2 = IllumClass(user->ReadKey(kGroup, kIllum2, String()).str());
-    amDirectLightPart =
-        ParseDouble(user->ReadKey(kGroup, kDirectLightPart, String("0.5")).str(),
-                    kDefaultDirectLightPart);
+    amDirectLightPart = ParseDouble(user->ReadKey(kGroup, kDirectLightPart, String("0.5")).str(),
+                                    kDefaultDirectLightPart);
     String display = user->ReadKey(kGroup, kDisplay, DisplayText(amDisplay));
     amDisplay = display == "Eye" ? EYE : INSTRUMENT;
 }

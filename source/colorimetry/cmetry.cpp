@@ -54,9 +54,13 @@ void CMetry::GetMeasuringConditions(MeasuringCondition& condition) const {
     condition = GetMeasuringConditions();
 }
 
-IllumClass CMetry::GetIllum() const { return amIllum; }
+IllumClass CMetry::GetIllum() const {
+    return amIllum;
+}
 
-ObserverClass CMetry::GetObserver() const { return amObserver; }
+ObserverClass CMetry::GetObserver() const {
+    return amObserver;
+}
 
 const CMetryFilter& CMetry::GetRGBFilter() {
     static const CMetryFilter filter(Lichtart(IllumClass(ILLUM_D65, 0)),
@@ -77,8 +81,8 @@ boost::shared_ptr<klume::cmetry::IDensityStandard> CMetry::GetDensityStandard() 
     return amDStd.GetDensityStandard();
 }
 
-bool CMetry::GetDensity(const ReflectanceSpectrum& spectrum, unsigned short channel,
-                        float& density, bool relativeToPaper) const {
+bool CMetry::GetDensity(const ReflectanceSpectrum& spectrum, unsigned short channel, float& density,
+                        bool relativeToPaper) const {
     if (!relativeToPaper || !amPaperDefined) {
         return amDichteFilter.GetDensity(spectrum, channel, density);
     }

@@ -20,19 +20,20 @@ struct IllumName {
 };
 
 constexpr IllumName kIllumNames[] = {
-    {ILLUM_A, "A"},       {ILLUM_C, "C"},       {ILLUM_D65, "D65"},   {ILLUM_D50, "D50"},
-    {ILLUM_FL1, "FL1"},   {ILLUM_FL2, "FL2"},   {ILLUM_FL3, "FL3"},   {ILLUM_FL4, "FL4"},
-    {ILLUM_FL5, "FL5"},   {ILLUM_FL6, "FL6"},   {ILLUM_FL7, "FL7"},   {ILLUM_FL8, "FL8"},
-    {ILLUM_FL9, "FL9"},   {ILLUM_FL10, "FL10"}, {ILLUM_FL11, "FL11"}, {ILLUM_FL12, "FL12"},
-    {ILLUM_D55, "D55"},   {ILLUM_D75, "D75"},   {ILLUM_E, "E"},
+    {ILLUM_A, "A"},     {ILLUM_C, "C"},       {ILLUM_D65, "D65"},   {ILLUM_D50, "D50"},
+    {ILLUM_FL1, "FL1"}, {ILLUM_FL2, "FL2"},   {ILLUM_FL3, "FL3"},   {ILLUM_FL4, "FL4"},
+    {ILLUM_FL5, "FL5"}, {ILLUM_FL6, "FL6"},   {ILLUM_FL7, "FL7"},   {ILLUM_FL8, "FL8"},
+    {ILLUM_FL9, "FL9"}, {ILLUM_FL10, "FL10"}, {ILLUM_FL11, "FL11"}, {ILLUM_FL12, "FL12"},
+    {ILLUM_D55, "D55"}, {ILLUM_D75, "D75"},   {ILLUM_E, "E"},
 };
 
 // The data provider's diagnostics go to the process log, always written.
-void LogProviderMessage(const std::string& message) { LogFile::WriteToLog(String(message), String()); }
+void LogProviderMessage(const std::string& message) {
+    LogFile::WriteToLog(String(message), String());
+}
 
 // Installed when the library is loaded, before any colour work.
-const bool kProviderLogInstalled =
-    (klume::cmetry::SetMessageHandler(&LogProviderMessage), true);
+const bool kProviderLogInstalled = (klume::cmetry::SetMessageHandler(&LogProviderMessage), true);
 
 constexpr const char* kObserver2 = "2";
 constexpr const char* kObserver10 = "10";
@@ -63,8 +64,8 @@ IllumClass::IllumClass() : amIlluminant(IlluminantRepository::GetDefault()) {}
 
 IllumClass::IllumClass(IllumType type, short /*variant*/) {
     const std::string name = NameOfType(type);
-    amIlluminant = name.empty() ? IlluminantRepository::GetDefault()
-                                : IlluminantRepository::Get(name);
+    amIlluminant =
+        name.empty() ? IlluminantRepository::GetDefault() : IlluminantRepository::Get(name);
 }
 
 IllumClass::IllumClass(const std::string& name) : amIlluminant(IlluminantRepository::Get(name)) {}
@@ -80,15 +81,19 @@ IllumClass::IllumClass(IIlluminant& illuminant) {
         amIlluminant = known;
         return;
     }
-    amIlluminant = klume::cmetry::MakeIlluminant(illuminant.GetName(), illuminant.GetDescription(),
-                                                 illuminant.GetWavelengths(),
-                                                 illuminant.GetPowers());
+    amIlluminant =
+        klume::cmetry::MakeIlluminant(illuminant.GetName(), illuminant.GetDescription(),
+                                      illuminant.GetWavelengths(), illuminant.GetPowers());
     if (!amIlluminant) amIlluminant = IlluminantRepository::GetDefault();
 }
 
-std::string IllumClass::GetName() const { return amIlluminant->GetName(); }
+std::string IllumClass::GetName() const {
+    return amIlluminant->GetName();
+}
 
-std::string IllumClass::GetDisplayString() const { return amIlluminant->GetName(); }
+std::string IllumClass::GetDisplayString() const {
+    return amIlluminant->GetName();
+}
 
 IllumType IllumClass::GetIllumType() const {
     const std::string& name = amIlluminant->GetName();
@@ -110,17 +115,17 @@ std::string IllumClass::NameOfType(IllumType type) {
 
 ObserverClass::ObserverClass(ObserverType type) {
     switch (type) {
-    case OBSERVER_2DEG:
-        amName = kObserver2;
-        break;
-    case OBSERVER_10DEG:
-        amName = kObserver10;
-        break;
-    default:
-        amType = OBSERVER_UNKNOWN;
-        amName = String::CreateFromInt(static_cast<long>(type));
-        amObserver = ObserverRepository::GetDefault();
-        return;
+        case OBSERVER_2DEG:
+            amName = kObserver2;
+            break;
+        case OBSERVER_10DEG:
+            amName = kObserver10;
+            break;
+        default:
+            amType = OBSERVER_UNKNOWN;
+            amName = String::CreateFromInt(static_cast<long>(type));
+            amObserver = ObserverRepository::GetDefault();
+            return;
     }
     amType = type;
     amObserver = ObserverRepository::Get(amName.str());
@@ -243,10 +248,10 @@ void CMetryFilter::Build(boost::shared_ptr<IIlluminant> illuminant,
     if (!illuminant) illuminant = IlluminantRepository::GetDefault();
     amFilter = klume::cmetry::CMetryFilter::Find(illuminant, observer);
     if (!amFilter) {
-        LogFile::WriteToLog(String("Illuminant \"" + illuminant->GetName() +
-                                   "\" has no weights; using \"" +
-                                   IlluminantRepository::GetDefault()->GetName() + "\""),
-                            String());
+        LogFile::WriteToLog(
+            String("Illuminant \"" + illuminant->GetName() + "\" has no weights; using \"" +
+                   IlluminantRepository::GetDefault()->GetName() + "\""),
+            String());
         amFilter = klume::cmetry::CMetryFilter::Find(IlluminantRepository::GetDefault(), observer);
     }
     for (unsigned short c = 0; c < 3; ++c) {
@@ -271,6 +276,10 @@ void CMetryFilter::Tristimulus(const float* values, float sums[3]) const {
     sums[2] = z;
 }
 
-ObserverClass CMetryFilter::GetObserver() const { return ObserverClass(amFilter->GetObserver()); }
+ObserverClass CMetryFilter::GetObserver() const {
+    return ObserverClass(amFilter->GetObserver());
+}
 
-IllumClass CMetryFilter::GetIllum() const { return IllumClass(amFilter->GetIlluminant()); }
+IllumClass CMetryFilter::GetIllum() const {
+    return IllumClass(amFilter->GetIlluminant());
+}

@@ -73,7 +73,8 @@ class Cleansed {
 };
 
 [[noreturn]] void NotAuthentic() {
-    throw std::runtime_error("EncryptedSpectralData: not authentic (wrong key, or altered or foreign data)");
+    throw std::runtime_error(
+        "EncryptedSpectralData: not authentic (wrong key, or altered or foreign data)");
 }
 
 }  // namespace
@@ -81,15 +82,19 @@ class Cleansed {
 EncryptedSpectralData::EncryptedSpectralData(std::vector<unsigned char> axEncrypted)
     : amEncrypted(std::move(axEncrypted)) {}
 
-EncryptedSpectralData EncryptedSpectralData::Encrypt(const std::vector<double>& axSpectrum, const Key& axKey) {
+EncryptedSpectralData EncryptedSpectralData::Encrypt(const std::vector<double>& axSpectrum,
+                                                     const Key& axKey) {
     if (axSpectrum.size() > kMaxValues) {
-        throw std::invalid_argument("EncryptedSpectralData: more than " + std::to_string(kMaxValues) + " values");
+        throw std::invalid_argument("EncryptedSpectralData: more than " +
+                                    std::to_string(kMaxValues) + " values");
     }
     std::vector<unsigned char> plain(kCountSize + 8 * axSpectrum.size());
     const Cleansed<std::vector<unsigned char>> plainGoes(plain);
     const auto count = static_cast<std::uint32_t>(axSpectrum.size());
-    for (std::size_t i = 0; i < kCountSize; ++i) plain[i] = static_cast<unsigned char>(count >> (8 * i));
-    for (std::size_t i = 0; i < axSpectrum.size(); ++i) PutDouble(axSpectrum[i], &plain[kCountSize + 8 * i]);
+    for (std::size_t i = 0; i < kCountSize; ++i)
+        plain[i] = static_cast<unsigned char>(count >> (8 * i));
+    for (std::size_t i = 0; i < axSpectrum.size(); ++i)
+        PutDouble(axSpectrum[i], &plain[kCountSize + 8 * i]);
 
     std::vector<unsigned char> out(kHeaderSize + kNonceSize + plain.size() + kTagSize);
     std::memcpy(out.data(), kMagic, sizeof kMagic);
@@ -103,10 +108,13 @@ EncryptedSpectralData EncryptedSpectralData::Encrypt(const std::vector<double>& 
     unsigned char* cipher = nonce + kNonceSize;
     const bool ok =
         EVP_EncryptInit_ex(context.get(), EVP_aes_256_gcm(), nullptr, nullptr, nullptr) == 1 &&
-        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_IVLEN, static_cast<int>(kNonceSize), nullptr) == 1 &&
+        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_IVLEN, static_cast<int>(kNonceSize),
+                            nullptr) == 1 &&
         EVP_EncryptInit_ex(context.get(), nullptr, nullptr, axKey.data(), nonce) == 1 &&
-        EVP_EncryptUpdate(context.get(), nullptr, &length, out.data(), static_cast<int>(kHeaderSize)) == 1 &&
-        EVP_EncryptUpdate(context.get(), cipher, &length, plain.data(), static_cast<int>(plain.size())) == 1 &&
+        EVP_EncryptUpdate(context.get(), nullptr, &length, out.data(),
+                          static_cast<int>(kHeaderSize)) == 1 &&
+        EVP_EncryptUpdate(context.get(), cipher, &length, plain.data(),
+                          static_cast<int>(plain.size())) == 1 &&
         EVP_EncryptFinal_ex(context.get(), cipher + length, &length) == 1 &&
         EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_GET_TAG, static_cast<int>(kTagSize),
                             cipher + plain.size()) == 1;
@@ -131,17 +139,23 @@ std::vector<double> EncryptedSpectralData::GetDecryptedSpectrum(const Key& axKey
     int length = 0;
     const bool ok =
         EVP_DecryptInit_ex(context.get(), EVP_aes_256_gcm(), nullptr, nullptr, nullptr) == 1 &&
-        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_IVLEN, static_cast<int>(kNonceSize), nullptr) == 1 &&
+        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_IVLEN, static_cast<int>(kNonceSize),
+                            nullptr) == 1 &&
         EVP_DecryptInit_ex(context.get(), nullptr, nullptr, axKey.data(), nonce) == 1 &&
-        EVP_DecryptUpdate(context.get(), nullptr, &length, in.data(), static_cast<int>(kHeaderSize)) == 1 &&
-        EVP_DecryptUpdate(context.get(), plain.data(), &length, cipher, static_cast<int>(cipherSize)) == 1 &&
-        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_TAG, static_cast<int>(kTagSize), tag.data()) == 1 &&
+        EVP_DecryptUpdate(context.get(), nullptr, &length, in.data(),
+                          static_cast<int>(kHeaderSize)) == 1 &&
+        EVP_DecryptUpdate(context.get(), plain.data(), &length, cipher,
+                          static_cast<int>(cipherSize)) == 1 &&
+        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_TAG, static_cast<int>(kTagSize),
+                            tag.data()) == 1 &&
         EVP_DecryptFinal_ex(context.get(), plain.data() + length, &length) == 1;
     if (!ok) NotAuthentic();
     std::uint32_t count = 0;
-    for (std::size_t i = 0; i < kCountSize; ++i) count |= static_cast<std::uint32_t>(plain[i]) << (8 * i);
+    for (std::size_t i = 0; i < kCountSize; ++i)
+        count |= static_cast<std::uint32_t>(plain[i]) << (8 * i);
     // Authentic bytes that do not hold what the writer writes: not ours.
-    if (count > kMaxValues || kCountSize + 8 * static_cast<std::size_t>(count) != plain.size()) NotAuthentic();
+    if (count > kMaxValues || kCountSize + 8 * static_cast<std::size_t>(count) != plain.size())
+        NotAuthentic();
     std::vector<double> spectrum(count);
     for (std::size_t i = 0; i < count; ++i) spectrum[i] = GetDouble(&plain[kCountSize + 8 * i]);
     return spectrum;

@@ -41,14 +41,16 @@ double LabFInverse(double f) {
 
 }  // namespace
 
-std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ, const std::array<double, 3>& axWhite) {
+std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
+                               const std::array<double, 3>& axWhite) {
     const double fx = LabF(axXYZ[0] / axWhite[0]);
     const double fy = LabF(axXYZ[1] / axWhite[1]);
     const double fz = LabF(axXYZ[2] / axWhite[2]);
     return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
 }
 
-std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab, const std::array<double, 3>& axWhite) {
+std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
+                                  const std::array<double, 3>& axWhite) {
     const double fy = (axLab[0] + 16.0) / 116.0;
     return {LabFInverse(axLab[1] / 500.0 + fy) * axWhite[0], LabFInverse(fy) * axWhite[1],
             LabFInverse(fy - axLab[2] / 200.0) * axWhite[2]};
@@ -60,14 +62,16 @@ bool FineGridTristimulus::Applies(const std::vector<double>& wavelengths) {
     const double step = (wavelengths.back() - wavelengths.front()) / static_cast<double>(n - 1);
     if (!(step > 0.0) || step >= kCoarsestStep - kStepTolerance) return false;
     for (std::size_t k = 0; k < n; ++k) {
-        if (std::fabs(wavelengths[k] - (wavelengths.front() + step * static_cast<double>(k))) > kStepTolerance) {
+        if (std::fabs(wavelengths[k] - (wavelengths.front() + step * static_cast<double>(k))) >
+            kStepTolerance) {
             return false;
         }
     }
     return true;
 }
 
-FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition, std::vector<double> wavelengths)
+FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
+                                         std::vector<double> wavelengths)
     : amWavelengths(std::move(wavelengths)) {
     if (!Applies(amWavelengths)) {
         throw std::invalid_argument("FineGridTristimulus: not a regular grid finer than 10 nm");
@@ -85,7 +89,8 @@ FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition, 
     double ySum = 0.0;
     for (long j = from; j <= to; ++j) {
         const double nm = first + step * static_cast<double>(j);
-        const std::size_t k = static_cast<std::size_t>(std::clamp<long>(j, 0, static_cast<long>(n) - 1));
+        const std::size_t k =
+            static_cast<std::size_t>(std::clamp<long>(j, 0, static_cast<long>(n) - 1));
         const double power = illuminant->GetPower(nm);
         for (int c = 0; c < 3; ++c) amWeights[c][k] += power * CmfAt(*observer, c, nm);
         ySum += power * CmfAt(*observer, 1, nm);

@@ -18,10 +18,10 @@ struct FilterName {
 
 // Accepted names; the first of a type is the one written.
 constexpr FilterName kFilterNames[] = {
-    {FILTER_NO, "No"},         {FILTER_POL, "Pol"},       {FILTER_D65, "D65"},
-    {FILTER_UV, "UV"},         {FILTER_UVCUT, "UVCut"},   {FILTER_CUSTOM, "Custom"},
-    {FILTER_CUSTOM, "Cust"},   {FILTER_REPRO, "Repro"},   {FILTER_D8T, "D8t"},
-    {FILTER_D8E, "D8e"},       {FILTER_D8I, "D8i"},       {FILTER_DEFAULT, "Default"},
+    {FILTER_NO, "No"},       {FILTER_POL, "Pol"},     {FILTER_D65, "D65"},
+    {FILTER_UV, "UV"},       {FILTER_UVCUT, "UVCut"}, {FILTER_CUSTOM, "Custom"},
+    {FILTER_CUSTOM, "Cust"}, {FILTER_REPRO, "Repro"}, {FILTER_D8T, "D8t"},
+    {FILTER_D8E, "D8e"},     {FILTER_D8I, "D8i"},     {FILTER_DEFAULT, "Default"},
 };
 
 struct DisplayNames {
@@ -75,26 +75,28 @@ ActualFilterClass::ActualFilterClass(const String& name) {
     amType = FILTER_DEFAULT;
 }
 
-ActualFilterClass::operator String() const { return FilterTypeName(amType); }
+ActualFilterClass::operator String() const {
+    return FilterTypeName(amType);
+}
 
 ActualFilterClass::Geometry ActualFilterClass::GetGeometry() const {
     switch (amType) {
-    case FILTER_NO:
-    case FILTER_POL:
-    case FILTER_D65:
-    case FILTER_UV:
-    case FILTER_UVCUT:
-    case FILTER_CUSTOM:
-    case FILTER_REPRO:
-        return GEOMETRY_45_0;
-    case FILTER_D8T:
-        return GEOMETRY_D8T;
-    case FILTER_D8E:
-        return GEOMETRY_D8E;
-    case FILTER_D8I:
-        return GEOMETRY_D8I;
-    default:
-        return GEOMETRY_UNDEFINED;
+        case FILTER_NO:
+        case FILTER_POL:
+        case FILTER_D65:
+        case FILTER_UV:
+        case FILTER_UVCUT:
+        case FILTER_CUSTOM:
+        case FILTER_REPRO:
+            return GEOMETRY_45_0;
+        case FILTER_D8T:
+            return GEOMETRY_D8T;
+        case FILTER_D8E:
+            return GEOMETRY_D8E;
+        case FILTER_D8I:
+            return GEOMETRY_D8I;
+        default:
+            return GEOMETRY_UNDEFINED;
     }
 }
 
@@ -146,15 +148,18 @@ DStdClass::DStdClass(DStdType type) {
                               : DensityStandardRepository::Get(name);
 }
 
-DStdClass::DStdClass(const std::string& name)
-    : amStandard(DensityStandardRepository::Get(name)) {}
+DStdClass::DStdClass(const std::string& name) : amStandard(DensityStandardRepository::Get(name)) {}
 
 DStdClass::DStdClass(boost::shared_ptr<IDensityStandard> standard)
     : amStandard(standard ? std::move(standard) : DensityStandardRepository::GetDefault()) {}
 
-std::string DStdClass::GetName() const { return amStandard->GetName(); }
+std::string DStdClass::GetName() const {
+    return amStandard->GetName();
+}
 
-std::string DStdClass::GetDisplayString() const { return amStandard->GetName(); }
+std::string DStdClass::GetDisplayString() const {
+    return amStandard->GetName();
+}
 
 DStdType DStdClass::GetDStdType() const {
     const std::string& name = amStandard->GetName();
@@ -174,8 +179,7 @@ std::string DStdClass::NameOfType(DStdType type) {
 // ---------------------------------------------------------------------------
 // MeasuringCondition
 
-MeasuringCondition::MeasuringCondition(const IllumClass& illuminant,
-                                       const ObserverClass& observer,
+MeasuringCondition::MeasuringCondition(const IllumClass& illuminant, const ObserverClass& observer,
                                        const PhysicalConditions& physical)
     : amIllum(illuminant), amObserver(observer), amPhysical(physical) {}
 
@@ -183,14 +187,14 @@ MeasuringCondition::MeasuringCondition(const DStdClass& standard,
                                        const PhysicalConditions& physical)
     : amDStd(standard), amPhysical(physical) {}
 
-MeasuringCondition::MeasuringCondition(const IllumClass& illuminant,
-                                       const ObserverClass& observer, const DStdClass& standard,
+MeasuringCondition::MeasuringCondition(const IllumClass& illuminant, const ObserverClass& observer,
+                                       const DStdClass& standard,
                                        const PhysicalConditions& physical)
     : amIllum(illuminant), amObserver(observer), amDStd(standard), amPhysical(physical) {}
 
 std::string MeasuringCondition::GetMeasuringConditionString() const {
-    std::string text = amIllum.GetIllumType() == ILLUM_UNKNOWN ? std::string("?")
-                                                               : amIllum.GetDisplayString();
+    std::string text =
+        amIllum.GetIllumType() == ILLUM_UNKNOWN ? std::string("?") : amIllum.GetDisplayString();
     text += ",";
     text += amObserver.GetObserverType() == OBSERVER_UNKNOWN
                 ? std::string("?")
@@ -208,8 +212,8 @@ MeasuringCondition::operator String() const {
 }
 
 bool MeasuringCondition::operator==(const MeasuringCondition& other) const {
-    return amIllum == other.amIllum && amObserver == other.amObserver &&
-           amDStd == other.amDStd && amPhysical == other.amPhysical;
+    return amIllum == other.amIllum && amObserver == other.amObserver && amDStd == other.amDStd &&
+           amPhysical == other.amPhysical;
 }
 
 // ---------------------------------------------------------------------------

@@ -13,8 +13,8 @@ namespace {
 // Sprague's polynomial on [P0, P1]: P(x) = sum of a_k x^k with
 // a_k = sum of kSprague[k][j] P_(j-2) / 24, j = 0..5 for P-2..P3.
 constexpr double kSprague[6][6] = {
-    {0, 0, 24, 0, 0, 0},           {2, -16, 0, 16, -2, 0},        {-1, 16, -30, 16, -1, 0},
-    {-9, 39, -70, 66, -33, 7},     {13, -64, 126, -124, 61, -12}, {-5, 25, -50, 50, -25, 5},
+    {0, 0, 24, 0, 0, 0},       {2, -16, 0, 16, -2, 0},        {-1, 16, -30, 16, -1, 0},
+    {-9, 39, -70, 66, -33, 7}, {13, -64, 126, -124, 61, -12}, {-5, 25, -50, 50, -25, 5},
 };
 // The two points before the data (P-2, P-1) from its first six; mirrored for
 // the two after the data. Each row sums to 209.
@@ -45,7 +45,8 @@ std::vector<double> StandardWavelengths() {
 
 SpectralResampler::SpectralResampler(std::vector<double> source, std::vector<double> target)
     : amSource(std::move(source)) {
-    if (amSource.size() < 2) throw std::invalid_argument("resampling needs at least two source wavelengths");
+    if (amSource.size() < 2)
+        throw std::invalid_argument("resampling needs at least two source wavelengths");
     if (target.empty()) throw std::invalid_argument("resampling needs a target wavelength");
     for (std::size_t i = 0; i < amSource.size(); ++i) {
         if (!std::isfinite(amSource[i]) || (i > 0 && amSource[i] <= amSource[i - 1])) {
@@ -64,7 +65,8 @@ SpectralResampler::SpectralResampler(std::vector<double> source, std::vector<dou
         } else {
             // The interval [i, i+1] holding nm.
             const std::size_t i =
-                static_cast<std::size_t>(std::upper_bound(amSource.begin(), amSource.end(), nm) - amSource.begin()) -
+                static_cast<std::size_t>(std::upper_bound(amSource.begin(), amSource.end(), nm) -
+                                         amSource.begin()) -
                 1;
             const double fraction = (nm - amSource[i]) / (amSource[i + 1] - amSource[i]);
             if (std::fabs(nm - amSource[i]) <= kSameWavelength) {
@@ -84,7 +86,8 @@ SpectralResampler::SpectralResampler(std::vector<double> source, std::vector<dou
     }
 }
 
-SpectralResampler::Taps SpectralResampler::LinearTaps(std::size_t axInterval, double axFraction) const {
+SpectralResampler::Taps SpectralResampler::LinearTaps(std::size_t axInterval,
+                                                      double axFraction) const {
     Taps taps;
     taps.first = static_cast<int>(axInterval);
     taps.count = 2;
@@ -93,7 +96,8 @@ SpectralResampler::Taps SpectralResampler::LinearTaps(std::size_t axInterval, do
     return taps;
 }
 
-SpectralResampler::Taps SpectralResampler::SpragueTaps(std::size_t axInterval, double axFraction) const {
+SpectralResampler::Taps SpectralResampler::SpragueTaps(std::size_t axInterval,
+                                                       double axFraction) const {
     const int n = static_cast<int>(amSource.size());
     const int i = static_cast<int>(axInterval);
     Taps taps;
@@ -118,7 +122,8 @@ SpectralResampler::Taps SpectralResampler::SpragueTaps(std::size_t axInterval, d
         } else {
             // P(n) or P(n+1), made from the last six: the rows mirrored.
             const double* row = kBeforeStart[n + 1 - point];
-            for (int m = 0; m < 6; ++m) taps.weights[n - 1 - m - taps.first] += weight * row[m] / 209.0;
+            for (int m = 0; m < 6; ++m)
+                taps.weights[n - 1 - m - taps.first] += weight * row[m] / 209.0;
         }
     }
     return taps;
@@ -126,9 +131,12 @@ SpectralResampler::Taps SpectralResampler::SpragueTaps(std::size_t axInterval, d
 
 const char* SpectralResampler::MethodName() const {
     switch (amMethod) {
-        case Method::kSelection: return "as read";
-        case Method::kSprague: return "Sprague";
-        case Method::kLinear: return "linear";
+        case Method::kSelection:
+            return "as read";
+        case Method::kSprague:
+            return "Sprague";
+        case Method::kLinear:
+            return "linear";
     }
     return "?";
 }
@@ -173,7 +181,8 @@ void SpectralResampler::ResampleMany(const float* pIn, std::size_t alCount, floa
     for (std::size_t s = 0; s < alCount; ++s) Resample(pIn + s * in, pOut + s * out);
 }
 
-std::vector<float> ResampleToStandard(const std::vector<double>& wavelengths, const std::vector<float>& values) {
+std::vector<float> ResampleToStandard(const std::vector<double>& wavelengths,
+                                      const std::vector<float>& values) {
     if (values.size() != wavelengths.size()) {
         throw std::invalid_argument("resampling needs one value per wavelength");
     }

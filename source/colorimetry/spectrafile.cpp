@@ -1,7 +1,6 @@
 // Spectral input common to CSV and CGATS: the scale, plausibility, bounded
 // reading of streams and files, and the 36-point grid.
 #include "nxbase/spectrafile.h"
-#include "spectrafile_parse.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -16,6 +15,7 @@
 
 #include "nxbase/finegrid.h"
 #include "nxbase/resample.h"
+#include "spectrafile_parse.h"
 
 namespace nxbase {
 namespace {
@@ -39,7 +39,8 @@ std::string Implausible(const SpectralSample& sample) {
     bool allZero = true;
     for (const float v : sample.values) {
         if (std::fabs(v) > kMaxPlausibleReflectance) {
-            return "value " + std::to_string(v) + " is not a reflectance factor (scale wrong? see --percent)";
+            return "value " + std::to_string(v) +
+                   " is not a reflectance factor (scale wrong? see --percent)";
         }
         allZero = allZero && v == 0.0f;
     }
@@ -97,14 +98,16 @@ void GuessScale(SpectralSet* pSet, const std::string& source) {
             ++fitFraction;
         }
     }
-    const std::string counts = std::to_string(needPercent) + " of " + std::to_string(needPercent + fitFraction);
+    const std::string counts =
+        std::to_string(needPercent) + " of " + std::to_string(needPercent + fitFraction);
     std::vector<SpectralSample> kept;
     kept.reserve(pSet->samples.size());
     if (needPercent > fitFraction) {
         pSet->percent = true;
         for (SpectralSample& sample : pSet->samples) DivideBy100(sample);
-        pSet->scaleNote = source + ": read as percentages: " + counts + " spectra have values above 1.5 (up to " +
-                          Number(largest, 2) + "); --fraction reads them as they stand";
+        pSet->scaleNote = source + ": read as percentages: " + counts +
+                          " spectra have values above 1.5 (up to " + Number(largest, 2) +
+                          "); --fraction reads them as they stand";
         return;
     }
     pSet->scaleNote = source + ": read as reflectance factors (white = 1): " +
@@ -117,13 +120,18 @@ void GuessScale(SpectralSet* pSet, const std::string& source) {
         const float m = Largest(sample);
         const double y = YProxy(sample, pSet->wavelengths);
         if (m > kPercentThreshold && m <= 100.0 * kMaxPlausibleReflectance) {
-            detail::AddError(pSet, Where(source, sample.line) + ": a value of " + Number(m, 2) +
-                               " fits only percentages, while the other spectra read as reflectance factors; "
-                               "--percent or --fraction says which the file holds");
+            detail::AddError(
+                pSet,
+                Where(source, sample.line) + ": a value of " + Number(m, 2) +
+                    " fits only percentages, while the other spectra read as reflectance factors; "
+                    "--percent or --fraction says which the file holds");
         } else if (y > kBrightestReflectance) {
-            detail::AddError(pSet, Where(source, sample.line) + ": as reflectance factors this is brighter than any "
-                               "reflectance (Y about " + Number(100.0 * y, 0) +
-                               " % of the white); if the file holds percentages, --percent reads it");
+            detail::AddError(
+                pSet, Where(source, sample.line) +
+                          ": as reflectance factors this is brighter than any "
+                          "reflectance (Y about " +
+                          Number(100.0 * y, 0) +
+                          " % of the white); if the file holds percentages, --percent reads it");
         } else {
             kept.push_back(std::move(sample));
         }
@@ -170,12 +178,13 @@ bool LooksLikeCgats(std::string_view text) {
     return text.find("BEGIN_DATA_FORMAT") != std::string_view::npos;
 }
 
-SpectralSet ReadSpectralText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectralSet ReadSpectralText(std::string_view text, const std::string& source,
+                             const SpectralReadOptions& axOptions) {
     const std::size_t nul = text.find('\0');
     if (nul != std::string_view::npos) {
         SpectralSet set;
-        detail::AddError(&set, source + ": binary data (a NUL byte at offset " + std::to_string(nul) +
-                                   "), not a text file");
+        detail::AddError(&set, source + ": binary data (a NUL byte at offset " +
+                                   std::to_string(nul) + "), not a text file");
         set.unusable = true;
         return set;
     }
@@ -219,7 +228,8 @@ SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& sou
             text.erase(0, start);
             start = 0;
             if (text.find('\0') != std::string::npos) {
-                return Unusable(source + ":" + std::to_string(number + 1) + ": binary data (a NUL byte), not a text file");
+                return Unusable(source + ":" + std::to_string(number + 1) +
+                                ": binary data (a NUL byte), not a text file");
             }
             if (!more || text.size() > kMaxLineLength) {
                 if (!text.empty()) parser.Line(text, ++number);
@@ -227,7 +237,8 @@ SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& sou
             }
             const std::size_t before = text.size();
             if (!ReadMore(in, &text, kReadChunk)) {
-                detail::AddError(&set, source + ": read error after line " + std::to_string(number));
+                detail::AddError(&set,
+                                 source + ": read error after line " + std::to_string(number));
                 break;
             }
             more = text.size() > before;
@@ -235,7 +246,8 @@ SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& sou
         }
         const std::string_view line(text.data() + start, end - start);
         if (line.find('\0') != std::string_view::npos) {
-            return Unusable(source + ":" + std::to_string(number + 1) + ": binary data (a NUL byte), not a text file");
+            return Unusable(source + ":" + std::to_string(number + 1) +
+                            ": binary data (a NUL byte), not a text file");
         }
         if (!parser.Line(line, ++number)) break;
         start = end + 1;
@@ -247,14 +259,17 @@ SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& sou
 
 }  // namespace
 
-SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source,
+                               const SpectralReadOptions& axOptions) {
     try {
         std::string head;
         if (!ReadMore(axInput, &head, kSniffBytes)) return Unusable(source + ": read error");
         if (!LooksLikeCgats(head)) return StreamCsv(axInput, std::move(head), source, axOptions);
-        if (!ReadMore(axInput, &head, kMaxCgatsBytes - head.size())) return Unusable(source + ": read error");
+        if (!ReadMore(axInput, &head, kMaxCgatsBytes - head.size()))
+            return Unusable(source + ": read error");
         if (head.size() >= kMaxCgatsBytes && axInput.peek() != std::char_traits<char>::eof()) {
-            return Unusable(source + ": CGATS text larger than " + std::to_string(kMaxCgatsBytes >> 20) + " MiB");
+            return Unusable(source + ": CGATS text larger than " +
+                            std::to_string(kMaxCgatsBytes >> 20) + " MiB");
         }
         return ReadSpectralText(head, source, axOptions);
     } catch (const std::bad_alloc&) {
@@ -262,8 +277,8 @@ SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source,
     }
 }
 
-bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions, SpectralSet* pSet,
-                      std::string* pError) {
+bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
+                      SpectralSet* pSet, std::string* pError) {
     if (path == "-") {
         *pSet = ReadSpectralStream(std::cin, "<stdin>", axOptions);
         return true;
@@ -305,8 +320,9 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
         SpectrumRow row;
         row.sampleId = sample.id;
         row.sampleName = sample.name;
-        row.id = sample.id.empty() ? sample.name
-                                   : (sample.name.empty() ? sample.id : sample.id + " " + sample.name);
+        row.id = sample.id.empty()
+                     ? sample.name
+                     : (sample.name.empty() ? sample.id : sample.id + " " + sample.name);
         row.line = sample.line;
         resampler.Resample(sample.values.data(), row.values.data());
         if (table.fineGrid) row.native = sample.values;
@@ -315,11 +331,13 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
     return table;
 }
 
-SpectraTable ParseSpectra(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectraTable ParseSpectra(std::string_view text, const std::string& source,
+                          const SpectralReadOptions& axOptions) {
     return ToStandardGrid(ReadSpectralText(text, source, axOptions));
 }
 
-SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectraTable ParseSpectraCsv(std::string_view text, const std::string& source,
+                             const SpectralReadOptions& axOptions) {
     return ToStandardGrid(detail::ReadCsvText(text, source, axOptions));
 }
 
@@ -328,8 +346,8 @@ SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
     return ToStandardGrid(detail::ReadCgatsText(text, source, axOptions));
 }
 
-bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions, SpectraTable* pTable,
-                     std::string* pError) {
+bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
+                     SpectraTable* pTable, std::string* pError) {
     SpectralSet set;
     if (!ReadSpectralFile(path, axOptions, &set, pError)) return false;
     *pTable = ToStandardGrid(set);

@@ -1,4 +1,6 @@
 // CGATS spectra through LittleCMS's CGATS/IT8 parser.
+#include <lcms2.h>
+
 #include <algorithm>
 #include <cmath>
 #include <filesystem>
@@ -11,8 +13,6 @@
 
 #include "nxbase/spectrafile.h"
 #include "spectrafile_parse.h"
-
-#include <lcms2.h>
 
 namespace nxbase {
 namespace {
@@ -39,7 +39,9 @@ std::size_t CountTokens(std::string_view line) {
             at = close + 1;
         } else {
             ++count;
-            while (at < line.size() && line[at] != ' ' && line[at] != '\t' && line[at] != '\r' && line[at] != '"') ++at;
+            while (at < line.size() && line[at] != ' ' && line[at] != '\t' && line[at] != '\r' &&
+                   line[at] != '"')
+                ++at;
         }
     }
     return count;
@@ -47,19 +49,22 @@ std::size_t CountTokens(std::string_view line) {
 
 std::string_view TrimLine(std::string_view line) {
     while (!line.empty() && (line.front() == ' ' || line.front() == '\t')) line.remove_prefix(1);
-    while (!line.empty() && (line.back() == '\r' || line.back() == ' ' || line.back() == '\t')) line.remove_suffix(1);
+    while (!line.empty() && (line.back() == '\r' || line.back() == ' ' || line.back() == '\t'))
+        line.remove_suffix(1);
     return line;
 }
 
 // The value after a keyword ("NUMBER_OF_SETS 24" or "NUMBER_OF_SETS \"24\"").
 std::string KeywordValue(std::string_view line, std::string_view keyword) {
     std::string_view rest = TrimLine(line.substr(keyword.size()));
-    if (rest.size() >= 2 && rest.front() == '"' && rest.back() == '"') rest = rest.substr(1, rest.size() - 2);
+    if (rest.size() >= 2 && rest.front() == '"' && rest.back() == '"')
+        rest = rest.substr(1, rest.size() - 2);
     return std::string(rest);
 }
 
 bool IsCount(const std::string& text, double* value) {
-    return detail::ParseNumber(text, value) && *value >= 0 && *value == std::floor(*value) && *value < 1e9;
+    return detail::ParseNumber(text, value) && *value >= 0 && *value == std::floor(*value) &&
+           *value < 1e9;
 }
 
 // What one pass over the text finds: the line of each data set (one set
@@ -73,8 +78,9 @@ struct Layout {
 // The problem: NUMBER_OF_FIELDS and NUMBER_OF_SETS against the data format
 // and the data, and, where the data holds one set per line, the first line
 // whose count of values differs, each with the line a user must look at.
-std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText, int setsLine,
-                          const std::string& setsText, int formatLine, std::size_t formatFields,
+std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText,
+                          int setsLine, const std::string& setsText, int formatLine,
+                          std::size_t formatFields,
                           const std::vector<std::pair<int, std::size_t>>& dataLines);
 
 Layout ScanLayout(std::string_view text, const std::string& source) {
@@ -116,44 +122,53 @@ Layout ScanLayout(std::string_view text, const std::string& source) {
     }
     Layout layout;
     for (const auto& line : dataLines) layout.dataLines.push_back(line.first);
-    layout.problem =
-        LayoutProblem(source, fieldsLine, fieldsText, setsLine, setsText, formatLine, formatFields, dataLines);
+    layout.problem = LayoutProblem(source, fieldsLine, fieldsText, setsLine, setsText, formatLine,
+                                   formatFields, dataLines);
     return layout;
 }
 
-std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText, int setsLine,
-                          const std::string& setsText, int formatLine, std::size_t formatFields,
+std::string LayoutProblem(const std::string& source, int fieldsLine, const std::string& fieldsText,
+                          int setsLine, const std::string& setsText, int formatLine,
+                          std::size_t formatFields,
                           const std::vector<std::pair<int, std::size_t>>& dataLines) {
     const auto at = [&](int line) { return source + ":" + std::to_string(line) + ": "; };
     double fields = 0.0, sets = 0.0;
     if (formatLine > 0 && fieldsLine == 0) {
-        return at(formatLine) + "NUMBER_OF_FIELDS is missing: it must stand before BEGIN_DATA_FORMAT and give the "
-               "number of fields (" + std::to_string(formatFields) + " here)";
+        return at(formatLine) +
+               "NUMBER_OF_FIELDS is missing: it must stand before BEGIN_DATA_FORMAT and give the "
+               "number of fields (" +
+               std::to_string(formatFields) + " here)";
     }
     if (fieldsLine > 0 && !IsCount(fieldsText, &fields)) {
-        return at(fieldsLine) + "NUMBER_OF_FIELDS \"" + detail::Shown(fieldsText) + "\" is not a number of fields";
+        return at(fieldsLine) + "NUMBER_OF_FIELDS \"" + detail::Shown(fieldsText) +
+               "\" is not a number of fields";
     }
     if (formatLine > 0 && static_cast<std::size_t>(fields) != formatFields) {
         return at(formatLine) + "the data format names " + std::to_string(formatFields) +
-               " fields, NUMBER_OF_FIELDS on line " + std::to_string(fieldsLine) + " says " + fieldsText;
+               " fields, NUMBER_OF_FIELDS on line " + std::to_string(fieldsLine) + " says " +
+               fieldsText;
     }
     if (setsLine > 0 && !IsCount(setsText, &sets)) {
-        return at(setsLine) + "NUMBER_OF_SETS \"" + detail::Shown(setsText) + "\" is not a number of sets";
+        return at(setsLine) + "NUMBER_OF_SETS \"" + detail::Shown(setsText) +
+               "\" is not a number of sets";
     }
     if (sets > kMostCgatsSets || fields > kMostCgatsSets) {
-        return at(sets > kMostCgatsSets ? setsLine : fieldsLine) + "more than " + std::to_string(kMostCgatsSets) +
-               (sets > kMostCgatsSets ? " sets" : " fields") +
-               ", which the CGATS parser (LittleCMS) does not take; split the file, or write it as CSV";
+        return at(sets > kMostCgatsSets ? setsLine : fieldsLine) + "more than " +
+               std::to_string(kMostCgatsSets) + (sets > kMostCgatsSets ? " sets" : " fields") +
+               ", which the CGATS parser (LittleCMS) does not take; split the file, or write it as "
+               "CSV";
     }
     if (fields == 0.0 || dataLines.empty()) return "";
     std::size_t oneSetLines = 0;
-    for (const auto& line : dataLines) oneSetLines += line.second == static_cast<std::size_t>(fields);
+    for (const auto& line : dataLines)
+        oneSetLines += line.second == static_cast<std::size_t>(fields);
     if (2 * oneSetLines < dataLines.size()) return "";  // sets laid out over several lines
     for (const auto& line : dataLines) {
         if (line.second != static_cast<std::size_t>(fields)) {
-            return at(line.first) + std::to_string(line.second) + (line.second == 1 ? " value" : " values") +
-                   " where the data format has " +
-                   fieldsText + " fields (a value missing or extra, a name with blanks outside quotes, or an "
+            return at(line.first) + std::to_string(line.second) +
+                   (line.second == 1 ? " value" : " values") + " where the data format has " +
+                   fieldsText +
+                   " fields (a value missing or extra, a name with blanks outside quotes, or an "
                    "unclosed quote)";
         }
     }
@@ -173,8 +188,8 @@ std::string LocateError(const std::string& source, const std::string& message) {
         std::size_t end = at + marker.size();
         while (end < message.size() && message[end] >= '0' && message[end] <= '9') ++end;
         if (end > at + marker.size() && message.compare(end, 2, ", ") == 0) {
-            return source + ":" + message.substr(at + marker.size(), end - at - marker.size()) + ": " +
-                   message.substr(end + 2);
+            return source + ":" + message.substr(at + marker.size(), end - at - marker.size()) +
+                   ": " + message.substr(end + 2);
         }
     }
     return source + ": " + message;
@@ -186,14 +201,15 @@ void CollectError(cmsContext context, cmsUInt32Number, const char* text) {
     if (!errors || !text) return;
     std::string message(text);
     // Messages come with line ends of their own.
-    while (!message.empty() && (message.back() == '\n' || message.back() == '\r' || message.back() == ' ')) {
+    while (!message.empty() &&
+           (message.back() == '\n' || message.back() == '\r' || message.back() == ' ')) {
         message.pop_back();
     }
     errors->push_back(std::move(message));
 }
 
 class Cgats {
-public:
+  public:
     Cgats() : amContext(cmsCreateContext(nullptr, &amErrors)) {
         if (amContext) cmsSetLogErrorHandlerTHR(amContext, CollectError);
     }
@@ -206,7 +222,8 @@ public:
 
     bool Load(std::string_view text) {
         if (!amContext || text.size() > std::numeric_limits<cmsUInt32Number>::max()) return false;
-        amHandle = cmsIT8LoadFromMem(amContext, text.data(), static_cast<cmsUInt32Number>(text.size()));
+        amHandle =
+            cmsIT8LoadFromMem(amContext, text.data(), static_cast<cmsUInt32Number>(text.size()));
         return amHandle != nullptr;
     }
     cmsHANDLE Handle() const { return amHandle; }
@@ -214,12 +231,11 @@ public:
         return amErrors.empty() ? std::string("not a readable CGATS file") : amErrors.front();
     }
 
-private:
+  private:
     std::vector<std::string> amErrors;
     cmsContext amContext = nullptr;
     cmsHANDLE amHandle = nullptr;
 };
-
 
 // A property as a number, or 0 when it is absent or not a number.
 double NumericProperty(cmsHANDLE it8, const char* name) {
@@ -230,7 +246,8 @@ double NumericProperty(cmsHANDLE it8, const char* name) {
 }
 
 // The spectral fields of the data format, sorted by wavelength: (nm, field).
-std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* idField, int* nameField) {
+std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* idField,
+                                                int* nameField) {
     std::vector<std::pair<int, int>> spectral;
     for (int f = 0; f < fields && names; ++f) {
         const std::string name = names[f] ? names[f] : "";
@@ -248,9 +265,12 @@ std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* i
 
 // The grid: from SPECTRAL_BANDS/START/END when they agree with the fields
 // (exact for fractional steps), else from the field names.
-std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spectral, SpectralSet* set) {
-    if (spectral.size() < 3) return spectral.empty() ? "spectral fields missing" : "fewer than 3 spectral fields";
-    if (spectral.size() > kMaxBands) return "more than " + std::to_string(kMaxBands) + " spectral fields";
+std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spectral,
+                     SpectralSet* set) {
+    if (spectral.size() < 3)
+        return spectral.empty() ? "spectral fields missing" : "fewer than 3 spectral fields";
+    if (spectral.size() > kMaxBands)
+        return "more than " + std::to_string(kMaxBands) + " spectral fields";
     for (std::size_t i = 1; i < spectral.size(); ++i) {
         if (spectral[i].first == spectral[i - 1].first) {
             return "two spectral fields for " + std::to_string(spectral[i].first) + " nm";
@@ -259,24 +279,27 @@ std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spec
     const double bands = NumericProperty(it8, "SPECTRAL_BANDS");
     const double start = NumericProperty(it8, "SPECTRAL_START_NM");
     const double end = NumericProperty(it8, "SPECTRAL_END_NM");
-    const bool declared = bands == static_cast<double>(spectral.size()) && start > 0.0 && end > start &&
-                          std::fabs(start - spectral.front().first) < 1.0 &&
+    const bool declared = bands == static_cast<double>(spectral.size()) && start > 0.0 &&
+                          end > start && std::fabs(start - spectral.front().first) < 1.0 &&
                           std::fabs(end - spectral.back().first) < 1.0;
     // A header that states a grid the fields do not have: ArgyllCMS refuses
     // the file, and so do we, rather than pick one of the two silently.
-    const bool stated = cmsIT8GetProperty(it8, "SPECTRAL_BANDS") || cmsIT8GetProperty(it8, "SPECTRAL_START_NM") ||
+    const bool stated = cmsIT8GetProperty(it8, "SPECTRAL_BANDS") ||
+                        cmsIT8GetProperty(it8, "SPECTRAL_START_NM") ||
                         cmsIT8GetProperty(it8, "SPECTRAL_END_NM");
     if (stated && !declared) {
         const auto shown = [&](const char* name) {
             const char* text = cmsIT8GetProperty(it8, name);
-            return std::string(name) + " " + (text ? detail::Shown(text) : std::string("(missing)"));
+            return std::string(name) + " " +
+                   (text ? detail::Shown(text) : std::string("(missing)"));
         };
         return "the header (" + shown("SPECTRAL_BANDS") + ", " + shown("SPECTRAL_START_NM") + ", " +
                shown("SPECTRAL_END_NM") + ") contradicts the " + std::to_string(spectral.size()) +
                " spectral fields; ArgyllCMS refuses such a file too";
     }
     for (std::size_t i = 0; i < spectral.size(); ++i) {
-        set->wavelengths.push_back(declared ? start + (end - start) * static_cast<double>(i) / (bands - 1.0)
+        set->wavelengths.push_back(declared ? start + (end - start) * static_cast<double>(i) /
+                                                          (bands - 1.0)
                                             : spectral[i].first);
     }
     return "";
@@ -286,7 +309,8 @@ std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spec
 
 namespace detail {
 
-SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
+                          const SpectralReadOptions& axOptions) {
     SpectralSet set;
     set.format = "CGATS";
     const Layout layout = ScanLayout(text, source);
@@ -306,13 +330,14 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source, cons
     const int fields = cmsIT8EnumDataFormat(it8, &names);
     int idField = -1;
     int nameField = -1;
-    const std::vector<std::pair<int, int>> spectral = SpectralFields(names, fields, &idField, &nameField);
+    const std::vector<std::pair<int, int>> spectral =
+        SpectralFields(names, fields, &idField, &nameField);
     const std::string gridProblem = TakeGrid(it8, spectral, &set);
     if (!gridProblem.empty()) {
         std::string what = source + ": " + gridProblem;
         if (spectral.size() >= 2) {
-            what += " (" + std::to_string(spectral.front().first) + ".." + std::to_string(spectral.back().first) +
-                    " nm)";
+            what += " (" + std::to_string(spectral.front().first) + ".." +
+                    std::to_string(spectral.back().first) + " nm)";
         }
         AddError(&set, what);
         set.unusable = true;
@@ -348,7 +373,8 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source, cons
         SpectralSample sample;
         sample.line = s < lines.size() ? lines[s] : 0;
         const std::string where =
-            source + ":" + (sample.line ? std::to_string(sample.line) : "set " + std::to_string(s + 1));
+            source + ":" +
+            (sample.line ? std::to_string(sample.line) : "set " + std::to_string(s + 1));
         if (set.samples.size() >= axOptions.maxSamples) {
             AddError(&set, where + ": more than " + std::to_string(axOptions.maxSamples) +
                                " spectra; the rest is not read");
@@ -366,7 +392,8 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source, cons
             double number = 0.0;
             const std::string field = names[spectral[k].second];
             if (!value || !ParseNumber(value, &number)) {
-                AddError(&set, where + ": " + field + ": \"" + Shown(value ? value : "") + "\" is not a number");
+                AddError(&set, where + ": " + field + ": \"" + Shown(value ? value : "") +
+                                   "\" is not a number");
                 good = false;
                 break;
             }
@@ -378,10 +405,11 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source, cons
         }
         if (good) set.samples.push_back(std::move(sample));
     }
-    const SpectralReadOptions known = {fileNorm > 0.0 && axOptions.scale == SpectralScale::kAuto
-                                           ? (fileNorm == 1.0 ? SpectralScale::kFraction : SpectralScale::kPercent)
-                                           : axOptions.scale,
-                                       axOptions.maxSamples};
+    const SpectralReadOptions known = {
+        fileNorm > 0.0 && axOptions.scale == SpectralScale::kAuto
+            ? (fileNorm == 1.0 ? SpectralScale::kFraction : SpectralScale::kPercent)
+            : axOptions.scale,
+        axOptions.maxSamples};
     FinishScale(&set, known, fileNorm, normReason, source);
     return set;
 }

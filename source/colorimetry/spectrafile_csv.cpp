@@ -1,17 +1,18 @@
 // CSV spectra; see nxbase/spectrafile.h for the format.
-#include "nxbase/spectrafile.h"
-#include "spectrafile_parse.h"
-
 #include <cctype>
 #include <charconv>
 #include <cmath>
+
+#include "nxbase/spectrafile.h"
+#include "spectrafile_parse.h"
 
 namespace nxbase {
 namespace {
 
 std::string_view Trim(std::string_view s) {
     while (!s.empty() && (s.front() == ' ' || s.front() == '\t')) s.remove_prefix(1);
-    while (!s.empty() && (s.back() == ' ' || s.back() == '\t' || s.back() == '\r')) s.remove_suffix(1);
+    while (!s.empty() && (s.back() == ' ' || s.back() == '\t' || s.back() == '\r'))
+        s.remove_suffix(1);
     return s;
 }
 
@@ -87,13 +88,17 @@ bool ParseNumber(std::string_view text, double* value) {
     if (!text.empty() && text.front() == '+') text.remove_prefix(1);
     if (text.empty()) return false;
     const auto result = std::from_chars(text.data(), text.data() + text.size(), *value);
-    return result.ec == std::errc() && result.ptr == text.data() + text.size() && std::isfinite(*value);
+    return result.ec == std::errc() && result.ptr == text.data() + text.size() &&
+           std::isfinite(*value);
 }
 
 int WavelengthOf(std::string_view field) {
     // Known prefixes, longest first; compared without ASCII case.
-    static const char* const kPrefixes[] = {"SPECTRAL_NM_", "SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
-    auto upper = [](char c) { return static_cast<char>(std::toupper(static_cast<unsigned char>(c))); };
+    static const char* const kPrefixes[] = {
+        "SPECTRAL_NM_", "SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
+    auto upper = [](char c) {
+        return static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    };
     for (const char* prefix : kPrefixes) {
         const std::string_view p(prefix);
         if (field.size() <= p.size()) continue;
@@ -107,7 +112,8 @@ int WavelengthOf(std::string_view field) {
         }
         int nm = 0;
         const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), nm);
-        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0) return nm;
+        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0)
+            return nm;
     }
     return -1;
 }
@@ -123,7 +129,6 @@ std::string Shown(std::string_view field) {
 
 }  // namespace detail
 
-
 namespace {
 
 using detail::ParseNumber;
@@ -136,7 +141,8 @@ constexpr std::size_t kMinBands = 3;
 
 bool IsWholeWavelength(const std::string& field, int* nm) {
     double value = 0.0;
-    if (!ParseNumber(field, &value) || field.find_first_of(".eE") != std::string::npos) return false;
+    if (!ParseNumber(field, &value) || field.find_first_of(".eE") != std::string::npos)
+        return false;
     if (value < kLowestWavelength || value > kHighestWavelength) return false;
     *nm = static_cast<int>(value);
     return true;
@@ -191,7 +197,8 @@ bool CsvSpectraParser::Line(std::string_view line, int number) {
     const std::string_view content = Trim(line);
     if (content.empty() || content.front() == '#') return true;
     if (line.size() > kMaxLineLength) {
-        Error(number, "line longer than " + std::to_string(kMaxLineLength) + " bytes; not read further");
+        Error(number,
+              "line longer than " + std::to_string(kMaxLineLength) + " bytes; not read further");
         amStopped = true;
         return false;
     }
@@ -229,7 +236,8 @@ void CsvSpectraParser::Error(int line, const std::string& what) {
 void CsvSpectraParser::Header(const std::vector<std::string>& fields, int line) {
     std::size_t count = NumericHeaderColumns(fields);
     if (count == 0) {
-        while (count < fields.size() && WavelengthOf(fields[fields.size() - 1 - count]) >= 0) ++count;
+        while (count < fields.size() && WavelengthOf(fields[fields.size() - 1 - count]) >= 0)
+            ++count;
     }
     const std::size_t first = fields.size() - count;
     std::vector<double> grid;
@@ -244,9 +252,11 @@ void CsvSpectraParser::Header(const std::vector<std::string>& fields, int line) 
     } else {
         for (std::size_t i = 0; i < grid.size() && problem.empty(); ++i) {
             if (grid[i] < kLowestWavelength || grid[i] > kHighestWavelength) {
-                problem = "column \"" + Shown(fields[first + i]) + "\" is not a wavelength from 200 to 2600 nm";
+                problem = "column \"" + Shown(fields[first + i]) +
+                          "\" is not a wavelength from 200 to 2600 nm";
             } else if (i > 0 && grid[i] <= grid[i - 1]) {
-                problem = "wavelengths do not increase at column \"" + Shown(fields[first + i]) + "\"";
+                problem =
+                    "wavelengths do not increase at column \"" + Shown(fields[first + i]) + "\"";
             }
         }
     }
@@ -265,22 +275,25 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
     const std::size_t bands = pSet->wavelengths.size();
     const std::size_t expected = amIdFields >= 0 ? amIdFields + bands : 0;
     if (expected != 0 && fields.size() != expected) {
-        Error(line, std::to_string(fields.size()) + " fields, expected " + std::to_string(expected));
+        Error(line,
+              std::to_string(fields.size()) + " fields, expected " + std::to_string(expected));
         return;
     }
     if (fields.size() < bands) {
-        Error(line, std::to_string(fields.size()) + " fields, expected at least " + std::to_string(bands) +
-                        " values");
+        Error(line, std::to_string(fields.size()) + " fields, expected at least " +
+                        std::to_string(bands) + " values");
         return;
     }
     const std::size_t ids = fields.size() - bands;
     if (ids > kMaxIdFields) {
-        Error(line, std::to_string(fields.size()) + " fields: more than " + std::to_string(kMaxIdFields) +
-                        " before the " + std::to_string(bands) + " values");
+        Error(line, std::to_string(fields.size()) + " fields: more than " +
+                        std::to_string(kMaxIdFields) + " before the " + std::to_string(bands) +
+                        " values");
         return;
     }
     if (pSet->samples.size() >= amOptions.maxSamples) {
-        Error(line, "more than " + std::to_string(amOptions.maxSamples) + " spectra; the rest is not read");
+        Error(line, "more than " + std::to_string(amOptions.maxSamples) +
+                        " spectra; the rest is not read");
         amStopped = true;
         return;
     }
@@ -291,15 +304,16 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
         if (i > 1) sample.name += ' ';
         sample.name += fields[i];
     }
-    if (sample.id.empty() && sample.name.empty()) sample.id = std::to_string(pSet->samples.size() + 1);
+    if (sample.id.empty() && sample.name.empty())
+        sample.id = std::to_string(pSet->samples.size() + 1);
     const double divisor = amOptions.scale == SpectralScale::kPercent ? 100.0 : 1.0;
     sample.values.resize(bands);
     for (std::size_t k = 0; k < bands; ++k) {
         double value = 0.0;
         const std::string& field = fields[ids + k];
         const std::string where = "field " + std::to_string(ids + k + 1) + " (" +
-                                  std::to_string(static_cast<int>(pSet->wavelengths[k])) + " nm): \"" +
-                                  Shown(field) + "\"";
+                                  std::to_string(static_cast<int>(pSet->wavelengths[k])) +
+                                  " nm): \"" + Shown(field) + "\"";
         if (!ParseNumber(field, &value)) {
             Error(line, where + " is not a number");
             return;
@@ -314,7 +328,8 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
     pSet->samples.push_back(std::move(sample));
 }
 
-SpectralSet ReadCsvText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions) {
+SpectralSet ReadCsvText(std::string_view text, const std::string& source,
+                        const SpectralReadOptions& axOptions) {
     SpectralSet set;
     CsvSpectraParser parser(source, axOptions, &set);
     int number = 0;

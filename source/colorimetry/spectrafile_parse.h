@@ -27,18 +27,21 @@ void AddError(SpectralSet* pSet, std::string message);
 // spectra.
 void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
                  const std::string& axNormReason, const std::string& source);
-SpectralSet ReadCsvText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions);
-SpectralSet ReadCgatsText(std::string_view text, const std::string& source, const SpectralReadOptions& axOptions);
+SpectralSet ReadCsvText(std::string_view text, const std::string& source,
+                        const SpectralReadOptions& axOptions);
+SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
+                          const SpectralReadOptions& axOptions);
 
 // Builds a CSV set line by line.
 class CsvSpectraParser {
-public:
-    CsvSpectraParser(const std::string& source, const SpectralReadOptions& axOptions, SpectralSet* pSet);
+  public:
+    CsvSpectraParser(const std::string& source, const SpectralReadOptions& axOptions,
+                     SpectralSet* pSet);
     // False once reading should stop (limit reached, unusable header).
     bool Line(std::string_view line, int number);
     void Finish();
 
-private:
+  private:
     void Header(const std::vector<std::string>& fields, int line);
     void Row(const std::vector<std::string>& fields, int line);
     void Error(int line, const std::string& what);

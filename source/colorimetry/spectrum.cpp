@@ -17,17 +17,27 @@ void CopyElements(const std::vector<T>& from, float* to) {
 
 IAdditionalSpectrumInfo::~IAdditionalSpectrumInfo() = default;
 
-Spectrum::Spectrum(float value) { Init(value); }
+Spectrum::Spectrum(float value) {
+    Init(value);
+}
 
-Spectrum::Spectrum(const float* values) { std::copy(values, values + kSize, amValues); }
+Spectrum::Spectrum(const float* values) {
+    std::copy(values, values + kSize, amValues);
+}
 
-Spectrum::Spectrum(const std::vector<double>& values) { CopyElements(values, amValues); }
+Spectrum::Spectrum(const std::vector<double>& values) {
+    CopyElements(values, amValues);
+}
 
-Spectrum::Spectrum(const std::vector<float>& values) { CopyElements(values, amValues); }
+Spectrum::Spectrum(const std::vector<float>& values) {
+    CopyElements(values, amValues);
+}
 
 Spectrum::~Spectrum() = default;
 
-void Spectrum::Init(float value) { std::fill(amValues, amValues + kSize, value); }
+void Spectrum::Init(float value) {
+    std::fill(amValues, amValues + kSize, value);
+}
 
 std::vector<float> Spectrum::GetValues() const {
     return std::vector<float>(amValues, amValues + kSize);
@@ -76,9 +86,13 @@ double Spectrum::GetSpectralDeviation(const Spectrum& other) const {
     return sum;
 }
 
-Spectrum Spectrum::CreateWhiteSpectrum() { return Spectrum(1.0f); }
+Spectrum Spectrum::CreateWhiteSpectrum() {
+    return Spectrum(1.0f);
+}
 
-Spectrum Spectrum::CreateBlackSpectrum() { return Spectrum(0.0f); }
+Spectrum Spectrum::CreateBlackSpectrum() {
+    return Spectrum(0.0f);
+}
 
 Spectrum& Spectrum::operator+=(const Spectrum& other) {
     for (int i = 0; i < kSize; ++i) amValues[i] += other.amValues[i];
@@ -132,7 +146,9 @@ Spectrum operator*(const Spectrum& a, double factor) {
     return result;
 }
 
-Spectrum operator*(double factor, const Spectrum& a) { return a * factor; }
+Spectrum operator*(double factor, const Spectrum& a) {
+    return a * factor;
+}
 
 Spectrum operator/(const Spectrum& a, double divisor) {
     Spectrum result(a);
@@ -237,7 +253,9 @@ ReflectanceSpectrum operator*(const ReflectanceSpectrum& a, double factor) {
     return result;
 }
 
-ReflectanceSpectrum operator*(double factor, const ReflectanceSpectrum& a) { return a * factor; }
+ReflectanceSpectrum operator*(double factor, const ReflectanceSpectrum& a) {
+    return a * factor;
+}
 
 ReflectanceSpectrum operator/(const ReflectanceSpectrum& a, double divisor) {
     ReflectanceSpectrum result(a);

@@ -89,9 +89,13 @@ AppName* AppName::Instance() {
                                            "Please create the AppName-Singleton first !");
 }
 
-bool AppName::IsInitialized() { return smInstance != nullptr; }
+bool AppName::IsInitialized() {
+    return smInstance != nullptr;
+}
 
-String AppName::GetVersionString() const { return amVersion.GetVersionString(2); }
+String AppName::GetVersionString() const {
+    return amVersion.GetVersionString(2);
+}
 
 // ------------------------------------------------------------------- AppDir
 
@@ -113,7 +117,9 @@ AppDir* AppDir::Instance() {
                                            "Please create the AppDir-Singleton first !");
 }
 
-bool AppDir::IsInitialized() { return smInstance != nullptr; }
+bool AppDir::IsInitialized() {
+    return smInstance != nullptr;
+}
 
 void AppDir::SetAppDir(AppDir* pAppDir) {
     if (smInstance == pAppDir) return;
@@ -126,15 +132,25 @@ void AppDir::SetAppDir(AppDir* pAppDir) {
     if (pAppDir != nullptr) NxSingleton::Insert(pAppDir);
 }
 
-DirEntry AppDir::BinDirEntry() const { return amEntry.GetPath(); }
+DirEntry AppDir::BinDirEntry() const {
+    return amEntry.GetPath();
+}
 
-DirEntry AppDir::RootDirEntry() const { return BinDirEntry().GetPath(); }
+DirEntry AppDir::RootDirEntry() const {
+    return BinDirEntry().GetPath();
+}
 
-DirEntry AppDir::LngDirEntry() const { return RootDirEntry() + DirEntry("LNG"); }
+DirEntry AppDir::LngDirEntry() const {
+    return RootDirEntry() + DirEntry("LNG");
+}
 
-DirEntry AppDir::HlpDirEntry() const { return RootDirEntry() + DirEntry("DOC"); }
+DirEntry AppDir::HlpDirEntry() const {
+    return RootDirEntry() + DirEntry("DOC");
+}
 
-DirEntry AppDir::TargetDisk() const { return BinDirEntry().GetMountPoint(); }
+DirEntry AppDir::TargetDisk() const {
+    return BinDirEntry().GetMountPoint();
+}
 
 // ----------------------------------------------------------------- KLConfig
 
@@ -171,7 +187,9 @@ std::vector<std::pair<String, String>> KLConfig::GetEntries(const String& asGrou
     return pConfig->ReadGroup();
 }
 
-bool KLConfig::EmptyGroup(const String& asGroup) { return pConfig->DeleteGroup(asGroup); }
+bool KLConfig::EmptyGroup(const String& asGroup) {
+    return pConfig->DeleteGroup(asGroup);
+}
 
 // ---------------------------------------------------------------- AppConfig
 
@@ -192,10 +210,12 @@ AppConfig* AppConfig::CreateAppConfig(const String& asDirectory, const String& a
 
 AppConfig* AppConfig::Instance() {
     return nxbase::StrictSingletonInstance<AppConfig, std::runtime_error>(smInstance,
-                                                                     "No AppConfig instance");
+                                                                          "No AppConfig instance");
 }
 
-bool AppConfig::IsInitialized() { return smInstance != nullptr; }
+bool AppConfig::IsInitialized() {
+    return smInstance != nullptr;
+}
 
 void AppConfig::SetAppConfig(AppConfig* pAppConfig) {
     if (smInstance == pAppConfig) return;
@@ -251,7 +271,9 @@ UserConfig* UserConfig::Instance() {
         smInstance, "No UserConfig instance");
 }
 
-bool UserConfig::IsInitialized() { return smInstance != nullptr; }
+bool UserConfig::IsInitialized() {
+    return smInstance != nullptr;
+}
 
 // -------------------------------------------------------------- LocalConfig
 
@@ -282,17 +304,26 @@ VELTRAConfig* VELTRAConfig::Instance() {
                                            "Please create the VELTRAConfig-Singleton first !");
 }
 
-bool VELTRAConfig::IsInitialized() { return smInstance != nullptr; }
+bool VELTRAConfig::IsInitialized() {
+    return smInstance != nullptr;
+}
 
 String VELTRAConfig::GetGroupName(VELTRAiniGroup axGroup) {
     switch (axGroup) {
-        case VELTRA_LPM_SERVER: return String("LPM-Server");
-        case VELTRA_GRADUS: return String("Gradus");
-        case VELTRA_CHROMALINK_APPLICATIONS: return String("ChromaLink Applications");
-        case VELTRA_COMPATIBILITY: return String("Compatibility");
-        case VELTRA_32BIT_APPLICATIONS: return String("32-Bit Applications");
-        case VELTRA_COLOR_LIBRARIES: return String("Color Libraries");
-        case VELTRA_LICENSES: return String("Licenses");
+        case VELTRA_LPM_SERVER:
+            return String("LPM-Server");
+        case VELTRA_GRADUS:
+            return String("Gradus");
+        case VELTRA_CHROMALINK_APPLICATIONS:
+            return String("ChromaLink Applications");
+        case VELTRA_COMPATIBILITY:
+            return String("Compatibility");
+        case VELTRA_32BIT_APPLICATIONS:
+            return String("32-Bit Applications");
+        case VELTRA_COLOR_LIBRARIES:
+            return String("Color Libraries");
+        case VELTRA_LICENSES:
+            return String("Licenses");
     }
     Check::AssertFailed("\"Unknown VELTRAConfig group name\" == 0", __FILE__, __LINE__);
     return String();

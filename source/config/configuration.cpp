@@ -11,7 +11,8 @@ namespace {
 // Failed INI writes go to the process log with the empty key, which always
 // writes.
 const bool kSinkInstalled = [] {
-    Config::SetErrorSink([](const std::string& line) { LogFile::WriteToLog(String(line), String()); });
+    Config::SetErrorSink(
+        [](const std::string& line) { LogFile::WriteToLog(String(line), String()); });
     return true;
 }();
 
@@ -28,7 +29,9 @@ IniConfig::IniConfig(const std::string& path)
 
 IniConfig::~IniConfig() = default;
 
-void IniConfig::DeleteGroup(const std::string& group) { amConfig->DeleteGroup(String(group)); }
+void IniConfig::DeleteGroup(const std::string& group) {
+    amConfig->DeleteGroup(String(group));
+}
 
 std::string IniConfig::ReadKey(const std::string& group, const std::string& key,
                                const std::string& defaultValue) {
@@ -47,7 +50,9 @@ void IniConfig::WriteKey(const std::string& group, const std::string& key,
 MemoryConfig::MemoryConfig() = default;
 MemoryConfig::~MemoryConfig() = default;
 
-void MemoryConfig::DeleteGroup(const std::string& group) { amGroups.erase(group); }
+void MemoryConfig::DeleteGroup(const std::string& group) {
+    amGroups.erase(group);
+}
 
 std::string MemoryConfig::ReadKey(const std::string& group, const std::string& key,
                                   const std::string& defaultValue) {
@@ -82,8 +87,7 @@ boost::shared_ptr<Configuration> ConfigurationFactory::CreateUserConfig() {
 
 // ----------------------------------------------------------- CascadedConfig
 
-String CascadedConfig::ReadKey(const String& group, const String& key,
-                               const String& defaultValue) {
+String CascadedConfig::ReadKey(const String& group, const String& key, const String& defaultValue) {
     String fromApp = AppConfig::Instance()->ReadKey(group, key, defaultValue);
     return UserConfig::Instance()->ReadKey(group, key, fromApp);
 }

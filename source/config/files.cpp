@@ -25,18 +25,23 @@ namespace nxbase {
 
 void WriteWholeFile(const std::string& path, std::string_view content) {
     std::string why;
-    if (!toolkit::ReplaceFile(path, content, why)) throw std::runtime_error("cannot write " + path + ": " + why);
+    if (!toolkit::ReplaceFile(path, content, why))
+        throw std::runtime_error("cannot write " + path + ": " + why);
 }
 
 std::string LibraryDataDirectory() {
     std::error_code ignored;
     Dl_info info{};
-    if (dladdr(reinterpret_cast<void*>(&LibraryDataDirectory), &info) != 0 && info.dli_fname != nullptr) {
-        const std::filesystem::path library = std::filesystem::weakly_canonical(info.dli_fname, ignored);
+    if (dladdr(reinterpret_cast<void*>(&LibraryDataDirectory), &info) != 0 &&
+        info.dli_fname != nullptr) {
+        const std::filesystem::path library =
+            std::filesystem::weakly_canonical(info.dli_fname, ignored);
         const std::filesystem::path installed = library.parent_path() / NXBASE_LIBDIR_TO_DATADIR;
-        if (std::filesystem::is_directory(installed, ignored)) return installed.lexically_normal().string();
+        if (std::filesystem::is_directory(installed, ignored))
+            return installed.lexically_normal().string();
     }
-    if (std::filesystem::is_directory(NXBASE_SOURCE_DATA_DIR, ignored)) return NXBASE_SOURCE_DATA_DIR;
+    if (std::filesystem::is_directory(NXBASE_SOURCE_DATA_DIR, ignored))
+        return NXBASE_SOURCE_DATA_DIR;
     return "";
 }
 

@@ -63,7 +63,9 @@ std::string Utf16LeToUtf8(std::string_view asBytes) {
 }
 
 // Eight-bit text as UTF-8: kept when it is UTF-8 already, else Windows-1252.
-std::string NarrowToUtf8(std::string_view asText) { return toolkit::EightBitToUtf8(asText); }
+std::string NarrowToUtf8(std::string_view asText) {
+    return toolkit::EightBitToUtf8(asText);
+}
 
 std::string_view TrimRight(std::string_view asText) {
     while (!asText.empty() && (asText.back() == ' ' || asText.back() == '\t')) {
@@ -310,7 +312,8 @@ void AppendHex(std::string& axOut, const RegistryValue& axValue) {
         axOut += "hex:";
     } else {
         char type[9];
-        auto end = std::to_chars(type, type + sizeof type, static_cast<std::uint32_t>(axValue.type), 16);
+        auto end =
+            std::to_chars(type, type + sizeof type, static_cast<std::uint32_t>(axValue.type), 16);
         axOut += "hex(";
         axOut.append(type, end.ptr);
         axOut += "):";
@@ -392,8 +395,8 @@ std::vector<RegistryStore::Change> ParseRegedit4(const std::string& asText,
         std::string logical(physical);
         try {
             // Hex data continues on the next line after ",\".
-            while (TrimRight(logical).size() >= 2 && TrimRight(logical).substr(
-                                                         TrimRight(logical).size() - 2) == ",\\" &&
+            while (TrimRight(logical).size() >= 2 &&
+                   TrimRight(logical).substr(TrimRight(logical).size() - 2) == ",\\" &&
                    start < text.size()) {
                 logical.resize(TrimRight(logical).size() - 1);
                 std::string_view more;

@@ -52,7 +52,8 @@ std::string BelowRoot(const std::string& asSubKey) {
 RegistryHive RequireHive(HKEY axHKey) {
     std::optional<RegistryHive> hive = HiveOf(axHKey);
     if (!hive) {
-        throw RegistryError(nxbase::RegistryErrorKind::kInvalidHandle, kInvalidHandle, "Not a registry hive handle");
+        throw RegistryError(nxbase::RegistryErrorKind::kInvalidHandle, kInvalidHandle,
+                            "Not a registry hive handle");
     }
     return *hive;
 }

@@ -18,10 +18,10 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
 #include <array>
 #include <atomic>
 #include <chrono>
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
@@ -354,8 +354,8 @@ std::unique_ptr<Connection> OpenImmutable(const std::string& asFile) {
     }
     uri += "?immutable=1";
     sqlite3* pDb = nullptr;
-    const int result =
-        sqlite3_open_v2(uri.c_str(), &pDb, SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_URI, nullptr);
+    const int result = sqlite3_open_v2(
+        uri.c_str(), &pDb, SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_URI, nullptr);
     auto connection = std::make_unique<Connection>(asFile, pDb, false);
     if (result != SQLITE_OK) Fail(*connection, result, "cannot open");
     sqlite3_extended_result_codes(pDb, 1);
@@ -781,9 +781,9 @@ void RegistryStore::Apply(const std::vector<Change>& axChanges) {
         } catch (const RegistryError& error) {
             if (i == 0) throw;
             // The first hive is committed already: say exactly what happened.
-            throw RegistryError(error.GetKind(), error.Code(), std::string(HiveName(hives[0])) +
-                                                  " was written; " + HiveName(hives[i]) +
-                                                  " was not: " + error.what());
+            throw RegistryError(error.GetKind(), error.Code(),
+                                std::string(HiveName(hives[0])) + " was written; " +
+                                    HiveName(hives[i]) + " was not: " + error.what());
         }
     }
 }

@@ -160,7 +160,8 @@ std::string DefaultLogDirectory() {
     std::string directory = toolkit::UserTempDirectory(&refusal);
     if (directory.empty()) directory = toolkit::TempDirectory();
     if (!refusal.empty()) {
-        std::fprintf(stderr, "Log directory refused (%s); using %s\n", refusal.c_str(), directory.c_str());
+        std::fprintf(stderr, "Log directory refused (%s); using %s\n", refusal.c_str(),
+                     directory.c_str());
     }
     return directory;
 }
@@ -265,7 +266,8 @@ void LogFile::WriteToLog(const String& text, const String& key) {
 
 namespace {
 // The state of `key` in a snapshot (null: no table yet), 0 when absent.
-std::uint8_t StateIn(const std::unordered_map<std::string, std::uint8_t>* table, const std::string& key) {
+std::uint8_t StateIn(const std::unordered_map<std::string, std::uint8_t>* table,
+                     const std::string& key) {
     if (table == nullptr) return 0;
     auto at = table->find(key);
     return at == table->end() ? 0 : at->second;
@@ -359,8 +361,10 @@ void LogFile::WriteLog(const String& text, const String& key) {
             restartNote.clear();
         }
         written = AppendToFile(fileName, line, truncate);
-        if (written) ++loggedLines;
-        else writeError = errno;
+        if (written)
+            ++loggedLines;
+        else
+            writeError = errno;
     }
     if (!hasListeners) return;
     NotifyListeners(text, key);

@@ -2,12 +2,12 @@
 
 #include <algorithm>
 #include <cstring>
-#include <utility>
 #include <functional>
 #include <istream>
 #include <limits>
 #include <new>
 #include <string>
+#include <utility>
 
 #include "nxbase/check.h"
 

@@ -4,8 +4,8 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <chrono>
 #include <cerrno>
+#include <chrono>
 #include <exception>
 #include <map>
 #include <system_error>
@@ -213,11 +213,11 @@ std::vector<std::string> Thread::GetRunningThreads() {
 
 namespace nxbase {
 
-void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread, std::size_t alGranule,
-                const std::function<void(std::size_t, std::size_t)>& fPart) {
+void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread,
+                std::size_t alGranule, const std::function<void(std::size_t, std::size_t)>& fPart) {
     unsigned threads = alThreads ? alThreads : std::max(1u, std::thread::hardware_concurrency());
-    threads = static_cast<unsigned>(
-        std::min<std::size_t>(threads, std::max<std::size_t>(1, alCount / std::max<std::size_t>(1, alMinPerThread))));
+    threads = static_cast<unsigned>(std::min<std::size_t>(
+        threads, std::max<std::size_t>(1, alCount / std::max<std::size_t>(1, alMinPerThread))));
     if (threads <= 1) {
         fPart(0, alCount);
         return;
@@ -226,10 +226,12 @@ void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThr
     // core slowed by other work then takes fewer, instead of holding up
     // the call with a fixed share.
     const std::size_t granule = std::max<std::size_t>(1, alGranule);
-    const std::size_t part = std::max(granule * 256, (alCount / (8 * threads) + granule - 1) / granule * granule);
+    const std::size_t part =
+        std::max(granule * 256, (alCount / (8 * threads) + granule - 1) / granule * granule);
     std::atomic<std::size_t> next{0};
     const auto take = [&] {
-        for (std::size_t first = next.fetch_add(part); first < alCount; first = next.fetch_add(part)) {
+        for (std::size_t first = next.fetch_add(part); first < alCount;
+             first = next.fetch_add(part)) {
             fPart(first, std::min(part, alCount - first));
         }
     };

@@ -1,8 +1,8 @@
 #include "nxbase/applock.h"
 
+#include "messaging_log.h"
 #include "nxbase/logfile.h"
 #include "nxbase/postoffice.h"
-#include "messaging_log.h"
 
 namespace {
 

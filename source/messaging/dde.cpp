@@ -1,5 +1,6 @@
 #include "nxbase/dde.h"
 
+#include <sdbus-c++/sdbus-c++.h>
 #include <unistd.h>
 
 #include <boost/asio/posix/stream_descriptor.hpp>
@@ -8,7 +9,6 @@
 #include <chrono>
 #include <cstdlib>
 #include <ctime>
-#include <sdbus-c++/sdbus-c++.h>
 
 #include "messaging_log.h"
 #include "nxbase/check.h"
@@ -122,16 +122,16 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
             });
         bus->object->registerMethod("Execute")
             .onInterface(nxbase::kDdeInterface)
-            .implementedAs([this, ownTopic](const std::string& topic,
-                                            const std::vector<std::uint8_t>& data) {
-                Log("DDE Callback function (EXECUTE)");
-                if (!ownTopic(nxbase::kDdeService, topic) || !fmExecute) return false;
-                std::size_t size = std::min(data.size(), kMaxExecuteBytes);
-                std::string text(data.begin(), data.begin() + static_cast<long>(size));
-                boost::asio::post(Application::Get().GetContext(),
-                                  [this, text] { fmExecute(text); });
-                return true;
-            });
+            .implementedAs(
+                [this, ownTopic](const std::string& topic, const std::vector<std::uint8_t>& data) {
+                    Log("DDE Callback function (EXECUTE)");
+                    if (!ownTopic(nxbase::kDdeService, topic) || !fmExecute) return false;
+                    std::size_t size = std::min(data.size(), kMaxExecuteBytes);
+                    std::string text(data.begin(), data.begin() + static_cast<long>(size));
+                    boost::asio::post(Application::Get().GetContext(),
+                                      [this, text] { fmExecute(text); });
+                    return true;
+                });
         // Transactions this transport does not serve (a client asking for
         // data, say) are logged as the transport logs any unknown one.
         bus->object->registerMethod("Request")
@@ -181,7 +181,8 @@ void DDE::Arm() {
     auto& context = Application::Get().GetContext();
     sdbus::IConnection::PollData poll = pmBus->connection->getEventLoopPollData();
     if (!pmBus->descriptor) {
-        pmBus->descriptor = std::make_unique<boost::asio::posix::stream_descriptor>(context, poll.fd);
+        pmBus->descriptor =
+            std::make_unique<boost::asio::posix::stream_descriptor>(context, poll.fd);
         pmBus->timer = std::make_unique<boost::asio::steady_timer>(context);
     }
     std::weak_ptr<bool> alive = amAlive;
@@ -198,7 +199,8 @@ void DDE::Arm() {
         ::clock_gettime(CLOCK_MONOTONIC, &now);
         std::uint64_t nowUsec = static_cast<std::uint64_t>(now.tv_sec) * 1000000u +
                                 static_cast<std::uint64_t>(now.tv_nsec) / 1000u;
-        auto wait = std::chrono::microseconds(poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0);
+        auto wait = std::chrono::microseconds(
+            poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0);
         pmBus->timer->expires_after(wait);
         pmBus->timer->async_wait([this, alive](const boost::system::error_code& error) {
             if (!alive.lock() || error) return;
@@ -244,8 +246,8 @@ void DDE::UserEvent(unsigned long, void*) {
 // two processes each waiting for the other would stall until the time-out.
 bool DDE::Connect(const std::string& asTopic) {
     try {
-        auto bus = sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus",
-                                      "/org/freedesktop/DBus");
+        auto bus =
+            sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus", "/org/freedesktop/DBus");
         bool owned = false;
         bus->callMethod("NameHasOwner")
             .onInterface("org.freedesktop.DBus")
@@ -286,10 +288,11 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
         }
         std::string why;
         auto deadline = std::chrono::steady_clock::now() + nxbase::StartWaitLimit();
-        if (toolkit::WaitForStartedProcess(pid, [&] { return Connect(asApp); }, fmKeepWaiting, deadline,
-                                           why) != toolkit::StartWait::kReady) {
-            Log("DDE send abort: ConversationHandle:0, Topic:" + asApp + ", Service:" +
-                nxbase::kDdeService + " (" + why + ")");
+        if (toolkit::WaitForStartedProcess(
+                pid, [&] { return Connect(asApp); }, fmKeepWaiting, deadline, why) !=
+            toolkit::StartWait::kReady) {
+            Log("DDE send abort: ConversationHandle:0, Topic:" + asApp +
+                ", Service:" + nxbase::kDdeService + " (" + why + ")");
             return false;
         }
     }
@@ -312,8 +315,8 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
         });
         return true;
     } catch (const sdbus::Error& error) {
-        Log("DDE send abort: ConversationHandle:1, Topic:" + asApp + ", Service:" +
-            nxbase::kDdeService);
+        Log("DDE send abort: ConversationHandle:1, Topic:" + asApp +
+            ", Service:" + nxbase::kDdeService);
         Log(std::string("DDE: Last error (DdeGetLastError):") + error.getMessage());
         return false;
     }

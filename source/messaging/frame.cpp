@@ -18,7 +18,8 @@ void AppendLength(std::string& asOut, std::uint32_t alLength) {
 std::uint32_t ReadLength(const char* pHeader) {
     const auto* bytes = reinterpret_cast<const unsigned char*>(pHeader);
     return static_cast<std::uint32_t>(bytes[0]) | (static_cast<std::uint32_t>(bytes[1]) << 8) |
-           (static_cast<std::uint32_t>(bytes[2]) << 16) | (static_cast<std::uint32_t>(bytes[3]) << 24);
+           (static_cast<std::uint32_t>(bytes[2]) << 16) |
+           (static_cast<std::uint32_t>(bytes[3]) << 24);
 }
 
 }  // namespace
@@ -85,8 +86,8 @@ bool SplitRequest(const std::string& asRequest, std::string& asName) {
     if (underscore == std::string::npos || underscore == 0 || underscore + 1 == asRequest.size()) {
         return false;
     }
-    bool digits = std::all_of(asRequest.begin() + static_cast<long>(underscore) + 1, asRequest.end(),
-                              [](char c) { return c >= '0' && c <= '9'; });
+    bool digits = std::all_of(asRequest.begin() + static_cast<long>(underscore) + 1,
+                              asRequest.end(), [](char c) { return c >= '0' && c <= '9'; });
     if (!digits || asRequest.find('\0') != std::string::npos) return false;
     asName = asRequest.substr(0, underscore);
     return true;

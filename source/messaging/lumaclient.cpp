@@ -11,13 +11,14 @@ namespace {
 constexpr const char* kServer = "LumaServer";
 
 class Exchange {
-public:
+  public:
     Exchange(PostOffice& office, boost::function<bool()> keepWaiting, std::string* error)
         : amOffice(office), fKeepWaiting(std::move(keepWaiting)), pError(error) {}
 
     bool Send(int message, MyMemoryBlock& request, MyMemoryBlock& answer) {
-        const unsigned char sent = fKeepWaiting ? amOffice.SendAndReceive(kServer, message, request, answer, fKeepWaiting)
-                                                : amOffice.SendAndReceive(kServer, message, request, answer);
+        const unsigned char sent =
+            fKeepWaiting ? amOffice.SendAndReceive(kServer, message, request, answer, fKeepWaiting)
+                         : amOffice.SendAndReceive(kServer, message, request, answer);
         if (!sent) *pError = std::string("no answer from LumaServer to ") + MessageName(message);
         return sent != 0;
     }
@@ -63,7 +64,7 @@ public:
 
     PostOffice& Office() { return amOffice; }
 
-private:
+  private:
     PostOffice& amOffice;
     boost::function<bool()> fKeepWaiting;
     std::string* pError;
@@ -72,7 +73,8 @@ private:
 }  // namespace
 
 bool MeasureWithLumaServer(PostOffice& axOffice, int alCount, std::vector<MeasuredSpectrum>* pOut,
-                           std::string* pError, ProgressListener* pProgress, boost::function<bool()> fKeepWaiting) {
+                           std::string* pError, ProgressListener* pProgress,
+                           boost::function<bool()> fKeepWaiting) {
     Exchange exchange(axOffice, fKeepWaiting, pError);
     MyMemoryBlock level, answer, none;
     level << static_cast<unsigned char>(2);

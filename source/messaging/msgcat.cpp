@@ -158,8 +158,8 @@ int NumberOfCommandText(std::string_view asCommand) {
         offset = kAnswerOffset;
         // Token 1: the text after the first "!" up to the next one.
         std::size_t end = asCommand.find('!', bang + 1);
-        name = asCommand.substr(bang + 1,
-                                end == std::string_view::npos ? std::string_view::npos : end - bang - 1);
+        name = asCommand.substr(
+            bang + 1, end == std::string_view::npos ? std::string_view::npos : end - bang - 1);
     }
     // Every message passes here several times: a hash look-up, built once,
     // in place of comparing with 135 names. The names are unique, so the

@@ -5,12 +5,12 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <array>
 #include <boost/asio/local/stream_protocol.hpp>
 #include <boost/asio/steady_timer.hpp>
-#include <array>
 #include <cerrno>
-#include <cstdlib>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <fstream>
 #include <optional>
@@ -37,8 +37,8 @@ namespace detail {
 using Executor = boost::asio::io_context::executor_type;
 using Socket = boost::asio::basic_stream_socket<boost::asio::local::stream_protocol, Executor>;
 using Acceptor = boost::asio::basic_socket_acceptor<boost::asio::local::stream_protocol, Executor>;
-using Timer = boost::asio::basic_waitable_timer<std::chrono::steady_clock,
-                                                boost::asio::wait_traits<std::chrono::steady_clock>, Executor>;
+using Timer = boost::asio::basic_waitable_timer<
+    std::chrono::steady_clock, boost::asio::wait_traits<std::chrono::steady_clock>, Executor>;
 
 // One connection to a peer, in both directions.
 struct Channel {
@@ -55,7 +55,7 @@ struct Channel {
     FrameReader reader;
     std::array<char, 16 * 1024> input;  // what one read takes
     std::deque<std::string> pending;    // bodies read, not yet delivered
-    std::string outgoing;             // bytes not yet taken by the socket
+    std::string outgoing;               // bytes not yet taken by the socket
     bool writeArmed = false;
 };
 
@@ -120,10 +120,10 @@ bool IsApplicationRunning(const std::string& asApp) {
 
 }  // namespace nxbase
 
-using nxbase::detail::Channel;
-using nxbase::Stage;
 using nxbase::FrameReader;
+using nxbase::Stage;
 using nxbase::StartsWith;
+using nxbase::detail::Channel;
 
 struct Pipe::Listener {
     explicit Listener(boost::asio::io_context& context)
@@ -223,8 +223,9 @@ void Pipe::Listen() {
     std::string why;
     amLockFd = toolkit::Sockets().LockName(amSocketPath + ".lock", why);
     if (amLockFd < 0) {
-        throw std::runtime_error("Pipe: " + amOwnName + " " +
-                                 (why == "running already" ? why + " (" + amSocketPath + ")" : why));
+        throw std::runtime_error(
+            "Pipe: " + amOwnName + " " +
+            (why == "running already" ? why + " (" + amSocketPath + ")" : why));
     }
     ::unlink(amSocketPath.c_str());
     auto& context = Application::Get().GetContext();
@@ -247,24 +248,24 @@ void Pipe::Listen() {
 
 void Pipe::Accept() {
     auto channel = std::make_shared<Channel>(Application::Get().GetContext(), amNextChannelId++);
-    pmListener->acceptor.async_accept(channel->socket, [this, channel](
-                                                           const boost::system::error_code& error) {
-        if (error == boost::asio::error::operation_aborted) return;
-        if (error) {
-            AcceptFailed(error.message());
-            return;
-        }
-        pmListener->nextPause = nxbase::kFirstAcceptPause;
-        std::string why;
-        if (toolkit::Sockets().PeerIsSameUser(channel->socket.native_handle(), why)) {
-            AddChannel(channel);
-        } else {
-            nxbase::Log("Pipe: connection refused: " + why);
-            boost::system::error_code ignored;
-            channel->socket.close(ignored);
-        }
-        if (IsListening()) Accept();
-    });
+    pmListener->acceptor.async_accept(
+        channel->socket, [this, channel](const boost::system::error_code& error) {
+            if (error == boost::asio::error::operation_aborted) return;
+            if (error) {
+                AcceptFailed(error.message());
+                return;
+            }
+            pmListener->nextPause = nxbase::kFirstAcceptPause;
+            std::string why;
+            if (toolkit::Sockets().PeerIsSameUser(channel->socket.native_handle(), why)) {
+                AddChannel(channel);
+            } else {
+                nxbase::Log("Pipe: connection refused: " + why);
+                boost::system::error_code ignored;
+                channel->socket.close(ignored);
+            }
+            if (IsListening()) Accept();
+        });
 }
 
 // Out of descriptors (or another failure that would repeat at once): the
@@ -324,8 +325,10 @@ void Pipe::OnRead(const ChannelPtr& axChannel, const boost::system::error_code& 
     }
     // A full buffer: take the rest that is there now, a bounded amount per turn.
     int fd = axChannel->socket.native_handle();
-    for (int round = 0; !ended && alRead == axChannel->input.size() && round < nxbase::kReadsPerTurn; ++round) {
-        ssize_t n = toolkit::Sockets().Receive(fd, axChannel->input.data(), axChannel->input.size());
+    for (int round = 0;
+         !ended && alRead == axChannel->input.size() && round < nxbase::kReadsPerTurn; ++round) {
+        ssize_t n =
+            toolkit::Sockets().Receive(fd, axChannel->input.data(), axChannel->input.size());
         if (n > 0) {
             axChannel->reader.Append(axChannel->input.data(), static_cast<std::size_t>(n));
             alRead = static_cast<std::size_t>(n);
@@ -339,8 +342,9 @@ void Pipe::OnRead(const ChannelPtr& axChannel, const boost::system::error_code& 
         ended = true;
     }
     if (ended) {
-        Close(axChannel, axChannel->reader.Buffered() > 0 ? "malformed frame (end of file inside a frame)"
-                                                          : "end of file");
+        Close(axChannel, axChannel->reader.Buffered() > 0
+                             ? "malformed frame (end of file inside a frame)"
+                             : "end of file");
         return;
     }
     std::string body;
@@ -367,12 +371,14 @@ void Pipe::LimitPartialFrames() {
     while (amPartialBytes > nxbase::kMaxPartialBytes) {
         ChannelPtr largest;
         for (const auto& [id, channel] : amAllChannels) {
-            if (!largest || channel->reader.Buffered() > largest->reader.Buffered()) largest = channel;
+            if (!largest || channel->reader.Buffered() > largest->reader.Buffered())
+                largest = channel;
         }
         if (!largest) return;
         Close(largest, "partly read frames of all channels above " +
-                           std::to_string(nxbase::kMaxPartialBytes >> 20) + " MiB; this one holds " +
-                           std::to_string(largest->reader.Buffered()) + " bytes");
+                           std::to_string(nxbase::kMaxPartialBytes >> 20) +
+                           " MiB; this one holds " + std::to_string(largest->reader.Buffered()) +
+                           " bytes");
     }
 }
 
@@ -479,7 +485,8 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
 
 // Writes `asBytes` from `alDone` on in pieces until the socket is full;
 // false (the channel closed) when the write failed.
-bool Pipe::SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone) {
+bool Pipe::SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes,
+                        std::size_t& alDone) {
     int fd = axChannel->socket.native_handle();
     while (alDone < asBytes.size()) {
         std::size_t piece = std::min(nxbase::kWriteBlockSize, asBytes.size() - alDone);
@@ -489,7 +496,8 @@ bool Pipe::SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes,
             continue;
         }
         if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return true;
-        Close(axChannel, std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
+        Close(axChannel,
+              std::string("write failed: ") + (n == 0 ? "nothing written" : std::strerror(errno)));
         return false;
     }
     return true;
@@ -537,8 +545,8 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
     if (axChannel->closed) return;
     axChannel->closed = true;
     axChannel->closedWhy = asReason;
-    nxbase::Log("Pipe: channel " + (axChannel->peer.empty() ? std::string("(unknown)")
-                                                            : axChannel->peer) +
+    nxbase::Log("Pipe: channel " +
+                (axChannel->peer.empty() ? std::string("(unknown)") : axChannel->peer) +
                 " closed: " + asReason);
     amPartialBytes -= std::min(amPartialBytes, axChannel->reader.Buffered());
     boost::system::error_code ignored;
@@ -639,9 +647,10 @@ bool Pipe::AwaitHandshake(const ChannelPtr& axChannel) {
             Close(axChannel, "the wait for the connection reply was given up");
             break;
         }
-        Application::Get().RunOneFor(std::min(
-            nxbase::kLongestPause,
-            std::chrono::duration_cast<std::chrono::milliseconds>(deadline - now) + std::chrono::milliseconds(1)));
+        Application::Get().RunOneFor(
+            std::min(nxbase::kLongestPause,
+                     std::chrono::duration_cast<std::chrono::milliseconds>(deadline - now) +
+                         std::chrono::milliseconds(1)));
     }
     if (axChannel->stage == Stage::kOpen && !axChannel->closed) return true;
     return Fail("no channel to " + axChannel->peer + ": it did not answer the connection request");
@@ -661,7 +670,8 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
         return Fail(asApp + " is not running and not registered");
     }
-    if (asCommand == nxbase::kDisconnect) return Fail(asApp + " is not running (nothing to disconnect)");
+    if (asCommand == nxbase::kDisconnect)
+        return Fail(asApp + " is not running (nothing to disconnect)");
     SendScope& scope = *pmScope;
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
     if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
@@ -677,10 +687,11 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
         return (abByDde = OnDdeBus(asApp));
     };
     auto keepWaiting = [this] { return KeepWaiting(); };
-    toolkit::StartWait result = toolkit::WaitForStartedProcess(scope.amStartedPid, ready, keepWaiting,
-                                                               scope.Deadline(), why);
+    toolkit::StartWait result = toolkit::WaitForStartedProcess(scope.amStartedPid, ready,
+                                                               keepWaiting, scope.Deadline(), why);
     if (result == toolkit::StartWait::kReady) return true;
-    return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() + "): " + why);
+    return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
+                "): " + why);
 }
 
 namespace {
@@ -701,20 +712,25 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
     return SendOnChannel(alChannel, asCommand, BytesOf(axEncodedData));
 }
 
-bool Pipe::Send(const std::string& asApp, const std::string& asCommand, std::string_view asEncodedData) {
+bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
+                std::string_view asEncodedData) {
     NX_ASSERT(IsOwnThread());
     if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
-    if (nxbase::detail::CommunicationLogged()) nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
+    if (nxbase::detail::CommunicationLogged())
+        nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
-        return SendByDde(asApp, asCommand, asEncodedData) || Fail("DDE send to " + asApp + " failed");
+        return SendByDde(asApp, asCommand, asEncodedData) ||
+               Fail("DDE send to " + asApp + " failed");
     }
     std::optional<SendScope> own;
     if (pmScope == nullptr) own.emplace(this, nullptr);
     ChannelPtr channel = ChannelTo(asApp);
     bool byDde = false;
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
-    if (byDde) return SendByDde(asApp, asCommand, asEncodedData) || Fail("DDE send to " + asApp + " failed");
+    if (byDde)
+        return SendByDde(asApp, asCommand, asEncodedData) ||
+               Fail("DDE send to " + asApp + " failed");
     return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + asApp + " failed: " + channel->closedWhy);
 }

@@ -87,7 +87,8 @@ std::vector<std::string> PostOfficeApplication::StartLine(int alCountryCode) con
 }
 
 int PostOfficeApplication::Start(std::string& asError) const {
-    int country = Language::IsInitialized() ? static_cast<int>(Language::Instance()->GetCountryCode()) : 1;
+    int country =
+        Language::IsInitialized() ? static_cast<int>(Language::Instance()->GetCountryCode()) : 1;
     return toolkit::SpawnProcess(StartLine(country), amPath, asError);
 }
 
@@ -119,16 +120,16 @@ void PostOfficeApplications::AddServer() {
     if (version < kOldestServerVersion) {
         throw std::runtime_error("Old LumaServer found! Please reinstall new LumaServer.");
     }
-    amApplications[kServerId] = boost::shared_ptr<PostOfficeApplication>(
-        new PostOfficeApplication(kServerId, executable));
+    amApplications[kServerId] =
+        boost::shared_ptr<PostOfficeApplication>(new PostOfficeApplication(kServerId, executable));
 }
 
 void PostOfficeApplications::AddPeers() {
     RegistryEntry peers(HKEY_LOCAL_MACHINE, kPeersKey, std::string());
     for (const auto& [id, executablePath] : RegistryHandler::GetKeys(peers)) {
         if (id.empty() || executablePath.empty() || !FileExists(executablePath)) continue;
-        amApplications[id] = boost::shared_ptr<PostOfficeApplication>(
-            new PostOfficeApplication(id, executablePath));
+        amApplications[id] =
+            boost::shared_ptr<PostOfficeApplication>(new PostOfficeApplication(id, executablePath));
     }
 }
 

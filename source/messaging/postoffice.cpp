@@ -1,18 +1,18 @@
 #include "nxbase/postoffice.h"
 
-#include <boost/asio/post.hpp>
 #include <array>
+#include <boost/asio/post.hpp>
 #include <cstdlib>
 #include <optional>
 #include <stdexcept>
 
+#include "messaging_log.h"
 #include "nxbase/applock.h"
 #include "nxbase/check.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/text.h"
-#include "messaging_log.h"
 #include "toolkit/process.h"
 #include "toolkit/userinterface.h"
 
@@ -31,9 +31,9 @@ void Log(const String& asText) {
 }
 
 // Log lines under "Communication" are built only when the key is on.
-#define NX_COMM_LOG(text)                                          \
-    do {                                                           \
-        if (nxbase::detail::CommunicationLogged()) Log(text);      \
+#define NX_COMM_LOG(text)                                     \
+    do {                                                      \
+        if (nxbase::detail::CommunicationLogged()) Log(text); \
     } while (false)
 
 String Number(long alValue) {
@@ -49,7 +49,8 @@ class StuffedData {
         : amInUse(abKeptInUse), amOuter(!abKeptInUse), amBytes(amOuter ? asKept : amNested) {
         amInUse = true;
         amBytes.clear();
-        nxbase::AppendEncoded(amBytes, axData.GetDatenZeiger(), static_cast<std::size_t>(axData.Len()));
+        nxbase::AppendEncoded(amBytes, axData.GetDatenZeiger(),
+                              static_cast<std::size_t>(axData.Len()));
     }
     ~StuffedData() {
         if (!amOuter) return;
@@ -73,7 +74,8 @@ class StuffedData {
 const std::string& AnswerText(int alNumber) {
     static const auto texts = [] {
         std::array<std::string, ANZAHL_BOTSCHAFTEN> all;
-        for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n) all[n] = kAnswerPrefix + std::string(nxbase::MessageName(n));
+        for (int n = 0; n < ANZAHL_BOTSCHAFTEN; ++n)
+            all[n] = kAnswerPrefix + std::string(nxbase::MessageName(n));
         return all;
     }();
     return texts[static_cast<std::size_t>(alNumber)];
@@ -91,7 +93,8 @@ PostOffice* PostOffice::CreatePostOffice(String asAppName) {
 }
 
 PostOffice* PostOffice::Instance() {
-    return nxbase::StrictSingletonInstance(smInstance, "Please create the PostOffice-Singleton first !");
+    return nxbase::StrictSingletonInstance(smInstance,
+                                           "Please create the PostOffice-Singleton first !");
 }
 
 PostOffice::PostOffice(const String& asAppName)
@@ -207,8 +210,9 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     NX_COMM_LOG(String("Answer received: ") + Number(alNumber));
     auto at = amAnswers.find({axEvent.GetSender(), alNumber});
     if (at == amAnswers.end() || at->second.waiters == 0 || at->second.arrived) {
-        LogFile::WriteToLog(String("Answer nobody waits for dropped: ") + String(axEvent.GetCommand()) +
-                                " from " + String(axEvent.GetSender()),
+        LogFile::WriteToLog(String("Answer nobody waits for dropped: ") +
+                                String(axEvent.GetCommand()) + " from " +
+                                String(axEvent.GetSender()),
                             String(kLogKey));
         return;
     }
@@ -222,9 +226,9 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
 bool PostOffice::CountDisconnect(const std::string& asSender) {
     auto at = amConnectedPeers.find(asSender);
     if (at == amConnectedPeers.end()) {
-        LogFile::WriteToLog(String("Disconnect from ") + String(asSender) +
-                                " ignored: it has no connection",
-                            String(kLogKey));
+        LogFile::WriteToLog(
+            String("Disconnect from ") + String(asSender) + " ignored: it has no connection",
+            String(kLogKey));
         return false;
     }
     --amConnectionCount;
@@ -252,8 +256,8 @@ void PostOffice::HandleCommand(VELTRAEvent& axEvent) {
         ++amLockCount;
     }
     if (number == DISCONNECT) {
-        NX_COMM_LOG(String("Disconnect received from ") + sender + " (" + Number(amConnectionCount) +
-            " connections)");
+        NX_COMM_LOG(String("Disconnect received from ") + sender + " (" +
+                    Number(amConnectionCount) + " connections)");
         if (IsLPMServer()) {
             HandleDisconnectInServer(axEvent);
             return;
@@ -274,7 +278,7 @@ void PostOffice::HandleConnect(VELTRAEvent& axEvent) {
     ++amConnectedPeers[axEvent.GetSender()];
     amQuitTimer.Stop();  // a server about to close keeps running for its new peer
     NX_COMM_LOG(String("Connect received from ") + String(axEvent.GetSender()) + " (" +
-        Number(amConnectionCount) + " connections)");
+                Number(amConnectionCount) + " connections)");
     MyMemoryBlock data = axEvent.GetData();
     unsigned char level = 0;
     data >> level;
@@ -312,7 +316,7 @@ void PostOffice::PeerLost(const std::string& asApp) {
     amConnectionCount -= connected->second;
     amConnectedPeers.erase(connected);
     NX_COMM_LOG(String("Connection lost to ") + String(asApp) + " (" + Number(amConnectionCount) +
-        " connections)");
+                " connections)");
     if (IsLPMServer()) {
         VELTRAEvent event(asApp, nxbase::MessageName(DISCONNECT), MyMemoryBlock());
         amHandlers[DISCONNECT].Call(&event);
@@ -370,15 +374,15 @@ void PostOffice::BotschaftenHandler() {
     // commands are handled wherever they stand, so that it can finish its
     // conversation; the others keep their places until UNLOCK.
     std::vector<VELTRAEvent> waiting;  // no allocation while nobody waits
-    for (std::size_t count = amCommandQueue.size(); count > 0 && !amCommandQueue.empty();
-         --count) {
+    for (std::size_t count = amCommandQueue.size(); count > 0 && !amCommandQueue.empty(); --count) {
         VELTRAEvent event = std::move(amCommandQueue.front());
         amCommandQueue.pop_front();
         if (!locked && String(event.GetSender()) != amLockOwner) {
             waiting.push_back(std::move(event));
             continue;
         }
-        NX_COMM_LOG(String("Botschaften Handler - Handling Message: ") + String(event.GetCommand()));
+        NX_COMM_LOG(String("Botschaften Handler - Handling Message: ") +
+                    String(event.GetCommand()));
         amHandlerBusy = true;
         int number = NumberOfCommand(event);
         Link handler = amHandlers[number];
@@ -438,9 +442,9 @@ unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
         return true;
     }
     amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
-    LogFile::WriteToLog(String("Answer to ") + String(pCommand->GetSender()) + " failed: " +
-                            String(amLastError),
-                        String(kLogKey));
+    LogFile::WriteToLog(
+        String("Answer to ") + String(pCommand->GetSender()) + " failed: " + String(amLastError),
+        String(kLogKey));
     return false;
 }
 
@@ -556,7 +560,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
             Application::Get().RunOneFor(kLongestPause);
         }
         NX_COMM_LOG(answered ? String("Answer received: ") + Number(alMessage)
-                     : String("SendAndReceive, Abort"));
+                             : String("SendAndReceive, Abort"));
     }
     --awaited.waiters;
     if (touchWindow && wasEnabled) ui->EnableTopWindow(true);

@@ -57,8 +57,8 @@ std::size_t Width(int fd) {
 
 std::string Fixed(double value, int precision) {
     char buffer[64];
-    auto result = std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed,
-                                precision);
+    auto result =
+        std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed, precision);
     return std::string(buffer, result.ptr);
 }
 
@@ -274,9 +274,9 @@ CurrentWaitVisualizer::CurrentWaitVisualizer(Window* pParent, const Factory& fCr
     Install(fCreate ? fCreate(pParent) : boost::shared_ptr<ProgressListener>());
 }
 
-CurrentWaitVisualizer::CurrentWaitVisualizer(Window*, const String& asTitle, const String&,
-                                             bool) {
-    Install(boost::shared_ptr<ProgressListener>(new nxbase::TerminalProgressListener(asTitle.str())));
+CurrentWaitVisualizer::CurrentWaitVisualizer(Window*, const String& asTitle, const String&, bool) {
+    Install(
+        boost::shared_ptr<ProgressListener>(new nxbase::TerminalProgressListener(asTitle.str())));
 }
 
 void CurrentWaitVisualizer::Install(boost::shared_ptr<ProgressListener> axListener) {
@@ -323,8 +323,7 @@ bool CurrentWaitVisualizer::IsEnabled() {
 
 namespace nxbase {
 
-TerminalProgressListener::TerminalProgressListener(std::string asLabel, int axFd,
-                                                   DrawMode axMode)
+TerminalProgressListener::TerminalProgressListener(std::string asLabel, int axFd, DrawMode axMode)
     : amLabel(std::move(asLabel)), amFd(axFd) {
     amDrawing = axMode == DrawMode::kAlways ||
                 (axMode == DrawMode::kWhenTerminal && term::IsTerminal(axFd));
@@ -391,8 +390,9 @@ void TerminalProgressListener::DrawLocked(double axProgress) {
     double elapsed =
         std::chrono::duration<double>(std::chrono::steady_clock::now() - amStartTime).count();
     std::string label = amText.empty() ? amLabel : amText;
-    std::string line = "\r" + FormatLine(label, axProgress, elapsed, amTotal, amUnit,
-                                         term::Width(amFd) - 1) +
+    std::string line = "\r" +
+                       FormatLine(label, axProgress, elapsed, amTotal, amUnit,
+                                  term::Width(amFd) - 1) +
                        "\x1b[K";  // erase what a longer earlier line left
     if (axProgress >= 1.0) {
         line += "\n";
@@ -407,14 +407,14 @@ std::string TerminalProgressListener::FormatDuration(double axSeconds) {
     if (!(axSeconds >= 0.0) || axSeconds > 359999.0) return "--:--";
     long total = std::lround(axSeconds);
     long hours = total / 3600, minutes = total / 60 % 60, seconds = total % 60;
-    if (hours > 0) return std::to_string(hours) + ":" + TwoDigits(minutes) + ":" + TwoDigits(seconds);
+    if (hours > 0)
+        return std::to_string(hours) + ":" + TwoDigits(minutes) + ":" + TwoDigits(seconds);
     return std::to_string(minutes) + ":" + TwoDigits(seconds);
 }
 
 std::string TerminalProgressListener::FormatLine(const std::string& asLabel, double axProgress,
                                                  double axElapsedSeconds, std::uint64_t axTotal,
-                                                 const std::string& asUnit,
-                                                 std::size_t axWidth) {
+                                                 const std::string& asUnit, std::size_t axWidth) {
     constexpr std::size_t kMinBar = 10, kMaxBar = 40;
     double p = Clamp01(axProgress);
     std::string percent = std::to_string(static_cast<int>(std::floor(p * 100.0))) + "%";
@@ -438,8 +438,7 @@ std::string TerminalProgressListener::FormatLine(const std::string& asLabel, dou
     std::size_t bar = axWidth > fixed ? std::min(kMaxBar, axWidth - fixed) : kMinBar;
     bar = std::max(bar, kMinBar);
     std::size_t filled = static_cast<std::size_t>(std::floor(p * static_cast<double>(bar)));
-    return asLabel + "  [" + std::string(filled, '#') + std::string(bar - filled, '.') + "]" +
-           tail;
+    return asLabel + "  [" + std::string(filled, '#') + std::string(bar - filled, '.') + "]" + tail;
 }
 
 }  // namespace nxbase

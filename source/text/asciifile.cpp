@@ -1,6 +1,5 @@
 #include "nxbase/asciifile.h"
 
-
 #include <algorithm>
 #include <charconv>
 #include <climits>
@@ -73,8 +72,12 @@ void DosToWindows(std::string& text) {
     }
 }
 
-bool IsBlank(char c) { return c == ' ' || c == kTab; }
-bool IsDigit(char c) { return c >= '0' && c <= '9'; }
+bool IsBlank(char c) {
+    return c == ' ' || c == kTab;
+}
+bool IsDigit(char c) {
+    return c >= '0' && c <= '9';
+}
 
 template <class T>
 T Clamp(long long value) {
@@ -127,9 +130,13 @@ void AppendEscaped(std::string& out, const std::string& text) {
 
 // The current application's version text, from the AppName singleton
 // (which throws when the application has not created it).
-String ApplicationVersionText() { return AppName::Instance()->GetVersionString(); }
+String ApplicationVersionText() {
+    return AppName::Instance()->GetVersionString();
+}
 
-[[noreturn]] void Unsupported() { throw std::logic_error("Unsupported operation"); }
+[[noreturn]] void Unsupported() {
+    throw std::logic_error("Unsupported operation");
+}
 
 bool RejectWriting(bool axForReading) {
     if (!axForReading) throw std::logic_error("ASCIIFile 2 does not support write");
@@ -190,7 +197,8 @@ ASCIIFileImpl::~ASCIIFileImpl() {
     if (!amOwnsStream || !pOwned) return;
     if (pOutput != nullptr) CheckOutError();
     if (!pOwned->Close(!amError) || amError) {
-        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName + "\" failed; the file keeps the lines written before the failure",
+        LogFile::WriteToLog("ASCIIFile: writing \"" + amFileName +
+                                "\" failed; the file keeps the lines written before the failure",
                             "");
     }
 }
@@ -419,8 +427,9 @@ bool ASCIIFileImpl::ScanReal(double& axValue) {
         }
         if (result.ec == std::errc::result_out_of_range) {
             // Too large when a non-zero digit precedes the separator, else too small.
-            bool large = std::find_if(line + start, line + start + integerDigits,
-                                      [](char c) { return c != '0'; }) != line + start + integerDigits;
+            bool large = std::find_if(line + start, line + start + integerDigits, [](char c) {
+                             return c != '0';
+                         }) != line + start + integerDigits;
             value = large ? std::numeric_limits<double>::infinity() : 0.0;
         } else if (result.ec != std::errc()) {
             value = 0.0;  // a lone "-" or separator
@@ -601,7 +610,9 @@ void ASCIIFileImpl::CheckOutError() {
     LatchStreamState();
 }
 
-String ASCIIFileImpl::Trennzeichen() const { return String(amTabMode ? "\t" : " "); }
+String ASCIIFileImpl::Trennzeichen() const {
+    return String(amTabMode ? "\t" : " ");
+}
 
 // ---- writers ----
 
@@ -736,14 +747,36 @@ ASCIIFile2::ASCIIFile2(std::iostream* pStream, bool axForReading, bool axTabMode
 
 ASCIIFile2::~ASCIIFile2() = default;
 
-void ASCIIFile2::PutTitel(const String&) { Unsupported(); }
-void ASCIIFile2::PutBOOL(const String&, bool) { Unsupported(); }
-void ASCIIFile2::PutShort(const String&, short) { Unsupported(); }
-void ASCIIFile2::PutShortArray(const String&, const short*, int) { Unsupported(); }
-void ASCIIFile2::PutInt(const String&, int) { Unsupported(); }
-void ASCIIFile2::PutIntArray(const String&, const int*, int) { Unsupported(); }
-void ASCIIFile2::PutReal(const String&, double, int) { Unsupported(); }
-void ASCIIFile2::PutRealArray(const String&, const double*, int, int) { Unsupported(); }
-void ASCIIFile2::PutDate(const String&, int, int, int, int, int, int) { Unsupported(); }
-void ASCIIFile2::PutString(const String&, const std::vector<String>&) { Unsupported(); }
-void ASCIIFile2::PutString(const String&, const String&) { Unsupported(); }
+void ASCIIFile2::PutTitel(const String&) {
+    Unsupported();
+}
+void ASCIIFile2::PutBOOL(const String&, bool) {
+    Unsupported();
+}
+void ASCIIFile2::PutShort(const String&, short) {
+    Unsupported();
+}
+void ASCIIFile2::PutShortArray(const String&, const short*, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutInt(const String&, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutIntArray(const String&, const int*, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutReal(const String&, double, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutRealArray(const String&, const double*, int, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutDate(const String&, int, int, int, int, int, int) {
+    Unsupported();
+}
+void ASCIIFile2::PutString(const String&, const std::vector<String>&) {
+    Unsupported();
+}
+void ASCIIFile2::PutString(const String&, const String&) {
+    Unsupported();
+}

@@ -55,7 +55,7 @@ bool FsyncRetrying(int fd) {
 // write fails the file is cut back to what the earlier writes left, so that
 // it never ends in a part of a line.
 class DescriptorBuffer : public std::streambuf {
-public:
+  public:
     DescriptorBuffer(int fd, bool writing, bool regularFile = false)
         : fd_(fd), regularFile_(regularFile), buffer_(kBufferSize) {
         if (writing) {
@@ -100,7 +100,7 @@ public:
         return ok;
     }
 
-protected:
+  protected:
     int_type underflow() override {
         if (gptr() < egptr()) return traits_type::to_int_type(*gptr());
         if (fd_ < 0) return traits_type::eof();
@@ -128,7 +128,7 @@ protected:
         return Write(pbase(), pending) ? (Discard(), 0) : -1;
     }
 
-private:
+  private:
     // Writes the pending text up to its last line feed and moves the rest to
     // the front of the buffer.
     bool WriteCompleteLines() {
@@ -136,7 +136,8 @@ private:
         const char* data = pbase();
         const void* last = ::memrchr(data, '\n', pending);
         if (last == nullptr) return true;
-        const std::size_t lines = static_cast<std::size_t>(static_cast<const char*>(last) - data) + 1;
+        const std::size_t lines =
+            static_cast<std::size_t>(static_cast<const char*>(last) - data) + 1;
         if (!Write(data, lines)) return false;
         const std::size_t rest = pending - lines;
         std::memmove(buffer_.data(), data + lines, rest);
@@ -173,7 +174,9 @@ private:
 
 DataFileStream::DataFileStream() = default;
 
-DataFileStream::~DataFileStream() { Close(false); }
+DataFileStream::~DataFileStream() {
+    Close(false);
+}
 
 std::unique_ptr<DataFileStream> DataFileStream::OpenForReading(const std::string& path,
                                                                std::size_t probe) {

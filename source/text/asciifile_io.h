@@ -21,7 +21,7 @@ class DescriptorBuffer;
 // file only ever ends in a whole line: a write that fails is taken back. A
 // symbolic link is followed; a device or a pipe is written the same way.
 class DataFileStream {
-public:
+  public:
     // Opens `path` for reading. Stores the file's size (0 when it cannot be
     // opened) and whether one of its first `probe` bytes is a line feed. A
     // file that cannot be opened yields a stream that is at its end.
@@ -49,7 +49,7 @@ public:
     // failed.
     bool Close(bool commit);
 
-private:
+  private:
     DataFileStream();
 
     std::unique_ptr<DescriptorBuffer> buffer_;

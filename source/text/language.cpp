@@ -39,7 +39,10 @@ constexpr CountryEntry kCountries[] = {
     {7, "ru", "Russian", Language::kRussian},
     {30, "el", "Greek", Language::kGreek},
     {31, "nl", "Nederlands", Language::kDutch},
-    {33, "fr", "Fran\xE7" "ais", Language::kFrench},
+    {33, "fr",
+     "Fran\xE7"
+     "ais",
+     Language::kFrench},
     {34, "es", "Espa\xF1ol", Language::kSpanish},
     {35, "fi", "Suomi", Language::kFinnish},
     {36, "hu", "Magyar", Language::kHungarian},
@@ -84,25 +87,42 @@ struct LangIdEntry {
 // Windows language identifiers with a language of their own; every other
 // identifier means English.
 constexpr LangIdEntry kLangIds[] = {
-    {1025, Language::kArabic},   {1026, Language::kBulgarian},
+    {1025, Language::kArabic},
+    {1026, Language::kBulgarian},
     {1028, Language::kChineseTraditional},
-    {1029, Language::kCzech},    {1030, Language::kDanish},
-    {1031, Language::kGerman},   {2055, Language::kGerman},
-    {4103, Language::kGerman},   {1032, Language::kGreek},
-    {1034, Language::kSpanish},  {2058, Language::kSpanish},
-    {3082, Language::kSpanish},  {1035, Language::kFinnish},
-    {1036, Language::kFrench},   {2060, Language::kFrench},
-    {3084, Language::kFrench},   {4108, Language::kFrench},
-    {1037, Language::kHebrew},   {1038, Language::kHungarian},
-    {1040, Language::kItalian},  {2064, Language::kItalian},
-    {1041, Language::kJapanese}, {1043, Language::kDutch},
-    {2067, Language::kDutch},    {1044, Language::kNorwegian},
-    {2068, Language::kNorwegian}, {1045, Language::kPolish},
-    {1046, Language::kPortuguese}, {2070, Language::kPortuguese},
-    {1049, Language::kRussian},  {1051, Language::kSlovak},
-    {1053, Language::kSwedish},  {1055, Language::kTurkish},
+    {1029, Language::kCzech},
+    {1030, Language::kDanish},
+    {1031, Language::kGerman},
+    {2055, Language::kGerman},
+    {4103, Language::kGerman},
+    {1032, Language::kGreek},
+    {1034, Language::kSpanish},
+    {2058, Language::kSpanish},
+    {3082, Language::kSpanish},
+    {1035, Language::kFinnish},
+    {1036, Language::kFrench},
+    {2060, Language::kFrench},
+    {3084, Language::kFrench},
+    {4108, Language::kFrench},
+    {1037, Language::kHebrew},
+    {1038, Language::kHungarian},
+    {1040, Language::kItalian},
+    {2064, Language::kItalian},
+    {1041, Language::kJapanese},
+    {1043, Language::kDutch},
+    {2067, Language::kDutch},
+    {1044, Language::kNorwegian},
+    {2068, Language::kNorwegian},
+    {1045, Language::kPolish},
+    {1046, Language::kPortuguese},
+    {2070, Language::kPortuguese},
+    {1049, Language::kRussian},
+    {1051, Language::kSlovak},
+    {1053, Language::kSwedish},
+    {1055, Language::kTurkish},
     {2052, Language::kChineseSimplified},
-    {3081, Language::kEnglish},  {4105, Language::kEnglish},
+    {3081, Language::kEnglish},
+    {4105, Language::kEnglish},
 };
 
 struct WinIniEntry {
@@ -111,10 +131,10 @@ struct WinIniEntry {
 };
 
 constexpr WinIniEntry kWinIniNames[] = {
-    {"deu", Language::kGerman},  {"enu", Language::kEnglish},    {"eng", Language::kEnglish},
-    {"fra", Language::kFrench},  {"frc", Language::kFrench},     {"ita", Language::kItalian},
-    {"esp", Language::kSpanish}, {"esn", Language::kSpanish},    {"dan", Language::kDanish},
-    {"fin", Language::kFinnish}, {"nld", Language::kDutch},      {"nor", Language::kNorwegian},
+    {"deu", Language::kGerman},     {"enu", Language::kEnglish}, {"eng", Language::kEnglish},
+    {"fra", Language::kFrench},     {"frc", Language::kFrench},  {"ita", Language::kItalian},
+    {"esp", Language::kSpanish},    {"esn", Language::kSpanish}, {"dan", Language::kDanish},
+    {"fin", Language::kFinnish},    {"nld", Language::kDutch},   {"nor", Language::kNorwegian},
     {"ptg", Language::kPortuguese}, {"sve", Language::kSwedish}, {"heb", Language::kHebrew},
 };
 
@@ -130,37 +150,98 @@ struct PosixEntry {
 // knew, so that each POSIX locale lands where the Windows one did; a
 // territory missing here takes the language's main identifier.
 constexpr PosixEntry kPosixLocales[] = {
-    {"ar", "", 0x0401},   {"bg", "", 0x0402},   {"cs", "", 0x0405},   {"da", "", 0x0406},
-    {"el", "", 0x0408},   {"en", "", 0x0409},   {"fi", "", 0x040B},   {"he", "", 0x040D},
-    {"iw", "", 0x040D},   {"hu", "", 0x040E},   {"ja", "", 0x0411},   {"pl", "", 0x0415},
-    {"ru", "", 0x0419},   {"sk", "", 0x041B},   {"tr", "", 0x041F},   {"lt", "", 0x0427},
-    {"vi", "", 0x042A},   {"nb", "", 0x0414},   {"no", "", 0x0414},   {"nn", "", 0x0814},
+    {"ar", "", 0x0401},
+    {"bg", "", 0x0402},
+    {"cs", "", 0x0405},
+    {"da", "", 0x0406},
+    {"el", "", 0x0408},
+    {"en", "", 0x0409},
+    {"fi", "", 0x040B},
+    {"he", "", 0x040D},
+    {"iw", "", 0x040D},
+    {"hu", "", 0x040E},
+    {"ja", "", 0x0411},
+    {"pl", "", 0x0415},
+    {"ru", "", 0x0419},
+    {"sk", "", 0x041B},
+    {"tr", "", 0x041F},
+    {"lt", "", 0x0427},
+    {"vi", "", 0x042A},
+    {"nb", "", 0x0414},
+    {"no", "", 0x0414},
+    {"nn", "", 0x0814},
     // German.
-    {"de", "", 0x0407},   {"de", "DE", 0x0407}, {"de", "CH", 0x0807}, {"de", "AT", 0x0C07},
-    {"de", "LU", 0x1007}, {"de", "LI", 0x1407},
+    {"de", "", 0x0407},
+    {"de", "DE", 0x0407},
+    {"de", "CH", 0x0807},
+    {"de", "AT", 0x0C07},
+    {"de", "LU", 0x1007},
+    {"de", "LI", 0x1407},
     // English: every territory is English.
-    {"en", "US", 0x0409}, {"en", "GB", 0x0809}, {"en", "AU", 0x0C09}, {"en", "CA", 0x1009},
-    {"en", "NZ", 0x1409}, {"en", "IE", 0x1809},
+    {"en", "US", 0x0409},
+    {"en", "GB", 0x0809},
+    {"en", "AU", 0x0C09},
+    {"en", "CA", 0x1009},
+    {"en", "NZ", 0x1409},
+    {"en", "IE", 0x1809},
     // Spanish; "es_ES" is the modern sort.
-    {"es", "", 0x0C0A},   {"es", "ES", 0x0C0A}, {"es", "MX", 0x080A}, {"es", "GT", 0x100A},
-    {"es", "CR", 0x140A}, {"es", "PA", 0x180A}, {"es", "DO", 0x1C0A}, {"es", "VE", 0x200A},
-    {"es", "CO", 0x240A}, {"es", "PE", 0x280A}, {"es", "AR", 0x2C0A}, {"es", "EC", 0x300A},
-    {"es", "CL", 0x340A}, {"es", "UY", 0x380A}, {"es", "PY", 0x3C0A}, {"es", "BO", 0x400A},
-    {"es", "SV", 0x440A}, {"es", "HN", 0x480A}, {"es", "NI", 0x4C0A}, {"es", "PR", 0x500A},
+    {"es", "", 0x0C0A},
+    {"es", "ES", 0x0C0A},
+    {"es", "MX", 0x080A},
+    {"es", "GT", 0x100A},
+    {"es", "CR", 0x140A},
+    {"es", "PA", 0x180A},
+    {"es", "DO", 0x1C0A},
+    {"es", "VE", 0x200A},
+    {"es", "CO", 0x240A},
+    {"es", "PE", 0x280A},
+    {"es", "AR", 0x2C0A},
+    {"es", "EC", 0x300A},
+    {"es", "CL", 0x340A},
+    {"es", "UY", 0x380A},
+    {"es", "PY", 0x3C0A},
+    {"es", "BO", 0x400A},
+    {"es", "SV", 0x440A},
+    {"es", "HN", 0x480A},
+    {"es", "NI", 0x4C0A},
+    {"es", "PR", 0x500A},
     {"es", "US", 0x540A},
     // French.
-    {"fr", "", 0x040C},   {"fr", "FR", 0x040C}, {"fr", "BE", 0x080C}, {"fr", "CA", 0x0C0C},
-    {"fr", "CH", 0x100C}, {"fr", "LU", 0x140C}, {"fr", "MC", 0x180C}, {"fr", "RE", 0x200C},
-    {"fr", "CD", 0x240C}, {"fr", "SN", 0x280C}, {"fr", "CM", 0x2C0C}, {"fr", "CI", 0x300C},
-    {"fr", "ML", 0x340C}, {"fr", "MA", 0x380C}, {"fr", "HT", 0x3C0C},
+    {"fr", "", 0x040C},
+    {"fr", "FR", 0x040C},
+    {"fr", "BE", 0x080C},
+    {"fr", "CA", 0x0C0C},
+    {"fr", "CH", 0x100C},
+    {"fr", "LU", 0x140C},
+    {"fr", "MC", 0x180C},
+    {"fr", "RE", 0x200C},
+    {"fr", "CD", 0x240C},
+    {"fr", "SN", 0x280C},
+    {"fr", "CM", 0x2C0C},
+    {"fr", "CI", 0x300C},
+    {"fr", "ML", 0x340C},
+    {"fr", "MA", 0x380C},
+    {"fr", "HT", 0x3C0C},
     // Italian, Dutch, Swedish, Portuguese.
-    {"it", "", 0x0410},   {"it", "IT", 0x0410}, {"it", "CH", 0x0810},
-    {"nl", "", 0x0413},   {"nl", "NL", 0x0413}, {"nl", "BE", 0x0813},
-    {"sv", "", 0x041D},   {"sv", "SE", 0x041D}, {"sv", "FI", 0x081D},
-    {"pt", "", 0x0816},   {"pt", "PT", 0x0816}, {"pt", "BR", 0x0416},
+    {"it", "", 0x0410},
+    {"it", "IT", 0x0410},
+    {"it", "CH", 0x0810},
+    {"nl", "", 0x0413},
+    {"nl", "NL", 0x0413},
+    {"nl", "BE", 0x0813},
+    {"sv", "", 0x041D},
+    {"sv", "SE", 0x041D},
+    {"sv", "FI", 0x081D},
+    {"pt", "", 0x0816},
+    {"pt", "PT", 0x0816},
+    {"pt", "BR", 0x0416},
     // Chinese: a bare "zh" is taken as Simplified Chinese.
-    {"zh", "", 0x0804},   {"zh", "CN", 0x0804}, {"zh", "TW", 0x0404}, {"zh", "HK", 0x0C04},
-    {"zh", "SG", 0x1004}, {"zh", "MO", 0x1404},
+    {"zh", "", 0x0804},
+    {"zh", "CN", 0x0804},
+    {"zh", "TW", 0x0404},
+    {"zh", "HK", 0x0C04},
+    {"zh", "SG", 0x1004},
+    {"zh", "MO", 0x1404},
 };
 
 std::string Lower(std::string_view text) {
@@ -183,7 +264,9 @@ std::string_view Trim(std::string_view text) {
     return text.substr(first, last - first + 1);
 }
 
-void Log(const std::string& text, const char* key = kLogKey) { LogFile::WriteToLog(text, key); }
+void Log(const std::string& text, const char* key = kLogKey) {
+    LogFile::WriteToLog(text, key);
+}
 
 }  // namespace
 
@@ -246,7 +329,8 @@ std::string ReadWinIniLanguage(const std::string& asPath) {
         if (line.empty() || line.front() == ';') continue;
         if (line.front() == '[') {
             std::size_t close = line.find(']');
-            inIntl = close != std::string_view::npos && Lower(Trim(line.substr(1, close - 1))) == "intl";
+            inIntl =
+                close != std::string_view::npos && Lower(Trim(line.substr(1, close - 1))) == "intl";
             continue;
         }
         if (!inIntl) continue;
@@ -267,8 +351,8 @@ FileLanguageAccessChecker::FileLanguageAccessChecker(const String& asBasePath)
     : amBasePath(toolkit::NormalizePath(asBasePath.str())) {}
 
 bool FileLanguageAccessChecker::IsAccessible(LanguageCode axCode) const {
-    return nxbase::detail::IsReadableFile(amBasePath.str() + std::to_string(static_cast<int>(axCode)) +
-                                          ".lng");
+    return nxbase::detail::IsReadableFile(amBasePath.str() +
+                                          std::to_string(static_cast<int>(axCode)) + ".lng");
 }
 
 std::unique_ptr<LanguageAccessChecker> FileLanguageAccessChecker::Clone() const {
@@ -302,7 +386,9 @@ Language* Language::Instance() {
                                            "Please create the Language-Singleton first !");
 }
 
-bool Language::IsInitialized() { return smInstance != nullptr; }
+bool Language::IsInitialized() {
+    return smInstance != nullptr;
+}
 
 Language::Language(ConfigInterface* pConfigArg, std::unique_ptr<LanguageAccessChecker> pCheckerArg)
     : NxSingleton("Language"), pConfig(pConfigArg), pChecker(std::move(pCheckerArg)) {
@@ -326,7 +412,9 @@ Language::~Language() {
     if (smInstance == this) smInstance = nullptr;
 }
 
-LanguageCode Language::GetCountryCode() const { return LanguageToCountryCode(amLanguage); }
+LanguageCode Language::GetCountryCode() const {
+    return LanguageToCountryCode(amLanguage);
+}
 
 std::string Language::GetShortLanguageName() const {
     return CountryCodeToShortLanguageName(GetCountryCode());

@@ -2,9 +2,6 @@
 // the two error reporters.
 #include "nxbase/text.h"
 
-#include "nxbase/files.h"
-#include "toolkit/string.h"
-
 #include <boost/regex.hpp>
 #include <clocale>
 #include <cstring>
@@ -12,10 +9,12 @@
 #include <vector>
 
 #include "nxbase/appconfig.h"
+#include "nxbase/files.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "text_os.h"
 #include "toolkit/direntry.h"
+#include "toolkit/string.h"
 #include "toolkit/system.h"
 #include "toolkit/userinterface.h"
 
@@ -59,9 +58,13 @@ const boost::regex& TextExpression() {
     return expression;
 }
 
-void Log(const std::string& text, const char* key = kLogKey) { LogFile::WriteToLog(text, key); }
+void Log(const std::string& text, const char* key = kLogKey) {
+    LogFile::WriteToLog(text, key);
+}
 
-std::string Quoted(const std::string& text) { return "\"" + text + "\""; }
+std::string Quoted(const std::string& text) {
+    return "\"" + text + "\"";
+}
 
 using LineMatch = boost::match_results<std::string_view::const_iterator>;
 
@@ -101,9 +104,13 @@ std::string TextFilePrefix(const String& base) {
     return (AppDir::Instance()->LngDirEntry() + DirEntry(base)).GetFull().str();
 }
 
-std::string Utf8ToAnsi(std::string_view utf8) { return Utf8ToWindows1252(utf8); }
+std::string Utf8ToAnsi(std::string_view utf8) {
+    return Utf8ToWindows1252(utf8);
+}
 
-std::string AnsiToUtf8(std::string_view ansi) { return toolkit::Windows1252ToUtf8(ansi); }
+std::string AnsiToUtf8(std::string_view ansi) {
+    return toolkit::Windows1252ToUtf8(ansi);
+}
 
 void ParseTextBytes(std::string_view bytes, const std::string& fileName) {
     Log("Parse text file: " + Quoted(fileName));
@@ -175,11 +182,13 @@ std::string LoadErrorMessage(int language, const std::string& fileName, int code
     switch (code) {
         case 1:
             // "ö" in Windows-1252.
-            message += german ? "Es ist nicht m\xF6glich die Textdatei zu \xF6" "ffnen"
+            message += german ? "Es ist nicht m\xF6glich die Textdatei zu \xF6"
+                                "ffnen"
                               : "unable to open text file";
             break;
         case 2:
-            message += german ? "Mehr als " + limit + " Textgruppen" : "more then " + limit + " text groups";
+            message += german ? "Mehr als " + limit + " Textgruppen"
+                              : "more then " + limit + " text groups";
             break;
         default:
             message += german ? "Allgemeiner Fehler" : "general error";
@@ -242,11 +251,17 @@ unsigned long Text::GetEntryCount(const String& asGroup) {
     return group == table.end() ? 0 : static_cast<unsigned long>(group->second.size());
 }
 
-String Text::ConvertText(const String& asText) { return asText; }
+String Text::ConvertText(const String& asText) {
+    return asText;
+}
 
-void Text::FreeResources() { Store().table.clear(); }
+void Text::FreeResources() {
+    Store().table.clear();
+}
 
-int Text::GetLanguage() { return Store().language; }
+int Text::GetLanguage() {
+    return Store().language;
+}
 
 bool Text::SyntaxError(const String& asFileName, char axMissing, const String& asGroup) {
     return UserInterface::Current()->QueryBox(

@@ -15,10 +15,10 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
-#include "nxbase/version.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
+#include "nxbase/version.h"
 #include "spectra_csv.h"
 #include "toolkit/application.h"
 #include "toolkit/system.h"
@@ -111,10 +111,10 @@ class Server {
     }
     long Text(void* p) {
         int number = PostOffice::Instance()->NumberOfCommand(Event(p));
-        const char* text = number == GET_APP_VERSION   ? kVersion
-                           : number == GET_SW_VERSION  ? "lumaserver 3.0 (NxBase emulator)"
-                           : number == GET_SERIE_NR    ? "EMU-0001"
-                                                       : "LumaSpectro Emulator";
+        const char* text = number == GET_APP_VERSION  ? kVersion
+                           : number == GET_SW_VERSION ? "lumaserver 3.0 (NxBase emulator)"
+                           : number == GET_SERIE_NR   ? "EMU-0001"
+                                                      : "LumaSpectro Emulator";
         MyMemoryBlock answer;
         answer << kDone << String(text);
         Reply(p, answer);

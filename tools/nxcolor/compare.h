@@ -38,11 +38,11 @@ struct Comparison {
     std::size_t overTolerance = 0;
 };
 
-Comparison Compare(const SpectraTable& reference, const SpectraTable& sample, const MeasuringCondition& condition,
-                   const CompareOptions& options);
+Comparison Compare(const SpectraTable& reference, const SpectraTable& sample,
+                   const MeasuringCondition& condition, const CompareOptions& options);
 
-void WriteComparison(const Comparison& comparison, const CompareOptions& options, const std::string& header,
-                     std::ostream& out);
+void WriteComparison(const Comparison& comparison, const CompareOptions& options,
+                     const std::string& header, std::ostream& out);
 
 // "N pairs: mean ..., max ..., 95th percentile ...", the worst pairs, and
 // how many exceed the tolerance.

@@ -2,20 +2,20 @@
 // densities) under a chosen illuminant, observer and density standard, from a
 // CSV or CGATS file or the built-in ColorChecker chart.
 #include <cctype>
-#include <cmath>
 #include <charconv>
+#include <cmath>
 #include <cstdio>
 #include <iostream>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "compare.h"
 #include "klume/cmetry/repository.h"
+#include "measure.h"
 #include "nxbase/colorvector.h"
 #include "nxbase/progress.h"
 #include "nxbase/version.h"
-#include "compare.h"
-#include "measure.h"
 #include "report.h"
 #include "screen.h"
 #include "spectra_csv.h"
@@ -24,8 +24,8 @@ namespace {
 
 // Exit status.
 constexpr int kExitOk = 0;
-constexpr int kExitRowsRejected = 1;  // some rows bad, the others printed
-constexpr int kExitUsage = 2;         // bad options, unreadable or unusable input
+constexpr int kExitRowsRejected = 1;   // some rows bad, the others printed
+constexpr int kExitUsage = 2;          // bad options, unreadable or unusable input
 constexpr int kExitOverTolerance = 3;  // --compare: a pair above --tolerance
 
 constexpr int kMaxPrecision = 9;
@@ -34,7 +34,8 @@ constexpr int kMaxPrecision = 9;
 bool ParseWholeNumber(const std::string& text, double* value) {
     double x = 0.0;
     const auto r = std::from_chars(text.data(), text.data() + text.size(), x);
-    if (r.ec != std::errc() || r.ptr != text.data() + text.size() || !std::isfinite(x)) return false;
+    if (r.ec != std::errc() || r.ptr != text.data() + text.size() || !std::isfinite(x))
+        return false;
     *value = x;
     return true;
 }
@@ -192,7 +193,8 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             if (!take(&text)) return arg + " needs a number";
             int n = -1;
             const auto r = std::from_chars(text.data(), text.data() + text.size(), n);
-            if (r.ec != std::errc() || r.ptr != text.data() + text.size() || n < 0 || n > kMaxPrecision) {
+            if (r.ec != std::errc() || r.ptr != text.data() + text.size() || n < 0 ||
+                n > kMaxPrecision) {
                 return "precision must be 0..9, not \"" + text + "\"";
             }
             options->precision = n;
@@ -228,7 +230,8 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
             options->compareOptions.byOrder = true;
         } else if (arg == "--de") {
             std::string text;
-            if (!take(&text) || !nxbase::ParseDeltaEMethod(text.c_str(), &options->compareOptions.method)) {
+            if (!take(&text) ||
+                !nxbase::ParseDeltaEMethod(text.c_str(), &options->compareOptions.method)) {
                 return "--de needs 2000, 94, 94t, cmc, cmc11 or ab";
             }
         } else if (arg == "--tolerance") {
@@ -264,7 +267,8 @@ std::string ResolveIlluminant(Options* options) {
     if (LooksLikePath(options->illuminant)) {
         std::string name;
         std::string error;
-        if (!klume::cmetry::IlluminantRepository::AddFile(options->illuminant, &name, &error)) return error;
+        if (!klume::cmetry::IlluminantRepository::AddFile(options->illuminant, &name, &error))
+            return error;
         options->illuminant = name;
         return "";
     }
@@ -282,7 +286,8 @@ std::string ResolveDensity(Options* options) {
     if (LooksLikePath(options->density)) {
         std::string name;
         std::string error;
-        if (!klume::cmetry::DensityStandardRepository::AddFile(options->density, &name, &error)) return error;
+        if (!klume::cmetry::DensityStandardRepository::AddFile(options->density, &name, &error))
+            return error;
         options->density = name;
         return "";
     }
@@ -294,7 +299,8 @@ std::string ResolveDensity(Options* options) {
 }
 
 // Reads one input; false (after saying why) when it gives nothing usable.
-bool ReadInput(const std::string& file, const Options& options, nxcolor::SpectraTable* table, std::string* source) {
+bool ReadInput(const std::string& file, const Options& options, nxcolor::SpectraTable* table,
+               std::string* source) {
     std::string error;
     if (file.empty()) {
         *source = nxcolor::EmbeddedChartName();
@@ -316,10 +322,12 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
         for (const std::string& note : table->notes) std::cerr << "nxcolor: " << note << '\n';
         if (!table->sourceWavelengths.empty()) {
             std::cerr << "nxcolor: " << *source << ": " << table->rows.size() << " spectra, "
-                      << table->sourceWavelengths.size() << " wavelengths " << table->sourceWavelengths.front()
-                      << ".." << table->sourceWavelengths.back() << " nm, " << table->resampling << ", "
+                      << table->sourceWavelengths.size() << " wavelengths "
+                      << table->sourceWavelengths.front() << ".." << table->sourceWavelengths.back()
+                      << " nm, " << table->resampling << ", "
                       << (table->percent ? "percent" : "reflectance factors")
-                      << (table->fineGrid ? "; colour summed at the file's own interval" : "") << '\n';
+                      << (table->fineGrid ? "; colour summed at the file's own interval" : "")
+                      << '\n';
         }
     }
     if (table->unusable) return false;
@@ -340,23 +348,27 @@ int RunCompare(Options& options, const MeasuringCondition& condition) {
     if (!ReadInput(options.secondFile, options, &sample, &sampleName)) return kExitUsage;
     options.compareOptions.precision = options.precisionGiven ? options.precision : 2;
     options.compareOptions.csv = options.format == "csv";
-    if (options.format != "table" && options.format != "csv") return UsageError("--compare writes table or csv");
-    const nxcolor::Comparison comparison = nxcolor::Compare(reference, sample, condition, options.compareOptions);
+    if (options.format != "table" && options.format != "csv")
+        return UsageError("--compare writes table or csv");
+    const nxcolor::Comparison comparison =
+        nxcolor::Compare(reference, sample, condition, options.compareOptions);
     // A thousand unmatched samples say no more than the first few.
     constexpr std::size_t kShownProblems = 10;
     for (std::size_t i = 0; i < comparison.problems.size() && i < kShownProblems; ++i) {
         std::cerr << "nxcolor: " << comparison.problems[i] << '\n';
     }
     if (comparison.problems.size() > kShownProblems) {
-        std::cerr << "nxcolor: ... and " << comparison.problems.size() - kShownProblems << " more\n";
+        std::cerr << "nxcolor: ... and " << comparison.problems.size() - kShownProblems
+                  << " more\n";
     }
     if (comparison.pairs.empty()) {
-        std::cerr << "nxcolor: no sample of " << sampleName << " has a reference in " << referenceName
-                  << " (the ids differ; --by-order pairs by position)\n";
+        std::cerr << "nxcolor: no sample of " << sampleName << " has a reference in "
+                  << referenceName << " (the ids differ; --by-order pairs by position)\n";
         return kExitUsage;
     }
-    const std::string header = sampleName + " against " + referenceName + ": illuminant " + options.illuminant +
-                               ", observer " + options.observer + "\xC2\xB0, " +
+    const std::string header = sampleName + " against " + referenceName + ": illuminant " +
+                               options.illuminant + ", observer " + options.observer +
+                               "\xC2\xB0, " +
                                nxbase::DeltaEMethodName(options.compareOptions.method);
     nxcolor::WriteComparison(comparison, options.compareOptions, header, std::cout);
     for (const std::string& line : nxcolor::SummaryLines(comparison, options.compareOptions)) {
@@ -368,7 +380,8 @@ int RunCompare(Options& options, const MeasuringCondition& condition) {
         return kExitUsage;
     }
     if (comparison.overTolerance > 0) return kExitOverTolerance;
-    const bool rejected = !reference.errors.empty() || !sample.errors.empty() || !comparison.problems.empty();
+    const bool rejected =
+        !reference.errors.empty() || !sample.errors.empty() || !comparison.problems.empty();
     return rejected ? kExitRowsRejected : kExitOk;
 }
 
@@ -382,7 +395,8 @@ int Run(Options& options) {
         return kExitOk;
     }
     if (options.listIlluminants) {
-        for (const std::string& name : klume::cmetry::IlluminantRepository::GetNames()) std::cout << name << '\n';
+        for (const std::string& name : klume::cmetry::IlluminantRepository::GetNames())
+            std::cout << name << '\n';
         for (const std::string& name : klume::cmetry::IlluminantRepository::GetInstalledNames()) {
             std::cout << name << " (installed)\n";
         }
@@ -398,14 +412,17 @@ int Run(Options& options) {
     if (!densityProblem.empty()) return UsageError(densityProblem);
     const auto writer = nxcolor::Writers().find(options.format);
     if (writer == nxcolor::Writers().end()) {
-        return UsageError("unknown format \"" + options.format + "\"; use table, csv, cgats or ti3");
+        return UsageError("unknown format \"" + options.format +
+                          "\"; use table, csv, cgats or ti3");
     }
-    if (options.keepSpectra && options.format != "cgats") return UsageError("--keep-spectra needs -f cgats");
+    if (options.keepSpectra && options.format != "cgats")
+        return UsageError("--keep-spectra needs -f cgats");
     const MeasuringCondition condition(
         IllumClass(options.illuminant), observer,
         options.density.empty() ? DStdClass() : DStdClass(options.density), PhysicalConditions());
     if (options.compare) return RunCompare(options, condition);
-    if (!options.secondFile.empty()) return UsageError("more than one input file (--compare takes two)");
+    if (!options.secondFile.empty())
+        return UsageError("more than one input file (--compare takes two)");
 
     nxcolor::SpectraTable table;
     std::string source;
@@ -418,8 +435,8 @@ int Run(Options& options) {
         if (!nxcolor::MeasureThroughServer(options.measure, &table, &error, &measuring)) {
             std::cerr << "nxcolor: " << error << '\n';
             if (table.rows.empty()) return kExitUsage;
-            table.errors.push_back(source + ": measuring stopped after " + std::to_string(table.rows.size()) +
-                                   " patches");
+            table.errors.push_back(source + ": measuring stopped after " +
+                                   std::to_string(table.rows.size()) + " patches");
             std::cerr << "nxcolor: " << table.errors.back() << '\n';
         }
     } else if (!ReadInput(options.file, options, &table, &source)) {

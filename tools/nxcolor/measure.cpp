@@ -5,7 +5,8 @@
 
 namespace nxcolor {
 
-bool MeasureThroughServer(int count, SpectraTable* table, std::string* error, ProgressListener* progress) {
+bool MeasureThroughServer(int count, SpectraTable* table, std::string* error,
+                          ProgressListener* progress) {
     PostOffice* office = PostOffice::CreatePostOffice("nxcolor");
     std::vector<nxbase::MeasuredSpectrum> measured;
     const bool ok = nxbase::MeasureWithLumaServer(*office, count, &measured, error, progress);

@@ -1,8 +1,6 @@
 // nxcolor's quantities and output layouts.
 #include "report.h"
 
-#include "screen.h"
-
 #include <algorithm>
 #include <charconv>
 #include <cmath>
@@ -10,13 +8,14 @@
 #include <optional>
 
 #include "nxbase/finegrid.h"
+#include "screen.h"
 
 namespace nxcolor {
 namespace {
 
 // The process-wide Lab type set for one computation and restored after it.
 class ScopedLabType {
-public:
+  public:
     explicit ScopedLabType(LabColorSpaceType type) : amPrevious(LABVector::GetColorSpaceType()) {
         LABVector::SetColorSpaceType(type);
     }
@@ -24,7 +23,7 @@ public:
     ScopedLabType(const ScopedLabType&) = delete;
     ScopedLabType& operator=(const ScopedLabType&) = delete;
 
-private:
+  private:
     LabColorSpaceType amPrevious;
 };
 
@@ -48,18 +47,23 @@ void PutScreenColor(const ScreenColor& c, float* pOut) {
 
 // A CIE 1976 LABVector of values computed elsewhere.
 LABVector LabOf(const Triple& lab, const MeasuringCondition& mc) {
-    return LABVector(static_cast<float>(lab[0]), static_cast<float>(lab[1]), static_cast<float>(lab[2]), mc);
+    return LABVector(static_cast<float>(lab[0]), static_cast<float>(lab[1]),
+                     static_cast<float>(lab[2]), mc);
 }
 
 std::vector<Quantity> MakeQuantities() {
     std::vector<Quantity> q;
-    q.push_back({"xyz", {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
+    q.push_back({"xyz",
+                 {{"X", "XYZ_X"}, {"Y", "XYZ_Y"}, {"Z", "XYZ_Z"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(XYZVector(filter, s), out);
                  },
-                 [](const Triple& xyz, const Triple&, const MeasuringCondition&, float* out) { CopyTriple(xyz, out); }});
-    q.push_back({"xyy", {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
+                 [](const Triple& xyz, const Triple&, const MeasuringCondition&, float* out) {
+                     CopyTriple(xyz, out);
+                 }});
+    q.push_back({"xyy",
+                 {{"x", "XYY_X"}, {"y", "XYY_Y"}, {"Y", "XYY_CAPY"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      const CMetryFilter filter(Lichtart(mc.GetIllum()), Observer(mc.GetObserver()));
                      CopyThree(xyYVector(XYZVector(filter, s)), out);
@@ -68,13 +72,17 @@ std::vector<Quantity> MakeQuantities() {
                      const double sum = xyz[0] + xyz[1] + xyz[2];
                      CopyTriple({xyz[0] / sum, xyz[1] / sum, xyz[1]}, out);
                  }});
-    q.push_back({"lab", {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
+    q.push_back({"lab",
+                 {{"L*", "LAB_L"}, {"a*", "LAB_A"}, {"b*", "LAB_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      CopyThree(LABVector(s, mc), out);
                  },
-                 [](const Triple&, const Triple& lab, const MeasuringCondition&, float* out) { CopyTriple(lab, out); }});
-    q.push_back({"lch", {{"C*", "LAB_C"}, {"h", "LAB_H"}},
+                 [](const Triple&, const Triple& lab, const MeasuringCondition&, float* out) {
+                     CopyTriple(lab, out);
+                 }});
+    q.push_back({"lch",
+                 {{"C*", "LAB_C"}, {"h", "LAB_H"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
                      const LChVector lch{LABVector(s, mc)};
@@ -86,7 +94,8 @@ std::vector<Quantity> MakeQuantities() {
                      out[0] = lch[1];
                      out[1] = lch[2];
                  }});
-    q.push_back({"din99", {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
+    q.push_back({"din99",
+                 {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType din(LAB_DIN99);
                      CopyThree(LABVector(s, mc), out);
@@ -99,7 +108,8 @@ std::vector<Quantity> MakeQuantities() {
     // ISO 5-3 status densities of the condition's density standard (red,
     // green, blue filter: cyan, magenta, yellow density); NaN where the
     // weighted reflectance is not positive.
-    q.push_back({"density", {{"D_RED", "D_RED"}, {"D_GREEN", "D_GREEN"}, {"D_BLUE", "D_BLUE"}},
+    q.push_back({"density",
+                 {{"D_RED", "D_RED"}, {"D_GREEN", "D_GREEN"}, {"D_BLUE", "D_BLUE"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      thread_local std::string name;
                      thread_local DichteFilter filter;
@@ -115,7 +125,8 @@ std::vector<Quantity> MakeQuantities() {
                  nullptr});
     // Screen colour levels 0..255 and their hex code (not a CGATS.17 field).
     Column hex{"hex", "SCREEN_HEX", 0, true, Column::Kind::kHexColor};
-    q.push_back({"rgb", {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
+    q.push_back({"rgb",
+                 {{"R", "RGB_R", 0, true}, {"G", "RGB_G", 0, true}, {"B", "RGB_B", 0, true}, hex},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      PutScreenColor(ScreenColorOf(s, mc), out);
                  },
@@ -188,25 +199,30 @@ void WriteCgats(const Report& report, std::ostream& out) {
         << "WEIGHTING_FUNCTION " << CgatsString("ILLUMINANT, " + report.illuminant) << "\n"
         << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer + " degree") << "\n"
         << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n";
-    if (densities) out << "KEYWORD \"DENSITY_STANDARD\"\nDENSITY_STANDARD " << CgatsString(report.densityStandard) << "\n";
+    if (densities)
+        out << "KEYWORD \"DENSITY_STANDARD\"\nDENSITY_STANDARD "
+            << CgatsString(report.densityStandard) << "\n";
     if (report.keepSpectra) {
         out << "SPECTRAL_BANDS \"" << kSpectrumSize << "\"\n"
             << "SPECTRAL_START_NM \"" << kFirstWavelength << "\"\n"
-            << "SPECTRAL_END_NM \"" << kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1) << "\"\n"
+            << "SPECTRAL_END_NM \"" << kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1)
+            << "\"\n"
             << "SPECTRAL_NORM \"1.0\"\n";
     }
-    out << "NUMBER_OF_FIELDS " << report.columns.size() + 2 + (report.keepSpectra ? kSpectrumSize : 0) << "\n"
+    out << "NUMBER_OF_FIELDS "
+        << report.columns.size() + 2 + (report.keepSpectra ? kSpectrumSize : 0) << "\n"
         << "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME";
     for (const Column& c : report.columns) out << ' ' << c.cgats;
     if (report.keepSpectra) {
-        for (int k = 0; k < kSpectrumSize; ++k) out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
+        for (int k = 0; k < kSpectrumSize; ++k)
+            out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
     }
     out << "\nEND_DATA_FORMAT\n"
         << "NUMBER_OF_SETS " << report.rows.size() << "\n"
         << "BEGIN_DATA\n";
     for (const ReportRow& row : report.rows) {
-        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId) << ' '
-            << CgatsString(row.sampleName);
+        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId)
+            << ' ' << CgatsString(row.sampleName);
         for (std::size_t i = 0; i < row.values.size(); ++i) {
             const Column& column = report.columns[i];
             // Text cells (the screen colour's hex code) are quoted strings.
@@ -248,13 +264,15 @@ void WriteTi3(const Report& report, std::ostream& out) {
         << "KEYWORD \"ILLUMINANT\"\nILLUMINANT " << CgatsString(report.illuminant) << "\n"
         << "KEYWORD \"OBSERVER\"\nOBSERVER " << CgatsString(report.observer + " degree") << "\n"
         << "KEYWORD \"SPECTRAL_BANDS\"\nSPECTRAL_BANDS \"" << kSpectrumSize << "\"\n"
-        << "KEYWORD \"SPECTRAL_START_NM\"\nSPECTRAL_START_NM \"" << kFirstWavelength << ".000000\"\n"
+        << "KEYWORD \"SPECTRAL_START_NM\"\nSPECTRAL_START_NM \"" << kFirstWavelength
+        << ".000000\"\n"
         << "KEYWORD \"SPECTRAL_END_NM\"\nSPECTRAL_END_NM \""
         << kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1) << ".000000\"\n"
         << "KEYWORD \"SPECTRAL_NORM\"\nSPECTRAL_NORM \"100.0\"\n\n"
         << "NUMBER_OF_FIELDS " << 2 + 3 + 3 + kSpectrumSize << "\n"
         << "BEGIN_DATA_FORMAT\nSAMPLE_ID SAMPLE_NAME RGB_R RGB_G RGB_B XYZ_X XYZ_Y XYZ_Z";
-    for (int k = 0; k < kSpectrumSize; ++k) out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
+    for (int k = 0; k < kSpectrumSize; ++k)
+        out << " SPEC_" << kFirstWavelength + kWavelengthStep * k;
     out << "\nEND_DATA_FORMAT\n\n"
         << "NUMBER_OF_SETS " << report.rows.size() << "\n"
         << "BEGIN_DATA\n";
@@ -264,13 +282,17 @@ void WriteTi3(const Report& report, std::ostream& out) {
         xyz[c] = ColumnIndex(report, kXyz[c]);
     }
     for (const ReportRow& row : report.rows) {
-        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId) << ' '
-            << CgatsString(row.sampleName);
+        out << CgatsString(row.sampleId.empty() && row.sampleName.empty() ? row.id : row.sampleId)
+            << ' ' << CgatsString(row.sampleName);
         for (int c = 0; c < 3; ++c) {
-            out << ' ' << FormatNumber(device[c] < 0 ? 0.0f : row.values[device[c]] * (100.0f / 255.0f), 4);
+            out << ' '
+                << FormatNumber(device[c] < 0 ? 0.0f : row.values[device[c]] * (100.0f / 255.0f),
+                                4);
         }
-        for (int c = 0; c < 3; ++c) out << ' ' << FormatNumber(xyz[c] < 0 ? 0.0f : row.values[xyz[c]], 6);
-        for (const float v : row.spectrum) out << ' ' << FormatNumber(100.0f * v, kSpectrumDecimals);
+        for (int c = 0; c < 3; ++c)
+            out << ' ' << FormatNumber(xyz[c] < 0 ? 0.0f : row.values[xyz[c]], 6);
+        for (const float v : row.spectrum)
+            out << ' ' << FormatNumber(100.0f * v, kSpectrumDecimals);
         out << '\n';
     }
     out << "END_DATA\n";
@@ -364,14 +386,16 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
             } else {
                 q->compute(spectrum, condition, values);
             }
-            for (std::size_t c = 0; c < q->columns.size() && bad.empty() && q->key != "density"; ++c) {
-                if (!std::isfinite(values[c])) bad = q->columns[c].name + " is " + FormatNumber(values[c], 0);
+            for (std::size_t c = 0; c < q->columns.size() && bad.empty() && q->key != "density";
+                 ++c) {
+                if (!std::isfinite(values[c]))
+                    bad = q->columns[c].name + " is " + FormatNumber(values[c], 0);
             }
             row.values.insert(row.values.end(), values, values + q->columns.size());
         }
         if (!bad.empty()) {
-            report.errors.push_back(source + ":" + (in.line > 0 ? std::to_string(in.line) : "?") + ": " + bad +
-                                    "; the spectrum is left out");
+            report.errors.push_back(source + ":" + (in.line > 0 ? std::to_string(in.line) : "?") +
+                                    ": " + bad + "; the spectrum is left out");
             continue;
         }
         report.rows.push_back(std::move(row));
@@ -381,7 +405,8 @@ Report Evaluate(const SpectraTable& table, const std::string& source,
 }
 
 const std::map<std::string, Writer>& Writers() {
-    static const std::map<std::string, Writer> writers = {{"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}, {"ti3", WriteTi3}};
+    static const std::map<std::string, Writer> writers = {
+        {"table", WriteTable}, {"csv", WriteCsv}, {"cgats", WriteCgats}, {"ti3", WriteTi3}};
     return writers;
 }
 
@@ -398,7 +423,8 @@ std::string FormatNumber(float value, int precision) {
     char buffer[64];
     double v = value;
     if (v == 0.0) v = 0.0;  // no "-0.0000"
-    const auto result = std::to_chars(buffer, buffer + sizeof buffer, v, std::chars_format::fixed, precision);
+    const auto result =
+        std::to_chars(buffer, buffer + sizeof buffer, v, std::chars_format::fixed, precision);
     std::string text(buffer, result.ptr);
     // A tiny negative value rounds to "-0.00": print it unsigned.
     if (text.front() == '-' && text.find_first_not_of("-0.") == std::string::npos) text.erase(0, 1);

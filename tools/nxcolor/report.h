@@ -47,17 +47,17 @@ struct Quantity {
 const std::vector<Quantity>& Quantities();
 
 struct ReportRow {
-    std::string id;          // id and name joined
-    std::string sampleId;    // as the input gave them (CGATS SAMPLE_ID, SAMPLE_NAME)
+    std::string id;        // id and name joined
+    std::string sampleId;  // as the input gave them (CGATS SAMPLE_ID, SAMPLE_NAME)
     std::string sampleName;
     std::array<float, kSpectrumSize> spectrum{};
     std::vector<float> values;  // one per column of the report
 };
 
 struct Report {
-    std::string source;       // file name or the built-in chart's name
-    std::string illuminant;   // "D65"
-    std::string observer;     // "10"
+    std::string source;           // file name or the built-in chart's name
+    std::string illuminant;       // "D65"
+    std::string observer;         // "10"
     std::string densityStandard;  // "Status T" (used by the density columns)
     std::vector<Column> columns;
     std::vector<ReportRow> rows;
@@ -67,7 +67,7 @@ struct Report {
     // CGATS: also write the spectra (SPEC_380..SPEC_730), making the output a
     // measurement file other software reads back.
     bool keepSpectra = false;
-    std::string created;     // ISO 8601 time of the run; empty: now
+    std::string created;  // ISO 8601 time of the run; empty: now
     std::string originator = "nxcolor";
 };
 

@@ -1,8 +1,7 @@
 // nxcolor's screen colours and SVG chart picture.
-#include "nxbase/files.h"
 #include "screen.h"
 
-#include "toolkit/string.h"
+#include <unistd.h>
 
 #include <algorithm>
 #include <charconv>
@@ -10,17 +9,18 @@
 #include <filesystem>
 #include <fstream>
 #include <sstream>
-#include <unistd.h>
 
 #include "nxbase/appconfig.h"
 #include "nxbase/colorconverter.h"
+#include "nxbase/files.h"
 #include "nxbase/iccprofile.h"
+#include "toolkit/string.h"
 
 namespace nxcolor {
 namespace {
 
 // Layout of the picture, in SVG user units (px).
-constexpr int kCell = 210;         // cell width and height
+constexpr int kCell = 210;  // cell width and height
 constexpr int kMargin = 20;
 constexpr int kTitleHeight = 56;
 constexpr int kSwatchHeight = 88;
@@ -31,8 +31,8 @@ constexpr std::size_t kMaxIdChars = 26;  // of the bold 13 px id font in a cell
 std::string Num(double value, int precision) {
     char buffer[64];
     if (value == 0.0) value = 0.0;
-    auto result = std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed,
-                                precision);
+    auto result =
+        std::to_chars(buffer, buffer + sizeof buffer, value, std::chars_format::fixed, precision);
     return std::string(buffer, result.ptr);
 }
 
@@ -43,10 +43,18 @@ std::string Escape(const std::string& raw) {
     std::string out;
     for (char c : text) {
         switch (c) {
-            case '&': out += "&amp;"; break;
-            case '<': out += "&lt;"; break;
-            case '>': out += "&gt;"; break;
-            case '"': out += "&quot;"; break;
+            case '&':
+                out += "&amp;";
+                break;
+            case '<':
+                out += "&lt;";
+                break;
+            case '>':
+                out += "&gt;";
+                break;
+            case '"':
+                out += "&quot;";
+                break;
             default:
                 // Control characters are not allowed in XML 1.0.
                 if (static_cast<unsigned char>(c) < 0x20 && c != '\t') {
@@ -103,8 +111,8 @@ class ScopedLab {
     LabColorSpaceType previous_;
 };
 
-void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition& condition,
-               int x, int y) {
+void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition& condition, int x,
+               int y) {
     const ReflectanceSpectrum spectrum(row.spectrum.data(), PhysicalConditions());
     ScopedLab cie;
     const LABVector lab(spectrum, condition);
@@ -115,8 +123,8 @@ void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition
         << Hex(colour) << "\" stroke=\"#888\" stroke-width=\"1\"/>\n";
     // The hex code sits in the swatch's corner, in a colour that reads on it.
     out << "  <text x=\"" << w - 6 << "\" y=\"" << kSwatchHeight - 7
-        << "\" class=\"hex\" text-anchor=\"end\" fill=\"" << TextOn(colour) << "\">"
-        << Hex(colour) << "</text>\n";
+        << "\" class=\"hex\" text-anchor=\"end\" fill=\"" << TextOn(colour) << "\">" << Hex(colour)
+        << "</text>\n";
     out << "  <text x=\"0\" y=\"" << kSwatchHeight + 16 << "\" class=\"id\">"
         << Escape(Shortened(row.id)) << "</text>\n";
     out << "  <text x=\"0\" y=\"" << kSwatchHeight + 31 << "\" class=\"lab\">L* " << Num(lab[0], 2)
@@ -141,7 +149,8 @@ void WriteCell(std::ostream& out, const ReportRow& row, const MeasuringCondition
 
 }  // namespace
 
-ScreenColor ScreenColorOf(const ReflectanceSpectrum& spectrum, const MeasuringCondition& condition) {
+ScreenColor ScreenColorOf(const ReflectanceSpectrum& spectrum,
+                          const MeasuringCondition& condition) {
     ScopedLab cie;
     const Color colour = ColorConverter::RGBToColor(RGBVector(LABVector(spectrum, condition)));
     return {colour.GetRed8(), colour.GetGreen8(), colour.GetBlue8()};
@@ -188,8 +197,8 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
 
     std::ostringstream out;
     out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\""
-        << height << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
+        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\"" << height
+        << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
         << "<style>\n"
         << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; }\n"
         << "  .title, .sub, .id, .lab { fill: #222; }\n"
@@ -205,7 +214,8 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
         << "<rect width=\"100%\" height=\"100%\" fill=\"#f4f4f2\"/>\n";
     std::string title = report.source + ": " + std::to_string(report.rows.size()) + " samples";
     if (count < report.rows.size()) title += ", the first " + std::to_string(count) + " shown";
-    out << "<text x=\"" << kMargin << "\" y=\"28\" class=\"title\">" << Escape(title) << "</text>\n";
+    out << "<text x=\"" << kMargin << "\" y=\"28\" class=\"title\">" << Escape(title)
+        << "</text>\n";
     out << "<text x=\"" << kMargin << "\" y=\"46\" class=\"sub\">CIELAB under illuminant "
         << Escape(report.illuminant) << ", observer " << Escape(report.observer)
         << "\xC2\xB0; screen colours: " << Escape(ScreenColorSource())

@@ -20,11 +20,11 @@ constexpr int kLinesPerWorker = 4;
 
 // A worker thread of the library's Thread class writing under its own key.
 class Measurer : public Thread {
-public:
+  public:
     explicit Measurer(int number)
         : Thread("measurer-" + std::to_string(number), NORMAL_PRIORITY), number_(number) {}
 
-protected:
+  protected:
     unsigned int Run() override {
         String key = number_ == 2 ? "Quiet" : "Measure";
         for (int i = 0; i < kLinesPerWorker && !IsStopRequested(); ++i) {
@@ -35,7 +35,7 @@ protected:
         return 0;
     }
 
-private:
+  private:
     int number_;
 };
 
@@ -57,8 +57,9 @@ void RoundTripRecord() {
     copy >> id >> samples >> offset >> readChannels;
     block.Log(String("wrote ") + String::CreateFromInt(out.Len()) + " bytes, read back \"" + id +
               "\", " + String::CreateFromInt(samples) + " samples, offset " +
-              String::CreateFromInt(offset) + ", " + String::CreateFromInt(readChannels.CountSet()) +
-              " of " + String::CreateFromInt(readChannels.Count()) + " channels" +
+              String::CreateFromInt(offset) + ", " +
+              String::CreateFromInt(readChannels.CountSet()) + " of " +
+              String::CreateFromInt(readChannels.Count()) + " channels" +
               (copy.ReadPastEnd() || readChannels != channels ? " (MISMATCH)" : ""));
 }
 

@@ -11,17 +11,17 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
-#include "nxbase/version.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
+#include "nxbase/version.h"
 #include "toolkit/application.h"
 
 namespace {
 
-constexpr int kExitOk = 0;         // answered with status 0
-constexpr int kExitStatus = 1;     // answered with another status
+constexpr int kExitOk = 0;      // answered with status 0
+constexpr int kExitStatus = 1;  // answered with another status
 constexpr int kExitUsage = 2;
-constexpr int kExitFailed = 3;     // no answer, or no post office
+constexpr int kExitFailed = 3;  // no answer, or no post office
 
 const char kUsage[] =
     "Usage: nxmsg [--as NAME] [--expect TYPES] APP MESSAGE [VALUE...]\n"
@@ -87,7 +87,8 @@ std::string Hex(const MyMemoryBlock& block) {
     std::string hex;
     char digits[4];
     for (long i = 0; i < block.Len(); ++i) {
-        std::snprintf(digits, sizeof digits, "%02x", static_cast<unsigned char>(block.GetDatenZeiger()[i]));
+        std::snprintf(digits, sizeof digits, "%02x",
+                      static_cast<unsigned char>(block.GetDatenZeiger()[i]));
         if (i > 0) hex += ' ';
         hex += digits;
     }
@@ -100,7 +101,8 @@ const char* const kAnswerTypes[] = {"b", "s", "i", "str"};
 void CheckAnswerTypes(const std::string& types) {
     std::stringstream list(types);
     for (std::string type; std::getline(list, type, ',');) {
-        if (std::find(std::begin(kAnswerTypes), std::end(kAnswerTypes), type) == std::end(kAnswerTypes)) {
+        if (std::find(std::begin(kAnswerTypes), std::end(kAnswerTypes), type) ==
+            std::end(kAnswerTypes)) {
             throw UsageError("unknown type in --expect: \"" + type + "\" (types b, s, i, str)");
         }
     }
@@ -111,7 +113,8 @@ int MessageNumber(const std::string& message) {
     int number = nxbase::NumberOfCommandText(message);
     if (number >= 0) return number;
     if (message.empty() || message.find_first_not_of("0123456789") != std::string::npos) {
-        throw UsageError("not a message name: " + message + " (names such as GET_DEVICE_NAME, or numbers 0 to " +
+        throw UsageError("not a message name: " + message +
+                         " (names such as GET_DEVICE_NAME, or numbers 0 to " +
                          std::to_string(ANZAHL_BOTSCHAFTEN - 1) + ")");
     }
     char* end = nullptr;
@@ -183,7 +186,8 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     ::setenv("NXBASE_WAIT_TIMEOUT", std::to_string(timeout).c_str(), 1);
     PostOffice* office = PostOffice::CreatePostOffice(String(self));
     if (!office->HasApplication(app) && !nxbase::IsApplicationRunning(app)) {
-        std::cerr << "nxmsg: " << app << " is not registered and not running (nxreg --help shows how to register it)\n";
+        std::cerr << "nxmsg: " << app
+                  << " is not registered and not running (nxreg --help shows how to register it)\n";
         return kExitFailed;
     }
     if (!wait) {
@@ -212,11 +216,12 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
         }
     } disconnect{office, app, connected};
     if (!office->SendAndReceive(app, number, data, answer)) {
-        std::cerr << "nxmsg: no answer from " << app << " to " << nxbase::MessageName(number) << ": "
-                  << office->GetLastError() << "\n";
+        std::cerr << "nxmsg: no answer from " << app << " to " << nxbase::MessageName(number)
+                  << ": " << office->GetLastError() << "\n";
         return kExitFailed;
     }
-    signed char status = answer.Len() > 0 ? static_cast<signed char>(answer.GetDatenZeiger()[0]) : -1;
+    signed char status =
+        answer.Len() > 0 ? static_cast<signed char>(answer.GetDatenZeiger()[0]) : -1;
     std::cout << "status " << static_cast<int>(status) << "\nbytes  " << Hex(answer) << "\n";
     if (!expect.empty()) std::cout << "values" << Decode(answer, expect) << "\n";
     return status == 0 ? kExitOk : kExitStatus;

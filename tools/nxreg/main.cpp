@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
-#include <cstring>
 #include <cstdio>
+#include <cstring>
 #include <fstream>
 #include <iostream>
 #include <iterator>
@@ -16,8 +16,8 @@
 #include <vector>
 
 #include "nxbase/files.h"
-#include "nxbase/version.h"
 #include "nxbase/registry.h"
+#include "nxbase/version.h"
 
 namespace {
 
@@ -248,7 +248,8 @@ int Import(const std::vector<std::string>& asArguments) {
     std::string text;
     bool atEnd = ReadUpTo(fd, text, kHeadBytes, source);
     if (!nxbase::CheckRegedit4Header(text, atEnd, source)) {
-        throw std::runtime_error(source + ":1: the first line must be REGEDIT4 (no line end within " +
+        throw std::runtime_error(source +
+                                 ":1: the first line must be REGEDIT4 (no line end within " +
                                  std::to_string(kHeadBytes >> 10) + " KiB)");
     }
     std::string beyond;

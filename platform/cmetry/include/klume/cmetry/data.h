@@ -5,10 +5,9 @@
 #define KLUME_CMETRY_DATA_H_
 
 #include <array>
+#include <boost/shared_ptr.hpp>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "nxbase/export.h"
 #include "nxbase/spectralgrid.h"
@@ -27,7 +26,7 @@ using SampleTable = std::array<double, kSampleCount>;
 
 // A light source: relative spectral power on the source table's own grid.
 class NXBASE_EXPORT IIlluminant {
-public:
+  public:
     virtual ~IIlluminant();
     // Repository name: "A", "C", "D50", "D55", "D65", "D75", "E", "FL1".."FL12",
     // or the file stem of an installed illuminant.
@@ -47,7 +46,7 @@ public:
 
 // A standard colorimetric observer: colour-matching functions at 1 nm.
 class NXBASE_EXPORT IObserver {
-public:
+  public:
     virtual ~IObserver();
     // Repository name: "2" (CIE 1931) or "10" (CIE 1964).
     virtual const std::string& GetName() const = 0;
@@ -65,7 +64,7 @@ public:
 // A density standard: one linear spectral product per channel on the
 // 36-sample grid, each normalised to 1.0 at its peak.
 class NXBASE_EXPORT IDensityStandard {
-public:
+  public:
     virtual ~IDensityStandard();
     // Repository name, e.g. "Status E".
     virtual const std::string& GetName() const = 0;
@@ -87,10 +86,10 @@ public:
 // is not finite or negative, or the light has no power anywhere in the
 // 360..780 nm range the weights are computed over.
 NXBASE_EXPORT boost::shared_ptr<IIlluminant> MakeIlluminant(const std::string& name,
-                                                           const std::string& description,
-                                                           std::vector<double> wavelengths,
-                                                           std::vector<double> powers,
-                                                           std::string* error = nullptr);
+                                                            const std::string& description,
+                                                            std::vector<double> wavelengths,
+                                                            std::vector<double> powers,
+                                                            std::string* error = nullptr);
 
 }  // namespace cmetry
 }  // namespace klume

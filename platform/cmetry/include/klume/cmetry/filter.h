@@ -13,9 +13,8 @@
 #ifndef KLUME_CMETRY_FILTER_H_
 #define KLUME_CMETRY_FILTER_H_
 
-#include <string>
-
 #include <boost/shared_ptr.hpp>
+#include <string>
 
 #include "klume/cmetry/data.h"
 #include "nxbase/export.h"
@@ -33,7 +32,7 @@ struct WeightTable {
 NXBASE_EXPORT WeightTable ComputeWeights(const IIlluminant& illuminant, const IObserver& observer);
 
 class NXBASE_EXPORT CMetryFilter {
-public:
+  public:
     // The shared filter of the illuminant and observer named (names as the
     // repositories take them); computed on the first request for the pair.
     // An empty pointer when either name is unknown.
@@ -47,8 +46,7 @@ public:
                                                       boost::shared_ptr<IObserver> observer);
 
     // Computes the weights. REQUIRES: both pointers non-null.
-    CMetryFilter(boost::shared_ptr<IIlluminant> illuminant,
-                 boost::shared_ptr<IObserver> observer);
+    CMetryFilter(boost::shared_ptr<IIlluminant> illuminant, boost::shared_ptr<IObserver> observer);
     CMetryFilter(const CMetryFilter&) = delete;
     CMetryFilter& operator=(const CMetryFilter&) = delete;
 
@@ -62,7 +60,7 @@ public:
     boost::shared_ptr<IObserver> GetObserver() const { return amObserver; }
     boost::shared_ptr<IIlluminant> GetIlluminant() const { return amIlluminant; }
 
-private:
+  private:
     boost::shared_ptr<IIlluminant> amIlluminant;
     boost::shared_ptr<IObserver> amObserver;
     WeightTable amWeights;

@@ -14,10 +14,9 @@
 #ifndef KLUME_CMETRY_REPOSITORY_H_
 #define KLUME_CMETRY_REPOSITORY_H_
 
+#include <boost/shared_ptr.hpp>
 #include <string>
 #include <vector>
-
-#include <boost/shared_ptr.hpp>
 
 #include "klume/cmetry/data.h"
 #include "nxbase/export.h"
@@ -34,7 +33,7 @@ using MessageHandler = void (*)(const std::string& message);
 NXBASE_EXPORT MessageHandler SetMessageHandler(MessageHandler handler);
 
 class NXBASE_EXPORT IlluminantRepository {
-public:
+  public:
     // The illuminant of that name: built in, or installed in the data
     // directory. An unknown name, or a file that does not parse, is logged
     // (with the file, line and reason) and yields GetDefault().
@@ -60,7 +59,7 @@ public:
 };
 
 class NXBASE_EXPORT ObserverRepository {
-public:
+  public:
     // "2" (CIE 1931 2 degree) or "10" (CIE 1964 10 degree); an empty pointer
     // for any other name.
     static boost::shared_ptr<IObserver> Get(const std::string& name);
@@ -70,7 +69,7 @@ public:
 };
 
 class NXBASE_EXPORT DensityStandardRepository {
-public:
+  public:
     // The standard of that name. Built in: "Status A", "Status T", "Status M",
     // "Status E" (ISO 5-3). "Status I", "DIN", "DIN NB", "SPI" and any other
     // name only when a table is installed. A missing standard is logged and
