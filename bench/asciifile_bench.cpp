@@ -215,19 +215,5 @@ std::vector<nxbench::Pair> Pairs() {
 }  // namespace
 
 int main(int argc, char** argv) {
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-    const std::vector<nxbench::Pair> pairs = Pairs();
-    nxbench::PinTo(0);
-    nxbench::RegisterRounds(pairs, kRounds);
-    nxbench::RoundReporter reporter;
-    benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf(
-        "\nRatios of real time, contender / baseline, min / median / max over %d interleaved "
-        "rounds "
-        "(one thread, pinned to CPU 0; each write ends with an fsync):\n",
-        kRounds);
-    nxbench::PrintPairs(reporter, pairs, kRounds);
-    benchmark::Shutdown();
-    return 0;
+    return nxbench::RunPairs(argc, argv, Pairs(), "run (each write ends with an fsync)", kRounds);
 }

@@ -280,8 +280,6 @@ constexpr int kRounds = 5;
 }  // namespace
 
 int main(int argc, char** argv) {
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
     // Time ratios: how many times the raw SQLite loop's time per value.
     const std::vector<nxbench::Pair> pairs = {
         {"RegistryStorePointRead_vs_RawSqlite_Cached1000", BM_RawSqlitePointRead_Cached1000,
@@ -297,15 +295,5 @@ int main(int argc, char** argv) {
         {"RegistryAutocommitWrite_vs_RawSqlite_Random1M", BM_RawSqliteAutocommitWrite_Random1M,
          BM_RegistryAutocommitWrite_Random1M, false},
     };
-    nxbench::PinTo(0);
-    nxbench::RegisterRounds(pairs, kRounds);
-    nxbench::RoundReporter reporter;
-    benchmark::RunSpecifiedBenchmarks(&reporter);
-    std::printf(
-        "\nRatios of real time per value, registry / raw SQLite, min / median / max over %d "
-        "interleaved rounds; one thread, pinned to CPU 0:\n",
-        kRounds);
-    nxbench::PrintPairs(reporter, pairs, kRounds);
-    benchmark::Shutdown();
-    return 0;
+    return nxbench::RunPairs(argc, argv, pairs, "value (registry against raw SQLite)", kRounds);
 }
