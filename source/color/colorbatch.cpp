@@ -466,21 +466,36 @@ bool HasWideKernel() {
 #pragma GCC diagnostic pop
 #endif
 
-void RunNarrow(bool lab, const PaddedWeights& w, const float* src, std::size_t count, float* out) {
-    lab ? RunLab(w, src, count, out) : RunXyz(w, src, count, out);
-}
+template <bool kLab, class T>
+void Run(const PaddedWeights& w, const T* src, std::size_t count, float* out);
 
-// Double spectra on the eight-lane path: rounded to float in small pieces
-// first, as the float path would see a float copy of them.
-void RunNarrow(bool lab, const PaddedWeights& w, const double* src, std::size_t count, float* out) {
+// Spectra that are not contiguous floats (doubles, a table's rows): copied a
+// piece at a time into a buffer that stays in the cache, fill(first, n,
+// piece) writing spectra first..first+n-1, and each piece converted as an
+// array.
+template <bool kLab, class Fill>
+void RunCopied(const PaddedWeights& w, std::size_t count, float* out, Fill fill) {
     constexpr std::size_t kPiece = 64;
-    alignas(32) float piece[kPiece * kSamples];
+    alignas(64) float piece[kPiece * kSamples];
     for (std::size_t first = 0; first < count; first += kPiece) {
         const std::size_t n = std::min(kPiece, count - first);
-        const double* from = src + first * kSamples;
-        for (std::size_t k = 0; k < n * kSamples; ++k) piece[k] = static_cast<float>(from[k]);
-        RunNarrow(lab, w, piece, n, out + 3 * first);
+        fill(first, n, piece);
+        Run<kLab>(w, static_cast<const float*>(piece), n, out + 3 * first);
     }
+}
+
+template <bool kLab>
+void RunNarrow(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+    kLab ? RunLab(w, src, count, out) : RunXyz(w, src, count, out);
+}
+
+// Doubles on the eight-lane path: rounded to float first, as the float path
+// would see a float copy of them.
+template <bool kLab>
+void RunNarrow(const PaddedWeights& w, const double* src, std::size_t count, float* out) {
+    RunCopied<kLab>(w, count, out, [src](std::size_t first, std::size_t n, float* piece) {
+        std::copy(src + first * kSamples, src + (first + n) * kSamples, piece);
+    });
 }
 
 // The kernel for the machine: sixteen spectra at a time with AVX-512, the
@@ -496,7 +511,7 @@ void Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
         count -= wide;
     }
 #endif
-    RunNarrow(kLab, w, src, count, out);
+    RunNarrow<kLab>(w, src, count, out);
 }
 
 }  // namespace
@@ -590,21 +605,16 @@ void ColorBatch::ToLabParallel(const double* pSpectra, std::size_t alCount, floa
 
 namespace {
 
-// The rows' values gathered a piece at a time into a buffer that stays in
-// the cache, each piece converted as an array.
 template <bool kLab>
 std::vector<float> RunTable(const PaddedWeights& w, const SpectraTable& axTable) {
-    constexpr std::size_t kPiece = 256;
     std::vector<float> out(3 * axTable.rows.size());
-    std::vector<float> piece(kPiece * kSamples);
-    for (std::size_t first = 0; first < axTable.rows.size(); first += kPiece) {
-        const std::size_t n = std::min(kPiece, axTable.rows.size() - first);
-        for (std::size_t i = 0; i < n; ++i) {
-            const auto& values = axTable.rows[first + i].values;
-            std::copy(values.begin(), values.end(), piece.begin() + i * kSamples);
-        }
-        Run<kLab>(w, piece.data(), n, out.data() + 3 * first);
-    }
+    RunCopied<kLab>(w, axTable.rows.size(), out.data(),
+                    [&](std::size_t first, std::size_t n, float* piece) {
+                        for (std::size_t i = 0; i < n; ++i) {
+                            const auto& values = axTable.rows[first + i].values;
+                            std::copy(values.begin(), values.end(), piece + i * kSamples);
+                        }
+                    });
     return out;
 }
 
