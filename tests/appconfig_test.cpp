@@ -123,6 +123,14 @@ TEST_F(AppConfigTest, WholeFileWritesKeepHardLinksAndTheFilesOwner) {
     EXPECT_EQ(ReadFile(other), "new\n");
     EXPECT_EQ(std::filesystem::hard_link_count(file), 2u);
 
+    // A new file gets the mode open() would give it under the umask.
+    const mode_t mask = ::umask(027);
+    nxbase::WriteWholeFile(dir.File("fresh.reg"), "x\n");
+    ::umask(mask);
+    struct stat fresh {};
+    ASSERT_EQ(::stat(dir.File("fresh.reg").c_str(), &fresh), 0);
+    EXPECT_EQ(fresh.st_mode & 0777, 0640u);
+
     // Root writing a user's file leaves it the user's.
     if (::geteuid() == 0) {
         const std::string users = dir.File("users.reg");

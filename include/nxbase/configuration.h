@@ -31,8 +31,10 @@ class NXBASE_EXPORT Configuration {
 };
 
 // A store on one INI file. Group and key names compare case-insensitively
-// and keep their case. Every write replaces the file atomically; a write
-// that fails leaves the old file and logs one line (empty log key).
+// and keep their case. Every write replaces the file as toolkit::Config
+// describes (atomically, but for hard-linked files and the other cases it
+// names); a write that fails leaves the old file and logs one line (empty
+// log key).
 class NXBASE_EXPORT IniConfig : public Configuration {
   public:
     explicit IniConfig(const std::string& path);

@@ -6,7 +6,10 @@
 
 #include <cerrno>
 #include <climits>
+#include <cstdlib>
 #include <cstring>
+#include <fstream>
+#include <string>
 #include <vector>
 
 namespace toolkit {
@@ -66,8 +69,18 @@ bool WriteDirectly(const std::string& path, std::string_view content, bool trunc
     return written || Failed(why, "write failed", error);
 }
 
+// The mode open() would give a new file. The process's umask is read from
+// /proc: setting and restoring it would race with files other threads create
+// meanwhile.
 mode_t DefaultMode() {
-    const mode_t mask = ::umask(0);
+    std::ifstream status("/proc/self/status");
+    std::string line;
+    while (std::getline(status, line)) {
+        if (line.rfind("Umask:", 0) == 0) {
+            return static_cast<mode_t>(0666 & ~std::strtoul(line.c_str() + 6, nullptr, 8));
+        }
+    }
+    const mode_t mask = ::umask(0);  // kernels before 4.7 do not list it
     ::umask(mask);
     return static_cast<mode_t>(0666 & ~mask);
 }

@@ -51,9 +51,11 @@ class NXBASE_EXPORT Bitmap {
     // Every pixel opaque in `color`.
     void Erase(const Color& color);
 
-    // Writes an 8-bit RGB PNG (RGBA when any pixel is transparent). The file
-    // is written beside its target and renamed into place, so a failed write
-    // leaves no partial file. Returns false on failure (empty bitmap included).
+    // Writes an 8-bit RGB PNG (RGBA when any pixel is transparent). The image
+    // is encoded in memory, then the file replaced whole (toolkit::ReplaceFile:
+    // an existing file keeps its mode and owner, a new one gets the umask's),
+    // so a failed write leaves no partial file. Returns false on failure
+    // (empty bitmap included).
     bool WritePNG(const std::string& path) const;
     // Reads a PNG of any colour type into `bitmap` (8-bit channels widened by
     // ×257). Returns false, leaving `bitmap` unchanged, on any failure.

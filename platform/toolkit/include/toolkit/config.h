@@ -8,12 +8,16 @@
 // - Reads see the file as it is now: a read reloads the file when it changed
 //   on disk (checked by one stat()).
 // - Every write takes an exclusive flock() on "<file>.lock" beside the file,
-//   re-reads the file, applies the one change and replaces the file
-//   atomically (temporary file in the same directory, fsync, rename), so a
-//   crash leaves the old or the new file and two processes writing different
-//   keys never lose each other's changes. A path that is a symbolic link
-//   stays one: the file it points to is replaced. The permissions of the old
-//   file carry over to the new one.
+//   re-reads the file, applies the one change and replaces the file with
+//   toolkit::ReplaceFile (temporary file in the same directory, fsync,
+//   rename), so a crash leaves the old or the new file and two processes
+//   writing different keys never lose each other's changes. A path that is a
+//   symbolic link stays one: the file it points to is replaced. The old
+//   file's permissions and owner carry over; a file with several hard links,
+//   or one whose owner cannot be given to the replacement, or a writable file
+//   in a directory closed to new files is rewritten in place instead (not
+//   atomic). A writer killed mid-write may leave its temporary file
+//   ".<name>.XXXXXX" behind.
 // - A malformed line (no "=", an empty key name, an unclosed "[") is skipped
 //   and dropped by the next write; a missing file reads as empty.
 // - A write that fails leaves the old file whole, reports one line through

@@ -30,7 +30,8 @@ NXBASE_EXPORT bool WriteAll(int fd, std::string_view bytes);
 //   written directly, never replaced by a plain file.
 // Every step is checked. On failure returns false with `why` saying what
 // failed and why ("cannot open: Permission denied"), and leaves no temporary
-// file behind.
+// file behind; only a process killed while writing leaves its ".<name>.XXXXXX".
+// A new file gets the mode open() gives under the process's umask.
 NXBASE_EXPORT bool ReplaceFile(const std::string& path, std::string_view content, std::string& why);
 
 }  // namespace toolkit
