@@ -2,7 +2,7 @@
 // exchanges messages with its peers and with the measuring-device server
 // LumaServer. It owns the transport, keeps one handler per message number,
 // queues received commands and hands them to their handlers on the event
-// loop (at once and on a 100 ms tick), collects the answers that callers
+// loop (at once, and on a 100 ms tick while some stay queued), collects the answers that callers
 // wait for, counts connected peers and keeps the application lock.
 //
 // Every answer block starts with a status byte: 0 done, 1 refused (an
@@ -14,6 +14,7 @@
 #include <boost/function.hpp>
 #include <chrono>
 #include <deque>
+#include <functional>
 #include <map>
 #include <memory>
 #include <set>
@@ -36,12 +37,19 @@
 // 1 and 2 disable it while waiting.
 enum DisEnable { DisEnableNone = 0, DisEnableWindow = 1, DisEnableWindow2 = 2 };
 
+// How an asynchronous SendAndReceive ended: the answer block (its status
+// byte first), or why there is none.
+struct AnswerResult {
+    bool answered = false;
+    MyMemoryBlock data;
+    std::string error;
+};
+
 class NXBASE_EXPORT PostOffice : public NxSingleton {
   public:
     // Creates (or replaces) the post office of application `asAppName`: reads
     // the application table (which throws when the server is missing or too
-    // old, see PostOfficeApplications), opens the transport and starts the
-    // 100 ms timer.
+    // old, see PostOfficeApplications) and opens the transport.
     static PostOffice* CreatePostOffice(String asAppName);
     // std::logic_error "Please create the PostOffice-Singleton first !" when
     // none was created.
@@ -74,6 +82,19 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // (default 30) and logs it.
     unsigned char SendAndReceive(const std::string& asApp, int alMessage, MyMemoryBlock& axSend,
                                  MyMemoryBlock& axReceive, DisEnable axMode = DisEnableNone);
+    // Sends message `alMessage` to `asApp` and returns at once; `fDone` is
+    // called later on the loop, exactly once, with the answer or with why
+    // there is none: the send failed, the channel to `asApp` was lost,
+    // `fKeepWaiting` (asked at least every 100 ms) returned false, or
+    // `timeout` passed. Answers to the same message from the same peer go to
+    // asynchronous waiters first, in the order they were sent. Requests still
+    // pending when the post office is destroyed are dropped uncalled.
+    using AnswerCallback = std::function<void(AnswerResult&)>;
+    void SendAndReceiveAsync(const std::string& asApp, int alMessage, const MyMemoryBlock& axSend,
+                             AnswerCallback fDone,
+                             std::chrono::milliseconds timeout = std::chrono::seconds(30),
+                             boost::function<bool()> fKeepWaiting = {});
+    std::size_t GetPendingAsyncCount() const { return amAsync.size(); }
     // Answers a received command: "ANSWER!" + its name, back to its sender
     // on the connection the command came in on (no retries: a peer that is
     // gone does not come back on that connection).
@@ -156,7 +177,14 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     void HandleCommand(VELTRAEvent& axEvent);
     void HandleDisconnectInServer(VELTRAEvent& axEvent);
     void ScheduleHandler();
+    void TickWhileQueued();
     void PeerLost(const std::string& asApp);
+    struct AsyncRequest;
+    void StartAsync(const std::shared_ptr<AsyncRequest>& pRequest, const MyMemoryBlock& axSend);
+    void ArmAsync(const std::shared_ptr<AsyncRequest>& pRequest);
+    bool DeliverAsync(const std::pair<std::string, int>& axKey, MyMemoryBlock& axData);
+    void FinishAsync(const std::shared_ptr<AsyncRequest>& pRequest, bool abAnswered,
+                     MyMemoryBlock axData, std::string asError);
     void CloseWhenUnused();
 
     Link amHandlers[ANZAHL_BOTSCHAFTEN];
@@ -171,6 +199,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
         MyMemoryBlock data;
     };
     std::map<std::pair<std::string, int>, AwaitedAnswer> amAnswers;
+    std::vector<std::shared_ptr<AsyncRequest>> amAsync;  // in the order they were sent
     AutoTimer amTimer;
     Timer amQuitTimer;
     String amOwnName;

@@ -1,8 +1,52 @@
 #include "toolkit/application.h"
 
+#include <sys/epoll.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <boost/asio/detail/epoll_reactor.hpp>
 #include <boost/asio/post.hpp>
+#include <cerrno>
+#include <system_error>
 
 #include "toolkit/userinterface.h"
+
+#if !defined(BOOST_ASIO_HAS_EPOLL) || !defined(BOOST_ASIO_HAS_TIMERFD)
+#error "the loop descriptor needs asio's epoll reactor with timerfd timers"
+#endif
+
+namespace {
+
+// asio keeps its epoll descriptor private. Its timers are a timerfd and its
+// cross-thread wake-up an eventfd in that same epoll set, so the set becomes
+// readable whenever a handler is due: exactly what a foreign loop must
+// watch. An explicit instantiation may name a private member; a boost that
+// renames it fails to compile here instead of misbehaving.
+using ReactorDescriptor = int boost::asio::detail::epoll_reactor::*;
+ReactorDescriptor EpollDescriptorMember();
+template <ReactorDescriptor Member>
+struct EpollDescriptorAccess {
+    friend ReactorDescriptor EpollDescriptorMember() { return Member; }
+};
+template struct EpollDescriptorAccess<&boost::asio::detail::epoll_reactor::epoll_fd_>;
+
+int ContextEpollDescriptor(boost::asio::io_context& axContext) {
+    auto& reactor = boost::asio::use_service<boost::asio::detail::epoll_reactor>(axContext);
+    return reactor.*EpollDescriptorMember();
+}
+
+[[noreturn]] void ThrowErrno(const char* asWhat) {
+    throw std::system_error(errno, std::generic_category(), asWhat);
+}
+
+void Watch(int aEpoll, int aDescriptor) {
+    epoll_event event{};
+    event.events = EPOLLIN;
+    event.data.fd = aDescriptor;
+    if (::epoll_ctl(aEpoll, EPOLL_CTL_ADD, aDescriptor, &event) != 0) ThrowErrno("epoll_ctl");
+}
+
+}  // namespace
 
 Application& Application::Get() {
     // Never destroyed: handlers of objects that outlive main may still refer to it.
@@ -37,9 +81,69 @@ void Application::Reschedule() {
 
 bool Application::RunOneFor(std::chrono::milliseconds timeout) {
     MarkUserInterfaceThread();
+    if (nestedWait_ && !nestingBarred_) {
+        nestedWait_(timeout);
+        return true;
+    }
     if (context_.stopped()) context_.restart();
     bool ran = context_.run_one_for(timeout) > 0;
     return ran;
+}
+
+int Application::GetLoopDescriptor() {
+    if (loopDescriptor_ >= 0) return loopDescriptor_;
+    int loop = ::epoll_create1(EPOLL_CLOEXEC);
+    if (loop < 0) ThrowErrno("epoll_create1");
+    int wake = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+    try {
+        if (wake < 0) ThrowErrno("eventfd");
+        Watch(loop, ContextEpollDescriptor(context_));
+        Watch(loop, wake);
+    } catch (...) {
+        ::close(loop);
+        if (wake >= 0) ::close(wake);
+        throw;
+    }
+    wakeDescriptor_ = wake;
+    loopDescriptor_ = loop;
+    return loopDescriptor_;
+}
+
+std::size_t Application::Dispatch() {
+    MarkUserInterfaceThread();
+    if (wakeDescriptor_ >= 0) {
+        eventfd_t count;
+        (void)::eventfd_read(wakeDescriptor_, &count);
+    }
+    if (context_.stopped()) context_.restart();
+    ++dispatching_;
+    std::size_t ran = 0;
+    try {
+        ran = context_.poll();
+    } catch (...) {
+        --dispatching_;
+        throw;
+    }
+    --dispatching_;
+    return ran;
+}
+
+std::size_t Application::DispatchWithoutNesting() {
+    bool barred = nestingBarred_;
+    nestingBarred_ = true;
+    std::size_t ran = 0;
+    try {
+        ran = Dispatch();
+    } catch (...) {
+        nestingBarred_ = barred;
+        throw;
+    }
+    nestingBarred_ = barred;
+    return ran;
+}
+
+void Application::Wake() {
+    if (wakeDescriptor_ >= 0) (void)::eventfd_write(wakeDescriptor_, 1);
 }
 
 void Application::Wait(bool abWaiting) {
@@ -47,8 +151,16 @@ void Application::Wait(bool abWaiting) {
     UserInterface::Current()->SetWaiting(abWaiting);
 }
 
+void Application::Post(std::function<void()> handler) {
+    boost::asio::post(context_, std::move(handler));
+    // asio wakes a thread only while one blocks inside it: a foreign loop
+    // sleeping on the loop descriptor, or about to, hears of the handler
+    // only so. Inside Dispatch() the running poll takes it anyway.
+    if (!IsUserInterfaceThread() || dispatching_ == 0) Wake();
+}
+
 void Application::PostUserEvent(unsigned long alId, void* pData) {
-    boost::asio::post(context_, [this, alId, pData] {
+    Post([this, alId, pData] {
         if (userEventHandler_) userEventHandler_(alId, pData);
     });
 }

@@ -2,12 +2,16 @@
 
 #include <signal.h>
 #include <spawn.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <boost/asio/posix/stream_descriptor.hpp>
 #include <cerrno>
 #include <cstring>
 #include <map>
+#include <memory>
 
 #include "toolkit/application.h"
 
@@ -47,6 +51,18 @@ void Forget() {
     }
 }
 
+// A started process's pidfd becomes readable when it ends, so it is reaped
+// then, without a periodic check that would wake an idle application. A
+// kernel without pidfds leaves the reaping to the next explicit call.
+void ReapWhenEnded(pid_t pid) {
+    int descriptor = static_cast<int>(::syscall(SYS_pidfd_open, pid, 0));
+    if (descriptor < 0) return;
+    auto watch = std::make_shared<boost::asio::posix::stream_descriptor>(
+        Application::Get().GetContext(), descriptor);
+    watch->async_wait(boost::asio::posix::stream_descriptor::wait_read,
+                      [watch](const boost::system::error_code&) { ReapStartedProcesses(); });
+}
+
 }  // namespace
 
 pid_t SpawnProcess(const std::vector<std::string>& arguments, const std::string& directory,
@@ -71,6 +87,7 @@ pid_t SpawnProcess(const std::vector<std::string>& arguments, const std::string&
     }
     ReapStartedProcesses();
     Started()[pid] = std::string();
+    ReapWhenEnded(pid);
     return pid;
 }
 

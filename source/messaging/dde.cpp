@@ -4,7 +4,6 @@
 #include <unistd.h>
 
 #include <boost/asio/posix/stream_descriptor.hpp>
-#include <boost/asio/post.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
 #include <cstdlib>
@@ -128,8 +127,7 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
                     if (!ownTopic(nxbase::kDdeService, topic) || !fmExecute) return false;
                     std::size_t size = std::min(data.size(), kMaxExecuteBytes);
                     std::string text(data.begin(), data.begin() + static_cast<long>(size));
-                    boost::asio::post(Application::Get().GetContext(),
-                                      [this, text] { fmExecute(text); });
+                    Application::Get().Post([this, text] { fmExecute(text); });
                     return true;
                 });
         // Transactions this transport does not serve (a client asking for
@@ -227,7 +225,7 @@ void DDE::OnPoke(const std::string& asItem, const std::string& asData) {
     // answer, which needs the bus again.
     Log(Application::Get().IsInExecute() ? "DDE - PostUserEvent" : "DDE - ExecuteUserEvent");
     std::weak_ptr<bool> alive = amAlive;
-    boost::asio::post(Application::Get().GetContext(), [alive] {
+    Application::Get().Post([alive] {
         if (alive.lock()) UserEvent(1234, nullptr);
     });
 }
@@ -310,7 +308,7 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
         Log("Sent (Result:1)");
         // Messages read while the bus was busy with this call are dispatched next.
         std::weak_ptr<bool> alive = amAlive;
-        boost::asio::post(Application::Get().GetContext(), [this, alive] {
+        Application::Get().Post([this, alive] {
             if (alive.lock()) Process();
         });
         return true;

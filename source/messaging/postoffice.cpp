@@ -1,7 +1,8 @@
 #include "nxbase/postoffice.h"
 
+#include <algorithm>
 #include <array>
-#include <boost/asio/post.hpp>
+#include <boost/asio/steady_timer.hpp>
 #include <cstdlib>
 #include <optional>
 #include <stdexcept>
@@ -114,12 +115,26 @@ PostOffice::PostOffice(const String& asAppName)
     });
     amTimer.SetTimeout(kTickMs);
     amTimer.SetTimeoutHdl(LINK(PostOffice, this, TimerCallback));
-    amTimer.Start();
     amQuitTimer.SetTimeout(1000);
 }
 
+// One asynchronous SendAndReceive, from the send until its call-back.
+struct PostOffice::AsyncRequest {
+    std::pair<std::string, int> key;  // the peer and the answer's number
+    AnswerCallback done;
+    boost::function<bool()> keepWaiting;
+    std::chrono::steady_clock::time_point deadline;
+    std::chrono::milliseconds timeout{};
+    boost::asio::steady_timer timer{Application::Get().GetContext()};
+    bool finished = false;
+};
+
 PostOffice::~PostOffice() {
     *amAlive = false;
+    for (auto& request : amAsync) {
+        request->finished = true;
+        request->timer.cancel();
+    }
     amTimer.Stop();
     amQuitTimer.Stop();
     Pipe::DeletePipe();
@@ -208,7 +223,9 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
 // anything else would pile up for ever.
 void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     NX_COMM_LOG(String("Answer received: ") + Number(alNumber));
-    auto at = amAnswers.find({axEvent.GetSender(), alNumber});
+    std::pair<std::string, int> key(axEvent.GetSender(), alNumber);
+    if (DeliverAsync(key, axEvent.GetData())) return;
+    auto at = amAnswers.find(key);
     if (at == amAnswers.end() || at->second.waiters == 0 || at->second.arrived) {
         LogFile::WriteToLog(String("Answer nobody waits for dropped: ") +
                                 String(axEvent.GetCommand()) + " from " +
@@ -304,6 +321,11 @@ void PostOffice::HandleDisconnectInServer(VELTRAEvent& axEvent) {
 // connection and its lock for ever: its lost channel counts as both.
 void PostOffice::PeerLost(const std::string& asApp) {
     amLostPeers.insert(asApp);
+    std::vector<std::shared_ptr<AsyncRequest>> lost;
+    for (const auto& request : amAsync)
+        if (request->key.first == asApp) lost.push_back(request);
+    for (const auto& request : lost)
+        FinishAsync(request, false, MyMemoryBlock(), "the channel to " + asApp + " was lost");
     if (amLockOwner == String(asApp)) {
         NX_COMM_LOG(String("Lock owner lost: ") + String(asApp));
         amLockCount = 0;
@@ -351,15 +373,28 @@ void PostOffice::ScheduleHandler() {
     if (amHandlerScheduled) return;
     amHandlerScheduled = true;
     std::weak_ptr<bool> alive = amAlive;
-    boost::asio::post(Application::Get().GetContext(), [this, alive] {
+    Application::Get().Post([this, alive] {
         if (!alive.lock()) return;
         amHandlerScheduled = false;
         BotschaftenHandler();
     });
 }
 
+// The tick runs only while commands wait: an idle application sleeps.
+void PostOffice::TickWhileQueued() {
+    if (amCommandQueue.empty()) {
+        if (amTimer.IsActive()) amTimer.Stop();
+    } else if (!amTimer.IsActive()) {
+        amTimer.Start();
+    }
+}
+
 void PostOffice::BotschaftenHandler() {
-    if (amCommandQueue.empty()) return;
+    if (amCommandQueue.empty()) return TickWhileQueued();
+    struct TickAfter {
+        PostOffice* office;
+        ~TickAfter() { office->TickWhileQueued(); }
+    } tickAfter{this};
     std::optional<AutoLog> scope;
     if (nxbase::detail::CommunicationLogged()) {
         scope.emplace(String("Botschafent Handler (Message nr: ") +
@@ -597,4 +632,91 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     unsigned char result = SendAndReceive(asApp, alMessage, axSend, axReceive, keepWaiting, axMode);
     if (dialogOpen) UserInterface::Current()->CloseAbortDialog();
     return result;
+}
+
+// ---- asynchronous send and receive ----
+
+void PostOffice::SendAndReceiveAsync(const std::string& asApp, int alMessage,
+                                     const MyMemoryBlock& axSend, AnswerCallback fDone,
+                                     std::chrono::milliseconds timeout,
+                                     boost::function<bool()> fKeepWaiting) {
+    auto request = std::make_shared<AsyncRequest>();
+    request->key = {asApp, kAnswerOffset + alMessage};
+    request->done = std::move(fDone);
+    request->keepWaiting = std::move(fKeepWaiting);
+    request->timeout = timeout;
+    request->deadline = std::chrono::steady_clock::now() + timeout;
+    if (!OnOwnThread("SendAndReceiveAsync")) {
+        FinishAsync(request, false, MyMemoryBlock(), amLastError);
+        return;
+    }
+    amAsync.push_back(request);
+    // Sent from the loop, so that the caller returns at once even when the
+    // peer has to be started first.
+    std::weak_ptr<bool> alive = amAlive;
+    Application::Get().Post([this, alive, request, axSend] {
+        if (alive.lock() && !request->finished) StartAsync(request, axSend);
+    });
+}
+
+void PostOffice::StartAsync(const std::shared_ptr<AsyncRequest>& pRequest,
+                            const MyMemoryBlock& axSend) {
+    const std::string& app = pRequest->key.first;
+    int message = pRequest->key.second - kAnswerOffset;
+    if (!SendCommand(app, nxbase::CommandTextOfNumber(message), axSend, pRequest->keepWaiting)) {
+        FinishAsync(pRequest, false, MyMemoryBlock(), amLastError);
+        return;
+    }
+    if (!pRequest->finished) ArmAsync(pRequest);
+}
+
+// Wakes at the deadline, or every 100 ms while a keep-waiting function is to be asked.
+void PostOffice::ArmAsync(const std::shared_ptr<AsyncRequest>& pRequest) {
+    constexpr auto kAskEvery = std::chrono::milliseconds(100);
+    auto next = pRequest->deadline;
+    if (pRequest->keepWaiting) next = std::min(next, std::chrono::steady_clock::now() + kAskEvery);
+    pRequest->timer.expires_at(next);
+    std::weak_ptr<bool> alive = amAlive;
+    pRequest->timer.async_wait([this, alive, pRequest](const boost::system::error_code& error) {
+        if (error || !alive.lock() || pRequest->finished) return;
+        const std::string& app = pRequest->key.first;
+        if (std::chrono::steady_clock::now() >= pRequest->deadline) {
+            FinishAsync(pRequest, false, MyMemoryBlock(),
+                        "no answer from " + app + " within " +
+                            std::to_string(pRequest->timeout.count()) + " ms");
+        } else if (pRequest->keepWaiting && !pRequest->keepWaiting()) {
+            FinishAsync(pRequest, false, MyMemoryBlock(),
+                        "no answer from " + app + "; the wait was given up");
+        } else {
+            ArmAsync(pRequest);
+        }
+    });
+}
+
+bool PostOffice::DeliverAsync(const std::pair<std::string, int>& axKey, MyMemoryBlock& axData) {
+    for (const auto& request : amAsync) {
+        if (request->key != axKey) continue;
+        FinishAsync(request, true, std::move(axData), std::string());
+        return true;
+    }
+    return false;
+}
+
+// Calls the call-back on the loop, never from inside the transport's delivery.
+void PostOffice::FinishAsync(const std::shared_ptr<AsyncRequest>& pRequest, bool abAnswered,
+                             MyMemoryBlock axData, std::string asError) {
+    if (pRequest->finished) return;
+    pRequest->finished = true;
+    pRequest->timer.cancel();
+    amAsync.erase(std::remove(amAsync.begin(), amAsync.end(), pRequest), amAsync.end());
+    if (!abAnswered) {
+        LogFile::WriteToLog(String("SendAndReceiveAsync: ") + String(asError), String(kLogKey));
+    }
+    auto result = std::make_shared<AnswerResult>();
+    result->answered = abAnswered;
+    result->data = std::move(axData);
+    result->error = std::move(asError);
+    Application::Get().Post([pRequest, result] {
+        if (pRequest->done) pRequest->done(*result);
+    });
 }

@@ -2,13 +2,13 @@
 // user-interface thread. Timers, socket completions and posted user events
 // are handlers on it, so they never run concurrently with each other.
 //
-// A GUI port drives the same context from its own main loop instead of
-// Execute(): either poll it from an idle or short periodic source
-// (`Application::Get().GetContext().poll()` from a GTK idle function or a Qt
-// zero-interval QTimer), or, to sleep when idle, run it on the GUI's thread
-// between events (`run_one_for` with the time-out the GUI's loop allows).
-// Whatever drives it, it must be the one thread that also calls into the
-// messaging classes.
+// A GUI application drives the same context from its own main loop instead
+// of Execute(): it watches GetLoopDescriptor() and calls Dispatch() when the
+// descriptor is readable and before its loop goes to sleep, and installs a
+// nested wait so that the library's waits turn the GUI's loop. The GLib and
+// Qt adapters (nxbase/glibloop.h, nxbase/qtloop.h) do exactly that. Whatever
+// drives it, it must be the one thread that also calls into the messaging
+// classes.
 #ifndef TOOLKIT_APPLICATION_H_
 #define TOOLKIT_APPLICATION_H_
 
@@ -17,6 +17,7 @@
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
+#include <cstddef>
 #include <cstring>
 #include <functional>
 #include <memory>
@@ -81,7 +82,28 @@ class NXBASE_EXPORT Application {
     // Runs the handlers that are ready, without blocking.
     void Reschedule();
     // Blocks until one handler ran or `timeout` passed; true when one ran.
+    // With a nested wait installed, runs the GUI's loop instead (which
+    // dispatches this one) and returns true.
     bool RunOneFor(std::chrono::milliseconds timeout);
+
+    // For a foreign main loop: a descriptor that becomes readable whenever a
+    // handler is ready (a socket ready, a timer due, an event posted from
+    // another thread). Handlers made ready by calls outside any handler, on
+    // the loop's thread, are not announced: call Dispatch() also before the
+    // foreign loop sleeps. Created on first use; throws std::system_error
+    // when it cannot be.
+    int GetLoopDescriptor();
+    // Runs every ready handler without blocking; the number that ran.
+    std::size_t Dispatch();
+    // Dispatch() for a hook that must not run the foreign loop (GLib's
+    // prepare): a handler that waits there runs this loop alone meanwhile.
+    std::size_t DispatchWithoutNesting();
+    // Runs the foreign loop once, for at most the given time. Installed by a
+    // GUI adapter so that waits inside the library (SendAndReceive, a server
+    // being started) keep the GUI alive; an empty function uninstalls it.
+    using NestedWait = std::function<void(std::chrono::milliseconds)>;
+    void SetNestedWait(NestedWait wait) { nestedWait_ = std::move(wait); }
+    bool HasNestedWait() const { return static_cast<bool>(nestedWait_); }
 
     // True on the application's user-interface thread: the thread that last
     // drove the loop (Execute, Reschedule, RunOneFor), or, before the loop
@@ -93,15 +115,24 @@ class NXBASE_EXPORT Application {
     void Wait(bool abWaiting);
     bool IsWaiting() const { return waiting_; }
 
-    // Calls `handler` with (id, data) on the loop, after the running handler.
+    // Runs `handler` on the loop, after the running handler. Any thread may
+    // post; a foreign loop hears of it through the loop descriptor.
+    void Post(std::function<void()> handler);
+    // Calls the user-event handler with (id, data) on the loop, as Post().
     void PostUserEvent(unsigned long alId, void* pData);
     void SetUserEventHandler(std::function<void(unsigned long, void*)> handler);
 
   private:
     Application() = default;
     void MarkUserInterfaceThread() { uiThread_.store(std::this_thread::get_id()); }
+    void Wake();
 
     boost::asio::io_context context_;
+    NestedWait nestedWait_;
+    int dispatching_ = 0;         // Dispatch() calls running, nested ones included
+    bool nestingBarred_ = false;  // inside DispatchWithoutNesting()
+    int loopDescriptor_ = -1;     // an epoll set of the context's epoll set and wakeDescriptor_
+    std::atomic<int> wakeDescriptor_{-1};  // an eventfd written by posts from other threads
     std::function<void(unsigned long, void*)> userEventHandler_;
     bool quitting_ = false;
     bool waiting_ = false;
