@@ -27,7 +27,8 @@ class NXBASE_EXPORT Text {
     // kFallbackLanguage is loaded instead. True when either file was read.
     static bool LoadText(const String& asBase, int alLanguage);
 
-    // Loads the library's own texts (colour names, group "FarbTexte"),
+    // Loads the library's own texts (colour names, group "FarbTexte"; the
+    // post office's waiting dialog, group "ObjectIdApplikation"),
     // NxBase<language>.lng from nxbase::LibraryDataDirectory()/lng, falling
     // back to kFallbackLanguage; needs no AppDir. True when a file was read.
     static bool LoadLibraryTexts(int alLanguage);

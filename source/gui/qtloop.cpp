@@ -1,0 +1,67 @@
+#include "nxbase/qtloop.h"
+
+#include <QAbstractEventDispatcher>
+#include <QCoreApplication>
+#include <QSocketNotifier>
+#include <QTimer>
+#include <memory>
+
+#include "toolkit/application.h"
+
+namespace nxbase::qt {
+
+namespace {
+
+struct Attachment {
+    std::unique_ptr<QSocketNotifier> notifier;
+    QMetaObject::Connection beforeSleep;
+    std::uint64_t wakeUps = 0;
+};
+
+std::unique_ptr<Attachment> gAttachment;
+
+// One pass of Qt's loop, for at most `timeout`: a timer bounds the sleep,
+// so that the library's wait can ask its keep-waiting function.
+void ProcessEventsOnce(std::chrono::milliseconds timeout) {
+    QAbstractEventDispatcher* dispatcher = QAbstractEventDispatcher::instance();
+    if (dispatcher == nullptr) return;
+    QTimer limit;
+    limit.setSingleShot(true);
+    limit.start(static_cast<int>(timeout.count()));
+    dispatcher->processEvents(QEventLoop::AllEvents | QEventLoop::WaitForMoreEvents);
+}
+
+}  // namespace
+
+void Attach() {
+    Detach();
+    int descriptor = Application::Get().GetLoopDescriptor();
+    auto attachment = std::make_unique<Attachment>();
+    attachment->notifier = std::make_unique<QSocketNotifier>(descriptor, QSocketNotifier::Read);
+    Attachment* self = attachment.get();
+    QObject::connect(self->notifier.get(), &QSocketNotifier::activated, [self] {
+        ++self->wakeUps;
+        Application::Get().Dispatch();
+    });
+    // Handlers made ready by calls outside any handler (a button that sent a
+    // message) are not announced on the descriptor: run them before Qt sleeps.
+    if (QAbstractEventDispatcher* dispatcher = QAbstractEventDispatcher::instance()) {
+        self->beforeSleep = QObject::connect(dispatcher, &QAbstractEventDispatcher::aboutToBlock,
+                                             [] { Application::Get().Dispatch(); });
+    }
+    gAttachment = std::move(attachment);
+    Application::Get().SetNestedWait(ProcessEventsOnce);
+}
+
+void Detach() {
+    if (!gAttachment) return;
+    Application::Get().SetNestedWait({});
+    QObject::disconnect(gAttachment->beforeSleep);
+    gAttachment.reset();
+}
+
+std::uint64_t WakeUps() {
+    return gAttachment ? gAttachment->wakeUps : 0;
+}
+
+}  // namespace nxbase::qt
