@@ -86,6 +86,11 @@ bool MeasureWithLumaServer(PostOffice& axOffice, int alCount, std::vector<Measur
     lock << static_cast<unsigned char>(0);
     bool ok = exchange.Ask(LOCK, lock, answer);
     for (int i = 0; ok && i < alCount; ++i) {
+        if (pProgress && pProgress->IsAborted()) {
+            *pError = "the measurement was aborted";
+            ok = false;
+            break;
+        }
         ok = exchange.MeasureOne(pOut);
         if (pProgress) pProgress->DisplayProgress(static_cast<double>(i + 1) / alCount);
     }

@@ -1,5 +1,5 @@
 #!/usr/bin/env bash
-# Runs the three examples as a user would and checks what they print.
+# Runs the examples as a user would and checks what they print.
 set -euo pipefail
 build="$1"
 source="$2"
@@ -35,4 +35,12 @@ for _ in $(seq 50); do
     sleep 0.1
 done
 [ ! -S "$NXBASE_RUNTIME_DIR/PipeRequest-LumaServer" ] || fail "lumaserver did not end after the example left"
-echo "the three examples work"
+
+# The same with the GLib loop and the asynchronous send, when it was built.
+if [ -x "$build/examples/glib-measure" ]; then
+    out=$("$build/examples/glib-measure" 3)
+    [ "$(grep -c " L\* " <<< "$out")" -eq 3 ] || fail "glib-measure: not 3 measurements: $out"
+    grep -q "^1 dark skin  L\*  38.42  a\*   13.69  b\*   14.42" <<< "$out" || fail "glib-measure: dark skin: $out"
+    grep -q "^3 notices" <<< "$out" || fail "glib-measure: notices missing: $out"
+fi
+echo "the examples work"

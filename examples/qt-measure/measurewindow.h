@@ -1,0 +1,64 @@
+// The window of qt-measure: measures N patches through LumaServer with a
+// progress bar and an abort button, shows each patch as a swatch with its
+// CIELAB values, compares with a reference file (CIEDE2000 per patch, the
+// worst three marked) and lists the server's notices as they come.
+#ifndef QT_MEASURE_MEASUREWINDOW_H_
+#define QT_MEASURE_MEASUREWINDOW_H_
+
+#include <nxbase/lumaclient.h>
+#include <nxbase/qtuserinterface.h>
+#include <nxbase/spectrafile.h>
+
+#include <QLabel>
+#include <QListWidget>
+#include <QProgressBar>
+#include <QPushButton>
+#include <QSpinBox>
+#include <QTableWidget>
+#include <QWidget>
+#include <array>
+#include <string>
+#include <vector>
+
+class PostOffice;
+
+class MeasureWindow : public QWidget {
+  public:
+    explicit MeasureWindow(PostOffice& office);
+    ~MeasureWindow() override;
+
+    // Measures the number of patches in the spin box; the table then shows them.
+    void Measure();
+    // Reads a reference file (CSV or CGATS) and compares the table with it.
+    bool LoadReference(const std::string& path);
+    // The CIELAB values shown, one row per patch, and the status line.
+    const std::vector<std::array<float, 3>>& Lab() const { return lab_; }
+    QString Status() const { return status_->text(); }
+    int NoticeCount() const { return notices_->count(); }
+
+    // The server's notice that a patch was measured (MESSUNG_AUSGELOEST).
+    long OnNotice(void* event);
+
+  private:
+    bool Subscribe();
+    void ShowMeasured();
+    void Compare();
+    void SetStatus(const QString& text);
+
+    PostOffice& office_;
+    QSpinBox* patches_;
+    QPushButton* measure_;
+    QPushButton* abort_;
+    QPushButton* reference_;
+    QProgressBar* progress_;
+    QTableWidget* table_;
+    QListWidget* notices_;
+    QLabel* status_;
+    std::vector<nxbase::MeasuredSpectrum> measured_;
+    std::vector<std::array<float, 3>> lab_;
+    nxbase::SpectraTable referenceTable_;
+    bool aborted_ = false;
+    bool subscribed_ = false;
+};
+
+#endif  // QT_MEASURE_MEASUREWINDOW_H_

@@ -1,0 +1,166 @@
+// The qt-measure example, headless: it measures the built-in chart through
+// LumaServer with the numbers nxcolor prints, marks the three patches
+// farthest from a reference, shows the server's notices, and survives the
+// server being killed mid-measurement.
+#include <gtest/gtest.h>
+
+#include <QApplication>
+#include <QPushButton>
+#include <QSpinBox>
+#include <QTableWidget>
+#include <QTest>
+#include <QTimer>
+#include <cstdio>
+#include <fstream>
+#include <sstream>
+
+#include "gui_test_util.h"
+#include "measurewindow.h"
+#include "nxbase/qtloop.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+QApplication& App() {
+    static int argc = 1;
+    static char name[] = "qtmeasure_test";
+    static char* argv[] = {name, nullptr};
+    static nxtest::TempDir runtime;  // Qt's runtime directory, never a shared one
+    static QApplication* app = [] {
+        ::setenv("QT_QPA_PLATFORM", "offscreen", 1);
+        ::setenv("XDG_RUNTIME_DIR", runtime.path().c_str(), 1);
+        return new QApplication(argc, argv);
+    }();
+    return *app;
+}
+
+std::string Output(const std::string& command) {
+    std::string output;
+    FILE* pipe = ::popen(command.c_str(), "r");
+    char buffer[4096];
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        output.append(buffer, n);
+    ::pclose(pipe);
+    return output;
+}
+
+class QtMeasureTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        nxbase::qt::Attach();
+        UserInterface::Install(std::make_shared<nxbase::qt::QtUserInterface>());
+        office = PostOffice::CreatePostOffice("QtMeasureTest");
+        window = std::make_unique<MeasureWindow>(*office);
+        window->show();
+    }
+    void TearDown() override {
+        window.reset();
+        nxbase::qt::Detach();
+        UserInterface::Install(nullptr);
+    }
+    void Click(const char* button) {
+        QTest::mouseClick(window->findChild<QPushButton*>(QString::fromLatin1(button)),
+                          Qt::LeftButton);
+    }
+    void SetPatches(int count) {
+        window->findChild<QSpinBox*>(QStringLiteral("patches"))->setValue(count);
+    }
+    bool ProcessUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
+        auto deadline = std::chrono::steady_clock::now() + limit;
+        while (!done()) {
+            if (std::chrono::steady_clock::now() > deadline) return false;
+            QCoreApplication::processEvents(QEventLoop::WaitForMoreEvents, 20);
+        }
+        return true;
+    }
+
+    nxtest::GuiSandbox gui;
+    QApplication& app = App();
+    PostOffice* office = nullptr;
+    std::unique_ptr<MeasureWindow> window;
+};
+
+TEST_F(QtMeasureTest, MeasuresTheChartAsNxcolorDoesAndMarksTheThreeFarthestFromTheReference) {
+    SetPatches(24);
+    Click("measure");
+    ASSERT_EQ(window->Lab().size(), 24u) << window->Status().toStdString();
+    EXPECT_TRUE(window->Status().startsWith(QStringLiteral("Measured 24")))
+        << window->Status().toStdString();
+
+    // The table shows what nxcolor, through the same server, prints: id, L*, a*, b*.
+    auto* table = window->findChild<QTableWidget*>(QStringLiteral("table"));
+    std::istringstream lines(
+        Output(NXBASE_BINARY_DIR "/tools/nxcolor --measure 24 -f csv -p 2 2>&1"));
+    std::string line;
+    std::getline(lines, line);  // header
+    int rows = 0;
+    for (; rows < 24 && std::getline(lines, line); ++rows) {
+        std::string shown = table->item(rows, 1)->text().toStdString() + ",";
+        std::string lab;
+        for (int c = 2; c <= 4; ++c) lab += "," + table->item(rows, c)->text().toStdString();
+        EXPECT_EQ(line.rfind(shown, 0), 0u) << line << " vs " << shown;
+        EXPECT_NE(line.find(lab + ","), std::string::npos) << line << " vs " << lab;
+    }
+    EXPECT_EQ(rows, 24);
+    // Notices of every measured patch reached the window.
+    ASSERT_TRUE(ProcessUntil([&] { return window->NoticeCount() >= 24; })) << window->NoticeCount();
+
+    // A reference equal to the chart but for three darker patches: exactly those are marked.
+    std::ifstream chart(NXBASE_SOURCE_DIR
+                        "/tools/nxcolor/data/colorchecker_babelcolor_average.csv");
+    std::string reference = gui.sandbox.root() + "/reference.csv";
+    std::ofstream out(reference);
+    for (int row = 0; std::getline(chart, line); ++row) {
+        if (row == 5 || row == 11 || row == 17) {
+            std::istringstream fields(line);
+            std::string field;
+            for (int f = 0; std::getline(fields, field, ','); ++f)
+                out << (f ? "," : "") << (f < 2 ? field : std::to_string(std::stod(field) * 0.8));
+            out << "\n";
+        } else {
+            out << line << "\n";
+        }
+    }
+    out.close();
+    ASSERT_TRUE(window->LoadReference(reference)) << window->Status().toStdString();
+    std::vector<int> marked;
+    for (int row = 0; row < table->rowCount(); ++row) {
+        if (table->item(row, 1)->background().style() != Qt::NoBrush) marked.push_back(row);
+        double delta = table->item(row, 5)->text().toDouble();
+        if (row == 4 || row == 10 || row == 16) {
+            EXPECT_GT(delta, 3.0) << row;
+        } else {
+            EXPECT_LT(delta, 0.01) << row;
+        }
+    }
+    EXPECT_EQ(marked, (std::vector<int>{4, 10, 16}));
+}
+
+TEST_F(QtMeasureTest, SurvivesTheServerKilledMidMeasurementAndTheNextMeasurementRestartsIt) {
+    SetPatches(240);
+    auto* progress = window->findChild<QProgressBar*>();
+    QTimer killer;
+    pid_t killed = 0;
+    QObject::connect(&killer, &QTimer::timeout, [&] {
+        if (progress->value() <= 0 || killed != 0) return;
+        killed = nxtest::FindProcess(gui.serverExecutable);
+        if (killed != 0) ::kill(killed, SIGKILL);
+    });
+    killer.start(5);
+    Click("measure");
+    killer.stop();
+    ASSERT_NE(killed, 0);
+    EXPECT_GT(window->Lab().size(), 0u);
+    EXPECT_LT(window->Lab().size(), 240u);
+    EXPECT_TRUE(window->Status().contains(QStringLiteral("Measure again to restart LumaServer")))
+        << window->Status().toStdString();
+
+    SetPatches(3);
+    Click("measure");
+    EXPECT_EQ(window->Status().toStdString(), "Measured 3 patches.");
+    EXPECT_EQ(window->Lab().size(), 3u);
+    EXPECT_NE(nxtest::FindProcess(gui.serverExecutable), killed);
+}
+
+}  // namespace
