@@ -7,7 +7,9 @@
 // - one message there and back through Pipe against the same raw ping-pong;
 // - the post office over D-Bus against over the sockets (TwoCpus);
 // - the floor of any messaging on the loop: a bare asio ping-pong of the same
-//   frames (a read kept armed, run_one_for, no library code) against raw.
+//   frames (a read kept armed, run_one_for, no library code) against raw;
+// - SendAndReceive with the loop inside a GLib main loop and inside Qt's
+//   (their nested waits turn those loops) against the library's own loop.
 // Each pair runs side by side in every one of five rounds; at the end the
 // program prints the ratio of each pair's times per round as min/median/max.
 // The peers are this program started again with "--peer MODE CPU".
@@ -37,6 +39,13 @@
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
 #include "toolkit/application.h"
+
+#ifdef NXBASE_BENCH_GUI_LOOPS
+#include <QCoreApplication>
+
+#include "nxbase/glibloop.h"
+#include "nxbase/qtloop.h"
+#endif
 
 namespace {
 
@@ -169,12 +178,45 @@ bool WaitForSocket(const std::string& name) {
     return false;
 }
 
+// Which main loop drives the library's: its own, GLib's or Qt's.
+enum class Loop { kOwn, kGLib, kQt };
+
+// Attaches the library's loop to a GUI loop for the lifetime of a scope.
+class GuiLoop {
+  public:
+    explicit GuiLoop(Loop loop) : loop_(loop) {
+#ifdef NXBASE_BENCH_GUI_LOOPS
+        if (loop_ == Loop::kGLib) nxbase::glib::Attach();
+        if (loop_ == Loop::kQt) {
+            static int argc = 1;
+            static char name[] = "messaging_bench";
+            static char* argv[] = {name, nullptr};
+            static QCoreApplication* app = new QCoreApplication(argc, argv);
+            (void)app;
+            nxbase::qt::Attach();
+        }
+#endif
+    }
+    ~GuiLoop() {
+#ifdef NXBASE_BENCH_GUI_LOOPS
+        if (loop_ == Loop::kGLib) nxbase::glib::Detach();
+        if (loop_ == Loop::kQt) nxbase::qt::Detach();
+#endif
+    }
+    GuiLoop(const GuiLoop&) = delete;
+    GuiLoop& operator=(const GuiLoop&) = delete;
+
+  private:
+    Loop loop_;
+};
+
 // SendAndReceive to a post office that answers with its default handler.
-void PostOfficeRoundTrip(benchmark::State& state, Placement placement) {
+void PostOfficeRoundTrip(benchmark::State& state, Placement placement, Loop loop = Loop::kOwn) {
     PinTo(0);
     Scratch scratch;
     pid_t peer = StartPeer("server", placement);
     WaitForSocket("LumaServer");
+    GuiLoop driver(loop);
     PostOffice* office = PostOffice::CreatePostOffice("BenchClient");
     MyMemoryBlock request, answer;
     request.Put(Payload().data(), static_cast<long>(Payload().size()));
@@ -431,13 +473,21 @@ std::vector<Pair> Pairs() {
         };
     };
     std::vector<Placement> both{Placement::kSameCpu, Placement::kTwoCpus};
-    return {
-        {"SendAndReceive_vs_RawPingPong", PostOfficeRoundTrip, raw(DefaultAnswerFrame()), both},
+    auto on = [](Loop loop) {
+        return [loop](benchmark::State& state, Placement placement) {
+            PostOfficeRoundTrip(state, placement, loop);
+        };
+    };
+    auto ownLoop = on(Loop::kOwn);
+    std::vector<Pair> pairs = {
+        {"SendAndReceive_vs_RawPingPong", ownLoop, raw(DefaultAnswerFrame()), both},
         {"PipeRoundTrip_vs_RawPingPong", PipeRoundTrip, raw(EchoAnswerFrame()), both},
         {"BareLoopPingPong_vs_RawPingPong", LoopPingPong, raw(DefaultAnswerFrame()), both},
         {"SendAndReceiveOverDBus_vs_OverSockets",
          DdeRoundTrip,
-         PostOfficeRoundTrip,
+         [](benchmark::State& state, Placement placement) {
+             PostOfficeRoundTrip(state, placement);
+         },
          {Placement::kTwoCpus}},
         {"ServerThroughput4Clients_vs_RawServer",
          [](benchmark::State& state, Placement) { PostOfficeServerThroughput(state, 4); },
@@ -450,6 +500,11 @@ std::vector<Pair> Pairs() {
          {Placement::kAnyCpu},
          true},
     };
+#ifdef NXBASE_BENCH_GUI_LOOPS
+    pairs.push_back({"SendAndReceiveGLibLoop_vs_OwnLoop", on(Loop::kGLib), ownLoop, both});
+    pairs.push_back({"SendAndReceiveQtLoop_vs_OwnLoop", on(Loop::kQt), ownLoop, both});
+#endif
+    return pairs;
 }
 
 constexpr int kRounds = 5;

@@ -111,7 +111,10 @@ int Application::GetLoopDescriptor() {
 
 std::size_t Application::Dispatch() {
     MarkUserInterfaceThread();
-    if (wakeDescriptor_ >= 0) {
+    // Read only after a Wake(): a message's round trip should cost no call
+    // that finds nothing. The flag is raised after the write, so a counter
+    // written after this read is read by a later Dispatch().
+    if (wakePending_.exchange(false)) {
         eventfd_t count;
         (void)::eventfd_read(wakeDescriptor_, &count);
     }
@@ -143,7 +146,9 @@ std::size_t Application::DispatchWithoutNesting() {
 }
 
 void Application::Wake() {
-    if (wakeDescriptor_ >= 0) (void)::eventfd_write(wakeDescriptor_, 1);
+    if (wakeDescriptor_ < 0) return;
+    (void)::eventfd_write(wakeDescriptor_, 1);
+    wakePending_.store(true);
 }
 
 void Application::Wait(bool abWaiting) {

@@ -14,40 +14,45 @@ struct LoopSource {
 GSource* gAttached = nullptr;
 GMainContext* gContext = nullptr;
 std::uint64_t gWakeUps = 0;
+gint64 gNestedDeadline = -1;  // the end of a nested wait's turn, monotonic µs
 
 // Before GLib sleeps: handlers made ready by calls outside any handler (a
-// GTK signal that sent a message) are not announced on the descriptor. GLib
-// must not be iterated from here, so a handler that waits runs the
-// library's loop alone until it returns.
+// GTK signal that sent a message, or an answer that came while the message
+// was written) are not announced on the descriptor. When some ran here the
+// source counts as ready, so that the iteration returns instead of sleeping
+// (a nested wait is then over at once). GLib must not be iterated from
+// here, so a handler that waits runs the library's loop alone meanwhile.
 gboolean Prepare(GSource*, gint* timeout) {
     *timeout = -1;
-    Application::Get().DispatchWithoutNesting();
-    return FALSE;
+    if (gNestedDeadline >= 0) {
+        gint64 left = gNestedDeadline - g_get_monotonic_time();
+        *timeout = left > 0 ? static_cast<gint>((left + 999) / 1000) : 0;
+    }
+    return Application::Get().DispatchWithoutNesting() > 0;
 }
 
 gboolean Check(GSource* source) {
     auto* loop = reinterpret_cast<LoopSource*>(source);
-    return (g_source_query_unix_fd(source, loop->tag) & G_IO_IN) != 0;
+    bool readable = (g_source_query_unix_fd(source, loop->tag) & G_IO_IN) != 0;
+    if (readable) ++gWakeUps;
+    return readable;
 }
 
 gboolean Dispatch(GSource*, GSourceFunc, gpointer) {
-    ++gWakeUps;
     Application::Get().Dispatch();
     return G_SOURCE_CONTINUE;
 }
 
 GSourceFuncs gFuncs = {Prepare, Check, Dispatch, nullptr, nullptr, nullptr};
 
-// One turn of the context, for at most `timeout`: a short timeout source
-// bounds the sleep, so the library's wait can ask its keep-waiting function.
+// One turn of the context, for at most `timeout`, so that the library's
+// wait can ask its keep-waiting function. The source's prepare bounds the
+// poll by the deadline; no source is made for it.
 void IterateOnce(std::chrono::milliseconds timeout) {
-    GSource* limit = g_timeout_source_new(static_cast<guint>(timeout.count()));
-    g_source_set_callback(
-        limit, [](gpointer) -> gboolean { return G_SOURCE_REMOVE; }, nullptr, nullptr);
-    g_source_attach(limit, gContext);
+    gint64 outer = gNestedDeadline;
+    gNestedDeadline = g_get_monotonic_time() + timeout.count() * 1000;
     g_main_context_iteration(gContext, TRUE);
-    g_source_destroy(limit);
-    g_source_unref(limit);
+    gNestedDeadline = outer;
 }
 
 }  // namespace

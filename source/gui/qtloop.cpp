@@ -14,6 +14,7 @@ namespace {
 
 struct Attachment {
     std::unique_ptr<QSocketNotifier> notifier;
+    QTimer limit;  // ends a nested pass at its time limit
     QMetaObject::Connection beforeSleep;
     std::uint64_t wakeUps = 0;
 };
@@ -24,11 +25,10 @@ std::unique_ptr<Attachment> gAttachment;
 // so that the library's wait can ask its keep-waiting function.
 void ProcessEventsOnce(std::chrono::milliseconds timeout) {
     QAbstractEventDispatcher* dispatcher = QAbstractEventDispatcher::instance();
-    if (dispatcher == nullptr) return;
-    QTimer limit;
-    limit.setSingleShot(true);
-    limit.start(static_cast<int>(timeout.count()));
+    if (dispatcher == nullptr || !gAttachment) return;
+    gAttachment->limit.start(static_cast<int>(timeout.count()));
     dispatcher->processEvents(QEventLoop::AllEvents | QEventLoop::WaitForMoreEvents);
+    gAttachment->limit.stop();
 }
 
 }  // namespace
@@ -39,15 +39,20 @@ void Attach() {
     auto attachment = std::make_unique<Attachment>();
     attachment->notifier = std::make_unique<QSocketNotifier>(descriptor, QSocketNotifier::Read);
     Attachment* self = attachment.get();
+    self->limit.setSingleShot(true);
     QObject::connect(self->notifier.get(), &QSocketNotifier::activated, [self] {
         ++self->wakeUps;
         Application::Get().Dispatch();
     });
     // Handlers made ready by calls outside any handler (a button that sent a
-    // message) are not announced on the descriptor: run them before Qt sleeps.
+    // message, or an answer that came while the message was written) are not
+    // announced on the descriptor: run them before Qt sleeps, and when some
+    // ran, do not sleep (a nested wait is then over at once).
     if (QAbstractEventDispatcher* dispatcher = QAbstractEventDispatcher::instance()) {
-        self->beforeSleep = QObject::connect(dispatcher, &QAbstractEventDispatcher::aboutToBlock,
-                                             [] { Application::Get().Dispatch(); });
+        self->beforeSleep =
+            QObject::connect(dispatcher, &QAbstractEventDispatcher::aboutToBlock, [dispatcher] {
+                if (Application::Get().Dispatch() > 0) dispatcher->wakeUp();
+            });
     }
     gAttachment = std::move(attachment);
     Application::Get().SetNestedWait(ProcessEventsOnce);

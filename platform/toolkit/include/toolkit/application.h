@@ -132,7 +132,8 @@ class NXBASE_EXPORT Application {
     int dispatching_ = 0;         // Dispatch() calls running, nested ones included
     bool nestingBarred_ = false;  // inside DispatchWithoutNesting()
     int loopDescriptor_ = -1;     // an epoll set of the context's epoll set and wakeDescriptor_
-    std::atomic<int> wakeDescriptor_{-1};  // an eventfd written by posts from other threads
+    std::atomic<int> wakeDescriptor_{-1};   // an eventfd written by posts from other threads
+    std::atomic<bool> wakePending_{false};  // set after each write to it
     std::function<void(unsigned long, void*)> userEventHandler_;
     bool quitting_ = false;
     bool waiting_ = false;
