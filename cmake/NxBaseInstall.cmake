@@ -7,7 +7,9 @@ install(TARGETS nxbase EXPORT NxBaseTargets
     LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT runtime NAMELINK_COMPONENT dev
     ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT dev
     RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT runtime)
-install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
+# The GUI adapters' headers go with their own development packages (below).
+install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev
+        PATTERN "glibloop.h" EXCLUDE PATTERN "qtloop.h" EXCLUDE PATTERN "qtuserinterface.h" EXCLUDE)
 # Shipped texts, found relative to the installed library (LibraryDataDirectory).
 install(DIRECTORY data/lng DESTINATION ${CMAKE_INSTALL_DATADIR}/nxbase COMPONENT runtime)
 install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
@@ -30,6 +32,29 @@ file(RELATIVE_PATH NXBASE_PC_TO_PREFIX
 configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
 install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)
 
+# The GUI adapters, each a library of its own with a runtime and a
+# development component: find_package(NxBase COMPONENTS glib qt), or
+# pkg-config nxbase-glib / nxbase-qt.
+function(nxbase_install_gui component target export headers pc_name pc_requires)
+    install(TARGETS ${target} EXPORT ${export}
+        LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT ${component} NAMELINK_COMPONENT ${component}dev)
+    list(TRANSFORM headers PREPEND ${PROJECT_SOURCE_DIR}/include/nxbase/)
+    install(FILES ${headers} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/nxbase COMPONENT ${component}dev)
+    install(EXPORT ${export} NAMESPACE NxBase:: DESTINATION ${NXBASE_CMAKE_DIR} COMPONENT ${component}dev)
+    set(NXBASE_PC_NAME ${pc_name})
+    set(NXBASE_PC_REQUIRES ${pc_requires})
+    set(NXBASE_PC_LIB ${target})
+    configure_file(${PROJECT_SOURCE_DIR}/cmake/nxbase-gui.pc.in ${PROJECT_BINARY_DIR}/${pc_name}.pc @ONLY)
+    install(FILES ${PROJECT_BINARY_DIR}/${pc_name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig
+            COMPONENT ${component}dev)
+endfunction()
+if(TARGET nxbase-glib)
+    nxbase_install_gui(glib nxbase-glib NxBaseGlibTargets "glibloop.h" nxbase-glib "nxbase glib-2.0")
+endif()
+if(TARGET nxbase-qt)
+    nxbase_install_gui(qt nxbase-qt NxBaseQtTargets "qtloop.h;qtuserinterface.h" nxbase-qt "nxbase Qt6Widgets")
+endif()
+
 # The API reference (target "docs", with Doxygen): the public headers and
 # doc/first-hour.md as the first page; installed with the development
 # package when it was built. Any Doxygen warning fails the target.
@@ -49,6 +74,7 @@ if(DOXYGEN_FOUND AND Python_EXECUTABLE_FOR_DOCS)
     if(NXBASE_BUILD_TESTS)
         add_test(NAME Docs.ApiReferenceBuildsWithoutWarnings
                  COMMAND ${CMAKE_COMMAND} --build ${PROJECT_BINARY_DIR} --target docs)
-        set_tests_properties(Docs.ApiReferenceBuildsWithoutWarnings PROPERTIES LABELS packaging TIMEOUT 300)
+        set_tests_properties(Docs.ApiReferenceBuildsWithoutWarnings PROPERTIES LABELS packaging TIMEOUT 300
+                             RESOURCE_LOCK api-reference)
     endif()
 endif()

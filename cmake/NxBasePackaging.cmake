@@ -3,6 +3,8 @@
 #   libnxbase-dev    headers, CMake package, nxbase.pc
 #   nxbase-tools     nxcolor, nxreg, nxmsg, lumaserver and their manual pages
 #   python3-nxbase   the Python module for Debian's python3
+#   libnxbase-glib0, libnxbase-glib-dev, libnxbase-qt0, libnxbase-qt-dev
+#                    the GLib and Qt adapters, when they are built
 # Build them in a tree configured for /usr (scripts/packages.sh does):
 #   cmake -B build/deb -DCMAKE_INSTALL_PREFIX=/usr ... && cd build/deb && cpack -G DEB
 # dpkg-shlibdeps works out the library packages each one needs.
@@ -13,6 +15,12 @@ if(TARGET nxcolor)
 endif()
 if(TARGET nxbase_python)
     list(APPEND NXBASE_PACKAGES python python3-nxbase)
+endif()
+if(TARGET nxbase-glib)
+    list(APPEND NXBASE_PACKAGES glib libnxbase-glib0 glibdev libnxbase-glib-dev)
+endif()
+if(TARGET nxbase-qt)
+    list(APPEND NXBASE_PACKAGES qt libnxbase-qt0 qtdev libnxbase-qt-dev)
 endif()
 
 # Copyright and changelog in each package's documentation directory, as
@@ -78,5 +86,29 @@ set(CPACK_DEBIAN_PYTHON_PACKAGE_DEPENDS "${exact}, python3 (>= 3.11), python3 (<
 set(CPACK_DEBIAN_PYTHON_DESCRIPTION "NxBase for Linux, Python 3 module
  The module nxbase: spectra to XYZ, CIELAB, LCh, DIN99 and densities on NumPy
  arrays, colour differences, spectral files, and a client of LumaServer.")
+
+foreach(toolkit glib qt)
+    string(TOUPPER ${toolkit} upper)
+    set(CPACK_DEBIAN_${upper}_PACKAGE_SECTION libs)
+    set(CPACK_DEBIAN_${upper}_PACKAGE_DEPENDS "${exact}")
+    set(CPACK_DEBIAN_${upper}DEV_PACKAGE_SECTION libdevel)
+endforeach()
+set(CPACK_DEBIAN_GLIB_DESCRIPTION "NxBase for Linux, the GLib main-loop adapter
+ Runs NxBase's event loop (messaging with LumaServer and the other
+ applications) inside a GLib main loop, without polling.")
+set(CPACK_DEBIAN_GLIBDEV_PACKAGE_DEPENDS
+    "libnxbase-dev (= ${NXBASE_DEB_VERSION}), libnxbase-glib0 (= ${NXBASE_DEB_VERSION}), libglib2.0-dev")
+set(CPACK_DEBIAN_GLIBDEV_DESCRIPTION "NxBase for Linux, the GLib main-loop adapter, development files
+ Header, CMake component (find_package(NxBase COMPONENTS glib)) and
+ pkg-config file nxbase-glib.pc.")
+set(CPACK_DEBIAN_QT_DESCRIPTION "NxBase for Linux, the Qt 6 adapter and user interface
+ Runs NxBase's event loop inside Qt's without polling, and shows the
+ library's message boxes, waiting state, abort dialog and progress in Qt
+ widgets.")
+set(CPACK_DEBIAN_QTDEV_PACKAGE_DEPENDS
+    "libnxbase-dev (= ${NXBASE_DEB_VERSION}), libnxbase-qt0 (= ${NXBASE_DEB_VERSION}), qt6-base-dev")
+set(CPACK_DEBIAN_QTDEV_DESCRIPTION "NxBase for Linux, the Qt 6 adapter, development files
+ Headers, CMake component (find_package(NxBase COMPONENTS qt)) and
+ pkg-config file nxbase-qt.pc.")
 
 include(CPack)

@@ -12,7 +12,7 @@ packages=(
     python3-dev pybind11-dev python3-numpy python3-pytest
     argyll
     # GUI loop adapters, the Qt user interface and the GUI examples (Xvfb for the screenshot)
-    qt6-base-dev libglib2.0-dev xvfb xauth
+    qt6-base-dev libglib2.0-dev xvfb
     # NumPy's vectorised BLAS, so that bench/python_bench.py compares with a fair peer
     libopenblas0-pthread
 )
