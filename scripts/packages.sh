@@ -101,6 +101,7 @@ pkg-config --exists nxbase-glib nxbase-qt || fail "no pkg-config files for the a
     test -s "$work/qt-measure.png" || fail "qt-measure saved no window"
     for _ in $(seq 50); do [ -S "$NXBASE_RUNTIME_DIR/PipeRequest-LumaServer" ] || break; sleep 0.1; done
 )
+echo "glib-measure and qt-measure built against the adapters' packages and ran"
 
 # The tools from /usr/bin, with their manual pages.
 nxcolor --list-illuminants | grep -q D65 || fail "nxcolor"
