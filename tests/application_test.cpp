@@ -2,9 +2,11 @@
 #include "toolkit/application.h"
 
 #include <gtest/gtest.h>
+#include <poll.h>
 
 #include <boost/asio/post.hpp>
 #include <memory>
+#include <thread>
 
 #include "toolkit/userinterface.h"
 
@@ -106,6 +108,51 @@ TEST(EventLoop, UserEventsRunAfterTheCurrentHandlerAndQuitEndsExecute) {
     EXPECT_FALSE(app.IsInExecute());
     app.ResetQuit();
     app.SetUserEventHandler(nullptr);
+}
+
+// Whether the loop descriptor becomes readable within `ms`.
+bool Readable(int descriptor, int ms) {
+    pollfd entry{descriptor, POLLIN, 0};
+    return ::poll(&entry, 1, ms) == 1;
+}
+
+// What a foreign main loop relies on: the descriptor is readable when a timer
+// is due or another thread posted, not before and not after the dispatch.
+TEST(EventLoop, TheLoopDescriptorIsReadableExactlyWhileAHandlerIsDue) {
+    Application& app = Application::Get();
+    const int descriptor = app.GetLoopDescriptor();
+    app.Dispatch();
+    EXPECT_FALSE(Readable(descriptor, 0));
+
+    Counter timerCalls;
+    Timer timer;
+    timer.SetTimeout(30);
+    timer.SetTimeoutHdl(LINK(Counter, &timerCalls, Count));
+    auto start = std::chrono::steady_clock::now();
+    timer.Start();
+    EXPECT_FALSE(Readable(descriptor, 0));
+    ASSERT_TRUE(Readable(descriptor, 2000));
+    EXPECT_GE(std::chrono::steady_clock::now() - start, 25ms);
+    EXPECT_GE(app.Dispatch(), 1u);
+    EXPECT_EQ(timerCalls.calls, 1);
+    EXPECT_FALSE(Readable(descriptor, 0)) << "still readable after the dispatch: a busy loop";
+
+    std::vector<unsigned long> events;
+    app.SetUserEventHandler([&](unsigned long id, void*) { events.push_back(id); });
+    std::thread([&app] { app.PostUserEvent(7, nullptr); }).join();
+    ASSERT_TRUE(Readable(descriptor, 2000)) << "a post from another thread was not announced";
+    app.Dispatch();
+    EXPECT_EQ(events, std::vector<unsigned long>{7});
+    EXPECT_FALSE(Readable(descriptor, 0));
+    app.SetUserEventHandler(nullptr);
+
+    // With a nested wait installed the library's waits turn the foreign loop.
+    std::vector<long> turns;
+    app.SetNestedWait(
+        [&turns](std::chrono::milliseconds limit) { turns.push_back(limit.count()); });
+    app.RunOneFor(15ms);
+    app.SetNestedWait({});
+    EXPECT_EQ(turns, std::vector<long>{15});
 }
 
 TEST(EventLoop, WaitingStateAndTopWindowGoThroughTheUserInterface) {
