@@ -28,13 +28,7 @@ void Record(VELTRAEvent& event) {
 }
 
 std::string Shell(const std::string& command) {
-    std::string output;
-    FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
-    char buffer[4096];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        output.append(buffer, n);
-    ::pclose(pipe);
-    return output;
+    return nxtest::ShellOutput(command);
 }
 
 class DdeTest : public ::testing::Test {

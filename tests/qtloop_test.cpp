@@ -21,25 +21,11 @@
 #include "nxbase/check.h"
 #include "nxbase/qtuserinterface.h"
 #include "nxbase/text.h"
+#include "qt_test_util.h"
 
 namespace {
 
 using namespace std::chrono_literals;
-
-QApplication& App() {
-    static int argc = 1;
-    static char name[] = "qtloop_test";
-    static char* argv[] = {name, nullptr};
-    // Qt's runtime directory: a private one in the build tree, never a
-    // shared /tmp/runtime-<user>.
-    static nxtest::TempDir runtime;
-    static QApplication* app = [] {
-        ::setenv("QT_QPA_PLATFORM", "offscreen", 1);
-        ::setenv("XDG_RUNTIME_DIR", runtime.path().c_str(), 1);
-        return new QApplication(argc, argv);
-    }();
-    return *app;
-}
 
 // Calls `step` every 20 ms on Qt's loop until it returns true.
 void EveryTwentyMs(QObject* owner, std::function<bool()> step) {
@@ -62,7 +48,7 @@ class QtLoopTest : public ::testing::Test {
         UserInterface::Install(nullptr);
     }
     nxtest::GuiSandbox gui;
-    QApplication& app = App();  // before any widget
+    QApplication& app = nxtest::QtApp();  // before any widget
     QWidget window;
 };
 

@@ -17,33 +17,11 @@
 #include "gui_test_util.h"
 #include "measurewindow.h"
 #include "nxbase/qtloop.h"
+#include "qt_test_util.h"
 
 namespace {
 
 using namespace std::chrono_literals;
-
-QApplication& App() {
-    static int argc = 1;
-    static char name[] = "qtmeasure_test";
-    static char* argv[] = {name, nullptr};
-    static nxtest::TempDir runtime;  // Qt's runtime directory, never a shared one
-    static QApplication* app = [] {
-        ::setenv("QT_QPA_PLATFORM", "offscreen", 1);
-        ::setenv("XDG_RUNTIME_DIR", runtime.path().c_str(), 1);
-        return new QApplication(argc, argv);
-    }();
-    return *app;
-}
-
-std::string Output(const std::string& command) {
-    std::string output;
-    FILE* pipe = ::popen(command.c_str(), "r");
-    char buffer[4096];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        output.append(buffer, n);
-    ::pclose(pipe);
-    return output;
-}
 
 class QtMeasureTest : public ::testing::Test {
   protected:
@@ -76,7 +54,7 @@ class QtMeasureTest : public ::testing::Test {
     }
 
     nxtest::GuiSandbox gui;
-    QApplication& app = App();
+    QApplication& app = nxtest::QtApp();
     PostOffice* office = nullptr;
     std::unique_ptr<MeasureWindow> window;
 };
@@ -91,7 +69,7 @@ TEST_F(QtMeasureTest, MeasuresTheChartAsNxcolorDoesAndMarksTheThreeFarthestFromT
     // The table shows what nxcolor, through the same server, prints: id, L*, a*, b*.
     auto* table = window->findChild<QTableWidget*>(QStringLiteral("table"));
     std::istringstream lines(
-        Output(NXBASE_BINARY_DIR "/tools/nxcolor --measure 24 -f csv -p 2 2>&1"));
+        nxtest::ShellOutput(NXBASE_BINARY_DIR "/tools/nxcolor --measure 24 -f csv -p 2"));
     std::string line;
     std::getline(lines, line);  // header
     int rows = 0;

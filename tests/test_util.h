@@ -3,6 +3,7 @@
 #ifndef NXBASE_TESTS_TEST_UTIL_H_
 #define NXBASE_TESTS_TEST_UTIL_H_
 
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -87,6 +88,18 @@ class ScopedEnv {
 inline std::string ReadFile(const std::string& path) {
     std::ifstream in(path, std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+}
+
+// What a shell command prints, standard error included.
+inline std::string ShellOutput(const std::string& command) {
+    std::string output;
+    FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
+    if (pipe == nullptr) return output;
+    char buffer[4096];
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        output.append(buffer, n);
+    ::pclose(pipe);
+    return output;
 }
 
 inline std::vector<std::string> ReadLines(const std::string& path) {
