@@ -131,11 +131,11 @@ TEST_F(QtLoopTest, TheAbortDialogEndsAWaitWhilstTheTopWindowIsOffAndBoxesAreAnsw
     EXPECT_TRUE(asked.contains(QStringLiteral("Quit application?"))) << asked.toStdString();
     EXPECT_TRUE(asked.contains(QStringLiteral("a test's own assertion"))) << asked.toStdString();
 
-    // LOCK with the waiting byte turns the busy cursor on; UNLOCK off again.
-    ui->SetWaiting(true);
+    // The application's waiting state (a LOCK with its waiting byte) is the busy cursor.
+    Application::Get().Wait(true);
     ASSERT_NE(QApplication::overrideCursor(), nullptr);
     EXPECT_EQ(QApplication::overrideCursor()->shape(), Qt::BusyCursor);
-    ui->SetWaiting(false);
+    Application::Get().Wait(false);
     EXPECT_EQ(QApplication::overrideCursor(), nullptr);
 }
 
