@@ -32,6 +32,10 @@ template struct EpollDescriptorAccess<&boost::asio::detail::epoll_reactor::epoll
 
 int ContextEpollDescriptor(boost::asio::io_context& axContext) {
     auto& reactor = boost::asio::use_service<boost::asio::detail::epoll_reactor>(axContext);
+    // The reactor runs in a poll only once it is the scheduler's task, which
+    // the first timer or socket would make it; until then its first wake-up
+    // would stay unread and keep the descriptor readable.
+    reactor.init_task();
     return reactor.*EpollDescriptorMember();
 }
 
@@ -106,6 +110,7 @@ int Application::GetLoopDescriptor() {
     }
     wakeDescriptor_ = wake;
     loopDescriptor_ = loop;
+    foreignWork_.emplace(context_.get_executor());
     return loopDescriptor_;
 }
 

@@ -14,6 +14,7 @@
 
 #include <array>
 #include <atomic>
+#include <boost/asio/executor_work_guard.hpp>
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
@@ -21,6 +22,7 @@
 #include <cstring>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <thread>
 
 #include "nxbase/export.h"
@@ -129,6 +131,11 @@ class NXBASE_EXPORT Application {
 
     boost::asio::io_context context_;
     NestedWait nestedWait_;
+    // Held while a foreign loop drives this one: without work a poll stops
+    // the context at once and leaves a readiness on the descriptor unread,
+    // which would have the foreign loop spin.
+    std::optional<boost::asio::executor_work_guard<boost::asio::io_context::executor_type>>
+        foreignWork_;
     int dispatching_ = 0;         // Dispatch() calls running, nested ones included
     bool nestingBarred_ = false;  // inside DispatchWithoutNesting()
     int loopDescriptor_ = -1;     // an epoll set of the context's epoll set and wakeDescriptor_
