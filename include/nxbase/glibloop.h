@@ -8,7 +8,13 @@
 //     nxbase::glib::Attach();           // before or after CreatePostOffice
 //     g_main_loop_run(loop);            // instead of Application::Execute()
 //
-// Everything runs on the thread that iterates the context.
+// Everything runs on the thread that iterates the context. One limit: GLib
+// may not be iterated while it prepares a turn, and the source dispatches
+// there what calls outside any handler made ready (an answer read at once
+// by a send from a GTK signal); should such a handler itself wait for an
+// answer, the library's loop alone runs during that wait, GLib's other
+// sources pause. The library's own deferred work is announced on the
+// descriptor and never runs there.
 #ifndef NXBASE_GLIBLOOP_H_
 #define NXBASE_GLIBLOOP_H_
 
