@@ -7,7 +7,6 @@
 #include <sys/wait.h>
 
 #include <chrono>
-#include <fstream>
 #include <string>
 #include <thread>
 
@@ -19,12 +18,7 @@ namespace nxtest {
 
 // Voluntary context switches of the calling thread: one per sleep that ended.
 inline long ThreadWakeUps() {
-    std::ifstream status("/proc/thread-self/status");
-    std::string line;
-    while (std::getline(status, line)) {
-        if (line.rfind("voluntary_ctxt_switches:", 0) == 0) return std::stol(line.substr(24));
-    }
-    return -1;
+    return ProcStatusField("/proc/thread-self/status", "voluntary_ctxt_switches");
 }
 
 // LumaServer (a copy of lumaserver, registered) and the echo peer "EchoPeer".

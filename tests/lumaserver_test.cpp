@@ -299,11 +299,7 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
 
 // The server's highest resident memory so far, in KiB.
 long HighWaterKiB(pid_t pid) {
-    std::ifstream status("/proc/" + std::to_string(pid) + "/status");
-    for (std::string line; std::getline(status, line);) {
-        if (line.rfind("VmHWM:", 0) == 0) return std::stol(line.substr(6));
-    }
-    return -1;
+    return nxtest::ProcStatusField("/proc/" + std::to_string(pid) + "/status", "VmHWM");
 }
 
 // Ends a child process when the test ends, however it ends.

@@ -13,6 +13,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <memory>
 #include <string>
@@ -55,6 +56,17 @@ inline bool Accepts(const std::string& path) {
     bool accepted = ::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
     ::close(fd);
     return accepted;
+}
+
+// A number field of a /proc status file ("VmRSS", "voluntary_ctxt_switches"
+// of "/proc/self/status", say); -1 when it is not there.
+inline long ProcStatusField(const std::string& path, const std::string& field) {
+    std::ifstream status(path);
+    const std::string key = field + ":";
+    for (std::string line; std::getline(status, line);) {
+        if (line.rfind(key, 0) == 0) return std::stol(line.substr(key.size()));
+    }
+    return -1;
 }
 
 // Runs the loop until `done` or `limit`; false on the time-out.

@@ -345,11 +345,7 @@ TEST_F(PostOfficeTest, TheLockOwnersCommandsPassThoseQueuedBeforeThem) {
 }
 
 long ResidentKiB() {
-    std::ifstream status("/proc/self/status");
-    for (std::string line; std::getline(status, line);) {
-        if (line.rfind("VmRSS:", 0) == 0) return std::stol(line.substr(6));
-    }
-    return -1;
+    return nxtest::ProcStatusField("/proc/self/status", "VmRSS");
 }
 
 TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {

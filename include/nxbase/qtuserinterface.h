@@ -76,6 +76,7 @@ class NXBASE_EXPORT QtProgressListener : public ProgressListener {
 
   private:
     static constexpr int kSteps = 1000;
+    static int Steps(double progress);  // 0..1 clamped, as bar steps
     void Show(int value, const QString& text, bool withText);
 
     QPointer<QProgressBar> bar_;

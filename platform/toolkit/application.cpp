@@ -50,6 +50,22 @@ void Watch(int aEpoll, int aDescriptor) {
     if (::epoll_ctl(aEpoll, EPOLL_CTL_ADD, aDescriptor, &event) != 0) ThrowErrno("epoll_ctl");
 }
 
+// Gives a variable a value for the lifetime of a scope, exceptions included.
+template <class T>
+class ScopedValue {
+  public:
+    ScopedValue(T& axVariable, T axValue) : amVariable(axVariable), amOld(axVariable) {
+        amVariable = axValue;
+    }
+    ~ScopedValue() { amVariable = amOld; }
+    ScopedValue(const ScopedValue&) = delete;
+    ScopedValue& operator=(const ScopedValue&) = delete;
+
+  private:
+    T& amVariable;
+    T amOld;
+};
+
 }  // namespace
 
 Application& Application::Get() {
@@ -124,30 +140,13 @@ std::size_t Application::Dispatch() {
         (void)::eventfd_read(wakeDescriptor_, &count);
     }
     if (context_.stopped()) context_.restart();
-    ++dispatching_;
-    std::size_t ran = 0;
-    try {
-        ran = context_.poll();
-    } catch (...) {
-        --dispatching_;
-        throw;
-    }
-    --dispatching_;
-    return ran;
+    ScopedValue<int> depth(dispatching_, dispatching_ + 1);
+    return context_.poll();
 }
 
 std::size_t Application::DispatchWithoutNesting() {
-    bool barred = nestingBarred_;
-    nestingBarred_ = true;
-    std::size_t ran = 0;
-    try {
-        ran = Dispatch();
-    } catch (...) {
-        nestingBarred_ = barred;
-        throw;
-    }
-    nestingBarred_ = barred;
-    return ran;
+    ScopedValue<bool> barred(nestingBarred_, true);
+    return Dispatch();
 }
 
 void Application::Wake() {

@@ -123,6 +123,10 @@ void QtUserInterface::CloseAbortDialog() {
     dialog->hide();
 }
 
+int QtProgressListener::Steps(double progress) {
+    return static_cast<int>(std::lround(std::clamp(progress, 0.0, 1.0) * kSteps));
+}
+
 QtProgressListener::QtProgressListener(QProgressBar* bar) : bar_(bar) {
     if (bar) bar->setRange(0, kSteps);
 }
@@ -133,13 +137,13 @@ QtProgressListener::QtProgressListener(QProgressDialog* dialog) : dialog_(dialog
 
 void QtProgressListener::DisplayProgress(double progress) {
     if (!CheckProgressIncrement(progress)) return;
-    Show(static_cast<int>(std::lround(std::clamp(progress, 0.0, 1.0) * kSteps)), QString(), false);
+    Show(Steps(progress), QString(), false);
 }
 
 void QtProgressListener::DisplayProgress(double progress, const std::string& text) {
     // A new text is worth showing even when the value has not moved enough.
     CheckProgressIncrement(progress);
-    Show(static_cast<int>(std::lround(std::clamp(progress, 0.0, 1.0) * kSteps)), Q(text), true);
+    Show(Steps(progress), Q(text), true);
 }
 
 void QtProgressListener::DisplayProgress(const std::string& text) {
