@@ -14,6 +14,12 @@ temporaries stay in the cache (its fastest form here, several times faster).
   CPU 0 as in the one-thread case and free on both CPUs (where it runs on
   the faster one: the CPUs of a virtual machine need not be equally fast).
 
+With the bench module nxbench_readonce (built beside the module with the
+benchmarks), one read of the same array with the batch kernel's prefetch runs
+in the same rounds, on one thread and on two: the memory-bandwidth bound. Its
+ratios say how far the module is from it, and what any converter could reach
+against NumPy and from a second thread on this machine.
+
 Each round runs the contenders back to back, the side that goes first
 alternating, each for about a quarter of a second (repeated calls, as a
 single call of a few milliseconds is at the mercy of the scheduler); prints
@@ -35,6 +41,11 @@ from concurrent.futures import ThreadPoolExecutor  # noqa: E402
 import numpy as np  # noqa: E402
 
 import nxbase  # noqa: E402
+
+try:
+    import nxbench_readonce  # noqa: E402
+except ImportError:
+    nxbench_readonce = None
 
 COUNT = 1_000_000
 ROUNDS = max(7, int(sys.argv[1]) if len(sys.argv) > 1 else 7)
@@ -112,10 +123,10 @@ def run_rounds(contenders):
 def report(title, times, ratios):
     print(title)
     for name, values in times.items():
-        print(f"  {name:36s} M spectra/s  min / median / max {spread([COUNT / t / 1e6 for t in values])}")
-    for label, (faster, slower) in ratios.items():
-        per_round = [s / f for f, s in zip(times[faster], times[slower])]
-        print(f"  {label:36s} ratio       min / median / max {spread(per_round)}")
+        print(f"  {name:40s} M spectra/s  min / median / max {spread([COUNT / t / 1e6 for t in values])}")
+    for label, (contender, baseline) in ratios.items():
+        per_round = [b / c for c, b in zip(times[contender], times[baseline])]
+        print(f"  {label:40s} ratio       min / median / max {spread(per_round)}")
 
 
 def main():
@@ -135,30 +146,41 @@ def main():
     assert np.array_equal(sliced, numpy_lab(spectra, weights, white))
 
     os.sched_setaffinity(0, {0})
-    one = run_rounds([
+    contenders = [
         ("nxbase threads=1", lambda: nxbase.spectra_to_Lab(spectra, threads=1)),
         ("NumPy whole array", lambda: numpy_lab(spectra, weights, white)),
         ("NumPy sliced", lambda: numpy_lab_sliced(spectra, weights, white, out)),
-    ])
-    report("One thread each, pinned to CPU 0:", one,
-           {"nxbase over NumPy whole array": ("nxbase threads=1", "NumPy whole array"),
-            "nxbase over NumPy sliced": ("nxbase threads=1", "NumPy sliced")})
+    ]
+    ratios = {"nxbase over NumPy whole array": ("nxbase threads=1", "NumPy whole array"),
+              "nxbase over NumPy sliced": ("nxbase threads=1", "NumPy sliced")}
+    if nxbench_readonce:
+        contenders.append(("read once", lambda: nxbench_readonce.read_once(spectra, 1)))
+        ratios["nxbase over read once"] = ("nxbase threads=1", "read once")
+        ratios["read once over NumPy sliced"] = ("read once", "NumPy sliced")
+    report("One thread each, pinned to CPU 0:", run_rounds(contenders), ratios)
 
     if len(os.sched_getaffinity(0) | set(range(os.cpu_count() or 1))) < 2:
         print("Two threads each: skipped, one CPU")
         return
     os.sched_setaffinity(0, {0, 1})
     with ThreadPoolExecutor(2) as pool:
-        two = run_rounds([
+        contenders = [
             ("nxbase threads=2", lambda: nxbase.spectra_to_Lab(spectra, threads=2)),
             ("NumPy sliced, two threads", lambda: numpy_lab_on_two_threads(pool, spectra, weights, white, out)),
             ("nxbase threads=1 on CPU 0", lambda: on_cpu0(lambda: nxbase.spectra_to_Lab(spectra, threads=1))),
             ("nxbase threads=1 free", lambda: nxbase.spectra_to_Lab(spectra, threads=1)),
-        ])
-    report("Two threads each, on CPUs 0 and 1:", two,
-           {"nxbase over NumPy sliced": ("nxbase threads=2", "NumPy sliced, two threads"),
-            "nxbase two threads over one on CPU 0": ("nxbase threads=2", "nxbase threads=1 on CPU 0"),
-            "nxbase two threads over one free": ("nxbase threads=2", "nxbase threads=1 free")})
+        ]
+        ratios = {"nxbase over NumPy sliced": ("nxbase threads=2", "NumPy sliced, two threads"),
+                  "nxbase two threads over one on CPU 0": ("nxbase threads=2", "nxbase threads=1 on CPU 0"),
+                  "nxbase two threads over one free": ("nxbase threads=2", "nxbase threads=1 free")}
+        if nxbench_readonce:
+            contenders += [
+                ("read once, two threads", lambda: nxbench_readonce.read_once(spectra, 2)),
+                ("read once on CPU 0", lambda: on_cpu0(lambda: nxbench_readonce.read_once(spectra, 1))),
+            ]
+            ratios["nxbase over read once"] = ("nxbase threads=2", "read once, two threads")
+            ratios["read once two threads over one on CPU 0"] = ("read once, two threads", "read once on CPU 0")
+        report("Two threads each, on CPUs 0 and 1:", run_rounds(contenders), ratios)
 
 
 if __name__ == "__main__":

@@ -164,14 +164,28 @@ constexpr float kMaxPlausibleL = 130.2f;
 
 // The index of the first result whose lightness says the spectrum was not a
 // reflectance factor (percentages, most likely); -1 when all are plausible.
+// Each stretch is first tested as a whole, in a loop without an early exit
+// that the compiler vectorises; only a stretch that fails is searched.
 long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     const int axis = quantity == Quantity::kXYZ ? 1 : 0;
     const float limit = quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
-    for (std::size_t i = 0; i < count; ++i) {
-        if (out[3 * i + axis] > limit) return static_cast<long>(i);
+    constexpr std::size_t kStretch = 256;
+    for (std::size_t begin = 0; begin < count; begin += kStretch) {
+        const std::size_t end = std::min(count, begin + kStretch);
+        int any = 0;
+        for (std::size_t i = begin; i < end; ++i) any |= out[3 * i + axis] > limit;
+        if (!any) continue;
+        for (std::size_t i = begin; i < end; ++i) {
+            if (out[3 * i + axis] > limit) return static_cast<long>(i);
+        }
     }
     return -1;
 }
+
+// Spectra converted and then checked at a time: their results (96 KiB) are
+// still in the second-level cache when they are checked; a multiple of the
+// batch kernel's sixteen.
+constexpr std::size_t kCheckedPiece = 8192;
 
 // Spectra per call of a progress call-back: large enough that the call costs
 // nothing against the work, small enough for a bar to move.
@@ -276,17 +290,23 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
     py::array_t<float> result(ResultShape(input.array, 3));
     const std::size_t count = input.count;
     float* out = result.mutable_data();
-    // Each part is converted and checked by the thread that wrote it, while
-    // its results are still in that core's cache.
+    // Each part is converted and checked by the thread that wrote it, a
+    // piece at a time, while the piece's results are still in the core's cache.
     std::atomic<long> implausible{-1};
     const auto convert = [&](const auto* in, std::size_t first, std::size_t n) {
-        float* to = out + 3 * first;
-        quantity == Quantity::kXYZ ? batch->ToXYZ(in + first * kBands, n, to)
-                                   : batch->ToLab(in + first * kBands, n, to);
-        const long bad = FirstImplausible(to, n, quantity);
+        long bad = -1;
+        for (std::size_t done = 0; done < n && bad < 0; done += kCheckedPiece) {
+            const std::size_t piece = std::min(kCheckedPiece, n - done);
+            float* to = out + 3 * (first + done);
+            const auto* from = in + (first + done) * kBands;
+            quantity == Quantity::kXYZ ? batch->ToXYZ(from, piece, to)
+                                       : batch->ToLab(from, piece, to);
+            bad = FirstImplausible(to, piece, quantity);
+            if (bad >= 0) bad += static_cast<long>(first + done);
+        }
         long seen = implausible.load();
-        while (bad >= 0 && (seen < 0 || seen > static_cast<long>(first) + bad) &&
-               !implausible.compare_exchange_weak(seen, static_cast<long>(first) + bad)) {
+        while (bad >= 0 && (seen < 0 || seen > bad) &&
+               !implausible.compare_exchange_weak(seen, bad)) {
         }
     };
     RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {

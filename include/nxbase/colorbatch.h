@@ -38,7 +38,7 @@ struct BatchTables {
     alignas(32) float chunks[3][kChunks][8] = {};
     float sumY = 0.0f;  // XYZ = S / sumY * 100
     float sums[3] = {};
-    float labScale[3] = {};  // Lab: t = XYZ * (sumY / sums[c] / 100)
+    float inverseSums[3] = {};  // Lab: t = S * (1 / sums[c])
 };
 }  // namespace detail
 

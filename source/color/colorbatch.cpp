@@ -185,13 +185,13 @@ NXBASE_BATCH_INLINE void XyzOfSums(const PaddedWeights& w, V v[3]) {
     for (int c = 0; c < 3; ++c) v[c] = v[c] / sumY * Splat<V>(100.0f);
 }
 
-// Lab from the weighted sums, in place, as LABVector from XYZ with the same
-// weights: t = X * (sum_1 / sum_c / 100).
+// Lab from the weighted sums, in place: t = S / sum_c, which LABVector gets
+// through XYZ as X * (sum_1 / sum_c / 100); taken as one multiplication by
+// 1 / sum_c instead of a division and two multiplications.
 template <class V>
 NXBASE_BATCH_INLINE void LabOfSums(const PaddedWeights& w, V v[3]) {
-    XyzOfSums(w, v);
     V f[3];
-    for (int c = 0; c < 3; ++c) f[c] = LabF(v[c] * Splat<V>(w.labScale[c]));
+    for (int c = 0; c < 3; ++c) f[c] = LabF(v[c] * Splat<V>(w.inverseSums[c]));
     v[0] = Splat<V>(116.0f) * f[1] - Splat<V>(16.0f);
     v[1] = Splat<V>(500.0f) * (f[0] - f[1]);
     v[2] = Splat<V>(200.0f) * (f[1] - f[2]);
@@ -545,7 +545,7 @@ ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {
         for (int k = 0; k < 4; ++k) chunks[32 + k] = 0.0f;
         std::memcpy(chunks + 36, amWeights.weights[c] + 32, sizeof(float) * 4);
         amTables.sums[c] = amWeights.sums[c];
-        amTables.labScale[c] = amWeights.sums[1] / amWeights.sums[c] / 100.0f;
+        amTables.inverseSums[c] = static_cast<float>(1.0 / amWeights.sums[c]);
     }
     amTables.sumY = amWeights.sums[1];
 }
