@@ -50,10 +50,11 @@ def test_large_arrays_take_the_parallel_path_with_identical_results(chart):
     np.testing.assert_array_equal(nxbase.spectra_to_LCh(many, threads=1), nxbase.spectra_to_LCh(many))
     with pytest.raises(ValueError, match="threads must be at least 1"):
         nxbase.spectra_to_Lab(chart, threads=0)
-    # Percentages in two parts of a split array: the earliest is named.
+    # Percentages in two parts of a split array, or in two pieces that one
+    # thread checks in turn: the earliest is named.
     bad = many * 1
     bad[[90001, 70001]] *= 100
-    for threads in (None, 3):
+    for threads in (None, 1, 3):
         with pytest.raises(ValueError, match="spectrum 70001 gives L"):
             nxbase.spectra_to_Lab(bad, threads=threads)
     # Contiguous float64 is read in place: the same numbers, and no copy of
