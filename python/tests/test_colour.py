@@ -57,6 +57,8 @@ def test_large_arrays_take_the_parallel_path_with_identical_results(chart):
     for threads in (None, 1, 3):
         with pytest.raises(ValueError, match="spectrum 70001 gives L"):
             nxbase.spectra_to_Lab(bad, threads=threads)
+    with pytest.raises(ValueError, match="spectrum 70001 gives Y"):
+        nxbase.spectra_to_XYZ(bad, threads=1)
     # Contiguous float64 is read in place: the same numbers, and no copy of
     # the input (the peak grows by the result only, not by 17 MB of float32).
     wide = many.astype(np.float64)
