@@ -25,7 +25,7 @@ alternating, each for about a quarter of a second (repeated calls, as a
 single call of a few milliseconds is at the mercy of the scheduler); prints
 min / median / max over the rounds of each rate and of the per-round ratios.
 
-    PYTHONPATH=build/default/python python3 bench/python_bench.py [ROUNDS]
+    PYTHONPATH=build/default/python /usr/bin/python3 bench/python_bench.py [ROUNDS]
 """
 import os
 

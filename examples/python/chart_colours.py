@@ -2,7 +2,7 @@
 """Colour values of a spectral file (or the ColorChecker shipped with the
 sources) with the NxBase module, and the difference between two illuminants.
 
-    PYTHONPATH=build/default/python python3 examples/python/chart_colours.py [FILE]
+    PYTHONPATH=build/default/python /usr/bin/python3 examples/python/chart_colours.py [FILE]
 """
 import os
 import sys
@@ -12,9 +12,11 @@ import numpy as np
 import nxbase
 
 here = os.path.dirname(os.path.abspath(__file__))
-path = sys.argv[1] if len(sys.argv) > 1 else os.path.join(
-    here, "..", "..", "tools", "nxcolor", "data", "colorchecker_babelcolor_average.csv")
-ids, names, spectra = nxbase.read_spectra(path)
+if len(sys.argv) > 1:
+    ids, names, spectra = nxbase.read_spectra(sys.argv[1])   # the scale guessed, with a warning
+else:  # the shipped chart holds reflectance factors
+    ids, names, spectra = nxbase.read_spectra(os.path.join(
+        here, "..", "..", "tools", "nxcolor", "data", "colorchecker_babelcolor_average.csv"), scale="fraction")
 
 lab_d50 = nxbase.spectra_to_Lab(spectra)                                  # (N, 3)
 lab_a = nxbase.spectra_to_Lab(spectra, illuminant="A", observer=10)

@@ -1,5 +1,7 @@
 """Colour functions: shapes, dtypes, exactness against the C++ paths, errors."""
+import os
 import subprocess
+import sys
 import tracemalloc
 import warnings
 
@@ -97,6 +99,15 @@ def test_values_agree_with_nxcolor(chart):
     np.testing.assert_allclose(lch[:, 2], printed[:, 7], atol=5e-3)
     np.testing.assert_allclose(din, printed[:, 8:11], atol=1.5e-4)
     np.testing.assert_allclose(density, printed[:, 11:14], atol=1.5e-4)
+
+
+def test_the_example_script_prints_the_chart_without_warnings(chart):
+    script = os.path.join(os.path.dirname(__file__), "..", "..", "examples", "python", "chart_colours.py")
+    run = subprocess.run([sys.executable, script], capture_output=True, text=True, check=True)
+    lines = run.stdout.splitlines()
+    lch = nxbase.spectra_to_LCh(chart)
+    assert len(lines) == 26 and lines[1].split()[:5] == ["1", "dark", "skin", f"{lch[0, 0]:.2f}", f"{lch[0, 1]:.2f}"]
+    assert lines[-1].startswith("largest change from D50/2 to A/10: ") and run.stderr == ""
 
 
 def test_conversions_adaptation_and_progress(chart):
