@@ -203,10 +203,9 @@ long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     return -1;
 }
 
-// Spectra converted and then checked at a time: their results (24 KiB) are
-// still in the second-level cache when they are checked, which a megabyte of
-// input streaming through it would not leave them; a multiple of the batch
-// kernel's sixteen.
+// Spectra converted and then checked at a time, so that the check reads
+// results the core has just written and a part with a bad spectrum stops
+// early; a multiple of the batch kernel's sixteen.
 constexpr std::size_t kCheckedPiece = 2048;
 
 // Spectra per call of a progress call-back: large enough that the call costs

@@ -9,10 +9,10 @@
 // LABVector (CIE 1976, type 0) compute from a ReflectanceSpectrum with the same
 // filter: the weighted sums are formed in the same order with the same single
 // precision operations, so XYZ agree bit for bit, and Lab differs only by the
-// scaling of t (one multiplication by sum_1 / sum_c / 100 instead of two
-// divisions) and the cube root, a vectorised approximation agreeing with the
-// objects' pow(t, 0.33333334) to a unit or two in the last place (within 1e-5
-// of the vector's length).
+// scaling of t (the weighted sum S times 1 / sum_c, where the objects compute
+// X = S / sum_1 * 100 and then t = X * sum_1 / sum_c / 100) and the cube root, a
+// vectorised approximation agreeing with the objects' pow(t, 0.33333334) to a
+// unit or two in the last place (within 1e-5 of the vector's length).
 #ifndef NXBASE_COLORBATCH_H_
 #define NXBASE_COLORBATCH_H_
 

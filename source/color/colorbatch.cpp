@@ -186,7 +186,7 @@ NXBASE_BATCH_INLINE void XyzOfSums(const PaddedWeights& w, V v[3]) {
 }
 
 // Lab from the weighted sums, in place: t = S / sum_c, which LABVector gets
-// through XYZ as X * (sum_1 / sum_c / 100); taken as one multiplication by
+// through XYZ as X * sum_1 / sum_c / 100; taken as one multiplication by
 // 1 / sum_c instead of a division and two multiplications.
 template <class V>
 NXBASE_BATCH_INLINE void LabOfSums(const PaddedWeights& w, V v[3]) {
