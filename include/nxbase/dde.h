@@ -19,7 +19,10 @@
 //                                        transaction, answered false
 // The bus connection is driven by the application's event loop (its file
 // descriptor and time-out), never by a thread of its own, and received pokes
-// reach the receive function on that loop, after the bus dispatch returned.
+// and execute commands reach their functions on that loop, after the bus
+// dispatch returned; they are posted through Application::Post, so a GUI's
+// loop that drives the application's (nxbase/glibloop.h, nxbase/qtloop.h)
+// runs them as well.
 #ifndef NXBASE_DDE_H_
 #define NXBASE_DDE_H_
 

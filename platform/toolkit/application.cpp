@@ -94,9 +94,7 @@ void Application::ResetQuit() {
 }
 
 void Application::Reschedule() {
-    MarkUserInterfaceThread();
-    if (context_.stopped()) context_.restart();
-    context_.poll();
+    Dispatch();
 }
 
 bool Application::RunOneFor(std::chrono::milliseconds timeout) {

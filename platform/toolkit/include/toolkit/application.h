@@ -81,7 +81,7 @@ class NXBASE_EXPORT Application {
     void ResetQuit();
     bool IsInExecute() const { return executing_ > 0; }
 
-    // Runs the handlers that are ready, without blocking.
+    // Runs the handlers that are ready, without blocking: Dispatch().
     void Reschedule();
     // Blocks until one handler ran or `timeout` passed; true when one ran.
     // With a nested wait installed, runs the GUI's loop instead (which
