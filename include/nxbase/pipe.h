@@ -96,10 +96,15 @@ class NXBASE_EXPORT Pipe {
     // each a scope of their own.
     class NXBASE_EXPORT SendScope {
       public:
-        SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting);
+        // With `abMayStart` false a peer that does not run is not started:
+        // the send fails at once.
+        SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting, bool abMayStart = true);
         ~SendScope();
         SendScope(const SendScope&) = delete;
         SendScope& operator=(const SendScope&) = delete;
+        // Whether trying again is of no use: the start failed, or the peer
+        // does not run and must not be started.
+        bool Hopeless() const { return amHopeless; }
 
       private:
         friend class Pipe;
@@ -108,8 +113,11 @@ class NXBASE_EXPORT Pipe {
         SendScope* pmOuter;
         std::function<bool()> fmKeepWaiting;
         std::chrono::steady_clock::time_point amStart;
+        bool amMayStart = true;
         bool amStarted = false;
+        bool amHopeless = false;
         int amStartedPid = -1;
+        std::string amStartFailure;
     };
 
     // Frames and writes one message to `asApp`, opening the channel first and
@@ -132,6 +140,8 @@ class NXBASE_EXPORT Pipe {
     const std::string& GetRefusal() const { return amRefusal; }
 
     bool HasChannel(const std::string& asApp) const;
+    // Whether connection `alChannel` (VELTRAEvent::GetChannel()) is open.
+    bool IsChannelOpen(std::uint64_t alChannel) const;
     std::size_t ChannelCount() const { return amAllChannels.size(); }
     // Bytes of partly read frames over all channels.
     std::size_t PartialBytes() const { return amPartialBytes; }

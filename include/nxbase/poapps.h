@@ -17,8 +17,8 @@
 #include "nxbase/export.h"
 
 namespace nxbase {
-// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT
-// (default 30).
+// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT, or 0
+// when it is unset or not a positive whole number: no limit.
 NXBASE_EXPORT int WaitTimeoutSeconds();
 // How long one send waits for an application it started: 10 s, or
 // $NXBASE_WAIT_TIMEOUT if that is shorter.

@@ -37,6 +37,11 @@
 // 1 and 2 disable it while waiting.
 enum DisEnable { DisEnableNone = 0, DisEnableWindow = 1, DisEnableWindow2 = 2 };
 
+// Whether a send may start its peer when it does not run. Inside a
+// conversation (after CONNECT and LOCK) a server that was started anew knows
+// nothing of it, so such sends say kNever.
+enum class PeerStart { kIfNeeded, kNever };
+
 // How an asynchronous SendAndReceive ended: the answer block (its status
 // byte first), or why there is none.
 struct AnswerResult {
@@ -64,37 +69,68 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // and is also asked while a peer that was started is awaited, whichever
     // transport started it (one start per Send, all retries included, and
     // at most nxbase::StartWaitLimit(): 10 s, less when $NXBASE_WAIT_TIMEOUT
-    // is shorter). True on success; GetLastError() says why a send failed.
+    // is shorter). A peer that does not run is started only with
+    // PeerStart::kIfNeeded. True on success; GetLastError() says why a send
+    // failed.
     unsigned char Send(const std::string& asApp, PO_Botschaften axMessage, MyMemoryBlock& axData,
-                       boost::function<bool()> fKeepTrying = boost::function<bool()>());
+                       boost::function<bool()> fKeepTrying = boost::function<bool()>(),
+                       PeerStart axStart = PeerStart::kIfNeeded);
     unsigned char Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
-                       boost::function<bool()> fKeepTrying = boost::function<bool()>());
+                       boost::function<bool()> fKeepTrying = boost::function<bool()>(),
+                       PeerStart axStart = PeerStart::kIfNeeded);
     // Sends message `alMessage` and waits, with the loop turning, for its
     // answer from `asApp`, which then replaces `axReceive`. The wait ends
     // without an answer when `keepWaiting` returns false (asked on every
-    // event and at least every 50 ms) or when the channel to `asApp` is lost.
+    // event and at least every 50 ms), when the channel to `asApp` is lost,
+    // when Application::Quit() is called meanwhile, or when the post office
+    // is destroyed meanwhile (by a handler the wait ran).
+    //
+    // Frames carry no request id: a peer answers its requests in the order
+    // they came. So every request, blocking or asynchronous, takes its place
+    // in one queue per peer and message number, in the order sent, and each
+    // answer goes to the oldest request in it. A request given up (time-out,
+    // keep-waiting, its caller's end) keeps its place until its answer comes,
+    // and that answer is logged and dropped; the queue empties when the
+    // channel is lost.
     unsigned char SendAndReceive(const std::string& asApp, int alMessage, MyMemoryBlock& axSend,
                                  MyMemoryBlock& axReceive, boost::function<bool()> fKeepWaiting,
-                                 DisEnable axMode = DisEnableNone);
+                                 DisEnable axMode = DisEnableNone,
+                                 PeerStart axStart = PeerStart::kIfNeeded);
     // The same with the post office's own keep-waiting function: after 6 s
-    // it opens the abort dialog of the UserInterface handler; a handler that
-    // cannot ask a person ends the wait after $NXBASE_WAIT_TIMEOUT seconds
-    // (default 30) and logs it.
+    // it opens the abort dialog of the UserInterface handler. There is no
+    // fixed time-out (a measurement may wait for an operator), unless
+    // $NXBASE_WAIT_TIMEOUT gives one in seconds; a handler that cannot ask a
+    // person then ends the wait after that time and logs it.
     unsigned char SendAndReceive(const std::string& asApp, int alMessage, MyMemoryBlock& axSend,
-                                 MyMemoryBlock& axReceive, DisEnable axMode = DisEnableNone);
+                                 MyMemoryBlock& axReceive, DisEnable axMode = DisEnableNone,
+                                 PeerStart axStart = PeerStart::kIfNeeded);
     // Sends message `alMessage` to `asApp` and returns at once; `fDone` is
     // called later on the loop, exactly once, with the answer or with why
     // there is none: the send failed, the channel to `asApp` was lost,
     // `fKeepWaiting` (asked at least every 100 ms) returned false, or
-    // `timeout` passed. Answers to the same message from the same peer go to
-    // asynchronous waiters first, in the order they were sent. Requests still
-    // pending when the post office is destroyed are dropped uncalled.
+    // `timeout` passed (starting the peer included). Answers are matched to
+    // requests as for SendAndReceive. Requests still pending when the post
+    // office is destroyed are dropped uncalled.
     using AnswerCallback = std::function<void(AnswerResult&)>;
     void SendAndReceiveAsync(const std::string& asApp, int alMessage, const MyMemoryBlock& axSend,
                              AnswerCallback fDone,
                              std::chrono::milliseconds timeout = std::chrono::seconds(30),
-                             boost::function<bool()> fKeepWaiting = {});
+                             boost::function<bool()> fKeepWaiting = {},
+                             PeerStart axStart = PeerStart::kIfNeeded);
+    // Asynchronous requests whose call-back is still to come.
     std::size_t GetPendingAsyncCount() const { return amAsync.size(); }
+    // Requests sent to `asApp` for message `alMessage` whose answers are still
+    // to come, given up ones included.
+    std::size_t GetOutstandingCount(const std::string& asApp, int alMessage) const;
+
+    // Called on the loop with the peer's name whenever the channel to a peer
+    // is lost (it ended, was killed, or broke the protocol). An application
+    // in a conversation with a server (after CONNECT and LOCK) learns so that
+    // the server it talks to is gone. Returns an id for
+    // RemovePeerLostFunction.
+    using PeerLostFunction = std::function<void(const std::string&)>;
+    int AddPeerLostFunction(PeerLostFunction fFunction);
+    void RemovePeerLostFunction(int alId);
     // Answers a received command: "ANSWER!" + its name, back to its sender
     // on the connection the command came in on (no retries: a peer that is
     // gone does not come back on that connection).
@@ -106,11 +142,13 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     Link GetMessageHdl(unsigned int alMessage) const;
     // The function the transports deliver every received event to. While it
     // is DummyReceiveFunction (the start) the post office handles events
-    // itself; another function receives them instead and forwards those the
-    // post office is to handle to CommunicationReceiveFunction (one that
-    // does not forward filters). Returns the old one.
+    // itself; another function receives them instead and passes on those the
+    // post office is to handle, to the function it got back (a chain) or to
+    // CommunicationReceiveFunction; one that does neither filters. Returns
+    // the old one.
     ReceiveFunction ChangeReceiveFunction(ReceiveFunction fFunction);
-    static void DummyReceiveFunction(VELTRAEvent&);
+    // The post office's own handling, for a receive function to chain to.
+    static void DummyReceiveFunction(VELTRAEvent& axEvent);
 
     int NumberOfCommand(VELTRAEvent& axEvent);
     static void Encode(MyMemoryBlock& axBlock);
@@ -168,7 +206,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
                  std::string_view asEncoded);
     unsigned char SendCommand(const std::string& asApp, const std::string& asCommand,
                               const MyMemoryBlock& axData,
-                              const boost::function<bool()>& fKeepTrying);
+                              const boost::function<bool()>& fKeepTrying, PeerStart axStart);
     bool OnOwnThread(const char* asCall);
     void AnswerStatus(VELTRAEvent& axEvent, signed char axStatus);
     void HandleConnect(VELTRAEvent& axEvent);
@@ -179,27 +217,26 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     void ScheduleHandler();
     void TickWhileQueued();
     void PeerLost(const std::string& asApp);
-    struct AsyncRequest;
-    void StartAsync(const std::shared_ptr<AsyncRequest>& pRequest, const MyMemoryBlock& axSend);
-    void ArmAsync(const std::shared_ptr<AsyncRequest>& pRequest);
-    bool DeliverAsync(const std::pair<std::string, int>& axKey, MyMemoryBlock& axData);
-    void FinishAsync(const std::shared_ptr<AsyncRequest>& pRequest, bool abAnswered,
-                     MyMemoryBlock axData, std::string asError);
+    struct Request;
+    using RequestPtr = std::shared_ptr<Request>;
+    bool SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
+                     const boost::function<bool()>& fKeepTrying, PeerStart axStart);
+    void StartAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend, PeerStart axStart);
+    void ArmAsync(const RequestPtr& pRequest);
+    void Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlock axData,
+                std::string asError);
     void CloseWhenUnused();
 
     Link amHandlers[ANZAHL_BOTSCHAFTEN];
     PostOfficeApplications amApplications;
     FlagSet amFlags;
     std::deque<VELTRAEvent> amCommandQueue;
-    // Answers awaited by SendAndReceive, by peer and answer number; one
-    // arriving while nobody waits is dropped. Entries stay for the next wait.
-    struct AwaitedAnswer {
-        int waiters = 0;
-        bool arrived = false;
-        MyMemoryBlock data;
-    };
-    std::map<std::pair<std::string, int>, AwaitedAnswer> amAnswers;
-    std::vector<std::shared_ptr<AsyncRequest>> amAsync;  // in the order they were sent
+    // Requests sent and not yet answered, by peer and answer number, in the
+    // order sent; given up ones keep their places until their answers come.
+    std::map<std::pair<std::string, int>, std::deque<RequestPtr>> amOutstanding;
+    std::vector<RequestPtr> amAsync;  // asynchronous requests whose call-back is to come
+    std::map<int, PeerLostFunction> amPeerLostFunctions;
+    int amNextPeerLostId = 1;
     AutoTimer amTimer;
     Timer amQuitTimer;
     String amOwnName;
@@ -210,12 +247,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     bool amHandlerBusy = false;
     bool amHandlerScheduled = false;
     ReceiveFunction fmReceiveFunction = &PostOffice::DummyReceiveFunction;
-    std::set<std::string> amLostPeers;            // channels lost since a wait began
     std::map<std::string, int> amConnectedPeers;  // CONNECTs not yet matched, per peer
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
     std::string amLastError;
-    std::string amEncoded;  // the last message's stuffed data, its storage reused
-    bool amEncodedInUse = false;
     std::thread::id amThread = std::this_thread::get_id();
 
     static PostOffice* smInstance;

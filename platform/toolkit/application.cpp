@@ -77,16 +77,20 @@ Application& Application::Get() {
 void Application::Execute() {
     MarkUserInterfaceThread();
     ++executing_;
+    // Sleeps until a handler is due: Quit() stops the context to end it.
+    auto work = boost::asio::make_work_guard(context_);
     while (!quitting_) {
         if (context_.stopped()) context_.restart();
-        // Wakes at least every 100 ms, so that Quit() from a handler ends the loop.
-        context_.run_one_for(std::chrono::milliseconds(100));
+        context_.run_one();
     }
     --executing_;
 }
 
 void Application::Quit() {
     quitting_ = true;
+    ++quitCount_;
+    context_.stop();
+    Wake();
 }
 
 void Application::ResetQuit() {

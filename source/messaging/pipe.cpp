@@ -565,11 +565,12 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
 
 // ---- opening channels and starting peers ----
 
-Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting)
+Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting, bool abMayStart)
     : pmPipe(pPipe),
       pmOuter(pPipe ? pPipe->pmScope : nullptr),
       fmKeepWaiting(std::move(fKeepWaiting)),
-      amStart(std::chrono::steady_clock::now()) {
+      amStart(std::chrono::steady_clock::now()),
+      amMayStart(abMayStart) {
     if (pmPipe == nullptr) return;
     pmPipe->pmScope = this;
     // DDE starts peers of a DDE-only process itself: the same caller decides.
@@ -667,19 +668,31 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
     if ((abByDde = OnDdeBus(asApp))) return true;
     if (!amRefusal.empty() && !(pmDDE && pmDDE->IsActive())) return Fail(amRefusal);
+    SendScope& scope = *pmScope;
     if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
+        if (nxbase::IsApplicationRunning(asApp))
+            return Fail(asApp + " is running but did not answer the connection request");
         return Fail(asApp + " is not running and not registered");
     }
     if (asCommand == nxbase::kDisconnect)
         return Fail(asApp + " is not running (nothing to disconnect)");
-    SendScope& scope = *pmScope;
+    if (!scope.amMayStart && !nxbase::IsApplicationRunning(asApp)) {
+        scope.amHopeless = true;
+        return Fail(asApp + " is not running, and this send does not start it");
+    }
+    if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
     if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
         scope.amStarted = true;
         nxbase::Log("Pipe: starting " + application.GetExecutableWithPath());
         std::string error;
         scope.amStartedPid = application.Start(error);
-        if (scope.amStartedPid < 0) return Fail(error);
+        if (scope.amStartedPid < 0) {
+            // Trying again would not make it executable.
+            scope.amHopeless = true;
+            scope.amStartFailure = error;
+            return Fail(error);
+        }
     }
     std::string why;
     auto ready = [&] {
@@ -754,6 +767,11 @@ bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
                      std::string_view asEncodedData) {
     if (!pmDDE || !pmDDE->IsActive()) return false;
     return pmDDE->Send(asApp, asCommand, std::string(asEncodedData));
+}
+
+bool Pipe::IsChannelOpen(std::uint64_t alChannel) const {
+    auto at = amAllChannels.find(alChannel);
+    return at != amAllChannels.end() && !at->second->closed;
 }
 
 bool Pipe::HasChannel(const std::string& asApp) const {

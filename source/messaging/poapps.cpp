@@ -61,18 +61,17 @@ std::string PostOfficeApplication::GetExecutableWithPath() const {
 namespace nxbase {
 
 int WaitTimeoutSeconds() {
-    constexpr int kDefaultWaitTimeoutSeconds = 30;
     const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
-    if (text == nullptr || *text == '\0') return kDefaultWaitTimeoutSeconds;
+    if (text == nullptr || *text == '\0') return 0;
     char* end = nullptr;
     long seconds = std::strtol(text, &end, 10);
-    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds)
-                                                          : kDefaultWaitTimeoutSeconds;
+    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds) : 0;
 }
 
 std::chrono::seconds StartWaitLimit() {
     constexpr std::chrono::seconds kStartLimit(10);
-    return std::min(kStartLimit, std::chrono::seconds(WaitTimeoutSeconds()));
+    int timeout = WaitTimeoutSeconds();
+    return timeout > 0 ? std::min(kStartLimit, std::chrono::seconds(timeout)) : kStartLimit;
 }
 
 }  // namespace nxbase

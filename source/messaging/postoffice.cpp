@@ -43,19 +43,20 @@ String Number(long alValue) {
 
 // A block's stuffed bytes, built in storage kept between messages. A send
 // nested in another (a handler run while a send waits) finds the storage
-// taken and uses its own.
+// taken and uses its own. The storage is the thread's, not the post
+// office's: a send survives the office's destruction by a handler it ran.
 class StuffedData {
   public:
-    StuffedData(std::string& asKept, bool& abKeptInUse, const MyMemoryBlock& axData)
-        : amInUse(abKeptInUse), amOuter(!abKeptInUse), amBytes(amOuter ? asKept : amNested) {
-        amInUse = true;
+    explicit StuffedData(const MyMemoryBlock& axData)
+        : amOuter(!tlInUse), amBytes(amOuter ? tlKept : amNested) {
+        tlInUse = true;
         amBytes.clear();
         nxbase::AppendEncoded(amBytes, axData.GetDatenZeiger(),
                               static_cast<std::size_t>(axData.Len()));
     }
     ~StuffedData() {
         if (!amOuter) return;
-        amInUse = false;
+        tlInUse = false;
         if (amBytes.capacity() > kKeptCapacity) std::string().swap(amBytes);
     }
     StuffedData(const StuffedData&) = delete;
@@ -64,11 +65,15 @@ class StuffedData {
 
   private:
     static constexpr std::size_t kKeptCapacity = 4096;
-    bool& amInUse;
+    static thread_local std::string tlKept;
+    static thread_local bool tlInUse;
     const bool amOuter;
     std::string amNested;
     std::string& amBytes;
 };
+
+thread_local std::string StuffedData::tlKept;
+thread_local bool StuffedData::tlInUse = false;
 
 // "ANSWER!" and the name of message `alNumber` (0..134), built once: every
 // answer needs one.
@@ -118,22 +123,36 @@ PostOffice::PostOffice(const String& asAppName)
     amQuitTimer.SetTimeout(1000);
 }
 
-// One asynchronous SendAndReceive, from the send until its call-back.
-struct PostOffice::AsyncRequest {
+// One SendAndReceive, blocking or asynchronous, from its send until its
+// answer, failure or abandonment.
+struct PostOffice::Request {
     std::pair<std::string, int> key;  // the peer and the answer's number
+    bool finished = false;            // its caller no longer waits
+    bool answered = false;
+    MyMemoryBlock data;
+    std::string error;
+    // Asynchronous requests only.
     AnswerCallback done;
     boost::function<bool()> keepWaiting;
     std::chrono::steady_clock::time_point deadline;
     std::chrono::milliseconds timeout{};
-    boost::asio::steady_timer timer{Application::Get().GetContext()};
-    bool finished = false;
+    bool async = false;
+    std::optional<boost::asio::steady_timer> timer;
 };
 
 PostOffice::~PostOffice() {
     *amAlive = false;
+    // Waits still on the stack end when they see their request finished;
+    // asynchronous call-backs are dropped.
+    for (auto& [key, queue] : amOutstanding) {
+        for (auto& request : queue) {
+            if (!request->finished) request->error = "the post office was closed";
+            request->finished = true;
+        }
+    }
     for (auto& request : amAsync) {
         request->finished = true;
-        request->timer.cancel();
+        request->timer->cancel();
     }
     amTimer.Stop();
     amQuitTimer.Stop();
@@ -141,7 +160,11 @@ PostOffice::~PostOffice() {
     if (smInstance == this) smInstance = nullptr;
 }
 
-void PostOffice::DummyReceiveFunction(VELTRAEvent&) {}
+// A receive function that chains to the one it replaced reaches the post
+// office's own handling through this.
+void PostOffice::DummyReceiveFunction(VELTRAEvent& axEvent) {
+    if (smInstance != nullptr) smInstance->CommunicationReceiveFunction(axEvent);
+}
 
 // The transports deliver here: to the installed receive function, or to the
 // post office itself while none is installed.
@@ -219,23 +242,48 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
     HandleCommand(axEvent);
 }
 
-// An answer counts only for a SendAndReceive waiting for it from its sender;
-// anything else would pile up for ever.
+// An answer belongs to the oldest request sent to its sender for its number:
+// peers answer in order. One nobody asked for is dropped, as is the answer to
+// a request given up, which held its place for it.
 void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     NX_COMM_LOG(String("Answer received: ") + Number(alNumber));
-    std::pair<std::string, int> key(axEvent.GetSender(), alNumber);
-    if (DeliverAsync(key, axEvent.GetData())) return;
-    auto at = amAnswers.find(key);
-    if (at == amAnswers.end() || at->second.waiters == 0 || at->second.arrived) {
+    auto at = amOutstanding.find({axEvent.GetSender(), alNumber});
+    if (at == amOutstanding.end()) {
         LogFile::WriteToLog(String("Answer nobody waits for dropped: ") +
                                 String(axEvent.GetCommand()) + " from " +
                                 String(axEvent.GetSender()),
                             String(kLogKey));
         return;
     }
-    at->second.data = std::move(axEvent.GetData());
-    at->second.arrived = true;
-    NX_COMM_LOG(String("MessageQueue - Insert message") + ", Queue size: 1");
+    NX_COMM_LOG(String("MessageQueue - Insert message") +
+                ", Queue size: " + Number(static_cast<long>(at->second.size())));
+    RequestPtr request = std::move(at->second.front());
+    at->second.pop_front();
+    if (at->second.empty()) amOutstanding.erase(at);
+    if (request->finished) {
+        LogFile::WriteToLog(String("Late answer dropped: ") + String(axEvent.GetCommand()) +
+                                " from " + String(axEvent.GetSender()) +
+                                " answers a request that was given up (" +
+                                String(request->error) + ")",
+                            String(kLogKey));
+        return;
+    }
+    Finish(request, true, std::move(axEvent.GetData()), std::string());
+}
+
+std::size_t PostOffice::GetOutstandingCount(const std::string& asApp, int alMessage) const {
+    auto at = amOutstanding.find({asApp, kAnswerOffset + alMessage});
+    return at == amOutstanding.end() ? 0 : at->second.size();
+}
+
+int PostOffice::AddPeerLostFunction(PeerLostFunction fFunction) {
+    int id = amNextPeerLostId++;
+    amPeerLostFunctions[id] = std::move(fFunction);
+    return id;
+}
+
+void PostOffice::RemovePeerLostFunction(int alId) {
+    amPeerLostFunctions.erase(alId);
 }
 
 // Counts a DISCONNECT against its sender's CONNECTs; false (logged) for one
@@ -320,12 +368,27 @@ void PostOffice::HandleDisconnectInServer(VELTRAEvent& axEvent) {
 // A peer that dies without DISCONNECT (killed, crashed) would hold its
 // connection and its lock for ever: its lost channel counts as both.
 void PostOffice::PeerLost(const std::string& asApp) {
-    amLostPeers.insert(asApp);
-    std::vector<std::shared_ptr<AsyncRequest>> lost;
-    for (const auto& request : amAsync)
-        if (request->key.first == asApp) lost.push_back(request);
+    // Nothing sent on the lost channel will be answered: its requests fail,
+    // and the order of answers starts afresh on the next channel.
+    std::vector<RequestPtr> lost;
+    for (auto at = amOutstanding.lower_bound({asApp, 0});
+         at != amOutstanding.end() && at->first.first == asApp;) {
+        for (auto& request : at->second) lost.push_back(std::move(request));
+        at = amOutstanding.erase(at);
+    }
     for (const auto& request : lost)
-        FinishAsync(request, false, MyMemoryBlock(), "the channel to " + asApp + " was lost");
+        Finish(request, false, MyMemoryBlock(), "the channel to " + asApp + " was lost");
+    // Told from the loop, not from inside the transport's closing.
+    std::weak_ptr<bool> alive = amAlive;
+    Application::Get().Post([this, alive, asApp] {
+        for (auto at = amPeerLostFunctions.begin(); alive.lock() && at != amPeerLostFunctions.end();) {
+            int id = at->first;
+            PeerLostFunction function = at->second;
+            function(asApp);
+            if (!alive.lock()) return;
+            at = amPeerLostFunctions.upper_bound(id);
+        }
+    });
     if (amLockOwner == String(asApp)) {
         NX_COMM_LOG(String("Lock owner lost: ") + String(asApp));
         amLockCount = 0;
@@ -443,9 +506,17 @@ long PostOffice::DefaultHdl(void* pEvent) {
     }
     MyMemoryBlock answer(1);
     answer << status;
-    if (!Answer(event, answer)) {
-        UserInterface::Current()->InfoBox("Answer failed in PostOffice::DefaultHdl()!");
+    if (Answer(event, answer)) return 0;
+    // A peer that has gone (its DISCONNECT, then its channel's end) needs no
+    // answer, and the user no box.
+    Pipe* pipe = Pipe::Instance();
+    if (number == DISCONNECT ||
+        (event->GetChannel() != 0 && pipe != nullptr && !pipe->IsChannelOpen(event->GetChannel()))) {
+        NX_COMM_LOG(String("Default Hdl - no answer to ") + String(event->GetSender()) +
+                    ": it has gone");
+        return 0;
     }
+    UserInterface::Current()->InfoBox("Answer failed in PostOffice::DefaultHdl()!");
     return 0;
 }
 
@@ -464,12 +535,13 @@ unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     const std::string& command = number >= 0 && number < ANZAHL_BOTSCHAFTEN
                                      ? AnswerText(number)
                                      : (unlisted = kAnswerPrefix + pCommand->GetCommand());
-    if (pCommand->GetChannel() == 0) return SendCommand(pCommand->GetSender(), command, axData, {});
+    if (pCommand->GetChannel() == 0)
+        return SendCommand(pCommand->GetSender(), command, axData, {}, PeerStart::kNever);
     if (!OnOwnThread("Answer")) return false;
     Pipe* pipe = Pipe::Instance();
     bool sent = false;
     if (pipe != nullptr) {
-        StuffedData encoded(amEncoded, amEncodedInUse, axData);
+        StuffedData encoded(axData);
         sent = pipe->SendOnChannel(pCommand->GetChannel(), command, encoded.Bytes());
     }
     if (sent) {
@@ -492,51 +564,66 @@ bool PostOffice::OnOwnThread(const char* asCall) {
 }
 
 unsigned char PostOffice::Send(const std::string& asApp, PO_Botschaften axMessage,
-                               MyMemoryBlock& axData, boost::function<bool()> fKeepTrying) {
+                               MyMemoryBlock& axData, boost::function<bool()> fKeepTrying,
+                               PeerStart axStart) {
     String command(nxbase::MessageName(axMessage));
-    return Send(asApp, command, axData, fKeepTrying);
+    return Send(asApp, command, axData, fKeepTrying, axStart);
 }
 
+// One attempt. False also when the post office was destroyed meanwhile (by a
+// handler the transport's wait ran): then nothing of it may be touched.
 bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
                          std::string_view asEncoded) {
+    std::weak_ptr<bool> alive = amAlive;
     Pipe* pipe = Pipe::Instance();
-    if (pipe != nullptr && pipe->Send(asApp, asCommand, asEncoded)) return true;
+    bool sent = pipe != nullptr && pipe->Send(asApp, asCommand, asEncoded);
+    if (!alive.lock()) return false;
+    if (sent) return true;
+    pipe = Pipe::Instance();
     amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
     return false;
 }
 
 unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
-                               boost::function<bool()> fKeepTrying) {
+                               boost::function<bool()> fKeepTrying, PeerStart axStart) {
     std::string command = asCommand.str();
     if (asCommand.IsNumeric()) command = nxbase::CommandTextOfNumber(std::atoi(command.c_str()));
-    return SendCommand(asApp, command, axData, fKeepTrying);
+    return SendCommand(asApp, command, axData, fKeepTrying, axStart);
 }
 
 unsigned char PostOffice::SendCommand(const std::string& asApp, const std::string& command,
                                       const MyMemoryBlock& axData,
-                                      const boost::function<bool()>& fKeepTrying) {
+                                      const boost::function<bool()>& fKeepTrying,
+                                      PeerStart axStart) {
     if (!OnOwnThread("Send")) return false;
-    StuffedData encoded(amEncoded, amEncodedInUse, axData);
+    std::weak_ptr<bool> alive = amAlive;
+    StuffedData encoded(axData);
     // One start of the peer and one bounded wait for it, retries included.
     // The function refers to the caller's, which outlives the scope.
     std::function<bool()> keepTrying;
     if (fKeepTrying) keepTrying = [&fKeepTrying] { return fKeepTrying(); };
-    Pipe::SendScope scope(Pipe::Instance(), std::move(keepTrying));
+    Pipe::SendScope scope(Pipe::Instance(), std::move(keepTrying), axStart == PeerStart::kIfNeeded);
     for (int retries = 0;;) {
         if (TryOnce(asApp, command, encoded.Bytes())) {
             NX_COMM_LOG(String("Sent: ") + String(command));
             return true;
         }
+        if (!alive.lock()) return false;
         ++retries;
-        for (int i = 0; i < 10; ++i) Application::Get().Reschedule();
-        Application::Get().RunOneFor(std::chrono::milliseconds(1));
+        for (int i = 0; i < 10 && alive.lock(); ++i) Application::Get().Reschedule();
+        if (alive.lock()) Application::Get().RunOneFor(std::chrono::milliseconds(1));
+        if (!alive.lock()) return false;
         NX_COMM_LOG("*** Send failed ***");
         NX_COMM_LOG(String("Retry ") + Number(retries));
         if (LogFile::Instance()->IsLogOptionEnabled(String("Acoustic"))) {
             UserInterface::Current()->Beep(5000, 200);
             UserInterface::Current()->Beep(1000, 200);
         }
-        if (retries > kMaxRetries || (fKeepTrying && !fKeepTrying())) {
+        // A start that failed, or a peer that must not be started, does not
+        // come back by trying again.
+        if (retries > kMaxRetries || scope.Hopeless() || (fKeepTrying && !fKeepTrying()) ||
+            !alive.lock()) {
+            if (!alive.lock()) return false;
             LogFile::WriteToLog(String("Send ") + String(command) + " to " + String(asApp) +
                                     " failed: " + String(amLastError),
                                 String(kLogKey));
@@ -545,9 +632,22 @@ unsigned char PostOffice::SendCommand(const std::string& asApp, const std::strin
     }
 }
 
+// Sends the request and, once its frame is with the transport (before any
+// answer can be read), gives it its place among the outstanding requests.
+bool PostOffice::SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
+                             const boost::function<bool()>& fKeepTrying, PeerStart axStart) {
+    const std::string& app = pRequest->key.first;
+    int message = pRequest->key.second - kAnswerOffset;
+    if (!SendCommand(app, nxbase::CommandTextOfNumber(message), axSend, fKeepTrying, axStart))
+        return false;
+    amOutstanding[pRequest->key].push_back(pRequest);
+    return true;
+}
+
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
-                                         boost::function<bool()> fKeepWaiting, DisEnable axMode) {
+                                         boost::function<bool()> fKeepWaiting, DisEnable axMode,
+                                         PeerStart axStart) {
     std::optional<AutoLog> scope;
     if (nxbase::detail::CommunicationLogged()) {
         scope.emplace(String("SendAndReceive (") + Number(alMessage), String(kLogKey));
@@ -556,67 +656,72 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     bool touchWindow = axMode != DisEnableNone && ui->HasTopWindow();
     bool wasEnabled = touchWindow && ui->IsTopWindowEnabled();
     if (touchWindow) ui->EnableTopWindow(false);
-    if (!OnOwnThread("SendAndReceive")) {
-        if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
-        return false;
-    }
-    // Registered before sending: the answer may come while the send waits.
-    const std::pair<std::string, int> key(asApp, kAnswerOffset + alMessage);
-    AwaitedAnswer& awaited = amAnswers[key];
-    ++awaited.waiters;
-    amLostPeers.erase(asApp);
-    bool answered = false;
+    struct RestoreWindow {
+        UserInterface* ui;
+        bool restore;
+        ~RestoreWindow() {
+            if (restore) ui->EnableTopWindow(true);
+        }
+    } restoreWindow{ui.get(), touchWindow && wasEnabled};
+    if (!OnOwnThread("SendAndReceive")) return false;
+    // Everything the wait needs lives in the request: a handler run by the
+    // wait may destroy the post office.
+    std::weak_ptr<bool> alive = amAlive;
+    auto request = std::make_shared<Request>();
+    request->key = {asApp, kAnswerOffset + alMessage};
     // The caller's wish to stop waiting also ends the sending, which may
     // wait for a peer that was just started.
-    if (!SendCommand(asApp, nxbase::CommandTextOfNumber(alMessage), axSend, fKeepWaiting)) {
-        NX_COMM_LOG("SendAndReceive, Send failed");
-    } else {
+    if (!SendRequest(request, axSend, fKeepWaiting, axStart)) {
+        if (alive.lock()) NX_COMM_LOG("SendAndReceive, Send failed");
+        return false;
+    }
+    {
         std::optional<AutoLog> waiting;
         if (nxbase::detail::CommunicationLogged()) {
             waiting.emplace(String("WaitForAnswer"), String(kLogKey));
         }
-        while (true) {
-            if (awaited.arrived) {
-                axReceive = std::move(awaited.data);
-                awaited.arrived = false;
-                NX_COMM_LOG("MessageQueue - Get data from message");
-                NX_COMM_LOG("MessageQueue - Erased message");
-                answered = true;
-                break;
+        const unsigned long quits = Application::Get().GetQuitCount();
+        while (!request->finished) {
+            if (Application::Get().GetQuitCount() != quits) {
+                request->finished = true;
+                request->error = "no answer from " + asApp + "; the application quits";
+            } else if (fKeepWaiting && !fKeepWaiting()) {
+                request->finished = true;
+                request->error = "no answer from " + asApp + "; the wait was given up";
+            } else {
+                Application::Get().RunOneFor(kLongestPause);
             }
-            if (amLostPeers.count(asApp) > 0) {
-                amLastError = "the channel to " + asApp + " was lost";
-                break;
-            }
-            if (fKeepWaiting && !fKeepWaiting()) {
-                amLastError = "no answer from " + asApp + "; the wait was given up";
-                break;
-            }
-            Application::Get().RunOneFor(kLongestPause);
         }
-        NX_COMM_LOG(answered ? String("Answer received: ") + Number(alMessage)
-                             : String("SendAndReceive, Abort"));
     }
-    --awaited.waiters;
-    if (touchWindow && wasEnabled) ui->EnableTopWindow(true);
-    return answered;
+    if (!alive.lock()) return false;
+    if (!request->answered) {
+        amLastError = request->error;
+        NX_COMM_LOG("SendAndReceive, Abort");
+        return false;
+    }
+    axReceive = std::move(request->data);
+    NX_COMM_LOG("MessageQueue - Get data from message");
+    NX_COMM_LOG("MessageQueue - Erased message");
+    NX_COMM_LOG(String("Answer received: ") + Number(alMessage));
+    return true;
 }
 
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
-                                         DisEnable axMode) {
+                                         DisEnable axMode, PeerStart axStart) {
     auto start = std::chrono::steady_clock::now();
-    auto limit = std::chrono::seconds(nxbase::WaitTimeoutSeconds());
+    const int limitSeconds = nxbase::WaitTimeoutSeconds();
+    auto limit = std::chrono::seconds(limitSeconds);
     bool toServer = PostOfficeApplications::IsServerName(asApp);
     if (!toServer) NX_COMM_LOG("Set callback function");
     bool dialogOpen = false;
     boost::function<bool()> keepWaiting = [&]() {
         auto ui = UserInterface::Current();
         auto elapsed = std::chrono::steady_clock::now() - start;
-        if (!ui->IsInteractive() && elapsed > limit) {
+        if (limitSeconds > 0 && !ui->IsInteractive() && elapsed > limit) {
             // Always written: a wait given up for want of a person must show.
             LogFile::WriteToLog(String("SendAndReceive: no answer from ") + String(asApp) +
-                                    " within " + Number(static_cast<long>(limit.count())) +
+                                    " within " + Number(static_cast<long>(limitSeconds)) +
                                     " s (NXBASE_WAIT_TIMEOUT), aborted",
                                 String());
             return false;
@@ -629,7 +734,8 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         }
         return !ui->IsAbortDialogAborted();
     };
-    unsigned char result = SendAndReceive(asApp, alMessage, axSend, axReceive, keepWaiting, axMode);
+    unsigned char result =
+        SendAndReceive(asApp, alMessage, axSend, axReceive, keepWaiting, axMode, axStart);
     if (dialogOpen) UserInterface::Current()->CloseAbortDialog();
     return result;
 }
@@ -639,84 +745,96 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
 void PostOffice::SendAndReceiveAsync(const std::string& asApp, int alMessage,
                                      const MyMemoryBlock& axSend, AnswerCallback fDone,
                                      std::chrono::milliseconds timeout,
-                                     boost::function<bool()> fKeepWaiting) {
-    auto request = std::make_shared<AsyncRequest>();
+                                     boost::function<bool()> fKeepWaiting, PeerStart axStart) {
+    auto request = std::make_shared<Request>();
     request->key = {asApp, kAnswerOffset + alMessage};
+    request->async = true;
     request->done = std::move(fDone);
     request->keepWaiting = std::move(fKeepWaiting);
     request->timeout = timeout;
     request->deadline = std::chrono::steady_clock::now() + timeout;
     if (!OnOwnThread("SendAndReceiveAsync")) {
-        FinishAsync(request, false, MyMemoryBlock(), amLastError);
+        Finish(request, false, MyMemoryBlock(), amLastError);
         return;
     }
+    request->timer.emplace(Application::Get().GetContext());
     amAsync.push_back(request);
     // Sent from the loop, so that the caller returns at once even when the
     // peer has to be started first.
     std::weak_ptr<bool> alive = amAlive;
-    Application::Get().Post([this, alive, request, axSend] {
-        if (alive.lock() && !request->finished) StartAsync(request, axSend);
+    Application::Get().Post([this, alive, request, axSend, axStart] {
+        if (alive.lock() && !request->finished) StartAsync(request, axSend, axStart);
     });
 }
 
-void PostOffice::StartAsync(const std::shared_ptr<AsyncRequest>& pRequest,
-                            const MyMemoryBlock& axSend) {
-    const std::string& app = pRequest->key.first;
-    int message = pRequest->key.second - kAnswerOffset;
-    if (!SendCommand(app, nxbase::CommandTextOfNumber(message), axSend, pRequest->keepWaiting)) {
-        FinishAsync(pRequest, false, MyMemoryBlock(), amLastError);
+// The time-out covers the start of the peer as well: the send gives up at
+// the deadline.
+void PostOffice::StartAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
+                            PeerStart axStart) {
+    std::weak_ptr<bool> alive = amAlive;
+    boost::function<bool()> keepTrying = [pRequest] {
+        return !pRequest->finished && std::chrono::steady_clock::now() < pRequest->deadline &&
+               (!pRequest->keepWaiting || pRequest->keepWaiting());
+    };
+    if (!SendRequest(pRequest, axSend, keepTrying, axStart)) {
+        if (!alive.lock()) return;
+        std::string why = std::chrono::steady_clock::now() >= pRequest->deadline
+                              ? "no answer from " + pRequest->key.first + " within " +
+                                    std::to_string(pRequest->timeout.count()) + " ms (" +
+                                    amLastError + ")"
+                              : amLastError;
+        Finish(pRequest, false, MyMemoryBlock(), why);
         return;
     }
     if (!pRequest->finished) ArmAsync(pRequest);
 }
 
 // Wakes at the deadline, or every 100 ms while a keep-waiting function is to be asked.
-void PostOffice::ArmAsync(const std::shared_ptr<AsyncRequest>& pRequest) {
+void PostOffice::ArmAsync(const RequestPtr& pRequest) {
     constexpr auto kAskEvery = std::chrono::milliseconds(100);
     auto next = pRequest->deadline;
     if (pRequest->keepWaiting) next = std::min(next, std::chrono::steady_clock::now() + kAskEvery);
-    pRequest->timer.expires_at(next);
+    pRequest->timer->expires_at(next);
     std::weak_ptr<bool> alive = amAlive;
-    pRequest->timer.async_wait([this, alive, pRequest](const boost::system::error_code& error) {
+    pRequest->timer->async_wait([this, alive, pRequest](const boost::system::error_code& error) {
         if (error || !alive.lock() || pRequest->finished) return;
         const std::string& app = pRequest->key.first;
         if (std::chrono::steady_clock::now() >= pRequest->deadline) {
-            FinishAsync(pRequest, false, MyMemoryBlock(),
-                        "no answer from " + app + " within " +
-                            std::to_string(pRequest->timeout.count()) + " ms");
+            Finish(pRequest, false, MyMemoryBlock(),
+                   "no answer from " + app + " within " +
+                       std::to_string(pRequest->timeout.count()) + " ms");
         } else if (pRequest->keepWaiting && !pRequest->keepWaiting()) {
-            FinishAsync(pRequest, false, MyMemoryBlock(),
-                        "no answer from " + app + "; the wait was given up");
+            Finish(pRequest, false, MyMemoryBlock(),
+                   "no answer from " + app + "; the wait was given up");
         } else {
             ArmAsync(pRequest);
         }
     });
 }
 
-bool PostOffice::DeliverAsync(const std::pair<std::string, int>& axKey, MyMemoryBlock& axData) {
-    for (const auto& request : amAsync) {
-        if (request->key != axKey) continue;
-        FinishAsync(request, true, std::move(axData), std::string());
-        return true;
-    }
-    return false;
-}
-
-// Calls the call-back on the loop, never from inside the transport's delivery.
-void PostOffice::FinishAsync(const std::shared_ptr<AsyncRequest>& pRequest, bool abAnswered,
-                             MyMemoryBlock axData, std::string asError) {
+// Ends a request for its caller; it keeps its place among the outstanding
+// ones until its answer comes. An asynchronous caller is called back on the
+// loop, never from inside the transport's delivery.
+void PostOffice::Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlock axData,
+                        std::string asError) {
     if (pRequest->finished) return;
     pRequest->finished = true;
-    pRequest->timer.cancel();
+    pRequest->answered = abAnswered;
+    pRequest->data = std::move(axData);
+    pRequest->error = std::move(asError);
+    if (!pRequest->async) return;  // a blocking wait sees it finished
+    if (pRequest->timer) pRequest->timer->cancel();
     amAsync.erase(std::remove(amAsync.begin(), amAsync.end(), pRequest), amAsync.end());
     if (!abAnswered) {
-        LogFile::WriteToLog(String("SendAndReceiveAsync: ") + String(asError), String(kLogKey));
+        LogFile::WriteToLog(String("SendAndReceiveAsync: ") + String(pRequest->error),
+                            String(kLogKey));
     }
-    auto result = std::make_shared<AnswerResult>();
-    result->answered = abAnswered;
-    result->data = std::move(axData);
-    result->error = std::move(asError);
-    Application::Get().Post([pRequest, result] {
-        if (pRequest->done) pRequest->done(*result);
+    Application::Get().Post([pRequest] {
+        if (!pRequest->done) return;
+        AnswerResult result;
+        result.answered = pRequest->answered;
+        result.data = std::move(pRequest->data);
+        result.error = pRequest->error;
+        pRequest->done(result);
     });
 }

@@ -72,11 +72,16 @@ class NXBASE_EXPORT Application {
 
     boost::asio::io_context& GetContext() { return context_; }
 
-    // Runs handlers until Quit(). Handlers posted before Execute run in it.
+    // Runs handlers until Quit(), sleeping while none is due. Handlers posted
+    // before Execute run in it.
     void Execute();
-    // Ends Execute() (and any wait) after the running handler returns.
+    // Ends Execute() after the running handler returns, and every wait of
+    // the library that is running (SendAndReceive, starting a peer). Any
+    // thread may call it.
     void Quit();
     bool IsQuitting() const { return quitting_; }
+    // How many times Quit() was called: a wait ends when it changes.
+    unsigned long GetQuitCount() const { return quitCount_; }
     // Clears a Quit(), so that the loop can run again (tests).
     void ResetQuit();
     bool IsInExecute() const { return executing_ > 0; }
@@ -142,7 +147,8 @@ class NXBASE_EXPORT Application {
     std::atomic<int> wakeDescriptor_{-1};   // an eventfd written by posts from other threads
     std::atomic<bool> wakePending_{false};  // set after each write to it
     std::function<void(unsigned long, void*)> userEventHandler_;
-    bool quitting_ = false;
+    std::atomic<bool> quitting_{false};
+    std::atomic<unsigned long> quitCount_{0};
     bool waiting_ = false;
     int executing_ = 0;
     std::atomic<std::thread::id> uiThread_{std::this_thread::get_id()};
