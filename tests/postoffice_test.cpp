@@ -13,6 +13,7 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iostream>
 #include <thread>
 
 #include "messaging_test_util.h"
@@ -396,6 +397,113 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
     if (!nxtest::kSanitized) {
         EXPECT_LT(ResidentKiB() - before, 16 * 1024) << "80 MB of unsolicited answers";
     }
+}
+
+// A request's data: the peer answers it `lateMs` late, with the same bytes.
+MyMemoryBlock Late(int lateMs, const std::string& text) {
+    MyMemoryBlock block;
+    unsigned char ms[4] = {static_cast<unsigned char>(lateMs), static_cast<unsigned char>(lateMs >> 8),
+                           static_cast<unsigned char>(lateMs >> 16), 0};
+    block.Put("LATE", 4);
+    block.Put(reinterpret_cast<const char*>(ms), 4);
+    block.Put(text.data(), static_cast<long>(text.size()));
+    return block;
+}
+// The text of an answer to Late(): what follows the 8 bytes of lateness.
+std::string TextOf(const MyMemoryBlock& answer) {
+    std::string bytes(answer.GetDatenZeiger(), static_cast<std::size_t>(answer.Len()));
+    return bytes.size() >= 8 ? bytes.substr(8) : "<" + bytes + ">";
+}
+
+TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    std::vector<std::string> got;
+    auto record = [&](const std::string& name) {
+        return [&got, name](AnswerResult& result) {
+            got.push_back(name + "=" + (result.answered ? TextOf(result.data) : "failed"));
+            if (!result.answered) std::cerr << name << ": " << result.error << "\n";
+        };
+    };
+    // Two asynchronous requests outstanding at once, for different messages.
+    office->SendAndReceiveAsync("EchoPeer", GET_APP_VERSION, Late(50, "version"), record("a"));
+    office->SendAndReceiveAsync("EchoPeer", GET_DEVICE_NAME, Late(0, "name"), record("b"));
+    ASSERT_TRUE(RunUntil([&] { return got.size() == 2; }));
+    RunUntil([] { return false; }, 100ms);  // nobody called twice
+    std::sort(got.begin(), got.end());  // the order the peer answered in
+    EXPECT_EQ(got, (std::vector<std::string>{"a=version", "b=name"}));
+
+    // A blocking request, then an asynchronous one for the same message: the
+    // peer answers in order, and so are the answers handed out.
+    got.clear();
+    MyMemoryBlock first = Late(150, "first"), answer;
+    bool posted = false;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SERIE_NR, first, answer, [&] {
+        if (!posted)
+            office->SendAndReceiveAsync("EchoPeer", GET_SERIE_NR, Late(0, "second"), record("c"));
+        posted = true;
+        return true;
+    }));
+    EXPECT_EQ(TextOf(answer), "first");
+    ASSERT_TRUE(RunUntil([&] { return got.size() == 1; }));
+    EXPECT_EQ(got[0], "c=second");
+
+    // A request given up keeps its place: its late answer is dropped, the
+    // next request gets its own. Asynchronous by time-out, then blocking by
+    // its keep-waiting function.
+    got.clear();
+    office->SendAndReceiveAsync("EchoPeer", GET_SW_VERSION, Late(300, "late"), record("d"), 50ms);
+    ASSERT_TRUE(RunUntil([&] { return got.size() == 1; }));
+    EXPECT_EQ(got[0], "d=failed");
+    MyMemoryBlock next = Late(0, "on time");
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
+    EXPECT_EQ(TextOf(answer), "on time");
+    auto stopAt = std::chrono::steady_clock::now() + 50ms;
+    MyMemoryBlock slow = Late(300, "slow");
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, slow, answer,
+                                        [&] { return std::chrono::steady_clock::now() < stopAt; }));
+    EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 1u);
+    next = Late(0, "after");
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
+    EXPECT_EQ(TextOf(answer), "after");
+    EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 0u);
+    const std::string log = Log();
+    EXPECT_NE(log.find("Late answer dropped: ANSWER!GET_SW_VERSION from EchoPeer"), std::string::npos);
+
+    // A lost channel empties the queue: the restarted peer's answers start afresh.
+    got.clear();
+    office->SendAndReceiveAsync("EchoPeer", GET_DEVICE_TYPE, Late(2000, "never"), record("e"), 20ms);
+    ASSERT_TRUE(RunUntil([&] { return got.size() == 1; }));
+    int lost = 0;
+    office->AddPeerLostFunction([&](const std::string& peer) { lost += peer == "EchoPeer"; });
+    MyMemoryBlock none;
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, none, answer, [] { return true; }));
+    EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_DEVICE_TYPE), 0u);
+    ASSERT_TRUE(RunUntil([&] { return lost == 1; }));
+    RunUntil([&] { return !nxbase::IsApplicationRunning("EchoPeer"); }, 5s);
+    next = Late(0, "fresh");
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_TYPE, next, answer, [] { return true; }));
+    EXPECT_EQ(TextOf(answer), "fresh");
+}
+
+TEST_F(PostOfficeTest, AnAnswerTooManyGoesToTheNextRequestOrNobody) {
+    // Frames carry no request id: a peer that answers twice has its second
+    // answer taken for the next request; with none outstanding it is dropped.
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    RawPeer peer("Twice", Pipe::Instance()->GetSocketPath());
+    MyMemoryBlock request, answer;
+    int calls = 0;
+    ASSERT_TRUE(office->SendAndReceive("Twice", GET_APP_VERSION, request, answer, [&] {
+        if (++calls == 1) {
+            EXPECT_EQ(peer.Next().first, "GET_APP_VERSION");
+            peer.Send("ANSWER!GET_APP_VERSION", "one");
+            peer.Send("ANSWER!GET_APP_VERSION", "one again");
+        }
+        return calls < 200;
+    }));
+    EXPECT_EQ(std::string(answer.GetDatenZeiger(), static_cast<std::size_t>(answer.Len())), "one");
+    RunUntil([] { return false; }, 100ms);
+    EXPECT_NE(Log().find("Answer nobody waits for dropped: ANSWER!GET_APP_VERSION from Twice"),
+              std::string::npos);
 }
 
 int gForwarded = 0;

@@ -205,6 +205,7 @@ class NXBASE_EXPORT Pipe {
     struct Listener;
     std::unique_ptr<Listener> pmListener;
     std::map<std::string, ChannelPtr> amChannels;       // by peer name
+    std::map<std::string, int> amStarting;              // peers being started, their pids
     std::map<std::uint64_t, ChannelPtr> amAllChannels;  // every open connection, by id
     std::uint64_t amNextChannelId = 1;
     std::size_t amPartialBytes = 0;

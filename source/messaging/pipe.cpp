@@ -682,6 +682,12 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     }
     if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
+    auto starting = amStarting.find(asApp);
+    if (!scope.amStarted && starting != amStarting.end()) {
+        // Another send (further up the stack) started it: wait for that one.
+        scope.amStarted = true;
+        scope.amStartedPid = starting->second;
+    }
     if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
         scope.amStarted = true;
         nxbase::Log("Pipe: starting " + application.GetExecutableWithPath());
@@ -696,12 +702,18 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     }
     std::string why;
     auto ready = [&] {
+        // A send nested in this wait may have opened the channel already.
+        if ((axChannel = ChannelTo(asApp))) return true;
         if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
         return (abByDde = OnDdeBus(asApp));
     };
     auto keepWaiting = [this] { return KeepWaiting(); };
-    toolkit::StartWait result = toolkit::WaitForStartedProcess(scope.amStartedPid, ready,
-                                                               keepWaiting, scope.Deadline(), why);
+    const int pid = scope.amStartedPid;
+    if (pid > 0) amStarting.emplace(asApp, pid);
+    toolkit::StartWait result =
+        toolkit::WaitForStartedProcess(pid, ready, keepWaiting, scope.Deadline(), why);
+    if (auto at = amStarting.find(asApp); at != amStarting.end() && at->second == pid)
+        amStarting.erase(at);
     if (result == toolkit::StartWait::kReady) return true;
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
                 "): " + why);

@@ -2,9 +2,17 @@
 // argument (or "EchoPeer"), writes its command line and working directory to
 // $NXBASE_RUNTIME_DIR/<name>.started, and answers every message with
 // "ANSWER!" + the command and the same data. "QUIT" ends it; CANCEL_REQUEST
-// makes it die without an answer, IS_APP_READY is never answered.
+// makes it die without an answer, IS_APP_READY is never answered. Data that
+// begins with "LATE" and a 4-byte little-endian count of milliseconds is
+// answered that much later; answers always leave in the order their
+// commands came, as a post office's handlers answer.
 #include <unistd.h>
 
+#include <algorithm>
+#include <boost/asio/steady_timer.hpp>
+#include <chrono>
+#include <cstring>
+#include <deque>
 #include <fstream>
 #include <string>
 
@@ -14,6 +22,37 @@
 
 namespace {
 
+struct PendingAnswer {
+    std::chrono::steady_clock::time_point due;
+    std::string peer, command;
+    MyMemoryBlock data;
+};
+std::deque<PendingAnswer> gPending;
+std::chrono::steady_clock::time_point gLastDue;
+
+void SendDueAnswers() {
+    static boost::asio::steady_timer timer(Application::Get().GetContext());
+    auto now = std::chrono::steady_clock::now();
+    while (!gPending.empty() && gPending.front().due <= now) {
+        PendingAnswer& answer = gPending.front();
+        Pipe::Instance()->Send(answer.peer, kAnswerPrefix + answer.command, answer.data);
+        gPending.pop_front();
+    }
+    if (gPending.empty()) return;
+    timer.expires_at(gPending.front().due);
+    timer.async_wait([](const boost::system::error_code& error) {
+        if (!error) SendDueAnswers();
+    });
+}
+
+std::chrono::milliseconds Lateness(const MyMemoryBlock& data) {
+    const char* bytes = data.GetDatenZeiger();
+    if (data.Len() < 8 || std::memcmp(bytes, "LATE", 4) != 0) return {};
+    unsigned char ms[4];
+    std::memcpy(ms, bytes + 4, 4);
+    return std::chrono::milliseconds(ms[0] | ms[1] << 8 | ms[2] << 16 | ms[3] << 24);
+}
+
 void Echo(VELTRAEvent& event) {
     if (event.GetCommand() == "QUIT") {
         Application::Get().Quit();
@@ -22,8 +61,12 @@ void Echo(VELTRAEvent& event) {
     if (event.GetCommand() == "CANCEL_REQUEST") ::_exit(0);
     if (event.GetCommand() == "IS_APP_READY") return;
     MyMemoryBlock data = event.GetData();
+    auto due = std::max(std::chrono::steady_clock::now() + Lateness(data), gLastDue);
+    gLastDue = due;
     nxbase::EncodeBlock(data);
-    Pipe::Instance()->Send(event.GetSender(), kAnswerPrefix + event.GetCommand(), data);
+    bool idle = gPending.empty();
+    gPending.push_back({due, event.GetSender(), event.GetCommand(), std::move(data)});
+    if (idle) SendDueAnswers();
 }
 
 }  // namespace
