@@ -4,6 +4,7 @@
 // four client processes.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -17,6 +18,7 @@
 #include <fstream>
 #include <functional>
 #include <iterator>
+#include <optional>
 #include <sstream>
 #include <thread>
 
@@ -24,6 +26,7 @@
 #include "nxbase/lumaclient.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
+#include "nxbase/progress.h"
 #include "nxbase/registry.h"
 #include "test_util.h"
 #include "toolkit/application.h"
@@ -235,6 +238,68 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     RunUntil([] { return false; }, 1500ms);
     EXPECT_TRUE(nxtest::ProcessRunning(serverExecutable));
     EXPECT_GT(notices.received.size(), before + 5);
+}
+
+// Kills the server when patch `at` has been measured.
+struct KillAtPatch : ProgressListener {
+    KillAtPatch(std::string name, int at, int count) : name(std::move(name)), at(at), count(count) {}
+    void DisplayProgress(double fraction) override {
+        if (static_cast<int>(std::lround(fraction * count)) == at) Kill();
+    }
+    void Kill() {
+        if (pid_t server = nxtest::FindProcess(name)) ::kill(server, SIGKILL);
+    }
+    std::string name;
+    int at, count;
+};
+
+TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    // Blocking: killed after patch 8, the measurement fails at patch 9 and
+    // what came before stays; neither the next request nor the cleanup
+    // starts a server, which would measure from the first patch again.
+    KillAtPatch killer(serverExecutable, 8, 24);
+    std::vector<nxbase::MeasuredSpectrum> measured;
+    std::string error;
+    EXPECT_FALSE(nxbase::MeasureWithLumaServer(*office, 24, &measured, &error, &killer));
+    EXPECT_EQ(error, "LumaServer was lost at patch 9 of 24");
+    ASSERT_EQ(measured.size(), 8u);
+    EXPECT_EQ(measured[7].id, "8 purplish blue");
+    RunUntil([] { return false; }, 300ms);
+    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+
+    // Asynchronous: the same, a call-back per patch.
+    std::vector<std::string> ids;
+    std::optional<std::string> done;
+    nxbase::MeasurementSession session(
+        *office, 24,
+        [&](const nxbase::MeasuredSpectrum& patch, int number, int count) {
+            ids.push_back(patch.id.substr(0, patch.id.find(' ')));
+            EXPECT_EQ(count, 24);
+            EXPECT_EQ(number, static_cast<int>(ids.size()));
+            if (number == 5) killer.Kill();
+        },
+        [&](bool ok, const std::string& why) { done = ok ? "ok" : why; });
+    session.Start();  // starts the server again: a new conversation may
+    ASSERT_TRUE(RunUntil([&] { return done.has_value(); }));
+    EXPECT_EQ(*done, "LumaServer was lost at patch 6 of 24");
+    EXPECT_EQ(ids, (std::vector<std::string>{"1", "2", "3", "4", "5"}));
+    RunUntil([] { return false; }, 300ms);
+    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+
+    // Undisturbed, it measures every patch in turn and releases the server.
+    ids.clear();
+    done.reset();
+    nxbase::MeasurementSession whole(
+        *office, 3, [&](const nxbase::MeasuredSpectrum& patch, int, int) {
+            ids.push_back(patch.id.substr(0, patch.id.find(' ')));
+        },
+        [&](bool ok, const std::string& why) { done = ok ? "ok" : why; });
+    whole.Start();
+    ASSERT_TRUE(RunUntil([&] { return done.has_value(); }));
+    EXPECT_EQ(*done, "ok");
+    EXPECT_EQ(ids, (std::vector<std::string>{"1", "2", "3"}));
+    EXPECT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
 }
 
 TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
