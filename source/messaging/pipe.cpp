@@ -682,11 +682,17 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     }
     if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
-    auto starting = amStarting.find(asApp);
-    if (!scope.amStarted && starting != amStarting.end()) {
-        // Another send (further up the stack) started it: wait for that one.
-        scope.amStarted = true;
-        scope.amStartedPid = starting->second;
+    // Another send started it (further up the stack, or one that gave up
+    // waiting): while that process lives, wait for it instead of starting a
+    // second one that would find the name taken.
+    if (auto starting = amStarting.find(asApp); !scope.amStarted && starting != amStarting.end()) {
+        std::string how;
+        if (toolkit::StartedProcessEnded(starting->second, how)) {
+            amStarting.erase(starting);
+        } else {
+            scope.amStarted = true;
+            scope.amStartedPid = starting->second;
+        }
     }
     if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
         scope.amStarted = true;
@@ -712,7 +718,10 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     if (pid > 0) amStarting.emplace(asApp, pid);
     toolkit::StartWait result =
         toolkit::WaitForStartedProcess(pid, ready, keepWaiting, scope.Deadline(), why);
-    if (auto at = amStarting.find(asApp); at != amStarting.end() && at->second == pid)
+    // Reachable or ended, it is no longer being started; given up, it still is.
+    if (auto at = amStarting.find(asApp); at != amStarting.end() && at->second == pid &&
+                                          result != toolkit::StartWait::kGivenUp &&
+                                          result != toolkit::StartWait::kTimedOut)
         amStarting.erase(at);
     if (result == toolkit::StartWait::kReady) return true;
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +

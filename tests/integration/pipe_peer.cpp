@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
+#include <cstdlib>
 #include <cstring>
 #include <deque>
 #include <fstream>
@@ -72,8 +73,13 @@ void Echo(VELTRAEvent& event) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    // Started by the transport, the arguments are "-S -LNG <code>".
+    // Started by the transport, the arguments are "-S -LNG <code>": the name
+    // is "EchoPeer", or the file's own with $NXBASE_PEER_NAMED_AFTER_FILE.
     std::string name = argc > 1 && argv[1][0] != '-' ? argv[1] : "EchoPeer";
+    if (argc > 1 && argv[1][0] == '-' && std::getenv("NXBASE_PEER_NAMED_AFTER_FILE")) {
+        name = argv[0];
+        name = name.substr(name.rfind('/') + 1);
+    }
     std::ofstream started(nxbase::MessagingRuntimeDirectory() + "/" + name + ".started");
     for (int i = 0; i < argc; ++i) started << (i ? " " : "") << argv[i];
     char cwd[4096];
