@@ -485,6 +485,46 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
     EXPECT_EQ(TextOf(answer), "fresh");
 }
 
+TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitButQuit) {
+    // A registered program that cannot be run: the reason, at once, whatever
+    // the retries (LumaServer's registered file does not exist).
+    std::string unrunnable = root + "/bin/unrunnable";
+    std::ofstream(unrunnable) << "#!/bin/sh\n";
+    std::filesystem::permissions(unrunnable, std::filesystem::perms::owner_read);
+    sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "Unrunnable", unrunnable);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    for (auto [peer, why] : {std::pair{"LumaServer", "No such file or directory"},
+                             std::pair{"Unrunnable", "Permission denied"}}) {
+        MyMemoryBlock request, answer;
+        auto start = std::chrono::steady_clock::now();
+        EXPECT_FALSE(office->SendAndReceive(peer, GET_APP_VERSION, request, answer));
+        EXPECT_LT(std::chrono::steady_clock::now() - start, 500ms) << peer;
+        EXPECT_NE(office->GetLastError().find(why), std::string::npos) << office->GetLastError();
+    }
+    // Without $NXBASE_WAIT_TIMEOUT a wait for a silent peer has no limit, even
+    // where nobody can abort it (a measurement may wait for an operator);
+    // Application::Quit() ends it.
+    ASSERT_FALSE(ui->IsInteractive());
+    nxtest::ScopedEnv unset("NXBASE_WAIT_TIMEOUT", "");
+    Timer quit;
+    quit.SetTimeout(1500);
+    struct Quitter {
+        long Quit(void*) {
+            Application::Get().Quit();
+            return 0;
+        }
+    } quitter;
+    quit.SetTimeoutHdl(LINK(Quitter, &quitter, Quit));
+    quit.Start();
+    MyMemoryBlock request, answer;
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer));
+    auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took, 1400ms);
+    EXPECT_LT(took, 3s);
+    EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
+}
+
 TEST_F(PostOfficeTest, AnAnswerTooManyGoesToTheNextRequestOrNobody) {
     // Frames carry no request id: a peer that answers twice has its second
     // answer taken for the next request; with none outstanding it is dropped.
@@ -511,6 +551,10 @@ void Forward(VELTRAEvent& event) {
     ++gForwarded;
     PostOffice::Instance()->CommunicationReceiveFunction(event);
 }
+ReceiveFunction gPrevious = nullptr;
+void Chain(VELTRAEvent& event) {
+    gPrevious(event);
+}
 void DropDeviceTypeRequests(VELTRAEvent& event) {
     if (event.GetCommand() != "GET_DEVICE_TYPE")
         PostOffice::Instance()->CommunicationReceiveFunction(event);
@@ -528,7 +572,22 @@ TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefuse
     EXPECT_EQ(peer.Next(300ms).first, "<none>");
     peer.Send("IS_READY", "");
     EXPECT_EQ(peer.Next().first, "ANSWER!IS_READY");
+    // A function that chains to the one it replaced reaches the post office.
+    gPrevious = office->ChangeReceiveFunction(&PostOffice::DummyReceiveFunction);
+    gPrevious = office->ChangeReceiveFunction(Chain);
+    peer.Send("GET_DEVICE_TYPE", "");
+    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
     office->ChangeReceiveFunction(&PostOffice::DummyReceiveFunction);
+    // A peer that says DISCONNECT and goes needs no answer, and the user no box.
+    {
+        RawPeer leaving("Leaving", Pipe::Instance()->GetSocketPath());
+        leaving.Send("CONNECT", "\x02");
+        EXPECT_EQ(leaving.Next().second, "\x02");
+        leaving.Send("DISCONNECT", "");
+    }
+    RunUntil([] { return !Pipe::Instance()->HasChannel("Leaving"); }, 2s);
+    RunUntil([] { return false; }, 200ms);
+    EXPECT_TRUE(ui->Boxes().empty());
 
     unsigned char sent = 1;
     std::thread([&] {

@@ -31,6 +31,7 @@
 #include "nxbase/frame.h"
 #include "nxbase/poapps.h"
 #include "nxbase/veltraevent.h"
+#include "toolkit/process.h"
 
 class DDE;
 class MyMemoryBlock;
@@ -167,6 +168,9 @@ class NXBASE_EXPORT Pipe {
     bool AwaitHandshake(const ChannelPtr& axChannel);
     bool Reach(const std::string& asApp, const std::string& asCommand, ChannelPtr& axChannel,
                bool& abByDde);
+    bool StartForScope(const std::string& asApp, const PostOfficeApplication& axApplication);
+    toolkit::StartWait WaitForStart(const std::string& asApp, const std::function<bool()>& fReady,
+                                    std::string& asWhy);
     bool Fail(const std::string& asReason);
     bool KeepWaiting() const;
     void AddChannel(const ChannelPtr& axChannel);

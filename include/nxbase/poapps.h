@@ -23,6 +23,9 @@ NXBASE_EXPORT int WaitTimeoutSeconds();
 // How long one send waits for an application it started: 10 s, or
 // $NXBASE_WAIT_TIMEOUT if that is shorter.
 NXBASE_EXPORT std::chrono::seconds StartWaitLimit();
+// For tools: where the server's registration lives and how to write it, to
+// follow the set-up errors about LumaServer.
+NXBASE_EXPORT std::string ServerRegistrationHint();
 }  // namespace nxbase
 
 class NXBASE_EXPORT PostOfficeApplication {

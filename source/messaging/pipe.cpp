@@ -682,50 +682,70 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     }
     if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
-    // Another send started it (further up the stack, or one that gave up
-    // waiting): while that process lives, wait for it instead of starting a
-    // second one that would find the name taken.
-    if (auto starting = amStarting.find(asApp); !scope.amStarted && starting != amStarting.end()) {
-        std::string how;
-        if (toolkit::StartedProcessEnded(starting->second, how)) {
-            amStarting.erase(starting);
-        } else {
-            scope.amStarted = true;
-            scope.amStartedPid = starting->second;
-        }
-    }
-    if (!scope.amStarted && !nxbase::IsApplicationRunning(asApp)) {
-        scope.amStarted = true;
-        nxbase::Log("Pipe: starting " + application.GetExecutableWithPath());
-        std::string error;
-        scope.amStartedPid = application.Start(error);
-        if (scope.amStartedPid < 0) {
-            // Trying again would not make it executable.
-            scope.amHopeless = true;
-            scope.amStartFailure = error;
-            return Fail(error);
-        }
-    }
+    if (!StartForScope(asApp, application)) return false;
     std::string why;
+    bool startNow = false;
     auto ready = [&] {
         // A send nested in this wait may have opened the channel already.
         if ((axChannel = ChannelTo(asApp))) return true;
         if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
-        return (abByDde = OnDdeBus(asApp));
+        if ((abByDde = OnDdeBus(asApp))) return true;
+        // The instance that held the name when this send began has ended.
+        return startNow = !scope.amStarted && !nxbase::IsApplicationRunning(asApp);
     };
+    toolkit::StartWait result = WaitForStart(asApp, ready, why);
+    if (startNow) {
+        if (!StartForScope(asApp, application)) return false;
+        startNow = false;
+        result = WaitForStart(asApp, ready, why);
+    }
+    if (result == toolkit::StartWait::kReady && !startNow) return true;
+    return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
+                "): " + why);
+}
+
+// Starts `asApp` once per scope, unless it runs or another send started it
+// (further up the stack, or one that gave up waiting): while that process
+// lives it is waited for, as a second one would find the name taken. False,
+// with the reason, when the start failed.
+bool Pipe::StartForScope(const std::string& asApp, const PostOfficeApplication& axApplication) {
+    SendScope& scope = *pmScope;
+    if (scope.amStarted) return true;
+    if (auto starting = amStarting.find(asApp); starting != amStarting.end()) {
+        std::string how;
+        if (!toolkit::StartedProcessEnded(starting->second, how)) {
+            scope.amStarted = true;
+            scope.amStartedPid = starting->second;
+            return true;
+        }
+        amStarting.erase(starting);
+    }
+    if (nxbase::IsApplicationRunning(asApp)) return true;
+    scope.amStarted = true;
+    nxbase::Log("Pipe: starting " + axApplication.GetExecutableWithPath());
+    std::string error;
+    scope.amStartedPid = axApplication.Start(error);
+    if (scope.amStartedPid > 0) return true;
+    // Trying again would not make it executable.
+    scope.amHopeless = true;
+    scope.amStartFailure = error;
+    return Fail(error);
+}
+
+// Waits for the process this scope started (if any) to become reachable.
+toolkit::StartWait Pipe::WaitForStart(const std::string& asApp,
+                                      const std::function<bool()>& fReady, std::string& asWhy) {
     auto keepWaiting = [this] { return KeepWaiting(); };
-    const int pid = scope.amStartedPid;
+    const int pid = pmScope->amStartedPid;
     if (pid > 0) amStarting.emplace(asApp, pid);
     toolkit::StartWait result =
-        toolkit::WaitForStartedProcess(pid, ready, keepWaiting, scope.Deadline(), why);
+        toolkit::WaitForStartedProcess(pid, fReady, keepWaiting, pmScope->Deadline(), asWhy);
     // Reachable or ended, it is no longer being started; given up, it still is.
     if (auto at = amStarting.find(asApp); at != amStarting.end() && at->second == pid &&
                                           result != toolkit::StartWait::kGivenUp &&
                                           result != toolkit::StartWait::kTimedOut)
         amStarting.erase(at);
-    if (result == toolkit::StartWait::kReady) return true;
-    return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
-                "): " + why);
+    return result;
 }
 
 namespace {

@@ -68,6 +68,12 @@ int WaitTimeoutSeconds() {
     return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds) : 0;
 }
 
+std::string ServerRegistrationHint() {
+    return std::string("LumaServer is registered under HKEY_LOCAL_MACHINE\\") + kServerKey +
+           " (Path, Executable, Version) in " + RegistryHiveFile(RegistryHive::LocalMachine) +
+           "; `lumaserver --register` writes it";
+}
+
 std::chrono::seconds StartWaitLimit() {
     constexpr std::chrono::seconds kStartLimit(10);
     int timeout = WaitTimeoutSeconds();

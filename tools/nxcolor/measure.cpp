@@ -1,13 +1,22 @@
 #include "measure.h"
 
+#include <stdexcept>
+
 #include "nxbase/lumaclient.h"
+#include "nxbase/poapps.h"
 #include "nxbase/postoffice.h"
 
 namespace nxcolor {
 
 bool MeasureThroughServer(int count, SpectraTable* table, std::string* error,
                           ProgressListener* progress) {
-    PostOffice* office = PostOffice::CreatePostOffice("nxcolor");
+    PostOffice* office = nullptr;
+    try {
+        office = PostOffice::CreatePostOffice("nxcolor");
+    } catch (const std::exception& failure) {
+        *error = std::string(failure.what()) + " (" + nxbase::ServerRegistrationHint() + ")";
+        return false;
+    }
     std::vector<nxbase::MeasuredSpectrum> measured;
     const bool ok = nxbase::MeasureWithLumaServer(*office, count, &measured, error, progress);
     for (const nxbase::MeasuredSpectrum& spectrum : measured) {

@@ -2,6 +2,7 @@
 // typed values and prints the answer, or listens under a name and prints
 // every command it receives.
 #include <algorithm>
+#include <chrono>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -12,6 +13,7 @@
 
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
+#include "nxbase/poapps.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/version.h"
 #include "toolkit/application.h"
@@ -43,7 +45,8 @@ const char kUsage[] =
     "  --dde            talk through DDE on the D-Bus session bus only\n"
     "  --listen NAME    run a post office named NAME that prints every command\n"
     "                   and answers with the default handler; Ctrl-C ends it\n"
-    "  --timeout S      give up waiting after S seconds (default 30)\n"
+    "  --timeout S      give up after S seconds, starting APP included\n"
+    "                   (default 30)\n"
     "\n"
     "Exit status: 0 answered with status 0, 1 answered with another status,\n"
     "2 usage error, 3 no answer or no post office.\n";
@@ -156,10 +159,13 @@ std::string Decode(MyMemoryBlock block, const std::string& types) {
     return out.str();
 }
 
+// Prints every command, then hands it on to the post office, whose default
+// handler answers it.
 void PrintCommand(VELTRAEvent& event) {
     std::cout << event.GetSender() << " -> " << event.GetCommand();
     if (event.GetData().Len() > 0) std::cout << "  " << Hex(event.GetData());
     std::cout << std::endl;
+    PostOffice::DummyReceiveFunction(event);
 }
 
 void StopListening(int) {
@@ -183,7 +189,9 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     CheckAnswerTypes(expect);
     MyMemoryBlock data;
     for (const std::string& value : values) AppendValue(data, value);
-    ::setenv("NXBASE_WAIT_TIMEOUT", std::to_string(timeout).c_str(), 1);
+    // One limit for the whole exchange, starting the peer and CONNECT included.
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
+    boost::function<bool()> inTime = [deadline] { return std::chrono::steady_clock::now() < deadline; };
     PostOffice* office = PostOffice::CreatePostOffice(String(self));
     if (!office->HasApplication(app) && !nxbase::IsApplicationRunning(app)) {
         std::cerr << "nxmsg: " << app
@@ -192,7 +200,7 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     }
     if (!wait) {
         String command(nxbase::MessageName(number));
-        if (!office->Send(app, command, data)) {
+        if (!office->Send(app, command, data, inTime)) {
             std::cerr << "nxmsg: cannot send " << message << " to " << app << ": "
                       << office->GetLastError() << "\n";
             return kExitFailed;
@@ -204,7 +212,7 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     MyMemoryBlock level, levelAnswer, answer;
     level << static_cast<unsigned char>(2);
     bool connected = number != CONNECT && number != DISCONNECT &&
-                     office->SendAndReceive(app, CONNECT, level, levelAnswer);
+                     office->SendAndReceive(app, CONNECT, level, levelAnswer, inTime);
     struct Disconnect {
         PostOffice* office;
         const std::string& app;
@@ -215,7 +223,7 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
             office->Send(app, DISCONNECT, none);
         }
     } disconnect{office, app, connected};
-    if (!office->SendAndReceive(app, number, data, answer)) {
+    if (!office->SendAndReceive(app, number, data, answer, inTime)) {
         std::cerr << "nxmsg: no answer from " << app << " to " << nxbase::MessageName(number)
                   << ": " << office->GetLastError() << "\n";
         return kExitFailed;
@@ -280,7 +288,10 @@ int main(int argc, char** argv) {
         std::cerr << "nxmsg: " << error.what() << "\n(nxmsg --help shows the usage)\n";
         return kExitUsage;
     } catch (const std::exception& error) {
-        std::cerr << "nxmsg: " << error.what() << "\n";
+        std::string what = error.what();
+        if (what.find("LumaServer") != std::string::npos)
+            what += "\n(" + nxbase::ServerRegistrationHint() + ")";
+        std::cerr << "nxmsg: " << what << "\n";
         return kExitFailed;
     }
 }
