@@ -240,6 +240,19 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     EXPECT_GT(notices.received.size(), before + 5);
 }
 
+TEST_F(LumaServerTest, AnIdleServerSleeps) {
+    PostOffice::CreatePostOffice("Tester");
+    Connect();  // started on demand, with its check for being unused
+    pid_t server = nxtest::FindProcess(serverExecutable);
+    ASSERT_NE(server, 0);
+    const std::string status = "/proc/" + std::to_string(server) + "/status";
+    RunUntil([] { return false; }, 300ms);
+    long before = nxtest::ProcStatusField(status, "voluntary_ctxt_switches");
+    RunUntil([] { return false; }, 3s);
+    long woken = nxtest::ProcStatusField(status, "voluntary_ctxt_switches") - before;
+    EXPECT_LE(woken, 2) << "wake-ups of an idle lumaserver in 3 s";
+}
+
 // Kills the server when patch `at` has been measured.
 struct KillAtPatch : ProgressListener {
     KillAtPatch(std::string name, int at, int count) : name(std::move(name)), at(at), count(count) {}
@@ -341,6 +354,37 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
         run("--timeout 1 Nobody IS_READY", status).find("Nobody is not registered and not running"),
         std::string::npos);
     EXPECT_EQ(status, 3);
+    // A stopped server: --timeout bounds the whole exchange, CONNECT included.
+    PostOffice::CreatePostOffice("Tester");
+    Connect();
+    pid_t server = nxtest::FindProcess(serverExecutable);
+    ASSERT_NE(server, 0);
+    ::kill(server, SIGSTOP);
+    auto start = std::chrono::steady_clock::now();
+    run("--timeout 2 LumaServer GET_DEVICE_NAME", status);
+    auto took = std::chrono::steady_clock::now() - start;
+    ::kill(server, SIGCONT);
+    EXPECT_EQ(status, 3);
+    EXPECT_GE(took, 1900ms);
+    EXPECT_LT(took, 3s);
+    // A listener prints what comes and answers with the default handler.
+    int output[2];
+    ASSERT_EQ(::pipe(output), 0);
+    pid_t listener = ::fork();
+    if (listener == 0) {
+        ::dup2(output[1], 1);
+        ::execl(NXBASE_BINARY_DIR "/tools/nxmsg", "nxmsg", "--listen", "Listener", nullptr);
+        ::_exit(127);
+    }
+    ::close(output[1]);
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("Listener"); }, 5s));
+    EXPECT_EQ(run("--timeout 5 Listener GET_DEVICE_TYPE", status), "status 2\nbytes  02\n");
+    ::kill(listener, SIGTERM);
+    ::waitpid(listener, nullptr, 0);
+    char printed[4096] = {};
+    EXPECT_GT(::read(output[0], printed, sizeof printed - 1), 0);
+    ::close(output[0]);
+    EXPECT_NE(std::string(printed).find("nxmsg -> GET_DEVICE_TYPE"), std::string::npos) << printed;
 }
 
 TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {

@@ -75,15 +75,17 @@ class Server {
     }
 
     // Started on demand (-S) but no peer for a while: the peer that started
-    // it is gone, so nobody will disconnect and end it.
-    long IdleTick(void*) {
+    // it is gone, so nobody will disconnect and end it. Looked at every 10 s,
+    // not every second, so that an idle server sleeps.
+    long IdleCheck(void* pTimer) {
         bool idle = PostOffice::Instance()->GetConnectionCount() <= 0 &&
                     Pipe::Instance()->ChannelCount() == 0;
-        amIdleSeconds = idle ? amIdleSeconds + 1 : 0;
-        if (amIdleSeconds >= kIdleSeconds) {
+        amIdleChecks = idle ? amIdleChecks + 1 : 0;
+        if (amIdleChecks * kIdleCheckSeconds >= kIdleSeconds) {
             LogFile::WriteToLog(String("No peer since the start - Closing application"), String());
             Application::Get().Quit();
         }
+        static_cast<Timer*>(pTimer)->Start();
         return 0;
     }
 
@@ -92,6 +94,9 @@ class Server {
         Notify();
         return 0;
     }
+
+    static constexpr int kIdleSeconds = 30;
+    static constexpr int kIdleCheckSeconds = 10;
 
   private:
     void Install(PostOffice* office, PO_Botschaften message, long (Server::*handler)(void*)) {
@@ -177,9 +182,8 @@ class Server {
         }
     }
 
-    static constexpr int kIdleSeconds = 30;
     nxcolor::SpectraTable amChart;
-    int amIdleSeconds = 0;
+    int amIdleChecks = 0;
     int amLast = -1;  // index of the last measured patch
     std::set<std::string> amSubscribers;
 };
@@ -282,10 +286,10 @@ int main(int argc, char** argv) {
         trigger.SetTimeoutHdl(LINK(Server, &server, TriggerTick));
         trigger.Start();
     }
-    AutoTimer idle;
+    Timer idle;
     if (startedOnDemand) {
-        idle.SetTimeout(1000);
-        idle.SetTimeoutHdl(LINK(Server, &server, IdleTick));
+        idle.SetTimeout(Server::kIdleCheckSeconds * 1000);
+        idle.SetTimeoutHdl(LINK(Server, &server, IdleCheck));
         idle.Start();
     }
     Application::Get().Execute();
