@@ -255,7 +255,8 @@ TEST_F(LumaServerTest, AnIdleServerSleeps) {
 
 // Kills the server when patch `at` has been measured.
 struct KillAtPatch : ProgressListener {
-    KillAtPatch(std::string name, int at, int count) : name(std::move(name)), at(at), count(count) {}
+    KillAtPatch(std::string name, int at, int count)
+        : name(std::move(name)), at(at), count(count) {}
     void DisplayProgress(double fraction) override {
         if (static_cast<int>(std::lround(fraction * count)) == at) Kill();
     }
@@ -304,7 +305,8 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     ids.clear();
     done.reset();
     nxbase::MeasurementSession whole(
-        *office, 3, [&](const nxbase::MeasuredSpectrum& patch, int, int) {
+        *office, 3,
+        [&](const nxbase::MeasuredSpectrum& patch, int, int) {
             ids.push_back(patch.id.substr(0, patch.id.find(' ')));
         },
         [&](bool ok, const std::string& why) { done = ok ? "ok" : why; });

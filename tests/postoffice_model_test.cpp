@@ -127,8 +127,8 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
                 ++givenUp;
             } else {
                 ++blockingUnanswered;
-                ADD_FAILURE() << "blocking request " << id << " unanswered: "
-                              << office->GetLastError();
+                ADD_FAILURE() << "blocking request " << id
+                              << " unanswered: " << office->GetLastError();
             }
         } else if (op < 90) {  // asynchronous, some with a short time-out
             auto timeout = chance(0.1) ? std::chrono::milliseconds(1 + below(8)) : 5000ms;

@@ -402,7 +402,8 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
 // A request's data: the peer answers it `lateMs` late, with the same bytes.
 MyMemoryBlock Late(int lateMs, const std::string& text) {
     MyMemoryBlock block;
-    unsigned char ms[4] = {static_cast<unsigned char>(lateMs), static_cast<unsigned char>(lateMs >> 8),
+    unsigned char ms[4] = {static_cast<unsigned char>(lateMs),
+                           static_cast<unsigned char>(lateMs >> 8),
                            static_cast<unsigned char>(lateMs >> 16), 0};
     block.Put("LATE", 4);
     block.Put(reinterpret_cast<const char*>(ms), 4);
@@ -429,7 +430,7 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
     office->SendAndReceiveAsync("EchoPeer", GET_DEVICE_NAME, Late(0, "name"), record("b"));
     ASSERT_TRUE(RunUntil([&] { return got.size() == 2; }));
     RunUntil([] { return false; }, 100ms);  // nobody called twice
-    std::sort(got.begin(), got.end());  // the order the peer answered in
+    std::sort(got.begin(), got.end());      // the order the peer answered in
     EXPECT_EQ(got, (std::vector<std::string>{"a=version", "b=name"}));
 
     // A blocking request, then an asynchronous one for the same message: the
@@ -455,7 +456,8 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
     ASSERT_TRUE(RunUntil([&] { return got.size() == 1; }));
     EXPECT_EQ(got[0], "d=failed");
     MyMemoryBlock next = Late(0, "on time");
-    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
+    ASSERT_TRUE(
+        office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
     EXPECT_EQ(TextOf(answer), "on time");
     auto stopAt = std::chrono::steady_clock::now() + 50ms;
     MyMemoryBlock slow = Late(300, "slow");
@@ -463,25 +465,30 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
                                         [&] { return std::chrono::steady_clock::now() < stopAt; }));
     EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 1u);
     next = Late(0, "after");
-    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
+    ASSERT_TRUE(
+        office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
     EXPECT_EQ(TextOf(answer), "after");
     EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 0u);
     const std::string log = Log();
-    EXPECT_NE(log.find("Late answer dropped: ANSWER!GET_SW_VERSION from EchoPeer"), std::string::npos);
+    EXPECT_NE(log.find("Late answer dropped: ANSWER!GET_SW_VERSION from EchoPeer"),
+              std::string::npos);
 
     // A lost channel empties the queue: the restarted peer's answers start afresh.
     got.clear();
-    office->SendAndReceiveAsync("EchoPeer", GET_DEVICE_TYPE, Late(2000, "never"), record("e"), 20ms);
+    office->SendAndReceiveAsync("EchoPeer", GET_DEVICE_TYPE, Late(2000, "never"), record("e"),
+                                20ms);
     ASSERT_TRUE(RunUntil([&] { return got.size() == 1; }));
     int lost = 0;
     office->AddPeerLostFunction([&](const std::string& peer) { lost += peer == "EchoPeer"; });
     MyMemoryBlock none;
-    EXPECT_FALSE(office->SendAndReceive("EchoPeer", CANCEL_REQUEST, none, answer, [] { return true; }));
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", CANCEL_REQUEST, none, answer, [] { return true; }));
     EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_DEVICE_TYPE), 0u);
     ASSERT_TRUE(RunUntil([&] { return lost == 1; }));
     RunUntil([&] { return !nxbase::IsApplicationRunning("EchoPeer"); }, 5s);
     next = Late(0, "fresh");
-    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_TYPE, next, answer, [] { return true; }));
+    ASSERT_TRUE(
+        office->SendAndReceive("EchoPeer", GET_DEVICE_TYPE, next, answer, [] { return true; }));
     EXPECT_EQ(TextOf(answer), "fresh");
 }
 

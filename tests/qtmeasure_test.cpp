@@ -62,6 +62,7 @@ class QtMeasureTest : public ::testing::Test {
 TEST_F(QtMeasureTest, MeasuresTheChartAsNxcolorDoesAndMarksTheThreeFarthestFromTheReference) {
     SetPatches(24);
     Click("measure");
+    ASSERT_TRUE(ProcessUntil([&] { return !window->IsMeasuring(); }));
     ASSERT_EQ(window->Lab().size(), 24u) << window->Status().toStdString();
     EXPECT_TRUE(window->Status().startsWith(QStringLiteral("Measured 24")))
         << window->Status().toStdString();
@@ -126,14 +127,18 @@ TEST_F(QtMeasureTest, SurvivesTheServerKilledMidMeasurementAndTheNextMeasurement
         if (killed != 0) ::kill(killed, SIGKILL);
     });
     Click("measure");
+    ASSERT_TRUE(ProcessUntil([&] { return !window->IsMeasuring(); }));
     ASSERT_NE(killed, 0);
     EXPECT_GT(window->Lab().size(), 0u);
     EXPECT_LT(window->Lab().size(), 240u);
     EXPECT_TRUE(window->Status().contains(QStringLiteral("Measure again to restart LumaServer")))
         << window->Status().toStdString();
 
+    EXPECT_TRUE(window->Status().contains(QStringLiteral("LumaServer was lost at patch")))
+        << window->Status().toStdString();
     SetPatches(3);
     Click("measure");
+    ASSERT_TRUE(ProcessUntil([&] { return !window->IsMeasuring(); }));
     EXPECT_EQ(window->Status().toStdString(), "Measured 3 patches.");
     EXPECT_EQ(window->Lab().size(), 3u);
     EXPECT_NE(nxtest::FindProcess(gui.serverExecutable), killed);

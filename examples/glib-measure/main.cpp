@@ -1,8 +1,8 @@
 // glib-measure: the library's loop inside a GLib main loop, with the
-// asynchronous SendAndReceive. Connects to LumaServer (started on demand),
-// subscribes to its notices, measures N patches one answer after the other
-// without ever blocking the loop, prints each patch's CIELAB and each notice
-// as it comes, and leaves.
+// asynchronous SendAndReceive and MeasurementSession. Connects to LumaServer
+// (started on demand), subscribes to its notices, measures N patches one
+// answer after the other without ever blocking the loop, prints each patch's
+// CIELAB and each notice as it comes, and leaves.
 //
 //   glib-measure [N]     N patches (default 4)
 // The server must be registered (lumaserver --register does it).
@@ -20,17 +20,21 @@
 
 namespace {
 
+// Subscribes to the server's notices (its own CONNECT keeps the server
+// between measurements), measures with a MeasurementSession, and leaves.
 class Session {
   public:
     Session(PostOffice& office, int count, GMainLoop* loop)
-        : office_(office), count_(count), loop_(loop) {}
+        : office_(office),
+          loop_(loop),
+          measurement_(
+              office, count, [](const nxbase::MeasuredSpectrum& patch, int, int) { Print(patch); },
+              [this](bool ok, const std::string& error) { Done(ok, error); }) {}
 
     void Start() {
         MyMemoryBlock level;
         level << static_cast<unsigned char>(2);
-        Ask(CONNECT, level, [this](MyMemoryBlock&) {
-            Ask(NOTIFY_MESSUNG, {}, [this](MyMemoryBlock&) { Next(); });
-        });
+        Ask(CONNECT, level, [this] { Ask(NOTIFY_MESSUNG, {}, [this] { measurement_.Start(); }); });
     }
 
     long OnNotice(void* event) {
@@ -42,73 +46,51 @@ class Session {
         return 0;
     }
 
-    bool Succeeded() const { return failed_.empty() && done_ == count_; }
+    bool Succeeded() const { return succeeded_; }
     const std::string& Failure() const { return failed_; }
     int Notices() const { return notices_; }
 
   private:
-    // Sends and continues with `then` once the answer (status 0) is there;
-    // the loop runs on meanwhile.
-    void Ask(int message, const MyMemoryBlock& data, std::function<void(MyMemoryBlock&)> then) {
+    // Sends and continues with `then` once the answer is there; the loop
+    // runs on meanwhile.
+    void Ask(int message, const MyMemoryBlock& data, std::function<void()> then) {
         office_.SendAndReceiveAsync(
             "LumaServer", message, data, [this, message, then](AnswerResult& result) {
                 // CONNECT is answered with the protocol level, everything else with a status first.
                 signed char status = -1;
-                if (result.answered) result.data >> status;
-                if (message == CONNECT && status > 0) status = 0;
-                if (!result.answered || status != 0) {
-                    Fail(std::string(nxbase::MessageName(message)) + ": " +
-                         (result.answered ? "status " + std::to_string(status) : result.error));
+                if (result.answered && message != CONNECT) result.data >> status;
+                if (!result.answered || (message != CONNECT && status != 0)) {
+                    Done(false,
+                         std::string(nxbase::MessageName(message)) + ": " +
+                             (result.answered ? "status " + std::to_string(status) : result.error));
                     return;
                 }
-                then(result.data);
+                then();
             });
     }
 
-    void Next() {
-        if (done_ == count_) return Leave();
-        Ask(EXEC_MEASUREMENT, {}, [this](MyMemoryBlock&) {
-            Ask(SPECTRUM_REQUEST, {}, [this](MyMemoryBlock& answer) {
-                Print(answer);
-                ++done_;
-                Next();
-            });
-        });
-    }
-
-    void Print(MyMemoryBlock& answer) {
-        String id;
-        int values = 0;
-        answer >> id >> values;
-        std::array<float, nxbase::kSpectrumSize> spectrum{};
-        for (float& value : spectrum) {
-            int scaled = 0;
-            answer >> scaled;
-            value = static_cast<float>(scaled / nxbase::kLumaSpectrumScale);
-        }
+    static void Print(const nxbase::MeasuredSpectrum& patch) {
         float lab[3];
-        nxbase::ColorBatch().ToLab(spectrum.data(), 1, lab);
-        std::printf("%-12s L* %6.2f  a* %7.2f  b* %7.2f\n", id.str().c_str(), lab[0], lab[1],
+        nxbase::ColorBatch().ToLab(patch.values.data(), 1, lab);
+        std::printf("%-12s L* %6.2f  a* %7.2f  b* %7.2f\n", patch.id.c_str(), lab[0], lab[1],
                     lab[2]);
     }
 
-    void Fail(const std::string& why) {
-        failed_ = why;
-        Leave();
-    }
-
-    void Leave() {
+    void Done(bool ok, const std::string& error) {
+        succeeded_ = ok;
+        failed_ = error;
         MyMemoryBlock none;
-        office_.Send("LumaServer", NOTIFY_MESSUNG_AUS, none);
-        office_.Send("LumaServer", DISCONNECT, none);
+        // The server is not started again only to be told goodbye.
+        office_.Send("LumaServer", NOTIFY_MESSUNG_AUS, none, {}, PeerStart::kNever);
+        office_.Send("LumaServer", DISCONNECT, none, {}, PeerStart::kNever);
         g_main_loop_quit(loop_);
     }
 
     PostOffice& office_;
-    const int count_;
     GMainLoop* loop_;
-    int done_ = 0;
+    nxbase::MeasurementSession measurement_;
     int notices_ = 0;
+    bool succeeded_ = false;
     std::string failed_;
 };
 

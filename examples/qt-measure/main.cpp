@@ -35,12 +35,13 @@ int main(int argc, char** argv) {
         QString screenshot =
             shot > 0 && shot + 1 < arguments.size() ? arguments[shot + 1] : QString();
         if (arguments.contains(QStringLiteral("--measure"))) {
-            QTimer::singleShot(0, &window, [&window, screenshot] {
-                window.Measure();
-                if (screenshot.isEmpty()) return;
-                bool saved = window.grab().save(screenshot);
-                QApplication::exit(saved ? 0 : 1);
-            });
+            if (!screenshot.isEmpty()) {
+                window.SetMeasuredHandler([&window, screenshot] {
+                    bool saved = window.grab().save(screenshot);
+                    QApplication::exit(saved ? 0 : 1);
+                });
+            }
+            QTimer::singleShot(0, &window, [&window] { window.Measure(); });
         }
         window.show();
         result = QApplication::exec();

@@ -85,7 +85,10 @@ MeasureWindow::MeasureWindow(PostOffice& office) : office_(office) {
     resize(520, 640);
 
     connect(measure_, &QPushButton::clicked, this, &MeasureWindow::Measure);
-    connect(abort_, &QPushButton::clicked, this, [this] { aborted_ = true; });
+    connect(abort_, &QPushButton::clicked, this, [this] {
+        aborted_ = true;
+        if (session_) session_->Abort();
+    });
     connect(reference_, &QPushButton::clicked, this, [this] {
         QString path = QFileDialog::getOpenFileName(
             this, QStringLiteral("Reference spectra"), QString(),
@@ -94,16 +97,22 @@ MeasureWindow::MeasureWindow(PostOffice& office) : office_(office) {
     });
     Link notice = LINK(MeasureWindow, this, OnNotice);
     office_.ChangeMessageHdl(MESSUNG_AUSGELOEST, notice);
+    // A lost server takes the window's subscription with it.
+    lost_watch_ = office_.AddPeerLostFunction([this](const std::string& peer) {
+        if (peer == "LumaServer") subscribed_ = false;
+    });
     SetStatus(QStringLiteral("Press Measure: LumaServer is started when it does not run."));
 }
 
 MeasureWindow::~MeasureWindow() {
+    session_.reset();
+    office_.RemovePeerLostFunction(lost_watch_);
     Link none;
     office_.ChangeMessageHdl(MESSUNG_AUSGELOEST, none);
     if (!subscribed_) return;
     MyMemoryBlock empty;
-    office_.Send("LumaServer", NOTIFY_MESSUNG_AUS, empty);
-    office_.Send("LumaServer", DISCONNECT, empty);
+    office_.Send("LumaServer", NOTIFY_MESSUNG_AUS, empty, {}, PeerStart::kNever);
+    office_.Send("LumaServer", DISCONNECT, empty, {}, PeerStart::kNever);
 }
 
 // The window's own connection, which keeps the server and its notices
@@ -120,35 +129,47 @@ bool MeasureWindow::Subscribe() {
 }
 
 void MeasureWindow::Measure() {
+    if (IsMeasuring()) return;
     measure_->setEnabled(false);
     abort_->setEnabled(true);
     aborted_ = false;
     measured_.clear();
-    progress_->reset();
-    SetStatus(QStringLiteral("Measuring…"));
-    // While this waits for each answer, Qt's loop runs: the bar moves, Abort works.
-    nxbase::qt::QtProgressListener progress(progress_);
-    std::string error = "LumaServer cannot be reached";
-    bool ok =
-        Subscribe() && nxbase::MeasureWithLumaServer(office_, patches_->value(), &measured_, &error,
-                                                     &progress, [this] { return !aborted_; });
     ShowMeasured();
+    const int count = patches_->value();
+    progress_->setRange(0, count);
+    progress_->setValue(0);
+    SetStatus(QStringLiteral("Measuring…"));
+    if (!Subscribe()) {
+        Finished(false, "LumaServer cannot be reached: " + office_.GetLastError());
+        return;
+    }
+    // Each patch comes on Qt's loop: the bar moves, Abort works, nothing waits.
+    session_ = std::make_unique<nxbase::MeasurementSession>(
+        office_, count,
+        [this](const nxbase::MeasuredSpectrum& patch, int number, int) {
+            measured_.push_back(patch);
+            progress_->setValue(number);
+            ShowMeasured();
+        },
+        [this](bool ok, const std::string& error) { Finished(ok, error); });
+    session_->Start();
+}
+
+void MeasureWindow::Finished(bool ok, const std::string& error) {
     if (ok) {
         SetStatus(QStringLiteral("Measured %1 patches.").arg(measured_.size()));
     } else if (aborted_) {
         SetStatus(QStringLiteral("Aborted after %1 patches.").arg(measured_.size()));
     } else {
-        // The server died or stopped answering: it is started again by the next measurement.
-        subscribed_ = false;
-        SetStatus(
-            QStringLiteral(
-                "Measuring failed after %1 patches: %2 (%3). Measure again to restart LumaServer.")
-                .arg(measured_.size())
-                .arg(QString::fromStdString(error),
-                     QString::fromStdString(office_.GetLastError())));
+        // The server died or stopped answering: the next measurement starts it again.
+        SetStatus(QStringLiteral("Measuring failed after %1 patches: %2. Measure again to "
+                                 "restart LumaServer.")
+                      .arg(measured_.size())
+                      .arg(QString::fromStdString(error)));
     }
     abort_->setEnabled(false);
     measure_->setEnabled(true);
+    if (measured_handler_) measured_handler_();
 }
 
 void MeasureWindow::ShowMeasured() {

@@ -1,7 +1,7 @@
-// The window of qt-measure: measures N patches through LumaServer with a
-// progress bar and an abort button, shows each patch as a swatch with its
-// CIELAB values, compares with a reference file (CIEDE2000 per patch, the
-// worst three marked) and lists the server's notices as they come.
+// The window of qt-measure: measures N patches through LumaServer on the
+// event loop (a MeasurementSession) with a progress bar and an abort button, shows each patch as a
+// swatch with its CIELAB values, compares with a reference file (CIEDE2000 per patch, the worst
+// three marked) and lists the server's notices as they come.
 #ifndef QT_MEASURE_MEASUREWINDOW_H_
 #define QT_MEASURE_MEASUREWINDOW_H_
 
@@ -17,6 +17,8 @@
 #include <QTableWidget>
 #include <QWidget>
 #include <array>
+#include <functional>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -27,8 +29,13 @@ class MeasureWindow : public QWidget {
     explicit MeasureWindow(PostOffice& office);
     ~MeasureWindow() override;
 
-    // Measures the number of patches in the spin box; the table then shows them.
+    // Measures the number of patches in the spin box on the event loop; the
+    // table shows each patch as it comes. `measured` is called at the end.
     void Measure();
+    bool IsMeasuring() const { return session_ && session_->IsRunning(); }
+    void SetMeasuredHandler(std::function<void()> measured) {
+        measured_handler_ = std::move(measured);
+    }
     // Reads a reference file (CSV or CGATS) and compares the table with it.
     bool LoadReference(const std::string& path);
     // The CIELAB values shown, one row per patch, and the status line.
@@ -41,6 +48,7 @@ class MeasureWindow : public QWidget {
 
   private:
     bool Subscribe();
+    void Finished(bool ok, const std::string& error);
     void ShowMeasured();
     void Compare();
     void SetStatus(const QString& text);
@@ -57,6 +65,9 @@ class MeasureWindow : public QWidget {
     std::vector<nxbase::MeasuredSpectrum> measured_;
     std::vector<std::array<float, 3>> lab_;
     nxbase::SpectraTable referenceTable_;
+    std::unique_ptr<nxbase::MeasurementSession> session_;
+    std::function<void()> measured_handler_;
+    int lost_watch_ = 0;
     bool aborted_ = false;
     bool subscribed_ = false;
 };

@@ -39,8 +39,8 @@ bool TakePatch(MyMemoryBlock& axTrigger, MyMemoryBlock& axSpectrum, int& alLastI
     MeasurementTrigger trigger;
     if (!DecodeMeasurementAnswer(axTrigger, &trigger, pError)) return false;
     if (!FollowsInTurn(alLastIndex, trigger.index)) {
-        *pError = "LumaServer measured patch index " + std::to_string(trigger.index) +
-                  " where " + std::to_string(alLastIndex + 1) + " was next";
+        *pError = "LumaServer measured patch index " + std::to_string(trigger.index) + " where " +
+                  std::to_string(alLastIndex + 1) + " was next";
         return false;
     }
     alLastIndex = trigger.index;
@@ -284,8 +284,9 @@ struct MeasurementSession::State : std::enable_shared_from_this<State> {
         office->RemovePeerLostFunction(lostId);
         connected = false;
         if (lost) return;
-        office->SendAndReceiveAsync(kServer, UNLOCK, MyMemoryBlock(0), [](AnswerResult&) {},
-                                    timeout, {}, PeerStart::kNever);
+        office->SendAndReceiveAsync(
+            kServer, UNLOCK, MyMemoryBlock(0), [](AnswerResult&) {}, timeout, {},
+            PeerStart::kNever);
         MyMemoryBlock none;
         office->Send(kServer, DISCONNECT, none, {}, PeerStart::kNever);
     }

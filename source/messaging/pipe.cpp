@@ -733,8 +733,8 @@ bool Pipe::StartForScope(const std::string& asApp, const PostOfficeApplication& 
 }
 
 // Waits for the process this scope started (if any) to become reachable.
-toolkit::StartWait Pipe::WaitForStart(const std::string& asApp,
-                                      const std::function<bool()>& fReady, std::string& asWhy) {
+toolkit::StartWait Pipe::WaitForStart(const std::string& asApp, const std::function<bool()>& fReady,
+                                      std::string& asWhy) {
     auto keepWaiting = [this] { return KeepWaiting(); };
     const int pid = pmScope->amStartedPid;
     if (pid > 0) amStarting.emplace(asApp, pid);

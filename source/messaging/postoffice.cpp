@@ -263,8 +263,8 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     if (request->finished) {
         LogFile::WriteToLog(String("Late answer dropped: ") + String(axEvent.GetCommand()) +
                                 " from " + String(axEvent.GetSender()) +
-                                " answers a request that was given up (" +
-                                String(request->error) + ")",
+                                " answers a request that was given up (" + String(request->error) +
+                                ")",
                             String(kLogKey));
         return;
     }
@@ -368,6 +368,19 @@ void PostOffice::HandleDisconnectInServer(VELTRAEvent& axEvent) {
 // A peer that dies without DISCONNECT (killed, crashed) would hold its
 // connection and its lock for ever: its lost channel counts as both.
 void PostOffice::PeerLost(const std::string& asApp) {
+    // Told from the loop, not from inside the transport's closing, and before
+    // the call-backs of the requests the loss fails.
+    std::weak_ptr<bool> alive = amAlive;
+    Application::Get().Post([this, alive, asApp] {
+        for (auto at = amPeerLostFunctions.begin();
+             alive.lock() && at != amPeerLostFunctions.end();) {
+            int id = at->first;
+            PeerLostFunction function = at->second;
+            function(asApp);
+            if (!alive.lock()) return;
+            at = amPeerLostFunctions.upper_bound(id);
+        }
+    });
     // Nothing sent on the lost channel will be answered: its requests fail,
     // and the order of answers starts afresh on the next channel.
     std::vector<RequestPtr> lost;
@@ -378,17 +391,6 @@ void PostOffice::PeerLost(const std::string& asApp) {
     }
     for (const auto& request : lost)
         Finish(request, false, MyMemoryBlock(), "the channel to " + asApp + " was lost");
-    // Told from the loop, not from inside the transport's closing.
-    std::weak_ptr<bool> alive = amAlive;
-    Application::Get().Post([this, alive, asApp] {
-        for (auto at = amPeerLostFunctions.begin(); alive.lock() && at != amPeerLostFunctions.end();) {
-            int id = at->first;
-            PeerLostFunction function = at->second;
-            function(asApp);
-            if (!alive.lock()) return;
-            at = amPeerLostFunctions.upper_bound(id);
-        }
-    });
     if (amLockOwner == String(asApp)) {
         NX_COMM_LOG(String("Lock owner lost: ") + String(asApp));
         amLockCount = 0;
@@ -510,8 +512,8 @@ long PostOffice::DefaultHdl(void* pEvent) {
     // A peer that has gone (its DISCONNECT, then its channel's end) needs no
     // answer, and the user no box.
     Pipe* pipe = Pipe::Instance();
-    if (number == DISCONNECT ||
-        (event->GetChannel() != 0 && pipe != nullptr && !pipe->IsChannelOpen(event->GetChannel()))) {
+    if (number == DISCONNECT || (event->GetChannel() != 0 && pipe != nullptr &&
+                                 !pipe->IsChannelOpen(event->GetChannel()))) {
         NX_COMM_LOG(String("Default Hdl - no answer to ") + String(event->GetSender()) +
                     ": it has gone");
         return 0;

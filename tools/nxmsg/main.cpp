@@ -191,7 +191,9 @@ int SendOne(const std::string& self, const std::string& app, const std::string& 
     for (const std::string& value : values) AppendValue(data, value);
     // One limit for the whole exchange, starting the peer and CONNECT included.
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
-    boost::function<bool()> inTime = [deadline] { return std::chrono::steady_clock::now() < deadline; };
+    boost::function<bool()> inTime = [deadline] {
+        return std::chrono::steady_clock::now() < deadline;
+    };
     PostOffice* office = PostOffice::CreatePostOffice(String(self));
     if (!office->HasApplication(app) && !nxbase::IsApplicationRunning(app)) {
         std::cerr << "nxmsg: " << app
