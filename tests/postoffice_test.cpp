@@ -532,6 +532,53 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
 }
 
+TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
+    PostOffice* office = PostOffice::CreatePostOffice("Host");
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+    const std::string socket = Pipe::Instance()->GetSocketPath();
+    // A child that ends its copy, one that sends through it, one that makes
+    // its own post office: the parent stays reachable and keeps its channels.
+    for (int kind = 0; kind < 3; ++kind) {
+        pid_t child = ::fork();
+        if (child == 0) {
+            int code = 0;
+            if (kind == 0) NxSingleton::DeleteAllSingleton();
+            if (kind == 1) {
+                MyMemoryBlock none;
+                code = PostOffice::Instance()->Send("EchoPeer", GET_DEVICE_NAME, none) ? 1 : 0;
+                if (PostOffice::Instance()->GetLastError().find("forked") == std::string::npos)
+                    code = 2;
+                NxSingleton::DeleteAllSingleton();
+            }
+            if (kind == 2) {
+                PostOffice* own = PostOffice::CreatePostOffice("Child");
+                MyMemoryBlock none, reply;
+                auto until = std::chrono::steady_clock::now() + 3s;
+                code = own->SendAndReceive("EchoPeer", GET_DEVICE_NAME, none, reply,
+                                           [&] { return std::chrono::steady_clock::now() < until; })
+                           ? 0
+                           : 3;
+                NxSingleton::DeleteAllSingleton();
+            }
+            ::_exit(code);
+        }
+        int status = -1;
+        ASSERT_TRUE(RunUntil([&] { return ::waitpid(child, &status, WNOHANG) == child; }));
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "child " << kind;
+        EXPECT_TRUE(std::filesystem::exists(socket)) << "child " << kind;
+        EXPECT_TRUE(nxbase::IsApplicationRunning("Host")) << "child " << kind;
+        RawPeer visitor("Visitor", socket);
+        visitor.Send("GET_DEVICE_TYPE", "");
+        EXPECT_EQ(visitor.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02")) << "child " << kind;
+        auto until = std::chrono::steady_clock::now() + 3s;
+        EXPECT_TRUE(
+            office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer,
+                                   [&] { return std::chrono::steady_clock::now() < until; }))
+            << "child " << kind << ": " << office->GetLastError();
+    }
+}
+
 TEST_F(PostOfficeTest, AnAnswerTooManyGoesToTheNextRequestOrNobody) {
     // Frames carry no request id: a peer that answers twice has its second
     // answer taken for the next request; with none outstanding it is dropped.

@@ -56,7 +56,9 @@ class NXBASE_EXPORT DDE {
     // The process's one DDE object (a second is an assertion, "pThis == 0").
     // Without a session bus the object exists but is off (logged); a bus that
     // is there but refuses the connection shows the error box "DDE-Server
-    // kann nicht initialisiert werden." and quits the application.
+    // kann nicht initialisiert werden." and quits the application. A bus
+    // that goes away later (a logout, a restart of the bus) turns it off,
+    // logged; the sockets go on serving.
     explicit DDE(const std::string& asOwnAppName);
     ~DDE();
     DDE(const DDE&) = delete;
@@ -64,6 +66,9 @@ class NXBASE_EXPORT DDE {
 
     static DDE* Instance();
     bool IsActive() const;
+    // Turns the transport off, logged with `asWhy`; the names stay with the
+    // bus (a forked child must not release its parent's).
+    void TurnOff(const std::string& asWhy);
 
     void SetReceiveFunction(ReceiveFunction fFunction) { fmReceiveFunction = fFunction; }
     void SetExecuteFunction(std::function<void(const std::string&)> fFunction) {

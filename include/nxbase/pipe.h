@@ -192,12 +192,15 @@ class NXBASE_EXPORT Pipe {
                    std::string_view asEncodedData);
     bool OnDdeBus(const std::string& asApp);
     std::string OwnRequestText() const;
+    void LetGoAfterFork();
+    std::string ForkedCopyError() const;
 
     std::string amOwnName;
     std::string amProcessId;
     std::string amSocketPath;
     std::string amRefusal;
     std::string amLastError;
+    std::string amForkedFrom;  // the parent's process id, in a forked child
     std::string amFrame;  // the last frame written, its storage reused
     bool amFrameInUse = false;
     std::thread::id amThread;

@@ -1,5 +1,6 @@
 #include "toolkit/application.h"
 
+#include <pthread.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
@@ -66,12 +67,42 @@ class ScopedValue {
     T amOld;
 };
 
+std::atomic<bool> gForkedChild{false};
+
+void MarkForkedChild() {
+    gForkedChild.store(true);  // all a fork handler may safely do
+}
+
 }  // namespace
 
 Application& Application::Get() {
     // Never destroyed: handlers of objects that outlive main may still refer to it.
-    static Application* application = new Application();
+    static Application* application = [] {
+        ::pthread_atfork(nullptr, nullptr, &MarkForkedChild);
+        return new Application();
+    }();
+    if (gForkedChild.load(std::memory_order_relaxed)) [[unlikely]]
+        application->AfterFork();
     return *application;
+}
+
+void Application::AfterFork() {
+    if (!gForkedChild.exchange(false)) return;
+    context_.notify_fork(boost::asio::execution_context::fork_child);
+    // The foreign loop's descriptors are the parent's too: the child's own
+    // are made on demand. The old ones stay open (closing the wake-up eventfd
+    // changes nothing for the parent, but a reused number would confuse).
+    loopDescriptor_ = -1;
+    wakeDescriptor_ = -1;
+    wakePending_ = false;
+    foreignWork_.reset();
+    nestedWait_ = nullptr;
+    uiThread_.store(std::this_thread::get_id());
+    for (const auto& function : forkChildFunctions_) function();
+}
+
+void Application::AddForkChildFunction(std::function<void()> fFunction) {
+    forkChildFunctions_.push_back(std::move(fFunction));
 }
 
 void Application::Execute() {
@@ -183,16 +214,19 @@ void Application::SetUserEventHandler(std::function<void(unsigned long, void*)> 
 Timer::Timer() : timer_(Application::Get().GetContext()) {}
 
 Timer::~Timer() {
+    Application::Get();  // a forked child's timers are its own first
     ++*generation_;
     timer_.cancel();
 }
 
 void Timer::Start() {
+    Application::Get();
     active_ = true;
     Arm();
 }
 
 void Timer::Stop() {
+    Application::Get();
     active_ = false;
     ++*generation_;
     timer_.cancel();

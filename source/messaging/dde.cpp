@@ -211,9 +211,21 @@ void DDE::Arm() {
 
 void DDE::Process() {
     if (!pmBus) return;
-    while (pmBus->connection->processPendingRequest()) {
+    try {
+        while (pmBus->connection->processPendingRequest()) {
+        }
+    } catch (const sdbus::Error& error) {
+        return TurnOff("the session bus was lost (" + error.getName() + ": " +
+                       error.getMessage() + ")");
     }
     Arm();
+}
+
+void DDE::TurnOff(const std::string& asWhy) {
+    if (!pmBus) return;
+    LogFile::WriteToLog(String("DDE is off: " + asWhy), String());
+    if (pmBus->timer) pmBus->timer->cancel();
+    pmBus.reset();
 }
 
 void DDE::OnPoke(const std::string& asItem, const std::string& asData) {

@@ -136,6 +136,13 @@ struct Pipe::Listener {
 // ---- creation ----
 
 Pipe* Pipe::CreatePipe(const std::string& asOwnAppName) {
+    static bool forkHandled = [] {
+        Application::Get().AddForkChildFunction([] {
+            if (nxbase::gPipe) nxbase::gPipe->LetGoAfterFork();
+        });
+        return true;
+    }();
+    (void)forkHandled;
     DeletePipe();
     auto* pipe = new Pipe(asOwnAppName);
     try {
@@ -177,7 +184,34 @@ Pipe::Pipe(const std::string& asOwnAppName)
       amProcessId(std::to_string(::getpid())),
       amThread(std::this_thread::get_id()) {}
 
+// In a forked child: the listener, the name's lock, the channels and the bus
+// connection are the parent's. The child's copies of the descriptors are
+// closed (the parent keeps its own), nothing is unlinked, nothing is sent,
+// and every later send fails with the reason.
+void Pipe::LetGoAfterFork() {
+    amForkedFrom = amProcessId;
+    if (pmDDE) pmDDE->TurnOff("a forked child does not use its parent's bus connection");
+    for (const auto& [id, channel] : amAllChannels) {
+        channel->closed = true;
+        boost::system::error_code ignored;
+        channel->timer.cancel();
+        channel->socket.close(ignored);
+    }
+    amAllChannels.clear();
+    amChannels.clear();
+    amStarting.clear();
+    if (pmListener) {
+        boost::system::error_code ignored;
+        pmListener->pause.cancel();
+        pmListener->acceptor.close(ignored);
+        pmListener.reset();
+    }
+    if (amLockFd >= 0) ::close(amLockFd);  // the parent's descriptor keeps the lock
+    amLockFd = -1;
+}
+
 Pipe::~Pipe() {
+    Application::Get();  // a forked child lets go of the parent's sockets first
     pmDDE.reset();
     for (const auto& [id, channel] : std::map<std::uint64_t, ChannelPtr>(amAllChannels)) {
         channel->closed = true;
@@ -195,6 +229,11 @@ Pipe::~Pipe() {
     }
     // The name is free again, and its lock file gone with it.
     toolkit::Sockets().UnlockName(amLockFd, amSocketPath + ".lock");
+}
+
+std::string Pipe::ForkedCopyError() const {
+    return "this process was forked from process " + amForkedFrom +
+           ", whose post office this is: delete it and create one of the child's own";
 }
 
 std::string Pipe::OwnRequestText() const {
@@ -768,6 +807,8 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
 
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 std::string_view asEncodedData) {
+    Application::Get();
+    if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
     NX_ASSERT(IsOwnThread());
     if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
     if (nxbase::detail::CommunicationLogged())
@@ -791,6 +832,8 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
 
 bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
                          std::string_view asEncodedData) {
+    Application::Get();
+    if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
     NX_ASSERT(IsOwnThread());
     auto at = amAllChannels.find(alChannel);
     if (at == amAllChannels.end() || at->second->closed || at->second->stage != Stage::kOpen) {

@@ -141,6 +141,7 @@ struct PostOffice::Request {
 };
 
 PostOffice::~PostOffice() {
+    Application::Get();  // a forked child lets go of the parent's loop first
     *amAlive = false;
     // Waits still on the stack end when they see their request finished;
     // asynchronous call-backs are dropped.

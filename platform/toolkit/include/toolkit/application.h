@@ -24,6 +24,7 @@
 #include <memory>
 #include <optional>
 #include <thread>
+#include <vector>
 
 #include "nxbase/export.h"
 
@@ -129,8 +130,17 @@ class NXBASE_EXPORT Application {
     void PostUserEvent(unsigned long alId, void* pData);
     void SetUserEventHandler(std::function<void(unsigned long, void*)> handler);
 
+    // After fork() the child shares the parent's epoll set, timer and
+    // wake-up descriptors. At its first use of the application object the
+    // child takes descriptors of its own and runs these functions (the
+    // transports let go of the parent's sockets there), so that nothing the
+    // child does reaches the parent's loop. Children that exec or _exit are
+    // untouched.
+    void AddForkChildFunction(std::function<void()> fFunction);
+
   private:
     Application() = default;
+    void AfterFork();
     void MarkUserInterfaceThread() { uiThread_.store(std::this_thread::get_id()); }
     void Wake();
 
@@ -147,6 +157,7 @@ class NXBASE_EXPORT Application {
     std::atomic<int> wakeDescriptor_{-1};   // an eventfd written by posts from other threads
     std::atomic<bool> wakePending_{false};  // set after each write to it
     std::function<void(unsigned long, void*)> userEventHandler_;
+    std::vector<std::function<void()>> forkChildFunctions_;
     std::atomic<bool> quitting_{false};
     std::atomic<unsigned long> quitCount_{0};
     bool waiting_ = false;
