@@ -13,6 +13,7 @@
 #include <thread>
 
 #include "messaging_test_util.h"
+#include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
@@ -148,6 +149,30 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
     MyMemoryBlock none;
     EXPECT_FALSE(office->Send("LumaServer", IS_APP_READY, none));
     EXPECT_TRUE(RunUntil([] { return true; }));
+}
+
+TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffAndTheSocketsServeOn) {
+    ASSERT_EQ(std::system((server + " &").c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                       [] { return true; }));
+    ASSERT_TRUE(DDE::Instance()->IsActive());
+    // A logout, a restarted bus: neither this process nor the server ends.
+    ::kill(daemon, SIGKILL);
+    ::waitpid(daemon, nullptr, 0);
+    daemon = -1;
+    EXPECT_TRUE(RunUntil([] { return !DDE::Instance()->IsActive(); }, 5s));
+    RunUntil([] { return false; }, 300ms);
+    EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
+    auto until = std::chrono::steady_clock::now() + 5s;
+    EXPECT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [&] {
+        return std::chrono::steady_clock::now() < until;
+    })) << office->GetLastError();
+    EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
+                  .find("DDE is off: the session bus was lost"),
+              std::string::npos);
 }
 
 }  // namespace
