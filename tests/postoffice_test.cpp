@@ -579,6 +579,56 @@ TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
     }
 }
 
+// Destroys every singleton when it fires, as a window closed by its user.
+struct Closer {
+    long Close(void*) {
+        NxSingleton::DeleteAllSingleton();
+        return 0;
+    }
+};
+
+TEST_F(PostOfficeTest, DestroyingThePostOfficeEndsTheWaitsOnIt) {
+    std::string slow = root + "/bin/slowstart";
+    std::ofstream(slow) << "#!/bin/sh\nsleep 1\n";
+    std::filesystem::permissions(slow, std::filesystem::perms::owner_all);
+    sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "SlowPeer", slow);
+    Closer closer;
+    Timer close;
+    close.SetTimeoutHdl(LINK(Closer, &closer, Close));
+    close.SetTimeout(300);
+    // A blocking wait for an answer that never comes.
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+    close.Start();
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer, [] { return true; }));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 2s);
+    EXPECT_FALSE(PostOffice::IsInitialized());
+    // An asynchronous send waiting for its peer to start, and a blocking one.
+    for (bool async : {true, false}) {
+        office = PostOffice::CreatePostOffice("Tester");
+        bool called = false;
+        close.Start();
+        start = std::chrono::steady_clock::now();
+        if (async) {
+            office->SendAndReceiveAsync("SlowPeer", GET_DEVICE_NAME, request,
+                                        [&](AnswerResult&) { called = true; });
+            RunUntil([] { return !PostOffice::IsInitialized(); }, 3s);
+        } else {
+            EXPECT_FALSE(office->SendAndReceive("SlowPeer", GET_DEVICE_NAME, request, answer,
+                                                [] { return true; }));
+        }
+        EXPECT_LT(std::chrono::steady_clock::now() - start, 900ms) << async;
+        EXPECT_FALSE(PostOffice::IsInitialized());
+        EXPECT_EQ(Pipe::Instance(), nullptr);
+        RunUntil([] { return false; }, 100ms);
+        EXPECT_FALSE(called);  // dropped uncalled, as the header says
+    }
+    EXPECT_FALSE(std::filesystem::exists(sandbox.runtime() + "/PipeRequest-Tester"));
+}
+
 TEST_F(PostOfficeTest, AnAnswerTooManyGoesToTheNextRequestOrNobody) {
     // Frames carry no request id: a peer that answers twice has its second
     // answer taken for the next request; with none outstanding it is dropped.

@@ -69,6 +69,9 @@ class NXBASE_EXPORT DDE {
     // Turns the transport off, logged with `asWhy`; the names stay with the
     // bus (a forked child must not release its parent's).
     void TurnOff(const std::string& asWhy);
+    // TurnOff, and no longer the process's DDE object: a new one may be made
+    // while this one waits to be deleted.
+    void Retire(const std::string& asWhy);
 
     void SetReceiveFunction(ReceiveFunction fFunction) { fmReceiveFunction = fFunction; }
     void SetExecuteFunction(std::function<void(const std::string&)> fFunction) {

@@ -73,7 +73,9 @@ class NXBASE_EXPORT Pipe {
     // not throw: GetRefusal() says why, and every Send fails with it.
     static Pipe* CreatePipe(const std::string& asOwnAppName);
     static Pipe* Instance();
-    // Closes every channel and the listener.
+    // Closes every channel and the listener. Called while a send of this
+    // transport waits (from a handler its wait ran), the name and the
+    // channels go at once and the object when that send returns.
     static void DeletePipe();
 
     // The receive function of both transports, the sockets' and DDE's.
@@ -193,6 +195,7 @@ class NXBASE_EXPORT Pipe {
     bool OnDdeBus(const std::string& asApp);
     std::string OwnRequestText() const;
     void LetGoAfterFork();
+    void CloseAll(bool abOwner);
     std::string ForkedCopyError() const;
 
     std::string amOwnName;
@@ -201,6 +204,7 @@ class NXBASE_EXPORT Pipe {
     std::string amRefusal;
     std::string amLastError;
     std::string amForkedFrom;  // the parent's process id, in a forked child
+    bool amDoomed = false;     // deleted while a send waited: goes when it returns
     std::string amFrame;  // the last frame written, its storage reused
     bool amFrameInUse = false;
     std::thread::id amThread;

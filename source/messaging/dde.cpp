@@ -221,6 +221,11 @@ void DDE::Process() {
     Arm();
 }
 
+void DDE::Retire(const std::string& asWhy) {
+    TurnOff(asWhy);
+    if (pThis == this) pThis = nullptr;
+}
+
 void DDE::TurnOff(const std::string& asWhy) {
     if (!pmBus) return;
     LogFile::WriteToLog(String("DDE is off: " + asWhy), String());
@@ -255,6 +260,7 @@ void DDE::UserEvent(unsigned long, void*) {
 // method call to the peer could cross one of the peer's own calls to us, and
 // two processes each waiting for the other would stall until the time-out.
 bool DDE::Connect(const std::string& asTopic) {
+    if (!pmBus) return false;
     try {
         auto bus =
             sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus", "/org/freedesktop/DBus");
@@ -305,6 +311,7 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
                 ", Service:" + nxbase::kDdeService + " (" + why + ")");
             return false;
         }
+        if (!pmBus) return false;  // turned off while it waited
     }
     std::string payload = amOwnName + ":" + asEncodedData;
     std::vector<std::uint8_t> bytes(payload.begin(), payload.end());

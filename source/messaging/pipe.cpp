@@ -175,8 +175,18 @@ Pipe* Pipe::Instance() {
 }
 
 void Pipe::DeletePipe() {
-    delete nxbase::gPipe;
+    Pipe* pipe = nxbase::gPipe;
     nxbase::gPipe = nullptr;
+    if (pipe == nullptr || pipe->pmScope == nullptr) {
+        delete pipe;
+        return;
+    }
+    // Deleted by a handler that a send's wait ran (a window closed while a
+    // server starts): the name and the channels go now, the object when that
+    // send has returned, and its waits end.
+    if (pipe->pmDDE) pipe->pmDDE->Retire("the transport was closed");
+    pipe->CloseAll(pipe->amForkedFrom.empty());
+    pipe->amDoomed = true;
 }
 
 Pipe::Pipe(const std::string& asOwnAppName)
@@ -191,7 +201,13 @@ Pipe::Pipe(const std::string& asOwnAppName)
 void Pipe::LetGoAfterFork() {
     amForkedFrom = amProcessId;
     if (pmDDE) pmDDE->TurnOff("a forked child does not use its parent's bus connection");
-    for (const auto& [id, channel] : amAllChannels) {
+    CloseAll(false);
+}
+
+// Closes every channel and the listener; `abOwner` also frees the name (the
+// socket and its lock file), which only the process that took it may do.
+void Pipe::CloseAll(bool abOwner) {
+    for (const auto& [id, channel] : std::map<std::uint64_t, ChannelPtr>(amAllChannels)) {
         channel->closed = true;
         boost::system::error_code ignored;
         channel->timer.cancel();
@@ -205,30 +221,20 @@ void Pipe::LetGoAfterFork() {
         pmListener->pause.cancel();
         pmListener->acceptor.close(ignored);
         pmListener.reset();
+        if (abOwner) ::unlink(amSocketPath.c_str());
     }
-    if (amLockFd >= 0) ::close(amLockFd);  // the parent's descriptor keeps the lock
+    if (abOwner) {
+        toolkit::Sockets().UnlockName(amLockFd, amSocketPath + ".lock");
+    } else if (amLockFd >= 0) {
+        ::close(amLockFd);  // the parent's descriptor keeps the lock
+    }
     amLockFd = -1;
 }
 
 Pipe::~Pipe() {
     Application::Get();  // a forked child lets go of the parent's sockets first
     pmDDE.reset();
-    for (const auto& [id, channel] : std::map<std::uint64_t, ChannelPtr>(amAllChannels)) {
-        channel->closed = true;
-        boost::system::error_code ignored;
-        channel->timer.cancel();
-        channel->socket.close(ignored);
-    }
-    amAllChannels.clear();
-    amChannels.clear();
-    if (pmListener) {
-        boost::system::error_code ignored;
-        pmListener->pause.cancel();
-        pmListener->acceptor.close(ignored);
-        ::unlink(amSocketPath.c_str());
-    }
-    // The name is free again, and its lock file gone with it.
-    toolkit::Sockets().UnlockName(amLockFd, amSocketPath + ".lock");
+    CloseAll(amForkedFrom.empty());
 }
 
 std::string Pipe::ForkedCopyError() const {
@@ -625,9 +631,11 @@ Pipe::SendScope::~SendScope() {
     if (pmPipe == nullptr) return;
     pmPipe->pmScope = pmOuter;
     if (pmPipe->pmDDE) pmPipe->pmDDE->SetStartWaitCheck(pmOuter ? pmOuter->fmKeepWaiting : nullptr);
+    if (pmOuter == nullptr && pmPipe->amDoomed) delete pmPipe;
 }
 
 bool Pipe::KeepWaiting() const {
+    if (amDoomed) return false;
     return pmScope == nullptr || !pmScope->fmKeepWaiting || pmScope->fmKeepWaiting();
 }
 
