@@ -629,6 +629,24 @@ TEST_F(PostOfficeTest, DestroyingThePostOfficeEndsTheWaitsOnIt) {
     EXPECT_FALSE(std::filesystem::exists(sandbox.runtime() + "/PipeRequest-Tester"));
 }
 
+TEST_F(PostOfficeTest, AStartedProgramGetsNoDescriptorButTheStandardOnes) {
+    std::string lister = root + "/bin/fdlister";
+    std::ofstream(lister) << "#!/bin/sh\nls -l /proc/self/fd > " << root << "/fds.txt\n";
+    std::filesystem::permissions(lister, std::filesystem::perms::owner_all);
+    sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "FdLister", lister);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+    RawPeer accepted("Accepted", Pipe::Instance()->GetSocketPath());  // an accepted channel
+    EXPECT_FALSE(office->SendAndReceive("FdLister", GET_DEVICE_NAME, request, answer));
+    // ls's own: 0 to 2 and the directory it reads.
+    std::string fds = nxtest::ReadFile(root + "/fds.txt");
+    ASSERT_NE(fds.find(" 0 -> "), std::string::npos) << fds;
+    EXPECT_EQ(fds.find("socket:"), std::string::npos) << fds;
+    EXPECT_EQ(fds.find("anon_inode"), std::string::npos) << fds;
+    EXPECT_EQ(fds.find(".lock"), std::string::npos) << fds;
+}
+
 TEST_F(PostOfficeTest, AnAnswerTooManyGoesToTheNextRequestOrNobody) {
     // Frames carry no request id: a peer that answers twice has its second
     // answer taken for the next request; with none outstanding it is dropped.

@@ -78,6 +78,9 @@ pid_t SpawnProcess(const std::vector<std::string>& arguments, const std::string&
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     if (!directory.empty()) posix_spawn_file_actions_addchdir_np(&actions, directory.c_str());
+    // Only standard input, output and error: a started server holding one
+    // of our channels would keep it open after we end.
+    posix_spawn_file_actions_addclosefrom_np(&actions, 3);
     pid_t pid = -1;
     int result = ::posix_spawn(&pid, copies[0].c_str(), &actions, nullptr, argv.data(), environ);
     posix_spawn_file_actions_destroy(&actions);

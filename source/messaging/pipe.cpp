@@ -301,6 +301,9 @@ void Pipe::Accept() {
                 return;
             }
             pmListener->nextPause = nxbase::kFirstAcceptPause;
+            // asio accepts without SOCK_CLOEXEC: a program started later
+            // must not hold the channel open.
+            ::fcntl(channel->socket.native_handle(), F_SETFD, FD_CLOEXEC);
             std::string why;
             if (toolkit::Sockets().PeerIsSameUser(channel->socket.native_handle(), why)) {
                 AddChannel(channel);
