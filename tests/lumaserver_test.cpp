@@ -253,6 +253,45 @@ TEST_F(LumaServerTest, AnIdleServerSleeps) {
     EXPECT_LE(woken, 2) << "wake-ups of an idle lumaserver in 3 s";
 }
 
+TEST_F(LumaServerTest, ASubscriberThatCannotBeReachedHoldsNobodyUp) {
+    PostOffice::CreatePostOffice("Third");
+    Connect();
+    // Deaf listens under its name but never accepts; it subscribed on a
+    // channel that it then closed.
+    int deaf = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::string path = nxbase::RequestSocketPath("Deaf");
+    std::strcpy(address.sun_path, path.c_str());
+    ASSERT_EQ(::bind(deaf, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    ASSERT_EQ(::listen(deaf, 4), 0);
+    int channel = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
+    ASSERT_EQ(::connect(channel, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    std::string frames = nxbase::EncodeFrame("Deaf_1") +
+                         nxbase::EncodeFrame(nxbase::MessageBody("Deaf", "NOTIFY_MESSUNG", ""));
+    ASSERT_EQ(::send(channel, frames.data(), frames.size(), MSG_NOSIGNAL),
+              static_cast<ssize_t>(frames.size()));
+    nxbase::FrameReader reader;
+    std::string body;
+    ASSERT_TRUE(RunUntil([&] {
+        char bytes[512];
+        ssize_t n = ::recv(channel, bytes, sizeof bytes, MSG_DONTWAIT);
+        if (n > 0) reader.Append(bytes, static_cast<std::size_t>(n));
+        return reader.Next(body) == nxbase::FrameReader::Result::kFrame &&
+               reader.Next(body) == nxbase::FrameReader::Result::kFrame;  // reply, then answer
+    }));
+    ::close(channel);
+    RunUntil([] { return false; }, 200ms);
+    // A third application measures and asks: the notices hold neither up.
+    auto start = std::chrono::steady_clock::now();
+    Ask(EXEC_MEASUREMENT);
+    Ask(GET_APP_VERSION);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
+    ::close(deaf);
+    ::unlink(path.c_str());
+}
+
 // Kills the server when patch `at` has been measured.
 struct KillAtPatch : ProgressListener {
     KillAtPatch(std::string name, int at, int count)

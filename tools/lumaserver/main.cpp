@@ -6,10 +6,12 @@
 // last peer disconnects.
 #include <unistd.h>
 
+#include <chrono>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
 #include <iostream>
+#include <memory>
 #include <set>
 #include <string>
 #include <vector>
@@ -72,6 +74,7 @@ class Server {
         Install(office, NOTIFY_MESSUNG, &Server::Subscribe);
         Install(office, NOTIFY_MESSUNG_AUS, &Server::Unsubscribe);
         Install(office, DISCONNECT, &Server::Disconnected);
+        office->AddPeerLostFunction([this](const std::string& peer) { PeerLost(peer); });
     }
 
     // Started on demand (-S) but no peer for a while: the peer that started
@@ -96,6 +99,7 @@ class Server {
     }
 
     static constexpr int kIdleSeconds = 30;
+    static constexpr std::chrono::seconds kNoticeWait{1};
     static constexpr int kIdleCheckSeconds = 10;
 
   private:
@@ -174,12 +178,33 @@ class Server {
         LogFile::WriteToLog(String("Measured patch ") + String(CurrentId()), String("LumaServer"));
     }
     std::string CurrentId() const { return amChart.rows[static_cast<std::size_t>(amLast)].id; }
+    // Each notice goes out from the loop, after the handler that measured,
+    // and waits at most a second for its subscriber: one that cannot be
+    // reached holds nobody up and loses its subscription.
     void Notify() {
-        for (const std::string& subscriber : std::set<std::string>(amSubscribers)) {
-            MyMemoryBlock notice;
-            notice << String(CurrentId()) << amLast;
-            PostOffice::Instance()->Send(subscriber, MESSUNG_AUSGELOEST, notice);
+        for (const std::string& subscriber : amSubscribers) {
+            auto notice = std::make_shared<MyMemoryBlock>();
+            *notice << String(CurrentId()) << amLast;
+            Application::Get().Post([this, subscriber, notice] {
+                auto until = std::chrono::steady_clock::now() + kNoticeWait;
+                boost::function<bool()> inTime = [until] {
+                    return std::chrono::steady_clock::now() < until;
+                };
+                if (amSubscribers.count(subscriber) == 0 ||
+                    PostOffice::Instance()->Send(subscriber, MESSUNG_AUSGELOEST, *notice, inTime,
+                                                 PeerStart::kNever))
+                    return;
+                LogFile::WriteToLog(String("Notice to ") + String(subscriber) + " failed (" +
+                                        String(PostOffice::Instance()->GetLastError()) +
+                                        "); its subscription ends",
+                                    String());
+                amSubscribers.erase(subscriber);
+            });
         }
+    }
+    // A subscriber whose channel is lost and that holds no connection has gone.
+    void PeerLost(const std::string& asPeer) {
+        if (PostOffice::Instance()->GetConnectionCount(asPeer) == 0) amSubscribers.erase(asPeer);
     }
 
     nxcolor::SpectraTable amChart;
