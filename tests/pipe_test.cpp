@@ -336,6 +336,25 @@ class FailingSockets : public toolkit::SocketCalls {
     }
 };
 
+TEST_F(PipeTest, PeersThatNeverReadAreCappedTogether) {
+    // Three peers that never read, each under its own limit, over the sum's:
+    // the one with the most waiting goes, the others stay.
+    constexpr std::size_t kEach = nxbase::kMaxAllQueuedBytes / 3 + (1u << 20);
+    static_assert(kEach < nxbase::kMaxQueuedBytes);
+    std::string big(kEach, 'x');
+    std::vector<int> peers;
+    for (const char* name : {"Deaf1", "Deaf2", "Deaf3"}) peers.push_back(RawClient(name));
+    EXPECT_TRUE(pipe->Send("Deaf1", "IS_READY", big));
+    EXPECT_TRUE(pipe->Send("Deaf2", "IS_READY", big));
+    EXPECT_FALSE(pipe->Send("Deaf3", "IS_READY", big + "more"));
+    EXPECT_NE(pipe->GetLastError().find("outgoing frames of all channels"), std::string::npos)
+        << pipe->GetLastError();
+    EXPECT_TRUE(pipe->HasChannel("Deaf1"));
+    EXPECT_TRUE(pipe->HasChannel("Deaf2"));
+    EXPECT_FALSE(pipe->HasChannel("Deaf3"));
+    for (int fd : peers) ::close(fd);
+}
+
 TEST_F(PipeTest, AFailedWriteClosesOnlyItsChannelAndSaysWhy) {
     ASSERT_EQ(RoundTrip("before"), "before");
     FailingSockets failing;

@@ -43,6 +43,9 @@ namespace nxbase {
 constexpr std::size_t kWriteBlockSize = 4096;
 // A channel whose peer lets this much pile up unread is closed.
 constexpr std::size_t kMaxQueuedBytes = 64u << 20;
+// Outgoing bytes of all channels together; beyond it the channel with the
+// most waiting is closed.
+constexpr std::size_t kMaxAllQueuedBytes = 128u << 20;
 // Partly read frames of all channels together; beyond it the channel with
 // the largest one is closed.
 constexpr std::size_t kMaxPartialBytes = 256u << 20;
@@ -180,6 +183,7 @@ class NXBASE_EXPORT Pipe {
     void OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError,
                 std::size_t alRead);
     void LimitPartialFrames();
+    void LimitQueuedBytes();
     void Deliver(const ChannelPtr& axChannel);
     void HandleBody(const ChannelPtr& axChannel, std::string&& asBody);
     void HandleHandshake(const ChannelPtr& axChannel, const std::string& asBody);

@@ -430,6 +430,24 @@ void Pipe::LimitPartialFrames() {
     }
 }
 
+// Peers that never read would each hold up to their own limit: their sum is
+// capped too. Only looked at while some channel has bytes waiting.
+void Pipe::LimitQueuedBytes() {
+    while (true) {
+        std::size_t all = 0;
+        ChannelPtr largest;
+        for (const auto& [id, channel] : amAllChannels) {
+            all += channel->outgoing.size();
+            if (!largest || channel->outgoing.size() > largest->outgoing.size()) largest = channel;
+        }
+        if (all <= nxbase::kMaxAllQueuedBytes || !largest) return;
+        Close(largest, "outgoing frames of all channels above " +
+                           std::to_string(nxbase::kMaxAllQueuedBytes >> 20) +
+                           " MiB; this one's peer does not read " +
+                           std::to_string(largest->outgoing.size()) + " bytes");
+    }
+}
+
 void Pipe::Deliver(const ChannelPtr& axChannel) {
     // Nested deliveries (a handler that runs the loop) take from the same
     // queue, so bodies are handled in the order they came.
@@ -520,7 +538,8 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     }
     if (!axChannel->outgoing.empty()) {
         axChannel->outgoing += asFrame;
-        return true;  // goes out behind what waits, when the socket is writable
+        LimitQueuedBytes();
+        return !axChannel->closed;  // goes out behind what waits, when the socket is writable
     }
     // The usual case: the socket takes the whole frame at once, no copy.
     std::size_t done = 0;
@@ -528,6 +547,7 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     if (done == asFrame.size()) return true;
     axChannel->outgoing.assign(asFrame, done, std::string::npos);
     FlushOutgoing(axChannel);
+    LimitQueuedBytes();
     return !axChannel->closed;
 }
 
@@ -597,6 +617,7 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
                 (axChannel->peer.empty() ? std::string("(unknown)") : axChannel->peer) +
                 " closed: " + asReason);
     amPartialBytes -= std::min(amPartialBytes, axChannel->reader.Buffered());
+    std::string().swap(axChannel->outgoing);  // a handler may still hold the channel
     boost::system::error_code ignored;
     axChannel->timer.cancel();
     axChannel->socket.close(ignored);
