@@ -373,8 +373,8 @@ void PostOffice::PeerLost(const std::string& asApp) {
     // the call-backs of the requests the loss fails.
     std::weak_ptr<bool> alive = amAlive;
     Application::Get().Post([this, alive, asApp] {
-        for (auto at = amPeerLostFunctions.begin();
-             alive.lock() && at != amPeerLostFunctions.end();) {
+        if (!alive.lock()) return;
+        for (auto at = amPeerLostFunctions.begin(); at != amPeerLostFunctions.end();) {
             int id = at->first;
             PeerLostFunction function = at->second;
             function(asApp);
