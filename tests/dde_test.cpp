@@ -5,6 +5,7 @@
 #include "nxbase/dde.h"
 
 #include <gtest/gtest.h>
+#include <sdbus-c++/sdbus-c++.h>
 #include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -173,6 +174,30 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffAndTheSocketsServeOn) {
     EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
                   .find("DDE is off: the session bus was lost"),
               std::string::npos);
+}
+
+TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {
+    // alice's and bob's servers on one login and one bus: names of their own.
+    for (const char* person : {"alice", "bob"}) {
+        std::string start = "USERNAME=" + std::string(person) + " " + server + " &";
+        ASSERT_EQ(std::system(start.c_str()), 0);
+    }
+    for (const char* person : {"alice", "bob"}) {
+        std::string socket = sandbox.runtime() + "/PipeRequest-LumaServer_" + person;
+        EXPECT_TRUE(RunUntil([&] { return nxtest::Accepts(socket); }, 5s)) << person;
+    }
+    RunUntil([] { return false; }, 300ms);
+    EXPECT_EQ(Shell("pgrep -c -x " + Exe(server)), "2\n");
+    Shell("pkill -f " + server);
+    // The server's bus name held by somebody else: it serves on its socket.
+    auto holder = sdbus::createSessionBusConnection(nxbase::DdeBusName("LumaServer"));
+    ASSERT_EQ(std::system((server + " &").c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    MyMemoryBlock request, answer;
+    auto until = std::chrono::steady_clock::now() + 5s;
+    EXPECT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                       [&] { return std::chrono::steady_clock::now() < until; }));
 }
 
 }  // namespace

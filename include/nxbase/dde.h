@@ -3,7 +3,9 @@
 // application name and the name + "_" + process id:
 //
 //   com.klume.VELTRAApplication.<topic>      (characters other than letters,
-//                                             digits, "_" and "-" become "_")
+//                                             digits, "_" and "-" become "_";
+//                                             + "_" + $USERNAME when set, as the
+//                                             sockets' names)
 //
 // and serves one object, /com/klume/VELTRAApplication, with the interface
 // com.klume.VELTRAApplication:
@@ -42,7 +44,7 @@ inline constexpr const char* kDdeService = "VELTRAApplication";
 inline constexpr const char* kDdeBusPrefix = "com.klume.VELTRAApplication.";
 inline constexpr const char* kDdeObjectPath = "/com/klume/VELTRAApplication";
 inline constexpr const char* kDdeInterface = "com.klume.VELTRAApplication";
-// The bus name of a topic.
+// The bus name of a topic, with the person's part of its pipe name.
 NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
 // Takes a poke's data apart: the sender before the first ":", then the
 // encoded block, decoded into `axBlock`. Without a ":" the sender is empty
@@ -57,7 +59,8 @@ class NXBASE_EXPORT DDE {
     // Without a session bus the object exists but is off (logged); a bus that
     // is there but refuses the connection shows the error box "DDE-Server
     // kann nicht initialisiert werden." and quits the application. A bus
-    // that goes away later (a logout, a restart of the bus) turns it off,
+    // name that another connection owns turns it off, logged, the sockets
+    // serving on. A bus that goes away later (a logout, a restart of the bus) turns it off,
     // logged; the sockets go on serving.
     explicit DDE(const std::string& asOwnAppName);
     ~DDE();

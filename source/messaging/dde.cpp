@@ -13,6 +13,7 @@
 #include "nxbase/check.h"
 #include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
+#include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
 #include "toolkit/process.h"
@@ -22,7 +23,8 @@ namespace nxbase {
 
 std::string DdeBusName(const std::string& asTopic) {
     std::string element;
-    for (char c : asTopic) {
+    // Per person, as the sockets are: two people on one login have names of their own.
+    for (char c : PipeName(asTopic)) {
         bool allowed = (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') ||
                        c == '_' || c == '-';
         element += allowed ? c : '_';
@@ -62,6 +64,19 @@ bool SessionBusConfigured() {
     return runtime && *runtime && ::access((std::string(runtime) + "/bus").c_str(), F_OK) == 0;
 }
 
+// False when another connection owns the name; other failures throw.
+bool RequestName(sdbus::IConnection& axConnection, const std::string& asName) {
+    try {
+        axConnection.requestName(asName);
+        return true;
+    } catch (const sdbus::Error& error) {
+        if (error.getName() == "org.freedesktop.DBus.Error.FileExists" ||
+            error.getMessage().find("File exists") != std::string::npos)
+            return false;
+        throw;
+    }
+}
+
 }  // namespace
 
 struct DDE::Bus {
@@ -89,7 +104,12 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
         bus->topics[0] = amOwnName + "_" + std::to_string(::getpid());
         bus->topics[1] = amOwnName;
         for (const std::string& topic : bus->topics) {
-            bus->connection->requestName(nxbase::DdeBusName(topic));
+            if (RequestName(*bus->connection, nxbase::DdeBusName(topic))) continue;
+            // Somebody else holds the name: the sockets serve on alone.
+            LogFile::WriteToLog(String("DDE is off: the bus name " + nxbase::DdeBusName(topic) +
+                                       " is taken"),
+                                String());
+            return;
         }
         bus->object = sdbus::createObject(*bus->connection, nxbase::kDdeObjectPath);
         std::weak_ptr<bool> alive = amAlive;

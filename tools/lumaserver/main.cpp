@@ -298,6 +298,13 @@ int main(int argc, char** argv) {
         std::cerr << "lumaserver: " << failure.what() << "\n";
         return kExitFailed;
     }
+    // The session bus refused the connection: the box said so, and the
+    // application quits, not as a success.
+    if (Application::Get().IsQuitting()) {
+        std::cerr << "lumaserver: DDE-Server kann nicht initialisiert werden.\n";
+        NxSingleton::DeleteAllSingleton();
+        return kExitFailed;
+    }
     // Without its socket nobody could reach the server: say why and end.
     if (!Pipe::Instance()->GetRefusal().empty()) {
         std::cerr << "lumaserver: " << Pipe::Instance()->GetRefusal() << "\n";
