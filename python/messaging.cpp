@@ -1,8 +1,10 @@
 // A post-office client for Python: send a message by name and wait for the
 // answer with the event loop turning, and measure through LumaServer.
+#include <atomic>
 #include <chrono>
 #include <memory>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "common.h"
@@ -76,17 +78,20 @@ void Pack(MyMemoryBlock& block, const py::handle& item) {
     }
 }
 
-// Asked while an answer is awaited: lets Python handle Ctrl-C and ends the
-// wait at the deadline.
+class Client;
+
+// Asked while an answer is awaited: lets Python handle Ctrl-C, ends the wait
+// at the deadline, and at once when another thread closes the client.
 class Waiter {
   public:
-    explicit Waiter(double timeout)
+    Waiter(double timeout, const std::atomic<bool>& closing)
         : amDeadline(Clock::now() + std::chrono::duration_cast<Clock::duration>(
-                                        std::chrono::duration<double>(timeout))) {}
+                                        std::chrono::duration<double>(timeout))),
+          amClosing(closing) {}
 
     bool KeepWaiting() {
         // Once interrupted the error is pending: no more Python calls.
-        if (amInterrupted) return false;
+        if (amInterrupted || amClosing.load()) return false;
         {
             py::gil_scoped_acquire locked;
             if (PyErr_CheckSignals() != 0) {
@@ -102,27 +107,38 @@ class Waiter {
 
   private:
     Clock::time_point amDeadline;
+    const std::atomic<bool>& amClosing;
     bool amInterrupted = false;
 };
+
+// The process's one post office belongs to one open client.
+Client* gOpenClient = nullptr;
 
 class Client {
   public:
     explicit Client(const std::string& name) {
+        if (gOpenClient != nullptr) {
+            throw std::runtime_error(
+                "a Client is open already in this process (one post office per process): close "
+                "it, or use it");
+        }
         try {
             pOffice = PostOffice::CreatePostOffice(String(name));
         } catch (const std::exception& error) {
             throw std::runtime_error("no post office for \"" + name + "\": " + error.what());
         }
+        gOpenClient = this;
     }
     ~Client() { Close(); }
 
     py::tuple Send(const std::string& target, const py::object& message, const py::iterable& values,
                    double timeout) {
+        Busy busy(amBusy);
         Office();
         const int number = MessageNumber(message);
         MyMemoryBlock request, answer;
         for (const py::handle item : values) Pack(request, item);
-        Waiter waiter(timeout);
+        Waiter waiter(timeout, amClosing);
         unsigned char sent = 0;
         {
             py::gil_scoped_release unlocked;
@@ -130,6 +146,7 @@ class Client {
                                            [&waiter] { return waiter.KeepWaiting(); });
         }
         waiter.RaiseIfInterrupted();
+        if (amClosing.load()) throw std::runtime_error("the client was closed while it waited");
         if (!sent) {
             throw std::runtime_error("no answer from " + target + " to " +
                                      nxbase::MessageName(number) + ": " + pOffice->GetLastError());
@@ -142,6 +159,7 @@ class Client {
     }
 
     void Post(const std::string& target, const py::object& message, const py::iterable& values) {
+        Busy busy(amBusy);
         Office();
         const int number = MessageNumber(message);
         MyMemoryBlock request;
@@ -157,11 +175,12 @@ class Client {
     }
 
     py::tuple Measure(int count, double timeout) {
+        Busy busy(amBusy);
         Office();
         if (count < 1) throw py::value_error("count must be at least 1");
         std::vector<nxbase::MeasuredSpectrum> measured;
         std::string error;
-        Waiter waiter(timeout);
+        Waiter waiter(timeout, amClosing);
         bool ok = false;
         {
             py::gil_scoped_release unlocked;
@@ -182,18 +201,35 @@ class Client {
         return py::make_tuple(ids, spectra);
     }
 
+    // From any thread: a send that waits on another thread ends first (its
+    // wait sees the close within 50 ms and raises), then the post office goes.
     void Close() {
-        if (pOffice == nullptr) return;
+        if (pOffice == nullptr || amClosing.exchange(true)) return;
+        {
+            py::gil_scoped_release unlocked;
+            while (amBusy.load() > 0) std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        }
         pOffice = nullptr;
+        if (gOpenClient == this) gOpenClient = nullptr;
         NxSingleton::DeleteAllSingleton();
     }
 
   private:
+    // A call in progress, which Close waits for.
+    struct Busy {
+        explicit Busy(std::atomic<int>& count) : amCount(count) { ++amCount; }
+        ~Busy() { --amCount; }
+        std::atomic<int>& amCount;
+    };
+
     void Office() const {
-        if (pOffice == nullptr) throw std::runtime_error("the client is closed");
+        if (pOffice == nullptr || amClosing.load())
+            throw std::runtime_error("the client is closed");
     }
 
     PostOffice* pOffice = nullptr;
+    std::atomic<bool> amClosing{false};
+    std::atomic<int> amBusy{0};
 };
 
 }  // namespace
@@ -202,7 +238,9 @@ void RegisterMessaging(py::module_& m) {
     py::class_<Client>(
         m, "Client",
         "A post office under an application name. Peers registered in the machine registry are "
-        "started when a message goes to them. One client per process.")
+        "started when a message goes to them. One client per process: a second one raises "
+        "RuntimeError while the first is open. close() may come from another thread; a send "
+        "waiting meanwhile raises RuntimeError.")
         .def(py::init<const std::string&>(), py::arg("name") = "python")
         .def("send", &Client::Send, py::arg("target"), py::arg("message"),
              py::arg("values") = py::tuple(), py::arg("timeout") = 30.0,

@@ -89,3 +89,35 @@ def test_ctrl_c_ends_a_wait_cleanly(sandbox, tmp_path):
         except ProcessLookupError:
             pass
     assert out.split() == ["interrupted", "True"], out
+
+
+def test_one_client_per_process_and_close_from_another_thread(sandbox):
+    out = run_python(
+        "import nxbase, os, signal, threading, time\n"
+        "client = nxbase.Client('pytest')\n"
+        "try:\n"
+        "    nxbase.Client('second')\n"
+        "except RuntimeError as error:\n"
+        "    print('second refused:', 'open already' in str(error))\n"
+        "client.send('LumaServer', 'CONNECT', [('b', 2)])\n"
+        "def ours(pid):\n"
+        "    try:\n"
+        "        with open(f'/proc/{pid}/comm') as comm, open(f'/proc/{pid}/environ', 'rb') as env:\n"
+        "            return comm.read().strip() == 'lumaserver' and os.environ['NXBASE_RUNTIME_DIR'].encode() in env.read()\n"
+        "    except OSError:\n"
+        "        return False\n"
+        "server = next(int(p) for p in os.listdir('/proc') if p.isdigit() and ours(p))\n"
+        "os.kill(server, signal.SIGSTOP)\n"
+        "closer = threading.Thread(target=lambda: (time.sleep(0.3), client.close()))\n"
+        "closer.start()\n"
+        "start = time.monotonic()\n"
+        "try:\n"
+        "    client.send('LumaServer', 'GET_DEVICE_NAME', timeout=10)\n"
+        "except RuntimeError as error:\n"
+        "    print('closed:', time.monotonic() - start < 2, 'closed while it waited' in str(error))\n"
+        "closer.join(5)\n"
+        "os.kill(server, signal.SIGKILL)\n"
+        "nxbase.Client('again').close()\n"
+        "print('again: True')\n",
+        sandbox)
+    assert out.splitlines() == ["second refused: True", "closed: True True", "again: True"]
