@@ -164,4 +164,36 @@ TEST_F(QtLoopTest, ProgressReachesABarFromAnyThreadAndADialogsCancelAborts) {
     EXPECT_TRUE(toDialog.IsAborted());
 }
 
+TEST_F(QtLoopTest, QtsQuitEndsAWaitAndALostPeerIsASignal) {
+    PostOffice* office = PostOffice::CreatePostOffice("QtTester");
+    nxbase::qt::Attach();
+    nxbase::qt::PeerWatch watch(*office);
+    QStringList lost;
+    QObject::connect(&watch, &nxbase::qt::PeerWatch::peerLost,
+                     [&lost](const QString& peer) { lost << peer; });
+    MyMemoryBlock request, answer;
+    ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
+    // The user closes the application while it waits for an answer that
+    // does not come: the wait ends with Qt's loop.
+    bool answered = true;
+    std::chrono::steady_clock::duration took{};
+    QTimer::singleShot(0, &app, [&] {
+        auto start = std::chrono::steady_clock::now();
+        answered =
+            office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer, [] { return true; });
+        took = std::chrono::steady_clock::now() - start;
+    });
+    QTimer::singleShot(300, &app, &QCoreApplication::quit);
+    QTimer::singleShot(5000, &app, [] { QCoreApplication::exit(1); });  // a hung wait fails
+    EXPECT_EQ(app.exec(), 0);
+    EXPECT_FALSE(answered);
+    EXPECT_LT(took, 2s);
+    Application::Get().ResetQuit();
+    // The peer dies: the watch says so.
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", CANCEL_REQUEST, request, answer, [] { return true; }));
+    EXPECT_TRUE(nxtest::RunUntil([&] { return !lost.isEmpty(); }, 3s));
+    EXPECT_EQ(lost, QStringList{QStringLiteral("EchoPeer")});
+}
+
 }  // namespace

@@ -9,13 +9,22 @@
 //     nxbase::qt::Attach();                 // before or after CreatePostOffice
 //     return app.exec();                    // instead of Application::Execute()
 //
+// QCoreApplication::quit() (or exit()) also ends a wait of the library that
+// is running, as Application::Quit() does: a window closed during a
+// SendAndReceive does not wait on for its answer.
+//
 // Everything runs on the thread of the QCoreApplication.
 #ifndef NXBASE_QTLOOP_H_
 #define NXBASE_QTLOOP_H_
 
+#include <QObject>
+#include <QString>
 #include <cstdint>
+#include <string>
 
 #include "nxbase/export.h"
+
+class PostOffice;
 
 namespace nxbase::qt {
 
@@ -28,6 +37,23 @@ NXBASE_EXPORT void Detach();
 // How often the notifier found the loop descriptor readable and
 // dispatched, since Attach(): the application's wake-ups for the library.
 NXBASE_EXPORT std::uint64_t WakeUps();
+
+// The post office's news as Qt signals, for widgets that show a peer's
+// state: peerLost(name) whenever the channel to a peer is lost (it ended,
+// was killed or broke the protocol).
+class NXBASE_EXPORT PeerWatch : public QObject {
+    Q_OBJECT
+  public:
+    explicit PeerWatch(PostOffice& office, QObject* parent = nullptr);
+    ~PeerWatch() override;
+
+  Q_SIGNALS:
+    void peerLost(const QString& peer);
+
+  private:
+    PostOffice& office_;
+    int id_ = 0;
+};
 
 }  // namespace nxbase::qt
 

@@ -2,18 +2,30 @@
 
 #include <QAbstractEventDispatcher>
 #include <QCoreApplication>
+#include <QEvent>
 #include <QSocketNotifier>
 #include <QTimer>
 #include <memory>
 
+#include "nxbase/postoffice.h"
 #include "toolkit/application.h"
 
 namespace nxbase::qt {
 
 namespace {
 
+// Qt's quit reaches the library: its waits end, as on Application::Quit().
+class QuitWatch : public QObject {
+  public:
+    bool eventFilter(QObject* watched, QEvent* event) override {
+        if (event->type() == QEvent::Quit) Application::Get().Quit();
+        return QObject::eventFilter(watched, event);
+    }
+};
+
 struct Attachment {
     std::unique_ptr<QSocketNotifier> notifier;
+    QuitWatch quitWatch;
     QTimer limit;  // ends a nested pass at its time limit
     QMetaObject::Connection beforeSleep;
     std::uint64_t wakeUps = 0;
@@ -54,6 +66,11 @@ void Attach() {
                 if (Application::Get().Dispatch() > 0) dispatcher->wakeUp();
             });
     }
+    if (QCoreApplication* application = QCoreApplication::instance()) {
+        application->installEventFilter(&self->quitWatch);
+        QObject::connect(application, &QCoreApplication::aboutToQuit, &self->quitWatch,
+                         [] { Application::Get().Quit(); });
+    }
     gAttachment = std::move(attachment);
     Application::Get().SetNestedWait(ProcessEventsOnce);
 }
@@ -67,6 +84,16 @@ void Detach() {
 
 std::uint64_t WakeUps() {
     return gAttachment ? gAttachment->wakeUps : 0;
+}
+
+PeerWatch::PeerWatch(PostOffice& office, QObject* parent) : QObject(parent), office_(office) {
+    id_ = office_.AddPeerLostFunction(
+        [this](const std::string& peer) { Q_EMIT peerLost(QString::fromStdString(peer)); });
+}
+
+PeerWatch::~PeerWatch() {
+    if (PostOffice::IsInitialized() && PostOffice::Instance() == &office_)
+        office_.RemovePeerLostFunction(id_);
 }
 
 }  // namespace nxbase::qt
