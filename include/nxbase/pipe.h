@@ -209,7 +209,7 @@ class NXBASE_EXPORT Pipe {
     std::string amLastError;
     std::string amForkedFrom;  // the parent's process id, in a forked child
     bool amDoomed = false;     // deleted while a send waited: goes when it returns
-    std::string amFrame;  // the last frame written, its storage reused
+    std::string amFrame;       // the last frame written, its storage reused
     bool amFrameInUse = false;
     std::thread::id amThread;
     int amLockFd = -1;  // held while this process owns its name

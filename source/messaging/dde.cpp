@@ -106,9 +106,9 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
         for (const std::string& topic : bus->topics) {
             if (RequestName(*bus->connection, nxbase::DdeBusName(topic))) continue;
             // Somebody else holds the name: the sockets serve on alone.
-            LogFile::WriteToLog(String("DDE is off: the bus name " + nxbase::DdeBusName(topic) +
-                                       " is taken"),
-                                String());
+            LogFile::WriteToLog(
+                String("DDE is off: the bus name " + nxbase::DdeBusName(topic) + " is taken"),
+                String());
             return;
         }
         bus->object = sdbus::createObject(*bus->connection, nxbase::kDdeObjectPath);
@@ -235,8 +235,8 @@ void DDE::Process() {
         while (pmBus->connection->processPendingRequest()) {
         }
     } catch (const sdbus::Error& error) {
-        return TurnOff("the session bus was lost (" + error.getName() + ": " +
-                       error.getMessage() + ")");
+        return TurnOff("the session bus was lost (" + error.getName() + ": " + error.getMessage() +
+                       ")");
     }
     Arm();
 }

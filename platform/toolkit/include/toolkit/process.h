@@ -17,7 +17,8 @@
 namespace toolkit {
 
 // Starts `arguments[0]` with `arguments` in `directory` (posix_spawn; the
-// environment and descriptors 0 to 2 are inherited, no other). The process id, or -1 with `error` set.
+// environment and descriptors 0 to 2 are inherited, no other). The process id, or -1 with `error`
+// set.
 NXBASE_EXPORT pid_t SpawnProcess(const std::vector<std::string>& arguments,
                                  const std::string& directory, std::string& error);
 
