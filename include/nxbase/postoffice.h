@@ -233,6 +233,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     std::deque<VELTRAEvent> amCommandQueue;
     // Requests sent and not yet answered, by peer and answer number, in the
     // order sent; given up ones keep their places until their answers come.
+    // An emptied queue stays until its peer's channel is lost.
     std::map<std::pair<std::string, int>, std::deque<RequestPtr>> amOutstanding;
     std::vector<RequestPtr> amAsync;  // asynchronous requests whose call-back is to come
     std::map<int, PeerLostFunction> amPeerLostFunctions;

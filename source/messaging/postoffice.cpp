@@ -129,7 +129,7 @@ struct PostOffice::Request {
     std::pair<std::string, int> key;  // the peer and the answer's number
     bool finished = false;            // its caller no longer waits
     bool answered = false;
-    MyMemoryBlock data;
+    std::optional<MyMemoryBlock> data;  // the answer: nothing allocated before it comes
     std::string error;
     // Asynchronous requests only.
     AnswerCallback done;
@@ -249,7 +249,7 @@ void PostOffice::CommunicationReceiveFunction(VELTRAEvent& axEvent) {
 void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     NX_COMM_LOG(String("Answer received: ") + Number(alNumber));
     auto at = amOutstanding.find({axEvent.GetSender(), alNumber});
-    if (at == amOutstanding.end()) {
+    if (at == amOutstanding.end() || at->second.empty()) {
         LogFile::WriteToLog(String("Answer nobody waits for dropped: ") +
                                 String(axEvent.GetCommand()) + " from " +
                                 String(axEvent.GetSender()),
@@ -258,9 +258,9 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     }
     NX_COMM_LOG(String("MessageQueue - Insert message") +
                 ", Queue size: " + Number(static_cast<long>(at->second.size())));
+    // The emptied queue stays for the next request: no allocation per request.
     RequestPtr request = std::move(at->second.front());
     at->second.pop_front();
-    if (at->second.empty()) amOutstanding.erase(at);
     if (request->finished) {
         LogFile::WriteToLog(String("Late answer dropped: ") + String(axEvent.GetCommand()) +
                                 " from " + String(axEvent.GetSender()) +
@@ -702,7 +702,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         NX_COMM_LOG("SendAndReceive, Abort");
         return false;
     }
-    axReceive = std::move(request->data);
+    axReceive = std::move(*request->data);
     NX_COMM_LOG("MessageQueue - Get data from message");
     NX_COMM_LOG("MessageQueue - Erased message");
     NX_COMM_LOG(String("Answer received: ") + Number(alMessage));
@@ -823,7 +823,7 @@ void PostOffice::Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlo
     if (pRequest->finished) return;
     pRequest->finished = true;
     pRequest->answered = abAnswered;
-    pRequest->data = std::move(axData);
+    if (abAnswered) pRequest->data.emplace(std::move(axData));
     pRequest->error = std::move(asError);
     if (!pRequest->async) return;  // a blocking wait sees it finished
     if (pRequest->timer) pRequest->timer->cancel();
@@ -836,7 +836,7 @@ void PostOffice::Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlo
         if (!pRequest->done) return;
         AnswerResult result;
         result.answered = pRequest->answered;
-        result.data = std::move(pRequest->data);
+        if (pRequest->data) result.data = std::move(*pRequest->data);
         result.error = pRequest->error;
         pRequest->done(result);
     });
