@@ -200,4 +200,26 @@ TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {
                                        [&] { return std::chrono::steady_clock::now() < until; }));
 }
 
+TEST_F(DdeTest, APokeSpeaksOnlyForTheConnectionThatOwnsItsName) {
+    ASSERT_EQ(std::system((server + " &").c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("AppA");
+    ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
+    MyMemoryBlock level, lock, answer;
+    level << static_cast<unsigned char>(2);
+    lock << static_cast<unsigned char>(0);
+    ASSERT_TRUE(office->SendAndReceive("LumaServer", CONNECT, level, answer, [] { return true; }));
+    ASSERT_TRUE(office->SendAndReceive("LumaServer", LOCK, lock, answer, [] { return true; }));
+    // Somebody on the bus claims to be AppA, connected over the sockets, and
+    // says goodbye for it: refused, and the server stays for AppA.
+    std::string spoof =
+        "dbus-send --session --print-reply --dest=" + nxbase::DdeBusName("LumaServer") + " " +
+        nxbase::kDdeObjectPath + " " + nxbase::kDdeInterface +
+        ".Poke string:LumaServer string:DISCONNECT array:byte:0x41,0x70,0x70,0x41,0x3a";
+    EXPECT_NE(Shell(spoof).find("boolean false"), std::string::npos);
+    RunUntil([] { return false; }, 1500ms);
+    EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
+    ASSERT_TRUE(
+        office->SendAndReceive("LumaServer", GET_DEVICE_NAME, level, answer, [] { return true; }));
+}
+
 }  // namespace

@@ -15,7 +15,9 @@
 //   Poke(s topic, s item, ay data) -> b  item: the command; data: the
 //                                        sender, ":", the encoded data block;
 //                                        sent without waiting for the reply
-//                                        (answers come back as pokes)
+//                                        (answers come back as pokes); served
+//                                        only from the connection that owns
+//                                        the sender's bus name, of this user
 //   Execute(s topic, ay data) -> b       at most 500 bytes go to the execute function
 //   Request(s topic, s item) -> b        not served: logged as an unknown
 //                                        transaction, answered false
@@ -105,6 +107,7 @@ class NXBASE_EXPORT DDE {
     void Arm();
     void Process();
     bool Connect(const std::string& asTopic);
+    bool SpeaksFor(const std::string& asClaimed);
     void OnPoke(const std::string& asItem, const std::string& asData);
 
     std::string amOwnName;

@@ -3,6 +3,7 @@
 #include <sdbus-c++/sdbus-c++.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <boost/asio/posix/stream_descriptor.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
@@ -136,6 +137,8 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
                                             const std::vector<std::uint8_t>& data) {
                 Log("DDE Callback function (POKE)");
                 if (!ownTopic(nxbase::kDdeService, topic)) return false;
+                std::string claimed(data.begin(), std::find(data.begin(), data.end(), ':'));
+                if (!SpeaksFor(claimed)) return false;
                 OnPoke(item, std::string(data.begin(), data.end()));
                 return true;
             });
@@ -274,6 +277,41 @@ void DDE::UserEvent(unsigned long, void*) {
     pThis->amEvents.pop_front();
     NX_ASSERT_TEXT(pThis->fmReceiveFunction != 0, "pThis->pReceiveFunction != 0");
     if (pThis->fmReceiveFunction) pThis->fmReceiveFunction(event);
+}
+
+namespace {
+
+bool RefusePoke(const std::string& asSender, const std::string& asClaimed) {
+    LogFile::WriteToLog(String("DDE: a poke from " + asSender + " claims to come from " +
+                               asClaimed + ", whose bus name it does not own; dropped"),
+                        String());
+    return false;
+}
+
+}  // namespace
+
+// A poke speaks for the application it names only when it comes from the
+// connection that owns that application's bus name, of this user: a socket
+// peer, or anybody else on the bus, cannot be claimed (as a socket frame is
+// bound to its handshake).
+bool DDE::SpeaksFor(const std::string& asClaimed) {
+    const sdbus::Message* message = pmBus ? pmBus->object->getCurrentlyProcessedMessage() : nullptr;
+    if (message == nullptr) return false;
+    const std::string sender = message->getSender();
+    std::string owner;
+    try {
+        if (message->getCredsUid() != ::geteuid()) return RefusePoke(sender, asClaimed);
+        auto bus =
+            sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus", "/org/freedesktop/DBus");
+        bus->callMethod("GetNameOwner")
+            .onInterface("org.freedesktop.DBus")
+            .withTimeout(kCallTimeout)
+            .withArguments(nxbase::DdeBusName(asClaimed))
+            .storeResultsTo(owner);
+    } catch (const sdbus::Error&) {
+        owner.clear();
+    }
+    return (!owner.empty() && owner == sender) || RefusePoke(sender, asClaimed);
 }
 
 // Whether the topic's bus name has an owner, asked of the bus itself: a
