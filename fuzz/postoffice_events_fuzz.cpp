@@ -155,7 +155,11 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
                          : "NO_SUCH_MESSAGE";
         // Channel numbers that are not open: answers fail at once, as to a
         // peer that has gone.
-        VELTRAEvent event(sender, command, std::move(block), 1000 + who);
+        // Alpha's answers come on its channel, as a peer answers.
+        std::uint64_t channel = who == 0 && what >= ANZAHL_BOTSCHAFTEN
+                                    ? Pipe::Instance()->ChannelId("Alpha")
+                                    : 1000 + who;
+        VELTRAEvent event(sender, command, std::move(block), channel);
         office->CommunicationReceiveFunction(event);
         int sum = 0;
         for (const char* name : kSenders) sum += office->GetConnectionCount(name);

@@ -146,6 +146,11 @@ class NXBASE_EXPORT Pipe {
     const std::string& GetRefusal() const { return amRefusal; }
 
     bool HasChannel(const std::string& asApp) const;
+    // The connection the last successful Send went out on (its
+    // VELTRAEvent::GetChannel() id); 0 when it went by DDE.
+    std::uint64_t GetLastSendChannel() const { return amLastSendChannel; }
+    // The id of the open channel to `asApp`, 0 when there is none.
+    std::uint64_t ChannelId(const std::string& asApp) const;
     // Whether connection `alChannel` (VELTRAEvent::GetChannel()) is open.
     bool IsChannelOpen(std::uint64_t alChannel) const;
     std::size_t ChannelCount() const { return amAllChannels.size(); }
@@ -223,6 +228,7 @@ class NXBASE_EXPORT Pipe {
     std::map<std::string, int> amStarting;              // peers being started, their pids
     std::map<std::uint64_t, ChannelPtr> amAllChannels;  // every open connection, by id
     std::uint64_t amNextChannelId = 1;
+    std::uint64_t amLastSendChannel = 0;
     std::size_t amPartialBytes = 0;
     std::unique_ptr<DDE> pmDDE;  // the older transport, for peers on the bus
 };

@@ -847,6 +847,7 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
         nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
+        amLastSendChannel = 0;
         return SendByDde(asApp, asCommand, asEncodedData) ||
                Fail("DDE send to " + asApp + " failed");
     }
@@ -855,9 +856,11 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
     ChannelPtr channel = ChannelTo(asApp);
     bool byDde = false;
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
+    amLastSendChannel = 0;
     if (byDde)
         return SendByDde(asApp, asCommand, asEncodedData) ||
                Fail("DDE send to " + asApp + " failed");
+    amLastSendChannel = channel->id;
     return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + asApp + " failed: " + channel->closedWhy);
 }
@@ -883,6 +886,11 @@ bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
                      std::string_view asEncodedData) {
     if (!pmDDE || !pmDDE->IsActive()) return false;
     return pmDDE->Send(asApp, asCommand, std::string(asEncodedData));
+}
+
+std::uint64_t Pipe::ChannelId(const std::string& asApp) const {
+    auto at = amChannels.find(asApp);
+    return at == amChannels.end() || at->second->closed ? 0 : at->second->id;
 }
 
 bool Pipe::IsChannelOpen(std::uint64_t alChannel) const {

@@ -127,6 +127,7 @@ PostOffice::PostOffice(const String& asAppName)
 // answer, failure or abandonment.
 struct PostOffice::Request {
     std::pair<std::string, int> key;  // the peer and the answer's number
+    std::uint64_t channel = 0;        // the connection it went out on (0: DDE)
     bool finished = false;            // its caller no longer waits
     bool answered = false;
     std::optional<MyMemoryBlock> data;  // the answer: nothing allocated before it comes
@@ -251,6 +252,16 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
     auto at = amOutstanding.find({axEvent.GetSender(), alNumber});
     if (at == amOutstanding.end() || at->second.empty()) {
         LogFile::WriteToLog(String("Answer nobody waits for dropped: ") +
+                                String(axEvent.GetCommand()) + " from " +
+                                String(axEvent.GetSender()),
+                            String(kLogKey));
+        return;
+    }
+    // A peer answers on the connection the request came in on; an answer on
+    // another (a peer that reconnected to deliver what an earlier post office
+    // of this name asked) belongs to no request of ours.
+    if (at->second.front()->channel != axEvent.GetChannel()) {
+        LogFile::WriteToLog(String("Answer on another connection than its request's dropped: ") +
                                 String(axEvent.GetCommand()) + " from " +
                                 String(axEvent.GetSender()),
                             String(kLogKey));
@@ -643,6 +654,7 @@ bool PostOffice::SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& ax
     int message = pRequest->key.second - kAnswerOffset;
     if (!SendCommand(app, nxbase::CommandTextOfNumber(message), axSend, fKeepTrying, axStart))
         return false;
+    if (Pipe* pipe = Pipe::Instance()) pRequest->channel = pipe->GetLastSendChannel();
     amOutstanding[pRequest->key].push_back(pRequest);
     return true;
 }

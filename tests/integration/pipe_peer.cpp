@@ -1,8 +1,9 @@
 // A peer for the transport tests: listens under the name given as its first
 // argument (or "EchoPeer"), writes its command line and working directory to
 // $NXBASE_RUNTIME_DIR/<name>.started, and answers every message with
-// "ANSWER!" + the command and the same data. "QUIT" ends it; CANCEL_REQUEST
-// makes it die without an answer, IS_APP_READY is never answered. Data that
+// "ANSWER!" + the command and the same data, on the connection the command
+// came in on (or by DDE). "QUIT" ends it; CANCEL_REQUEST makes it die without
+// an answer, IS_APP_READY is never answered. Data that
 // begins with "LATE" and a 4-byte little-endian count of milliseconds is
 // answered that much later; answers always leave in the order their
 // commands came, as a post office's handlers answer.
@@ -25,7 +26,9 @@ namespace {
 
 struct PendingAnswer {
     std::chrono::steady_clock::time_point due;
-    std::string peer, command;
+    std::uint64_t channel;  // answers go back on the connection the command came in on
+    std::string peer;       // or by DDE, which has none (0)
+    std::string command;
     MyMemoryBlock data;
 };
 std::deque<PendingAnswer> gPending;
@@ -36,7 +39,12 @@ void SendDueAnswers() {
     auto now = std::chrono::steady_clock::now();
     while (!gPending.empty() && gPending.front().due <= now) {
         PendingAnswer& answer = gPending.front();
-        Pipe::Instance()->Send(answer.peer, kAnswerPrefix + answer.command, answer.data);
+        const std::string command = kAnswerPrefix + answer.command;
+        if (answer.channel != 0) {
+            Pipe::Instance()->SendOnChannel(answer.channel, command, answer.data);
+        } else {
+            Pipe::Instance()->Send(answer.peer, command, answer.data);
+        }
         gPending.pop_front();
     }
     if (gPending.empty()) return;
@@ -66,7 +74,8 @@ void Echo(VELTRAEvent& event) {
     gLastDue = due;
     nxbase::EncodeBlock(data);
     bool idle = gPending.empty();
-    gPending.push_back({due, event.GetSender(), event.GetCommand(), std::move(data)});
+    gPending.push_back(
+        {due, event.GetChannel(), event.GetSender(), event.GetCommand(), std::move(data)});
     if (idle) SendDueAnswers();
 }
 
