@@ -251,6 +251,7 @@ TEST_F(LumaServerTest, AnIdleServerSleeps) {
     RunUntil([] { return false; }, 3s);
     long woken = nxtest::ProcStatusField(status, "voluntary_ctxt_switches") - before;
     EXPECT_LE(woken, 2) << "wake-ups of an idle lumaserver in 3 s";
+    std::printf("idle lumaserver: %ld voluntary context switches in 3 s\n", woken);
 }
 
 TEST_F(LumaServerTest, ASubscriberThatCannotBeReachedHoldsNobodyUp) {
