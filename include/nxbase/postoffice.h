@@ -7,7 +7,9 @@
 //
 // Every answer block starts with a status byte: 0 done, 1 refused (an
 // unknown message, or the application is locked by another peer), 2 not
-// supported. Everything here runs on the event-loop thread.
+// supported; except CONNECT's, whose one byte is the protocol level both
+// sides speak (at most 3; nxbase::ProtocolLevel reads it). Everything here
+// runs on the event-loop thread.
 #ifndef NXBASE_POSTOFFICE_H_
 #define NXBASE_POSTOFFICE_H_
 
