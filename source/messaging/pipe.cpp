@@ -737,6 +737,7 @@ bool Pipe::OnDdeBus(const std::string& asApp) {
 bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, ChannelPtr& axChannel,
                  bool& abByDde) {
     if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
+    if (amDoomed) return Fail("the transport was closed");  // by a handler the wait ran
     if ((abByDde = OnDdeBus(asApp))) return true;
     if (!amRefusal.empty() && !(pmDDE && pmDDE->IsActive())) return Fail(amRefusal);
     SendScope& scope = *pmScope;

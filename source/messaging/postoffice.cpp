@@ -158,6 +158,9 @@ PostOffice::~PostOffice() {
     }
     amTimer.Stop();
     amQuitTimer.Stop();
+    // A send of the transport may still be on the stack (it outlives this
+    // object then): it must not look at this office's table again.
+    if (Pipe* pipe = Pipe::Instance()) pipe->SetApplications(nullptr);
     Pipe::DeletePipe();
     if (smInstance == this) smInstance = nullptr;
 }
