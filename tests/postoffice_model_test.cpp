@@ -137,7 +137,7 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
         const int message = kMessages[below(3)];
         const int late = chance(0.05) ? 1 + below(8) : 0;
         const int op = below(100);
-        reopened();  // a wait in the step before may have run the closing timer
+        reopened();     // a wait in the step before may have run the closing timer
         if (op < 45) {  // blocking, given up now and then
             const bool giveUp = chance(0.1);
             auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(below(6));
