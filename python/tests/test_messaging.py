@@ -121,3 +121,24 @@ def test_one_client_per_process_and_close_from_another_thread(sandbox):
         "print('again: True')\n",
         sandbox)
     assert out.splitlines() == ["second refused: True", "closed: True True", "again: True"]
+
+
+def test_a_forked_child_that_exits_leaves_the_parents_client_alone(sandbox):
+    out = run_python(
+        "import nxbase, os, sys\n"
+        "client = nxbase.Client('pytest')\n"
+        "print(client.send('LumaServer', 'CONNECT', [('b', 2)])[0])\n"
+        "socket = os.path.join(os.environ['NXBASE_RUNTIME_DIR'], 'PipeRequest-pytest')\n"
+        "child = os.fork()\n"
+        "if child == 0:\n"
+        "    client.close()\n"
+        "    os._exit(0)\n"
+        "os.waitpid(child, 0)\n"
+        "child = os.fork()\n"
+        "if child == 0:\n"
+        "    sys.exit(0)\n"
+        "os.waitpid(child, 0)\n"
+        "print(os.path.exists(socket), client.send('LumaServer', 'GET_DEVICE_NAME')[0])\n"
+        "client.post('LumaServer', 'DISCONNECT')\n",
+        sandbox)
+    assert out.splitlines() == ["2", "True 0"]
