@@ -756,22 +756,27 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
     PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
     if (!StartForScope(asApp, application)) return false;
     std::string why;
-    bool startNow = false;
-    auto ready = [&] {
+    auto reachable = [&] {
         // A send nested in this wait may have opened the channel already.
         if ((axChannel = ChannelTo(asApp))) return true;
         if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
-        if ((abByDde = OnDdeBus(asApp))) return true;
-        // The instance that held the name when this send began has ended.
-        return startNow = !scope.amStarted && !nxbase::IsApplicationRunning(asApp);
+        return (abByDde = OnDdeBus(asApp));
     };
-    toolkit::StartWait result = WaitForStart(asApp, ready, why);
+    // Not started because an instance held the name: when that one has ended
+    // before becoming reachable, start one, once.
+    bool startNow = false;
+    toolkit::StartWait result = WaitForStart(
+        asApp,
+        [&] {
+            return reachable() ||
+                   (startNow = !scope.amStarted && !nxbase::IsApplicationRunning(asApp));
+        },
+        why);
     if (startNow) {
         if (!StartForScope(asApp, application)) return false;
-        startNow = false;
-        result = WaitForStart(asApp, ready, why);
+        result = WaitForStart(asApp, reachable, why);
     }
-    if (result == toolkit::StartWait::kReady && !startNow) return true;
+    if (result == toolkit::StartWait::kReady && (axChannel || abByDde)) return true;
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
                 "): " + why);
 }

@@ -625,8 +625,8 @@ unsigned char PostOffice::SendCommand(const std::string& asApp, const std::strin
             NX_COMM_LOG(String("Sent: ") + String(command));
             return true;
         }
-        if (!alive.lock()) return false;
         ++retries;
+        // The loop runs between tries; a handler it runs may close this office.
         for (int i = 0; i < 10 && alive.lock(); ++i) Application::Get().Reschedule();
         if (alive.lock()) Application::Get().RunOneFor(std::chrono::milliseconds(1));
         if (!alive.lock()) return false;
@@ -638,9 +638,7 @@ unsigned char PostOffice::SendCommand(const std::string& asApp, const std::strin
         }
         // A start that failed, or a peer that must not be started, does not
         // come back by trying again.
-        if (retries > kMaxRetries || scope.Hopeless() || (fKeepTrying && !fKeepTrying()) ||
-            !alive.lock()) {
-            if (!alive.lock()) return false;
+        if (retries > kMaxRetries || scope.Hopeless() || (fKeepTrying && !fKeepTrying())) {
             LogFile::WriteToLog(String("Send ") + String(command) + " to " + String(asApp) +
                                     " failed: " + String(amLastError),
                                 String(kLogKey));
