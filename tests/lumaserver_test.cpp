@@ -354,6 +354,9 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     ASSERT_TRUE(RunUntil([&] { return done.has_value(); }));
     EXPECT_EQ(*done, "ok");
     EXPECT_EQ(ids, (std::vector<std::string>{"1", "2", "3"}));
+    // Nothing to measure is an error, not a success with no patches.
+    EXPECT_FALSE(nxbase::MeasureWithLumaServer(*office, 0, &measured, &error));
+    EXPECT_NE(error.find("at least 1"), std::string::npos) << error;
     EXPECT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
 }
 

@@ -56,7 +56,7 @@ NXBASE_EXPORT bool DecodeSpectrumAnswer(MyMemoryBlock& axAnswer, MeasuredSpectru
                                         std::string* pError);
 
 // Appends `count` measurements to *out. False, with the reason in *error,
-// when the server cannot be reached, refuses, is lost, measures a patch out
+// when `count` is below 1, when the server cannot be reached, refuses, is lost, measures a patch out
 // of turn or sends a malformed spectrum; what was measured until then stays
 // in *out. `keepWaiting`, when given, is asked while each answer is awaited
 // (false gives up); without it the post office's own waiting rules apply. A
@@ -75,7 +75,8 @@ NXBASE_EXPORT bool MeasureWithLumaServer(PostOffice& axOffice, int alCount,
 // The same measurement on the event loop, for GUI applications: Start()
 // returns at once, `onPatch` is called with each spectrum as it comes
 // (patch numbers from 1), and `onDone` once at the end with the outcome.
-// Abort() ends it before the next request (onDone then says so). Destroying
+// Abort() ends it before the next request (onDone then says so); a count
+// below 1 is refused through onDone at once. Destroying
 // the session ends it without calling back; the server is unlocked and
 // disconnected in every case, unless it was lost.
 class NXBASE_EXPORT MeasurementSession {

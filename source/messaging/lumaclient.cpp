@@ -170,6 +170,10 @@ bool DecodeSpectrumAnswer(MyMemoryBlock& axAnswer, MeasuredSpectrum* pOut, std::
 bool MeasureWithLumaServer(PostOffice& axOffice, int alCount, std::vector<MeasuredSpectrum>* pOut,
                            std::string* pError, ProgressListener* pProgress,
                            boost::function<bool()> fKeepWaiting) {
+    if (alCount < 1) {
+        *pError = "the number of patches must be at least 1, not " + std::to_string(alCount);
+        return false;
+    }
     Exchange exchange(axOffice, fKeepWaiting, pError);
     MyMemoryBlock level, answer, none;
     level << static_cast<unsigned char>(2);
@@ -317,6 +321,12 @@ MeasurementSession::~MeasurementSession() {
 void MeasurementSession::Start() {
     State& state = *pmState;
     if (state.running) return;
+    if (state.count < 1) {
+        if (state.onDone)
+            state.onDone(false, "the number of patches must be at least 1, not " +
+                                    std::to_string(state.count));
+        return;
+    }
     state.running = true;
     state.aborted = state.lost = false;
     state.patch = 1;
