@@ -56,12 +56,11 @@ NXBASE_EXPORT bool DecodeSpectrumAnswer(MyMemoryBlock& axAnswer, MeasuredSpectru
                                         std::string* pError);
 
 // Appends `count` measurements to *out. False, with the reason in *error,
-// when `count` is below 1, when the server cannot be reached, refuses, is lost, measures a patch out
-// of turn or sends a malformed spectrum; what was measured until then stays
-// in *out. `keepWaiting`, when given, is asked while each answer is awaited
-// (false gives up); without it the post office's own waiting rules apply. A
-// progress listener that says it was aborted stops the measurement before
-// the next patch.
+// when `count` is below 1, when the server cannot be reached, refuses, is lost, measures a patch
+// out of turn or sends a malformed spectrum; what was measured until then stays in *out.
+// `keepWaiting`, when given, is asked while each answer is awaited (false gives up); without it the
+// post office's own waiting rules apply. A progress listener that says it was aborted stops the
+// measurement before the next patch.
 //
 // It sends CONNECT first and DISCONNECT last: the server counts each
 // application's CONNECTs and ends one second after the last is matched, so a
