@@ -1,10 +1,15 @@
 // Colour functions over NumPy arrays, on the library's batch path.
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <atomic>
 #include <cctype>
+#include <cerrno>
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <filesystem>
 #include <limits>
 #include <map>
 #include <memory>
@@ -554,10 +559,29 @@ void Warn(PyObject* category, const std::string& message) {
     if (PyErr_WarnEx(category, message.c_str(), 1) != 0) throw py::error_already_set();
 }
 
+// A file that cannot be opened raises the OSError Python's open() would
+// (FileNotFoundError, PermissionError, IsADirectoryError).
+void RaiseIfUnopenable(const std::string& path) {
+    if (path == "-") return;
+    std::error_code ignored;
+    int error = std::filesystem::is_directory(path, ignored) ? EISDIR : 0;
+    if (error == 0) {
+        const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+        if (fd < 0) error = errno;
+        if (fd >= 0) ::close(fd);
+    }
+    if (error == 0) return;
+    errno = error;
+    PyErr_SetFromErrnoWithFilename(PyExc_OSError, path.c_str());
+    throw py::error_already_set();
+}
+
 py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool native) {
     const std::string path =
         py::str(py::module_::import("os").attr("fspath")(pathLike)).cast<std::string>();
     nxbase::SpectralReadOptions options;
+    options.percentChoice = "scale=\"percent\"";
+    options.fractionChoice = "scale=\"fraction\"";
     if (scale == "percent") {
         options.scale = nxbase::SpectralScale::kPercent;
     } else if (scale == "fraction") {
@@ -565,6 +589,7 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool
     } else if (scale != "auto") {
         throw py::value_error("scale must be \"auto\", \"percent\" or \"fraction\"");
     }
+    RaiseIfUnopenable(path);
     nxbase::SpectralSet set;
     nxbase::SpectraTable table;
     std::string error;
@@ -575,15 +600,9 @@ py::tuple ReadSpectra(const py::object& pathLike, const std::string& scale, bool
         if (read) table = nxbase::ToStandardGrid(set);
     }
     if (!read) throw py::value_error(error);
-    if (table.unusable)
-        throw py::value_error(table.errors.empty() ? path + ": unusable" : table.errors.front());
-    if (table.rows.empty()) {
-        throw py::value_error(table.errors.empty()
-                                  ? path + ": no spectra"
-                                  : path + ": no spectra; " + table.errors.front());
-    }
     for (const std::string& message : table.errors) Warn(gDataWarning, message);
     if (!table.scaleNote.empty()) Warn(gScaleWarning, table.scaleNote);
+    for (const std::string& assumption : table.assumptions) Warn(gDataWarning, assumption);
     py::list ids, names;
     const py::ssize_t bands =
         native ? static_cast<py::ssize_t>(table.sourceWavelengths.size()) : kBands;
@@ -726,10 +745,15 @@ void RegisterColour(py::module_& m) {
         py::arg("native") = false,
         "Reads a CSV or CGATS spectral file of any grid (as nxcolor does) and returns (ids, names, "
         "spectra) "
-        "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows become "
-        "SpectralDataWarning; a scale that was guessed (the file does not say, scale=\"auto\") a "
+        "with spectra float32 of shape (N, 36). path: str or os.PathLike. Rejected rows, and what "
+        "the reading assumed (end values held where the grid stops short of 380..730 nm, the id "
+        "fields of a headerless file), become SpectralDataWarning; a scale that was guessed (the "
+        "file does not say, scale=\"auto\") a "
         "SpectralScaleWarning saying which and why; an unreadable or unusable file, or one without "
-        "spectra, raises ValueError. scale: \"auto\", \"percent\" or \"fraction\". native=True "
+        "spectra, raises ValueError (a file that cannot be opened the OSError open() raises, "
+        "FileNotFoundError for a missing one); so does a file whose spectra disagree on the "
+        "scale (some only percent explains, others fit reflectance factors) unless scale says "
+        "which it holds. scale: \"auto\", \"percent\" or \"fraction\". native=True "
         "returns "
         "(ids, names, spectra, wavelengths) with the spectra as read, on the file's own grid, for "
         "spectra_to_XYZ/Lab(..., wavelengths=wavelengths).");

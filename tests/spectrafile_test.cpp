@@ -176,41 +176,44 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
               std::string::npos)
         << detected.scaleNote;
 
-    // The whole file decides, never one row. A typo (50 for 0.50) in a file
-    // of reflectance factors rejects that row with a hint and keeps the
-    // others as they are.
+    // The whole file decides, never a vote among rows: a typo (50 for 0.50)
+    // among reflectance factors and a white beside dark patches in percent
+    // look alike, so spectra that disagree refuse the file, naming both sides.
     std::string typo = Header();
-    for (int i = 1; i <= 5; ++i) typo += "\n" + std::to_string(i) + ",f," + Values(0.5);
-    typo += "\n6,typo,50," + Values(0.5, 35) + "\n";
+    for (int i = 1; i <= 7; ++i) typo += "\n" + std::to_string(i) + ",f," + Values(0.5);
+    typo += "\n8,typo,50," + Values(0.5, 35) + "\n";
     const SpectraTable mixed = nxbase::ParseSpectraCsv(typo, "t.csv");
-    EXPECT_FALSE(mixed.percent);
-    ASSERT_EQ(mixed.rows.size(), 5u);
-    EXPECT_EQ(mixed.rows[0].values[3], 0.5f);
-    ExpectOnlyError(
-        mixed,
-        "t.csv:7: a value of 50.00 fits only percentages, while the other spectra read as "
-        "reflectance factors; --percent or --fraction");
-    // Rows beyond both scales take no part in the vote: one row of 1e4 does
-    // not outvote the single percent row.
+    EXPECT_TRUE(mixed.unusable);
+    EXPECT_TRUE(mixed.rows.empty());
+    ExpectOnlyError(mixed,
+                    "t.csv: the scale is unclear: line 9 fits only percentages (values up to "
+                    "50.00), lines 2, 3, 4, 5, 6 and 2 more read as reflectance factors (or as "
+                    "dark patches in percent); --percent or --fraction says which");
+    // With the scale given, the rows that do not fit it are refused at their line.
+    const SpectraTable fractionTold =
+        nxbase::ParseSpectraCsv(typo, "t.csv", {SpectralScale::kFraction});
+    EXPECT_EQ(fractionTold.rows.size(), 7u);
+    ExpectOnlyError(fractionTold, "t.csv:9: value 50.000000 is not a reflectance factor");
+    // Rows beyond both scales take no part: rows of 1e4 do not outvote the
+    // single percent row.
     const SpectraTable beyond = nxbase::ParseSpectraCsv(
         Header() + "\n1,p," + Values(40.0) + "\n2,x," + Values(1e4) + "\n3,y," + Values(1e4) + "\n",
         "b.csv");
     EXPECT_TRUE(beyond.percent);
     EXPECT_EQ(beyond.rows.size(), 1u);
-    // Dark patches in percent without SPECTRAL_NORM: every value at most 1.5
-    // reads as reflectance factors, but a mean above 1.05 where Y lies is
-    // brighter than any reflectance: an error with the hint, not Y 118.
+    // Dark patches in percent beside a brighter one: 1.18 everywhere is
+    // brighter than any reflectance as a factor, so only percent explains
+    // it; 0.9 fits both: refused, not Y 118.
     std::string dark = Header() + "\n1,d," + Values(1.18) + "\n2,e," + Values(0.9) + "\n";
     const SpectraTable guessed = nxbase::ParseSpectraCsv(dark, "d.csv");
-    EXPECT_FALSE(guessed.percent);
-    ExpectOnlyError(
-        guessed,
-        "d.csv:2: as reflectance factors this is brighter than any reflectance (Y about 118 % "
-        "of the white); if the file holds percentages, --percent");
-    EXPECT_NE(
-        guessed.scaleNote.find("read as reflectance factors (white = 1): no value is above 1.5"),
-        std::string::npos)
-        << guessed.scaleNote;
+    ExpectOnlyError(guessed, "d.csv: the scale is unclear: line 2 fits only percentages");
+    const SpectraTable allDark =
+        nxbase::ParseSpectraCsv(Header() + "\n2,e," + Values(0.9) + "\n", "a.csv");
+    EXPECT_NE(allDark.scaleNote.find(
+                  "read as reflectance factors (white = 1): no value is above 1.5 and the file "
+                  "does not give its scale; if it holds dark patches in percent, --percent"),
+              std::string::npos)
+        << allDark.scaleNote;
     const SpectraTable told = nxbase::ParseSpectraCsv(dark, "d.csv", {SpectralScale::kPercent});
     EXPECT_EQ(told.rows.size(), 2u);
     EXPECT_TRUE(told.scaleNote.empty());
@@ -220,6 +223,14 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     EXPECT_TRUE(forced.rows.empty());
     ASSERT_EQ(forced.errors.size(), 1u);
     EXPECT_NE(forced.errors[0].find("p.csv:2: value 50"), std::string::npos) << forced.errors[0];
+    // Readers for other users name the choices their way.
+    SpectralReadOptions keyword;
+    keyword.percentChoice = "scale=\"percent\"";
+    keyword.fractionChoice = "scale=\"fraction\"";
+    EXPECT_NE(nxbase::ParseSpectraCsv(dark, "d.csv", keyword)
+                  .errors.at(0)
+                  .find("scale=\"percent\" or scale=\"fraction\" says which"),
+              std::string::npos);
     // A fraction file stays as it is: 1.25 in the blue is a fluorescent
     // paper's brightener, not percent, and its Y stays below the limit.
     const std::string paper = Values(1.25, 11) + "," + Values(0.92, 25);
@@ -335,7 +346,7 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     ExpectOnlyError(
         refused,
         "x.sp: the header (SPECTRAL_BANDS 36, SPECTRAL_START_NM 377.5, SPECTRAL_END_NM 727.5) "
-        "contradicts the 71 spectral fields");
+        "contradicts the data format's 71 spectral fields (378..728 nm)");
     for (const auto& [text, expected] : faults) {
         const SpectraTable t = nxbase::ParseSpectra(text, "c");
         EXPECT_TRUE(t.unusable) << expected;
@@ -346,6 +357,100 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
     ASSERT_EQ(broken.errors.size(), 1u);
     EXPECT_EQ(broken.errors[0].rfind("b:", 0), 0u) << broken.errors[0];
     EXPECT_NE(broken.errors[0].back(), '\n') << "LittleCMS's own line end is dropped";
+}
+
+// Files whose layout once read into wrong numbers: each is read as it
+// stands or refused with a reason.
+TEST(SpectraFile, ReadsEveryValueUnderItsOwnWavelengthOrRefuses) {
+    // Irregular SPEC_nnn names: the names give the grid; keywords that
+    // contradict them refuse the file, naming both.
+    const int irregular[] = {380, 390, 400, 415, 430, 450, 480, 520, 560, 600, 650, 700, 730};
+    auto argyll = [&](const std::string& keywords) {
+        std::string text =
+            "CGATS.17\n" + keywords + "NUMBER_OF_FIELDS 14\nBEGIN_DATA_FORMAT\nSAMPLE_ID";
+        for (int nm : irregular) text += " SPEC_" + std::to_string(nm);
+        text += "\nEND_DATA_FORMAT\nNUMBER_OF_SETS 1\nBEGIN_DATA\nA";
+        for (int nm : irregular) text += " " + std::to_string(nm / 1000.0);
+        return text + "\nEND_DATA\n";
+    };
+    const nxbase::SpectralSet named = nxbase::ReadSpectralText(argyll(""), "i.ti3");
+    ASSERT_EQ(named.samples.size(), 1u) << named.errors.at(0);
+    for (std::size_t k = 0; k < named.wavelengths.size(); ++k)
+        EXPECT_FLOAT_EQ(named.samples[0].values[k], named.wavelengths[k] / 1000.0) << k;
+    ExpectOnlyError(
+        nxbase::ParseSpectra(
+            argyll("SPECTRAL_BANDS 13\nSPECTRAL_START_NM 380\nSPECTRAL_END_NM 730\n"), "i.ti3"),
+        "i.ti3: the header (SPECTRAL_BANDS 13, SPECTRAL_START_NM 380, SPECTRAL_END_NM 730) "
+        "contradicts the data format's field SPEC_390 (390 nm where they put 409.17 nm)");
+
+    // CSV headers that descend or carry decimals: each value stays under
+    // its wavelength, so both read as the ascending integer header does.
+    auto header = [](int from, int to, int step, const char* format) {
+        std::string text = "id";
+        char field[32];
+        for (int nm = from; step > 0 ? nm <= to : nm >= to; nm += step) {
+            std::snprintf(field, sizeof field, format, static_cast<double>(nm));
+            text += std::string(",") + field;
+        }
+        return text;
+    };
+    std::string ascending, descending;
+    for (int nm = 380; nm <= 730; nm += 10) ascending += "," + std::to_string(nm / 1000.0);
+    for (int nm = 730; nm >= 380; nm -= 10) descending += "," + std::to_string(nm / 1000.0);
+    const SpectraTable reference =
+        nxbase::ParseSpectraCsv(header(380, 730, 10, "%.0f") + "\nA" + ascending + "\n", "a.csv");
+    for (const std::string& text : {header(730, 380, -10, "%.0f") + "\nA" + descending,
+                                    header(380, 730, 10, "%.1f") + "\nA" + ascending,
+                                    header(730, 380, -10, "%.1f nm") + "\nA" + descending}) {
+        const SpectraTable t = nxbase::ParseSpectraCsv(text + "\n", "h.csv");
+        ASSERT_EQ(t.rows.size(), 1u) << text.substr(0, 40);
+        EXPECT_EQ(t.rows[0].values, reference.rows.at(0).values) << text.substr(0, 40);
+        EXPECT_TRUE(t.errors.empty() && t.assumptions.empty()) << text.substr(0, 40);
+    }
+
+    // Coverage: outside the visible refused; short of 380..730 said.
+    for (const auto& [first, last] : {std::pair{900, 1000}, {200, 300}, {420, 700}, {400, 690}}) {
+        const SpectraTable t = nxbase::ParseSpectraCsv(
+            header(first, last, 10, "%.0f") + "\nA," + Values(0.5, (last - first) / 10 + 1) + "\n",
+            "c.csv");
+        EXPECT_TRUE(t.unusable && t.rows.empty()) << first;
+        ExpectOnlyError(t, "c.csv: the spectra cover " + std::to_string(first) + ".." +
+                               std::to_string(last) + " nm, ");
+    }
+    const SpectraTable held = nxbase::ParseSpectraCsv(
+        header(400, 700, 10, "%.0f") + "\nA," + Values(0.5, 31) + "\n", "v.csv");
+    ASSERT_EQ(held.rows.size(), 1u);
+    EXPECT_EQ(held.assumptions, std::vector<std::string>{
+                                    "v.csv: the spectra cover 400..700 nm: the value at 400 nm is "
+                                    "held down to 380 nm, the value at 700 nm up to 730 nm"});
+
+    // A headerless row's id fields are said; a UTF-8 byte order mark before
+    // CGATS is skipped; UTF-16 is named.
+    const SpectraTable headerless = nxbase::ParseSpectraCsv("7," + Values(0.5) + "\n", "n.csv");
+    ASSERT_EQ(headerless.rows.size(), 1u);
+    EXPECT_EQ(headerless.rows[0].sampleId, "7");
+    ASSERT_EQ(headerless.assumptions.size(), 1u);
+    EXPECT_NE(headerless.assumptions[0].find("n.csv:1: no header: the last 36 of the 37 fields"),
+              std::string::npos)
+        << headerless.assumptions[0];
+    EXPECT_EQ(nxbase::ParseSpectra("\xEF\xBB\xBF" + argyll(""), "b.ti3").rows.size(), 1u);
+    std::string utf16 = "\xFF\xFE";
+    for (char c : Header()) utf16 += std::string{c, '\0'};
+    ExpectOnlyError(nxbase::ParseSpectra(utf16, "u.csv"),
+                    "u.csv: UTF-16 text; save the file as UTF-8");
+    ExpectOnlyError(nxbase::ParseSpectra(utf16.substr(2), "u.csv"), "u.csv: UTF-16 text");
+
+    // A file that gives nothing is false with its reason, never an empty success.
+    nxtest::TempDir dir;
+    const std::string broken = dir.File("broken.txt");
+    std::ofstream(broken) << "CGATS.17\nBEGIN_DATA_FORMAT\nKEYWORD\n";
+    nxbase::SpectralSet set;
+    std::string error;
+    EXPECT_FALSE(nxbase::ReadSpectralFile(broken, {}, &set, &error));
+    EXPECT_EQ(error.rfind(broken + ":", 0), 0u) << error;
+    std::ofstream(broken, std::ios::trunc) << Header() << "\n";
+    EXPECT_FALSE(nxbase::ReadSpectralFile(broken, {}, &set, &error));
+    EXPECT_EQ(error, broken + ": no spectra");
 }
 
 TEST(SpectraFile, StreamsAreBoundedAndAgreeWithText) {

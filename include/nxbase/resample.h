@@ -16,6 +16,7 @@
 #define NXBASE_RESAMPLE_H_
 
 #include <cstddef>
+#include <string>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -24,6 +25,18 @@ namespace nxbase {
 
 // 380, 390, ..., 730 nm: the grid of the library's weights.
 NXBASE_EXPORT std::vector<double> StandardWavelengths();
+
+// The range a spectrum must cover to be given a colour. Holding the end values
+// of data that stop short of it by more would invent colour: ASTM E308 holds
+// them for a few bands, not across hundreds of nanometres.
+constexpr double kVisibleFrom = 400.0;
+constexpr double kVisibleTo = 700.0;
+// "" when the increasing `wavelengths` reach from kVisibleFrom to kVisibleTo;
+// else why not, in words ("covers 900..1000 nm, not the visible 400..700 nm").
+NXBASE_EXPORT std::string VisibleCoverageProblem(const std::vector<double>& wavelengths);
+// How far the end values are held to fill `from`..`to` nm ("the value at 400
+// nm is held down to 380 nm"); "" when the grid reaches both.
+NXBASE_EXPORT std::string HeldEnds(const std::vector<double>& wavelengths, double from, double to);
 
 class NXBASE_EXPORT SpectralResampler {
   public:

@@ -9,32 +9,43 @@
 // byte order mark are accepted. Numbers never depend on the locale. A dialect
 // other than "," is named in the notes. An optional header is the first
 // content line that ends in wavelength names ("r380", "380", "nm380",
-// "SPEC_380", "SPECTRAL_NM380", "SPECTRAL_NM_380", "380nm", "380 nm"); its trailing
-// wavelength fields must increase and give the grid; fields before them are
-// ids (the first one the sample id, the second its name). A header of bare
-// numbers ("id,380,390,...") is recognised by its increasing whole numbers from
-// 200 to 2600. Without a header the last 36 fields of each row are 380..730 nm
-// and the fields before them the id.
+// "SPEC_380", "SPECTRAL_NM380", "SPECTRAL_NM_380", "380nm", "380 nm",
+// "382.5"); its trailing wavelength fields must increase or decrease and give
+// the grid (a decreasing header is read as it stands: each value under its
+// own wavelength); fields before them are ids (the first one the sample id,
+// the second its name). A header of bare numbers ("id,380,390,..." or
+// "400.0,410.0,...") is recognised by its monotonic numbers from 200 to 2600.
+// Without a header the last 36 fields of each row are 380..730 nm and the
+// fields before them the id; that is said in `assumptions`.
 //
 // CGATS (CGATS.17 / IT8.7 / ArgyllCMS .ti3 and .sp), read with LittleCMS's
 // parser: the spectral fields of the data format in any of the spellings above
-// (ArgyllCMS "SPEC_nnn", X-Rite "nmnnn", LittleCMS "SPECTRAL_NM_nnn"); with
-// SPECTRAL_BANDS, SPECTRAL_START_NM and SPECTRAL_END_NM the grid is taken from
-// those (exact for fractional steps). SAMPLE_ID and SAMPLE_NAME are kept apart.
+// (ArgyllCMS "SPEC_nnn", X-Rite "nmnnn", LittleCMS "SPECTRAL_NM_nnn"). The
+// field names give the wavelengths; SPECTRAL_BANDS, SPECTRAL_START_NM and
+// SPECTRAL_END_NM, where given, must describe the same grid (they make
+// fractional steps exact) or the file is refused, naming both. SAMPLE_ID and
+// SAMPLE_NAME are kept apart. A UTF-8 byte order mark is skipped; UTF-16
+// text is refused by name.
+//
+// Coverage: a grid that does not reach from 400 to 700 nm is refused (its end
+// values would have to be held across hundreds of nanometres); one that stops
+// short of 380..730 nm is read, and how far its end values are held is said
+// in `assumptions`.
 //
 // Scale: as the caller says, else as the file says (SPECTRAL_NORM gives the
 // value that stands for 1.0; an ArgyllCMS "CTI3" file holds percent). Else it
-// is guessed from the whole file, never from one row: a spectrum with a value
-// above 1.5 can only be percent, one without fits both (a reflectance factor,
-// or a dark patch in percent); percent when such spectra are the majority,
-// reflectance factors otherwise. Under a guessed fraction scale a spectrum
-// that only percent explains is rejected, and so is one brighter than any
-// reflectance (a mean above 1.05 over 500..620 nm, where Y lies), each with
-// the hint --percent / --fraction; the guess and its reason are in
-// scaleNote. Spectra beyond both scales take no part in the guess. After
-// scaling, a spectrum with a value above kMaxPlausibleReflectance or below
-// -kMaxPlausibleReflectance, or with every value zero, is implausible: it is
-// reported with its line and left out, rather than turned into an L* of 300.
+// is decided from the whole file, never from one row: a spectrum with a value
+// above 1.5, or brighter than any reflectance as reflectance factors (a mean
+// above 1.05 over 500..620 nm, where Y lies), only percent explains; one
+// without fits both (a reflectance factor, or a dark patch in percent).
+// Percent when every spectrum needs it, reflectance factors when none does
+// (ambiguous when all are dark: scaleNote says so every time); when the
+// spectra disagree, the file is refused, naming the lines on each side, for
+// the caller to say which scale it holds (SpectralReadOptions::scale). Spectra
+// beyond both scales take no part. After scaling, a spectrum with a value
+// above kMaxPlausibleReflectance or below -kMaxPlausibleReflectance, or with
+// every value zero, is implausible: it is reported with its line and left
+// out, rather than turned into an L* of 300.
 //
 // No function here throws on any input or crashes on arbitrary bytes; input is
 // bounded (see the limits below) so that endless or binary input ends in an
@@ -97,6 +108,9 @@ struct NXBASE_EXPORT SpectralSet {
     // "<source>: read as ...: <why>; <the option that reads the other>".
     // Empty when the scale was given. Worth showing every time.
     std::string scaleNote;
+    // What the reading assumed where the file did not say (end values held,
+    // the id fields of a headerless file). Worth showing every time.
+    std::vector<std::string> assumptions;
     std::string format;  // "CSV" or "CGATS"
 
     bool HasErrors() const { return !errors.empty() || suppressedErrors > 0; }
@@ -105,6 +119,9 @@ struct NXBASE_EXPORT SpectralSet {
 struct NXBASE_EXPORT SpectralReadOptions {
     SpectralScale scale = SpectralScale::kAuto;
     std::size_t maxSamples = kMaxSamples;
+    // How messages name the two scale choices to the reader's user.
+    std::string percentChoice = "--percent";
+    std::string fractionChoice = "--fraction";
 };
 
 // Parses text already in memory; `source` names it in the messages.
@@ -115,7 +132,8 @@ NXBASE_EXPORT SpectralSet ReadSpectralText(std::string_view text, const std::str
 NXBASE_EXPORT SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source,
                                              const SpectralReadOptions& axOptions = {});
 // A file by name ("-" is standard input). False, with the reason in *pError,
-// when the file cannot be opened or read.
+// when the file cannot be opened or read, is unusable or holds no spectrum
+// that could be read; *pSet then still holds every message.
 NXBASE_EXPORT bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
                                     SpectralSet* pSet, std::string* pError);
 
@@ -142,7 +160,8 @@ struct NXBASE_EXPORT SpectraTable {
     std::vector<std::string> notes;
     bool unusable = false;
     bool percent = false;
-    std::string scaleNote;  // as SpectralSet::scaleNote
+    std::string scaleNote;                 // as SpectralSet::scaleNote
+    std::vector<std::string> assumptions;  // as SpectralSet::assumptions
     // The grid the spectra were read on, and how they were brought onto
     // 380..730/10 nm ("as read", "Sprague", "linear").
     std::vector<double> sourceWavelengths;
@@ -163,6 +182,7 @@ NXBASE_EXPORT SpectraTable ParseSpectraCsv(std::string_view text, const std::str
                                            const SpectralReadOptions& axOptions = {});
 NXBASE_EXPORT SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
                                              const SpectralReadOptions& axOptions = {});
+// As ReadSpectralFile, onto the 36-point grid.
 NXBASE_EXPORT bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
                                    SpectraTable* pTable, std::string* pError);
 

@@ -203,10 +203,12 @@ def test_bad_input_raises_with_the_librarys_words(tmp_path):
         nxbase.delta_E(np.zeros((2, 3)), np.zeros((3, 3)))
     with pytest.raises(ValueError, match="increase"):
         nxbase.resample([500, 490, 510], [0.1, 0.2, 0.3])
-    with pytest.raises(ValueError, match="cannot open"):
+    with pytest.raises(FileNotFoundError):
         nxbase.read_spectra(str(tmp_path / "missing.csv"))
+    with pytest.raises(IsADirectoryError):
+        nxbase.read_spectra(tmp_path)
     bad = tmp_path / "bad.csv"
-    bad.write_text("id,r400,r500,r600\nA,0.1,0.2,0.3\nB,0.1,x,0.3\n")
+    bad.write_text("id,r400,r550,r700\nA,0.1,0.2,0.3\nB,0.1,x,0.3\n")
     with warnings.catch_warnings(record=True) as caught:
         warnings.simplefilter("always")
         ids, _, spectra = nxbase.read_spectra(bad)  # os.PathLike

@@ -6,6 +6,7 @@
 #include <stdexcept>
 
 #include "nxbase/spectrafile.h"
+#include "spectrafile_parse.h"
 
 namespace nxbase {
 namespace {
@@ -41,6 +42,31 @@ std::vector<double> StandardWavelengths() {
     std::vector<double> grid(kSpectrumSize);
     for (int i = 0; i < kSpectrumSize; ++i) grid[i] = kFirstWavelength + kWavelengthStep * i;
     return grid;
+}
+
+std::string VisibleCoverageProblem(const std::vector<double>& wavelengths) {
+    if (wavelengths.empty()) return "no wavelengths";
+    const double first = wavelengths.front(), last = wavelengths.back();
+    if (first <= kVisibleFrom && last >= kVisibleTo) return "";
+    const std::string range = detail::Nm(first) + ".." + detail::Nm(last) + " nm";
+    const std::string visible = detail::Nm(kVisibleFrom) + ".." + detail::Nm(kVisibleTo) + " nm";
+    if (last < kVisibleFrom || first > kVisibleTo)
+        return "the spectra cover " + range + ", outside the visible " + visible;
+    return "the spectra cover " + range + ", not the whole visible " + visible +
+           "; holding their end values across the rest would invent colour";
+}
+
+std::string HeldEnds(const std::vector<double>& wavelengths, double from, double to) {
+    std::string held;
+    if (!wavelengths.empty() && wavelengths.front() > from) {
+        held = "the value at " + detail::Nm(wavelengths.front()) + " nm is held down to " +
+               detail::Nm(from) + " nm";
+    }
+    if (!wavelengths.empty() && wavelengths.back() < to) {
+        held += (held.empty() ? "the value at " : ", the value at ") +
+                detail::Nm(wavelengths.back()) + " nm up to " + detail::Nm(to) + " nm";
+    }
+    return held;
 }
 
 SpectralResampler::SpectralResampler(std::vector<double> source, std::vector<double> target)

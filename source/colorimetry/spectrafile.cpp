@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cmath>
 #include <cstdio>
 #include <cstring>
@@ -35,12 +36,13 @@ std::string Where(const std::string& source, int line) {
 
 // A spectrum far outside reflectance, or all zero, comes from a wrong scale
 // or a broken measurement; it would print as nonsense colour.
-std::string Implausible(const SpectralSample& sample) {
+std::string Implausible(const SpectralSample& sample, const SpectralReadOptions& axOptions) {
     bool allZero = true;
     for (const float v : sample.values) {
         if (std::fabs(v) > kMaxPlausibleReflectance) {
-            return "value " + std::to_string(v) +
-                   " is not a reflectance factor (scale wrong? see --percent)";
+            return "value " + detail::Decimal(v, 6) +
+                   " is not a reflectance factor (scale wrong? " + axOptions.percentChoice +
+                   " reads percentages)";
         }
         allZero = allZero && v == 0.0f;
     }
@@ -69,74 +71,96 @@ double YProxy(const SpectralSample& sample, const std::vector<double>& wavelengt
     return count > 0 ? sum / count : -1.0;
 }
 
-std::string Number(double value, int decimals) {
-    char text[64];
-    std::snprintf(text, sizeof text, "%.*f", decimals, value);
-    return text;
-}
-
 void DivideBy100(SpectralSample& sample) {
     for (float& v : sample.values) v = static_cast<float>(static_cast<double>(v) / 100.0);
 }
 
-// The scale of a file that does not state it, decided from all its rows: a
-// row with a value above 1.5 can only be percent; a row without one fits
-// both, as reflectance factors or as a dark patch in percent. The majority
-// decides; rows that only the other scale explains are rejected with a
-// hint, as are rows that read as reflectance factors brighter than any
-// reflectance. Rows beyond both scales take no part.
-void GuessScale(SpectralSet* pSet, const std::string& source) {
-    std::size_t needPercent = 0, fitFraction = 0;
+// Which scales explain a spectrum of a file that does not say its scale.
+enum class Fit { kBoth, kOnlyPercent, kNeither };
+
+Fit FitOf(const SpectralSample& sample, const std::vector<double>& wavelengths) {
+    const float m = Largest(sample);
+    if (m > 100.0 * kMaxPlausibleReflectance || m <= 0.0f) return Fit::kNeither;
+    if (m > kPercentThreshold || YProxy(sample, wavelengths) > kBrightestReflectance)
+        return Fit::kOnlyPercent;
+    return Fit::kBoth;
+}
+
+// "lines 2, 3 and 7 more": the first few lines of a group.
+std::string LinesOf(const std::vector<int>& lines) {
+    constexpr std::size_t kShown = 5;
+    std::string text = lines.size() == 1 ? "line " : "lines ";
+    for (std::size_t i = 0; i < lines.size() && i < kShown; ++i)
+        text += (i ? ", " : "") + (lines[i] > 0 ? std::to_string(lines[i]) : std::string("?"));
+    if (lines.size() > kShown) text += " and " + std::to_string(lines.size() - kShown) + " more";
+    return text;
+}
+
+// The scale of a file that does not state it, decided from all its rows:
+// percent when every spectrum needs it, reflectance factors when none does.
+// Spectra that disagree leave the choice to the user: a typo of 50 for 0.50
+// and a black beside a white in percent look alike to any vote.
+void GuessScale(SpectralSet* pSet, const SpectralReadOptions& axOptions,
+                const std::string& source) {
+    std::vector<int> onlyPercent, both;
     float largest = 0.0f;
     for (const SpectralSample& sample : pSet->samples) {
-        const float m = Largest(sample);
-        if (m > 100.0 * kMaxPlausibleReflectance) continue;
-        if (m > kPercentThreshold) {
-            ++needPercent;
-            largest = std::max(largest, m);
-        } else if (m > 0.0f) {
-            ++fitFraction;
+        const Fit fit = FitOf(sample, pSet->wavelengths);
+        if (fit == Fit::kOnlyPercent) {
+            onlyPercent.push_back(sample.line);
+            largest = std::max(largest, Largest(sample));
+        } else if (fit == Fit::kBoth) {
+            both.push_back(sample.line);
         }
     }
-    const std::string counts =
-        std::to_string(needPercent) + " of " + std::to_string(needPercent + fitFraction);
-    std::vector<SpectralSample> kept;
-    kept.reserve(pSet->samples.size());
-    if (needPercent > fitFraction) {
+    const std::string choices = axOptions.percentChoice + " or " + axOptions.fractionChoice;
+    if (!onlyPercent.empty() && !both.empty()) {
+        detail::AddError(pSet, source + ": the scale is unclear: " + LinesOf(onlyPercent) +
+                                   (onlyPercent.size() == 1 ? " fits" : " fit") +
+                                   " only percentages (values up to " +
+                                   detail::Decimal(largest, 2) + "), " + LinesOf(both) +
+                                   (both.size() == 1 ? " reads" : " read") +
+                                   " as reflectance factors (or as dark patches in percent); " +
+                                   choices + " says which the file holds");
+        pSet->unusable = true;
+        pSet->samples.clear();
+        return;
+    }
+    const std::string counts = std::to_string(onlyPercent.size()) + " of " +
+                               std::to_string(onlyPercent.size() + both.size());
+    if (!onlyPercent.empty()) {
         pSet->percent = true;
         for (SpectralSample& sample : pSet->samples) DivideBy100(sample);
         pSet->scaleNote = source + ": read as percentages: " + counts +
-                          " spectra have values above 1.5 (up to " + Number(largest, 2) +
-                          "); --fraction reads them as they stand";
+                          " spectra have values above 1.5 or are brighter than any reflectance "
+                          "(up to " +
+                          detail::Decimal(largest, 2) + "); " + axOptions.fractionChoice +
+                          " reads them as they stand";
         return;
     }
-    pSet->scaleNote = source + ": read as reflectance factors (white = 1): " +
-                      (needPercent == 0 ? std::string("no value is above 1.5")
-                                        : std::to_string(fitFraction) + " of " +
-                                              std::to_string(needPercent + fitFraction) +
-                                              " spectra stay at or below 1.5") +
-                      " and the file does not give its scale; --percent reads percentages";
-    for (SpectralSample& sample : pSet->samples) {
-        const float m = Largest(sample);
-        const double y = YProxy(sample, pSet->wavelengths);
-        if (m > kPercentThreshold && m <= 100.0 * kMaxPlausibleReflectance) {
-            detail::AddError(
-                pSet,
-                Where(source, sample.line) + ": a value of " + Number(m, 2) +
-                    " fits only percentages, while the other spectra read as reflectance factors; "
-                    "--percent or --fraction says which the file holds");
-        } else if (y > kBrightestReflectance) {
-            detail::AddError(
-                pSet, Where(source, sample.line) +
-                          ": as reflectance factors this is brighter than any "
-                          "reflectance (Y about " +
-                          Number(100.0 * y, 0) +
-                          " % of the white); if the file holds percentages, --percent reads it");
-        } else {
-            kept.push_back(std::move(sample));
-        }
+    pSet->scaleNote = source +
+                      ": read as reflectance factors (white = 1): no value is above 1.5 and the "
+                      "file does not give its scale; if it holds dark patches in percent, " +
+                      axOptions.percentChoice + " reads them";
+}
+
+// Refuses a grid that misses the visible; says how far the ends are held
+// where it stops short of the library's grid.
+void CheckCoverage(SpectralSet* pSet, const std::string& source) {
+    if (pSet->unusable || pSet->wavelengths.empty()) return;
+    const std::string problem = VisibleCoverageProblem(pSet->wavelengths);
+    if (!problem.empty()) {
+        detail::AddError(pSet, source + ": " + problem);
+        pSet->unusable = true;
+        pSet->samples.clear();
+        return;
     }
-    pSet->samples = std::move(kept);
+    const std::string held = HeldEnds(pSet->wavelengths, kFirstWavelength, kLastWavelength);
+    if (!held.empty()) {
+        pSet->assumptions.push_back(source + ": the spectra cover " +
+                                    detail::Nm(pSet->wavelengths.front()) + ".." +
+                                    detail::Nm(pSet->wavelengths.back()) + " nm: " + held);
+    }
 }
 
 }  // namespace
@@ -151,18 +175,33 @@ void AddError(SpectralSet* pSet, std::string message) {
     }
 }
 
-void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
-                 const std::string& axNormReason, const std::string& source) {
+std::string Nm(double wavelength) {
+    char text[32];
+    const auto result = std::to_chars(text, text + sizeof text, wavelength);
+    return std::string(text, result.ptr);
+}
+
+std::string Decimal(double value, int decimals) {
+    char text[400];
+    const auto result =
+        std::to_chars(text, text + sizeof text, value, std::chars_format::fixed, decimals);
+    return result.ec == std::errc() ? std::string(text, result.ptr) : Nm(value);
+}
+
+void FinishSet(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
+               const std::string& axNormReason, const std::string& source) {
+    CheckCoverage(pSet, source);
+    if (pSet->unusable) return;
     if (axOptions.scale == SpectralScale::kPercent) {
         pSet->percent = true;
         if (axFileNorm > 0.0) pSet->notes.push_back(source + ": values read as " + axNormReason);
     } else if (axOptions.scale == SpectralScale::kAuto) {
-        GuessScale(pSet, source);
+        GuessScale(pSet, axOptions, source);
     }
     std::vector<SpectralSample> kept;
     kept.reserve(pSet->samples.size());
     for (SpectralSample& sample : pSet->samples) {
-        const std::string problem = Implausible(sample);
+        const std::string problem = Implausible(sample, axOptions);
         if (problem.empty()) {
             kept.push_back(std::move(sample));
         } else {
@@ -178,16 +217,42 @@ bool LooksLikeCgats(std::string_view text) {
     return text.find("BEGIN_DATA_FORMAT") != std::string_view::npos;
 }
 
+namespace {
+
+constexpr std::string_view kUtf8Bom = "\xEF\xBB\xBF";
+
+// Text in UTF-16 (with a byte order mark, or with a NUL in every other byte)
+// is named as such: "binary data" would send the user looking for the wrong
+// fault.
+bool LooksLikeUtf16(std::string_view text) {
+    if (text.substr(0, 2) == "\xFF\xFE" || text.substr(0, 2) == "\xFE\xFF") return true;
+    const std::size_t n = std::min<std::size_t>(text.size(), 4096) & ~std::size_t{1};
+    std::size_t even = 0, odd = 0;
+    for (std::size_t i = 0; i < n; ++i) (i % 2 ? odd : even) += text[i] == '\0';
+    return n >= 8 && std::max(even, odd) * 10 >= n / 2 * 9 && std::min(even, odd) == 0;
+}
+
+// "" for text the readers take; else why not.
+std::string EncodingProblem(std::string_view text, const std::string& source) {
+    if (LooksLikeUtf16(text)) return source + ": UTF-16 text; save the file as UTF-8";
+    const std::size_t nul = text.find('\0');
+    if (nul == std::string_view::npos) return "";
+    return source + ": binary data (a NUL byte at offset " + std::to_string(nul) +
+           "), not a text file";
+}
+
+}  // namespace
+
 SpectralSet ReadSpectralText(std::string_view text, const std::string& source,
                              const SpectralReadOptions& axOptions) {
-    const std::size_t nul = text.find('\0');
-    if (nul != std::string_view::npos) {
+    const std::string problem = EncodingProblem(text, source);
+    if (!problem.empty()) {
         SpectralSet set;
-        detail::AddError(&set, source + ": binary data (a NUL byte at offset " +
-                                   std::to_string(nul) + "), not a text file");
+        detail::AddError(&set, problem);
         set.unusable = true;
         return set;
     }
+    if (text.substr(0, kUtf8Bom.size()) == kUtf8Bom) text.remove_prefix(kUtf8Bom.size());
     return LooksLikeCgats(text) ? detail::ReadCgatsText(text, source, axOptions)
                                 : detail::ReadCsvText(text, source, axOptions);
 }
@@ -253,7 +318,7 @@ SpectralSet StreamCsv(std::istream& in, std::string text, const std::string& sou
         start = end + 1;
     }
     parser.Finish();
-    detail::FinishScale(&set, axOptions, 0.0, "", source);
+    detail::FinishSet(&set, axOptions, 0.0, "", source);
     return set;
 }
 
@@ -264,6 +329,7 @@ SpectralSet ReadSpectralStream(std::istream& axInput, const std::string& source,
     try {
         std::string head;
         if (!ReadMore(axInput, &head, kSniffBytes)) return Unusable(source + ": read error");
+        if (LooksLikeUtf16(head)) return Unusable(EncodingProblem(head, source));
         if (!LooksLikeCgats(head)) return StreamCsv(axInput, std::move(head), source, axOptions);
         if (!ReadMore(axInput, &head, kMaxCgatsBytes - head.size()))
             return Unusable(source + ": read error");
@@ -281,19 +347,27 @@ bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOpti
                       SpectralSet* pSet, std::string* pError) {
     if (path == "-") {
         *pSet = ReadSpectralStream(std::cin, "<stdin>", axOptions);
-        return true;
+    } else {
+        std::error_code ignored;
+        if (std::filesystem::is_directory(path, ignored)) {
+            *pError = path + ": is a directory";
+            return false;
+        }
+        std::ifstream in(path, std::ios::binary);
+        if (!in) {
+            *pError = path + ": cannot open the file: " + std::strerror(errno);
+            return false;
+        }
+        *pSet = ReadSpectralStream(in, path, axOptions);
     }
-    std::error_code ignored;
-    if (std::filesystem::is_directory(path, ignored)) {
-        *pError = path + ": is a directory";
+    if (pSet->unusable || pSet->samples.empty()) {
+        const std::string source = path == "-" ? "<stdin>" : path;
+        *pError = pSet->errors.empty()
+                      ? source + ": no spectra"
+                      : (pSet->unusable ? pSet->errors.front()
+                                        : source + ": no spectra; " + pSet->errors.front());
         return false;
     }
-    std::ifstream in(path, std::ios::binary);
-    if (!in) {
-        *pError = path + ": cannot open the file: " + std::strerror(errno);
-        return false;
-    }
-    *pSet = ReadSpectralStream(in, path, axOptions);
     return true;
 }
 
@@ -307,6 +381,7 @@ SpectraTable ToStandardGrid(const SpectralSet& axSet) {
     table.unusable = axSet.unusable;
     table.percent = axSet.percent;
     table.scaleNote = axSet.scaleNote;
+    table.assumptions = axSet.assumptions;
     table.sourceWavelengths = axSet.wavelengths;
     if (axSet.unusable || axSet.wavelengths.size() < 2) {
         table.unusable = true;
@@ -349,9 +424,9 @@ SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
 bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
                      SpectraTable* pTable, std::string* pError) {
     SpectralSet set;
-    if (!ReadSpectralFile(path, axOptions, &set, pError)) return false;
+    const bool read = ReadSpectralFile(path, axOptions, &set, pError);
     *pTable = ToStandardGrid(set);
-    return true;
+    return read;
 }
 
 }  // namespace nxbase

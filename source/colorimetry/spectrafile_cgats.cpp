@@ -1,5 +1,6 @@
 // CGATS spectra through LittleCMS's CGATS/IT8 parser.
 #include <lcms2.h>
+#include <locale.h>
 
 #include <algorithm>
 #include <cmath>
@@ -246,9 +247,10 @@ double NumericProperty(cmsHANDLE it8, const char* name) {
 }
 
 // The spectral fields of the data format, sorted by wavelength: (nm, field).
-std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* idField,
-                                                int* nameField) {
-    std::vector<std::pair<int, int>> spectral;
+using Fields = std::vector<std::pair<double, int>>;
+
+Fields SpectralFields(char** names, int fields, int* idField, int* nameField) {
+    Fields spectral;
     for (int f = 0; f < fields && names; ++f) {
         const std::string name = names[f] ? names[f] : "";
         if (name == "SAMPLE_ID") {
@@ -263,47 +265,99 @@ std::vector<std::pair<int, int>> SpectralFields(char** names, int fields, int* i
     return spectral;
 }
 
-// The grid: from SPECTRAL_BANDS/START/END when they agree with the fields
-// (exact for fractional steps), else from the field names.
-std::string TakeGrid(cmsHANDLE it8, const std::vector<std::pair<int, int>>& spectral,
-                     SpectralSet* set) {
+// The grid SPECTRAL_BANDS/START/END state, if they state one.
+std::vector<double> StatedGrid(cmsHANDLE it8) {
+    const double bands = NumericProperty(it8, "SPECTRAL_BANDS");
+    const double start = NumericProperty(it8, "SPECTRAL_START_NM");
+    const double end = NumericProperty(it8, "SPECTRAL_END_NM");
+    std::vector<double> grid;
+    if (bands < 2 || bands > kMaxBands || bands != std::floor(bands) || start <= 0.0 ||
+        end <= start)
+        return grid;
+    for (int i = 0; i < static_cast<int>(bands); ++i)
+        grid.push_back(start + (end - start) * i / (bands - 1.0));
+    return grid;
+}
+
+// The header's grid keywords as the file gives them.
+std::string StatedKeywords(cmsHANDLE it8) {
+    const auto shown = [&](const char* name) {
+        const char* text = cmsIT8GetProperty(it8, name);
+        return std::string(name) + " " + (text ? detail::Shown(text) : std::string("(missing)"));
+    };
+    return shown("SPECTRAL_BANDS") + ", " + shown("SPECTRAL_START_NM") + ", " +
+           shown("SPECTRAL_END_NM");
+}
+
+// Where the field names and the stated grid part: "" when every field names
+// its stated wavelength (to the whole nanometre the names are written in).
+std::string Contradiction(const Fields& spectral, const std::vector<double>& stated, char** names) {
+    if (stated.size() != spectral.size()) {
+        return std::to_string(spectral.size()) + " spectral fields (" +
+               detail::Nm(spectral.front().first) + ".." + detail::Nm(spectral.back().first) +
+               " nm)";
+    }
+    for (std::size_t i = 0; i < stated.size(); ++i) {
+        if (std::fabs(stated[i] - spectral[i].first) >= 1.0) {
+            return "field " + detail::Shown(names[spectral[i].second]) + " (" +
+                   detail::Nm(spectral[i].first) + " nm where they put " +
+                   detail::Decimal(stated[i], 2) + " nm)";
+        }
+    }
+    return "";
+}
+
+// The grid: the field names give it; SPECTRAL_BANDS/START/END, where given,
+// must agree with them and then make fractional steps exact.
+std::string TakeGrid(cmsHANDLE it8, const Fields& spectral, char** names, SpectralSet* set) {
     if (spectral.size() < 3)
         return spectral.empty() ? "spectral fields missing" : "fewer than 3 spectral fields";
     if (spectral.size() > kMaxBands)
         return "more than " + std::to_string(kMaxBands) + " spectral fields";
     for (std::size_t i = 1; i < spectral.size(); ++i) {
         if (spectral[i].first == spectral[i - 1].first) {
-            return "two spectral fields for " + std::to_string(spectral[i].first) + " nm";
+            return "two spectral fields for " + detail::Nm(spectral[i].first) + " nm";
         }
     }
-    const double bands = NumericProperty(it8, "SPECTRAL_BANDS");
-    const double start = NumericProperty(it8, "SPECTRAL_START_NM");
-    const double end = NumericProperty(it8, "SPECTRAL_END_NM");
-    const bool declared = bands == static_cast<double>(spectral.size()) && start > 0.0 &&
-                          end > start && std::fabs(start - spectral.front().first) < 1.0 &&
-                          std::fabs(end - spectral.back().first) < 1.0;
-    // A header that states a grid the fields do not have: ArgyllCMS refuses
-    // the file, and so do we, rather than pick one of the two silently.
     const bool stated = cmsIT8GetProperty(it8, "SPECTRAL_BANDS") ||
                         cmsIT8GetProperty(it8, "SPECTRAL_START_NM") ||
                         cmsIT8GetProperty(it8, "SPECTRAL_END_NM");
-    if (stated && !declared) {
-        const auto shown = [&](const char* name) {
-            const char* text = cmsIT8GetProperty(it8, name);
-            return std::string(name) + " " +
-                   (text ? detail::Shown(text) : std::string("(missing)"));
-        };
-        return "the header (" + shown("SPECTRAL_BANDS") + ", " + shown("SPECTRAL_START_NM") + ", " +
-               shown("SPECTRAL_END_NM") + ") contradicts the " + std::to_string(spectral.size()) +
-               " spectral fields; ArgyllCMS refuses such a file too";
+    const std::vector<double> grid = StatedGrid(it8);
+    if (stated) {
+        // A header that states a grid the fields do not have: ArgyllCMS
+        // refuses the file, and so do we, rather than pick one of the two.
+        const std::string contradiction = Contradiction(spectral, grid, names);
+        if (!contradiction.empty()) {
+            return "the header (" + StatedKeywords(it8) + ") contradicts the data format's " +
+                   contradiction + "; ArgyllCMS refuses such a file too";
+        }
+        set->wavelengths = grid;
+        return "";
     }
-    for (std::size_t i = 0; i < spectral.size(); ++i) {
-        set->wavelengths.push_back(declared ? start + (end - start) * static_cast<double>(i) /
-                                                          (bands - 1.0)
-                                            : spectral[i].first);
-    }
+    for (const auto& field : spectral) set->wavelengths.push_back(field.first);
     return "";
 }
+
+// LittleCMS formats the numbers it reads with the C library, which follows
+// the process's locale ("0,055" under a German one): the parser runs under
+// the "C" locale on this thread, whatever the application chose.
+class CLocaleScope {
+  public:
+    CLocaleScope() : amLocale(newlocale(LC_ALL_MASK, "C", nullptr)) {
+        if (amLocale) amPrevious = uselocale(amLocale);
+    }
+    ~CLocaleScope() {
+        if (!amLocale) return;
+        uselocale(amPrevious);
+        freelocale(amLocale);
+    }
+    CLocaleScope(const CLocaleScope&) = delete;
+    CLocaleScope& operator=(const CLocaleScope&) = delete;
+
+  private:
+    locale_t amLocale;
+    locale_t amPrevious = nullptr;
+};
 
 }  // namespace
 
@@ -319,6 +373,7 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
         set.unusable = true;
         return set;
     }
+    const CLocaleScope cLocale;
     Cgats cgats;
     if (!cgats.Load(text)) {
         AddError(&set, LocateError(source, cgats.FirstError()));
@@ -330,16 +385,10 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
     const int fields = cmsIT8EnumDataFormat(it8, &names);
     int idField = -1;
     int nameField = -1;
-    const std::vector<std::pair<int, int>> spectral =
-        SpectralFields(names, fields, &idField, &nameField);
-    const std::string gridProblem = TakeGrid(it8, spectral, &set);
+    const Fields spectral = SpectralFields(names, fields, &idField, &nameField);
+    const std::string gridProblem = TakeGrid(it8, spectral, names, &set);
     if (!gridProblem.empty()) {
-        std::string what = source + ": " + gridProblem;
-        if (spectral.size() >= 2) {
-            what += " (" + std::to_string(spectral.front().first) + ".." +
-                    std::to_string(spectral.back().first) + " nm)";
-        }
-        AddError(&set, what);
+        AddError(&set, source + ": " + gridProblem);
         set.unusable = true;
         set.wavelengths.clear();
         return set;
@@ -410,7 +459,7 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
             ? (fileNorm == 1.0 ? SpectralScale::kFraction : SpectralScale::kPercent)
             : axOptions.scale,
         axOptions.maxSamples};
-    FinishScale(&set, known, fileNorm, normReason, source);
+    FinishSet(&set, known, fileNorm, normReason, source);
     return set;
 }
 

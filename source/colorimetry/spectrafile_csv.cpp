@@ -1,4 +1,5 @@
 // CSV spectra; see nxbase/spectrafile.h for the format.
+#include <algorithm>
 #include <cctype>
 #include <charconv>
 #include <cmath>
@@ -92,7 +93,7 @@ bool ParseNumber(std::string_view text, double* value) {
            std::isfinite(*value);
 }
 
-int WavelengthOf(std::string_view field) {
+double WavelengthOf(std::string_view field) {
     // Known prefixes, longest first; compared without ASCII case.
     static const char* const kPrefixes[] = {
         "SPECTRAL_NM_", "SPECTRAL_NM", "SPECTRAL_", "SPEC_", "SPEC", "NM", "R_", "R", ""};
@@ -110,9 +111,11 @@ int WavelengthOf(std::string_view field) {
             rest.remove_suffix(2);  // "380nm", "380 nm"
             while (!rest.empty() && rest.back() == ' ') rest.remove_suffix(1);
         }
-        int nm = 0;
-        const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), nm);
-        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0)
+        double nm = 0.0;
+        const auto result =
+            std::from_chars(rest.data(), rest.data() + rest.size(), nm, std::chars_format::fixed);
+        if (result.ec == std::errc() && result.ptr == rest.data() + rest.size() && nm >= 0 &&
+            std::isfinite(nm))
             return nm;
     }
     return -1;
@@ -131,6 +134,7 @@ std::string Shown(std::string_view field) {
 
 namespace {
 
+using detail::Nm;
 using detail::ParseNumber;
 using detail::Shown;
 using detail::WavelengthOf;
@@ -139,23 +143,22 @@ constexpr int kLowestWavelength = 200;
 constexpr int kHighestWavelength = 2600;
 constexpr std::size_t kMinBands = 3;
 
-bool IsWholeWavelength(const std::string& field, int* nm) {
-    double value = 0.0;
-    if (!ParseNumber(field, &value) || field.find_first_of(".eE") != std::string::npos)
-        return false;
-    if (value < kLowestWavelength || value > kHighestWavelength) return false;
-    *nm = static_cast<int>(value);
-    return true;
-}
-
-// Trailing fields that are increasing whole numbers from 200 to 2600 nm: a
-// header such as "id,380,390,...". Percent or fraction data never looks so.
+// Trailing fields that are numbers from 200 to 2600, all increasing or all
+// decreasing: a header such as "id,380,390,...", "400.0,410.0,..." or
+// "730,720,...". Percent or fraction data never looks so.
 std::size_t NumericHeaderColumns(const std::vector<std::string>& fields) {
     std::size_t count = 0;
-    int next = kHighestWavelength + 1;
+    int direction = 0;  // +1 increasing towards the end, -1 decreasing
+    double next = 0.0;
     for (std::size_t i = fields.size(); i > 0; --i) {
-        int nm = 0;
-        if (!IsWholeWavelength(fields[i - 1], &nm) || nm >= next) break;
+        double nm = 0.0;
+        if (!ParseNumber(fields[i - 1], &nm) || nm < kLowestWavelength || nm > kHighestWavelength)
+            break;
+        if (count > 0) {
+            const int step = nm < next ? 1 : (nm > next ? -1 : 0);
+            if (step == 0 || (direction != 0 && step != direction)) break;
+            direction = step;
+        }
         next = nm;
         ++count;
     }
@@ -250,14 +253,20 @@ void CsvSpectraParser::Header(const std::vector<std::string>& fields, int line) 
     } else if (first > kMaxIdFields) {
         problem = "more than " + std::to_string(kMaxIdFields) + " id columns";
     } else {
+        const bool descending = grid.size() > 1 && grid[1] < grid[0];
         for (std::size_t i = 0; i < grid.size() && problem.empty(); ++i) {
             if (grid[i] < kLowestWavelength || grid[i] > kHighestWavelength) {
                 problem = "column \"" + Shown(fields[first + i]) +
                           "\" is not a wavelength from 200 to 2600 nm";
-            } else if (i > 0 && grid[i] <= grid[i - 1]) {
-                problem =
-                    "wavelengths do not increase at column \"" + Shown(fields[first + i]) + "\"";
+            } else if (i > 0 && (descending ? grid[i] >= grid[i - 1] : grid[i] <= grid[i - 1])) {
+                problem = std::string("wavelengths do not ") +
+                          (descending ? "decrease" : "increase") + " at column \"" +
+                          Shown(fields[first + i]) + "\"";
             }
+        }
+        if (descending) {
+            std::reverse(grid.begin(), grid.end());
+            amDescending = true;
         }
     }
     if (!problem.empty()) {
@@ -285,6 +294,14 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
         return;
     }
     const std::size_t ids = fields.size() - bands;
+    if (amIdFields < 0 && ids > 0 && !amIdsNoted) {
+        amIdsNoted = true;
+        pSet->assumptions.push_back(
+            amSource + ":" + std::to_string(line) + ": no header: the last " +
+            std::to_string(bands) + " of the " + std::to_string(fields.size()) +
+            " fields are taken as the values at 380..730 nm and the first " +
+            (ids == 1 ? std::string("one as the id") : std::to_string(ids) + " as id and name"));
+    }
     if (ids > kMaxIdFields) {
         Error(line, std::to_string(fields.size()) + " fields: more than " +
                         std::to_string(kMaxIdFields) + " before the " + std::to_string(bands) +
@@ -310,10 +327,10 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
     sample.values.resize(bands);
     for (std::size_t k = 0; k < bands; ++k) {
         double value = 0.0;
-        const std::string& field = fields[ids + k];
-        const std::string where = "field " + std::to_string(ids + k + 1) + " (" +
-                                  std::to_string(static_cast<int>(pSet->wavelengths[k])) +
-                                  " nm): \"" + Shown(field) + "\"";
+        const std::size_t column = ids + (amDescending ? bands - 1 - k : k);
+        const std::string& field = fields[column];
+        const std::string where = "field " + std::to_string(column + 1) + " (" +
+                                  Nm(pSet->wavelengths[k]) + " nm): \"" + Shown(field) + "\"";
         if (!ParseNumber(field, &value)) {
             Error(line, where + " is not a number");
             return;
@@ -340,7 +357,7 @@ SpectralSet ReadCsvText(std::string_view text, const std::string& source,
         text.remove_prefix(end + 1);
     }
     parser.Finish();
-    FinishScale(&set, axOptions, 0.0, "", source);
+    FinishSet(&set, axOptions, 0.0, "", source);
     return set;
 }
 

@@ -13,20 +13,24 @@ namespace nxbase {
 namespace detail {
 // A finite decimal number ("." separator, optional leading "+"), whole field.
 bool ParseNumber(std::string_view text, double* value);
-// The wavelength a spectral column name gives: digits after one of the
-// prefixes SPECTRAL_NM_, SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or none
-// (any case), optionally followed by "nm" ("r380", "SPECTRAL_NM380", "380nm");
-// else -1.
-int WavelengthOf(std::string_view field);
+// The wavelength a spectral column name gives: a decimal number after one of
+// the prefixes SPECTRAL_NM_, SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or
+// none (any case), optionally followed by "nm" ("r380", "SPECTRAL_NM380",
+// "380nm", "382.5"); else -1.
+double WavelengthOf(std::string_view field);
+// A wavelength as messages show it: "390", "382.5".
+std::string Nm(double wavelength);
+// `value` with `decimals` decimals and a decimal point, whatever the locale.
+std::string Decimal(double value, int decimals);
 // A field as shown in messages: at most 40 bytes, control bytes as "?".
 std::string Shown(std::string_view field);
 
 // Shared by the CSV and CGATS readers: records an error within the bound.
 void AddError(SpectralSet* pSet, std::string message);
-// Applies the scale (auto detection included) and drops implausible
-// spectra.
-void FinishScale(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
-                 const std::string& axNormReason, const std::string& source);
+// Checks that the grid covers the visible, applies the scale (auto
+// detection included) and drops implausible spectra.
+void FinishSet(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,
+               const std::string& axNormReason, const std::string& source);
 SpectralSet ReadCsvText(std::string_view text, const std::string& source,
                         const SpectralReadOptions& axOptions);
 SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
@@ -51,7 +55,9 @@ class CsvSpectraParser {
     SpectralReadOptions amOptions;
     SpectralSet* pSet;
     bool amSeenContent = false;
-    int amIdFields = -1;  // from the header; -1 without one
+    int amIdFields = -1;        // from the header; -1 without one
+    bool amDescending = false;  // the header lists the wavelengths from long to short
+    bool amIdsNoted = false;    // the id fields of a headerless file were said
     bool amStopped = false;
     char amSeparator = ',';  // "," ";" or TAB, from the first content line
 };

@@ -310,14 +310,16 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
         *table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), *source, chart);
     } else {
         *source = file == "-" ? "<stdin>" : file;
-        if (!nxcolor::ReadSpectraFile(file, options.read, table, &error)) {
+        if (!nxcolor::ReadSpectraFile(file, options.read, table, &error) && table->errors.empty()) {
             std::cerr << "nxcolor: " << error << '\n';
             return false;
         }
     }
     for (const std::string& message : table->errors) std::cerr << "nxcolor: " << message << '\n';
-    // A guessed scale is said every time: a wrong guess changes every number.
+    // A guessed scale and held ends are said every time: they change the numbers.
     if (!table->scaleNote.empty()) std::cerr << "nxcolor: " << table->scaleNote << '\n';
+    for (const std::string& assumption : table->assumptions)
+        std::cerr << "nxcolor: " << assumption << '\n';
     if (options.verbose) {
         for (const std::string& note : table->notes) std::cerr << "nxcolor: " << note << '\n';
         if (!table->sourceWavelengths.empty()) {
