@@ -29,6 +29,7 @@
 #include "nxbase/meascond.h"
 #include "nxbase/resample.h"
 #include "nxbase/spectrafile.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/thread.h"
 
 namespace nxpy {
@@ -173,11 +174,18 @@ constexpr float kMaxPlausibleL = 130.2f;
 typedef float Float4 __attribute__((vector_size(16)));
 typedef std::int32_t Int4 __attribute__((vector_size(16)));
 
-// The index of the first result whose lightness says the spectrum was not a
-// reflectance factor (percentages, most likely); -1 when all are plausible.
+// True for a result that no reflectance factors give: a lightness beyond
+// the limit (percentages, most likely), or NaN or an infinity from one in
+// the spectrum.
+inline bool Implausible(const float* v, int axis, float limit) {
+    return !(v[axis] <= limit) || !std::isfinite(v[0] + v[1] + v[2]);
+}
+
+// The index of the first implausible result; -1 when all are plausible.
 // Each stretch is first tested as a whole, four results (twelve floats, three
 // vectors) at a time against the limit where the tested component lies and
-// infinity elsewhere; only a stretch that fails is searched.
+// infinity elsewhere, and against the lowest float (a NaN fails both); only a
+// stretch that fails is searched.
 long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     const int axis = quantity == Quantity::kXYZ ? 1 : 0;
     const float limit = quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
@@ -186,26 +194,54 @@ long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
         limitOf[k] = k % 3 == axis ? limit : std::numeric_limits<float>::infinity();
     Float4 limits[3];
     std::memcpy(limits, limitOf, sizeof limits);
+    const float lowest = std::numeric_limits<float>::lowest();
+    const Float4 lows = {lowest, lowest, lowest, lowest};
     constexpr std::size_t kStretch = 256;
     for (std::size_t begin = 0; begin < count; begin += kStretch) {
         const std::size_t end = std::min(count, begin + kStretch);
-        Int4 above = {};
+        Int4 within = {-1, -1, -1, -1};
         std::size_t i = begin;
         for (; i + 4 <= end; i += 4) {
             Float4 v0, v1, v2;
             std::memcpy(&v0, out + 3 * i, sizeof v0);
             std::memcpy(&v1, out + 3 * i + 4, sizeof v1);
             std::memcpy(&v2, out + 3 * i + 8, sizeof v2);
-            above |= (v0 > limits[0]) | (v1 > limits[1]) | (v2 > limits[2]);
+            within &= (v0 <= limits[0]) & (v1 <= limits[1]) & (v2 <= limits[2]) & (v0 >= lows) &
+                      (v1 >= lows) & (v2 >= lows);
         }
-        bool any = above[0] | above[1] | above[2] | above[3];
-        for (; i < end; ++i) any |= out[3 * i + axis] > limit;
+        bool any = !(within[0] & within[1] & within[2] & within[3]);
+        for (; i < end; ++i) any |= Implausible(out + 3 * i, axis, limit);
         if (!any) continue;
         for (i = begin; i < end; ++i) {
-            if (out[3 * i + axis] > limit) return static_cast<long>(i);
+            if (Implausible(out + 3 * i, axis, limit)) return static_cast<long>(i);
         }
     }
     return -1;
+}
+
+// The first value of a spectrum that is not a finite number, or -1.
+template <class T>
+long FirstNonFinite(const T* values, std::size_t count) {
+    for (std::size_t k = 0; k < count; ++k) {
+        if (!std::isfinite(values[k])) return static_cast<long>(k);
+    }
+    return -1;
+}
+
+// Why spectrum `index` gave the implausible result `v`.
+template <class T>
+std::string ImplausibleReason(long index, const T* spectrum, std::size_t bands, const float* v,
+                              Quantity quantity) {
+    const long at = FirstNonFinite(spectrum, bands);
+    if (at >= 0) {
+        return "spectrum " + std::to_string(index) + " holds " +
+               (std::isnan(spectrum[at]) ? "NaN" : "an infinity") + " (value " +
+               std::to_string(at) + "): it has no colour";
+    }
+    return "spectrum " + std::to_string(index) + " gives " +
+           (quantity == Quantity::kXYZ ? "Y " + StringHelpers::Fixed(v[1], 6)
+                                       : "L* " + StringHelpers::Fixed(v[0], 6)) +
+           ": not reflectance factors (white = 1); divide percentages by 100 first";
 }
 
 // Spectra converted and then checked at a time, so that the check reads
@@ -255,10 +291,14 @@ std::shared_ptr<const nxbase::FineGridTristimulus> FineGridFor(const std::string
     return fine;
 }
 
+// A grid spectra are given a colour on: it must cover the visible.
 std::vector<double> GridOf(const py::object& wavelengths) {
     const DoubleArray grid = DoubleArray::ensure(py::array::ensure(wavelengths));
     if (!grid || grid.ndim() != 1) throw py::value_error("wavelengths must be one-dimensional");
-    return std::vector<double>(grid.data(), grid.data() + grid.shape(0));
+    std::vector<double> values(grid.data(), grid.data() + grid.shape(0));
+    const std::string problem = nxbase::VisibleCoverageProblem(values);
+    if (!problem.empty()) throw py::value_error(problem);
+    return values;
 }
 
 py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
@@ -294,10 +334,8 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
     });
     const long implausible = FirstImplausible(out, count, quantity);
     if (implausible >= 0) {
-        throw py::value_error(
-            "spectrum " + std::to_string(implausible) +
-            " is brighter than twice the white: not reflectance factors (white = 1); divide "
-            "percentages by 100 first");
+        throw py::value_error(ImplausibleReason(implausible, in + implausible * bands, bands,
+                                                out + 3 * implausible, quantity));
     }
     return result;
 }
@@ -344,12 +382,11 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
         });
     });
     if (implausible >= 0) {
-        const float* v = out + 3 * implausible;
+        const long i = implausible.load();
+        const float* v = out + 3 * i;
         throw py::value_error(
-            "spectrum " + std::to_string(implausible.load()) + " gives " +
-            (quantity == Quantity::kXYZ ? "Y " + std::to_string(v[1])
-                                        : "L* " + std::to_string(v[0])) +
-            ": not reflectance factors (white = 1); divide percentages by 100 first");
+            input.doubles ? ImplausibleReason(i, input.doubles + i * kBands, kBands, v, quantity)
+                          : ImplausibleReason(i, input.floats + i * kBands, kBands, v, quantity));
     }
     return result;
 }
@@ -365,8 +402,8 @@ py::array_t<float> SpectraToLCh(const py::object& spectra, const std::string& il
     py::gil_scoped_release unlocked;
     for (std::size_t i = 0; i < count; ++i, v += 3) {
         const LChVector lch{LABVector(v[0], v[1], v[2], condition)};
+        v[2] = static_cast<float>(nxbase::HueOfComputedLab(v[1], v[2]));
         v[1] = lch[1];
-        v[2] = lch[2];
     }
     return lab;
 }
@@ -454,7 +491,14 @@ nxbase::Tristimulus WhiteOf(const py::object& white, const py::object& observer)
     const DoubleArray xyz = AsDoubleRows(white, 3, "white");
     if (xyz.ndim() != 1)
         throw py::value_error("white must be an illuminant name or one XYZ triple");
-    return {xyz.data()[0], xyz.data()[1], xyz.data()[2]};
+    const nxbase::Tristimulus w{xyz.data()[0], xyz.data()[1], xyz.data()[2]};
+    for (const double v : w) {
+        if (!(v > 0.0 && std::isfinite(v))) {
+            throw py::value_error("white must have X, Y and Z above zero, got " +
+                                  std::string(py::str(py::repr(white))));
+        }
+    }
+    return w;
 }
 
 // Applies `convert` to each triple of a (..., 3) array, into float64.
@@ -488,16 +532,15 @@ py::array_t<double> LabToXYZ(const py::object& lab, const py::object& white,
     });
 }
 
-// LCh as LChVector has it: h in degrees within (0, 360], grey (|a|, |b| below
-// 1e-5) and an exact 0 degrees give 360.
+// LCh: h in degrees within (0, 360], grey (|a|, |b| below 0.001, beyond the
+// float path's rounding) and an exact 0 degrees give 360.
 py::array_t<double> LabToLCh(const py::object& lab) {
     return MapTriples(lab, "Lab", [](const double* v, double* out) {
-        out[0] = v[0];
-        out[1] = std::hypot(v[1], v[2]);
-        double h = std::atan2(v[2], v[1]) * 180.0 / M_PI;
-        if (std::fabs(v[1]) < 1e-5 && std::fabs(v[2]) < 1e-5) h = 360.0;
-        if (h <= 0.0) h += 360.0;
-        out[2] = h;
+        const bool finite = std::isfinite(v[0]) && std::isfinite(v[1]) && std::isfinite(v[2]);
+        const double nan = std::numeric_limits<double>::quiet_NaN();
+        out[0] = finite ? v[0] : nan;
+        out[1] = finite ? std::hypot(v[1], v[2]) : nan;
+        out[2] = finite ? nxbase::HueOfComputedLab(v[1], v[2]) : nan;
     });
 }
 
@@ -725,7 +768,8 @@ void RegisterColour(py::module_& m) {
     m.def("Lab_to_XYZ", &LabToXYZ, py::arg("Lab"), py::arg("white") = d50,
           py::arg("observer") = two, "The inverse of XYZ_to_Lab. float64 (..., 3).");
     m.def("Lab_to_LCh", &LabToLCh, py::arg("Lab"),
-          "L, C*, h of Lab values (..., 3); h in degrees within (0, 360], grey 360, as nxcolor "
+          "L, C*, h of Lab values (..., 3); h in degrees within (0, 360], grey (|a*|, |b*| below "
+          "0.001, beyond the rounding of a grey's Lab in single precision) 360, as nxcolor "
           "prints. float64.");
     m.def("chromatic_adaptation", &ChromaticAdaptation, py::arg("XYZ"), py::arg("source"),
           py::arg("target"), py::arg("method") = "Bradford", py::arg("observer") = two,

@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 #include <lcms2.h>
 
+#include <array>
 #include <cmath>
 #include <fstream>
 #include <random>
@@ -14,6 +15,7 @@
 #include "color_test_util.h"
 #include "nxbase/adaptation.h"
 #include "nxbase/colorvector.h"
+#include "nxbase/finegrid.h"
 
 namespace {
 
@@ -155,6 +157,67 @@ TEST(ChromaticAdaptation, MatchesPublishedMatricesAndMapsWhiteToWhite) {
                       underD50);
     EXPECT_TRUE(adapted.GetMeasuringCondition() == underD50);
     for (int c = 0; c < 3; ++c) EXPECT_NEAR(adapted[c], n50[c], nxtest::kFloatTwoStagesAtHundred);
+}
+
+// Properties every public colour function keeps, over random input: a NaN
+// or an infinity in gives NaN out (never a perfect match); ΔE(x, x) = 0;
+// CIE76 and CIEDE2000 are symmetric; CIELAB round-trips through XYZ; the
+// adaptation keeps the colour's scale whatever scale the whites are on; a
+// grey computed in single precision is grey.
+TEST(ColorFunctions, KeepTheirPropertiesOverRandomInput) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<double> lightness(0.0, 100.0), axis(-128.0, 128.0),
+        unit(0.02, 1.2), scale(0.5, 200.0);
+    const double bad[] = {std::nan(""), INFINITY, -INFINITY};
+    const nxbase::DeltaEMethod methods[] = {
+        nxbase::DeltaEMethod::kCie76,         nxbase::DeltaEMethod::kCie94,
+        nxbase::DeltaEMethod::kCie94Textiles, nxbase::DeltaEMethod::kCmc21,
+        nxbase::DeltaEMethod::kCmc11,         nxbase::DeltaEMethod::kCiede2000};
+    for (int i = 0; i < 5000; ++i) {
+        const LabValue x{lightness(random), axis(random), axis(random)};
+        const LabValue y{lightness(random), axis(random), axis(random)};
+        LabValue broken = x;
+        (&broken.L)[i % 3] = bad[i % 3];
+        for (const auto method : methods) {
+            ASSERT_EQ(nxbase::DeltaE(x, x, method), 0.0) << static_cast<int>(method);
+            ASSERT_TRUE(std::isnan(nxbase::DeltaE(broken, y, method))) << static_cast<int>(method);
+            ASSERT_TRUE(std::isnan(nxbase::DeltaE(y, broken, method))) << static_cast<int>(method);
+        }
+        ASSERT_EQ(nxbase::DeltaEab(x, y), nxbase::DeltaEab(y, x));
+        ASSERT_NEAR(nxbase::DeltaE2000(x, y), nxbase::DeltaE2000(y, x), 1e-9);
+
+        const std::array<double, 3> white{96.422 * unit(random), 100.0, 82.521 * unit(random)};
+        const std::array<double, 3> xyz{white[0] * unit(random), white[1] * unit(random),
+                                        white[2] * unit(random)};
+        const std::array<double, 3> back = nxbase::XyzOfCielab(nxbase::CielabOf(xyz, white), white);
+        for (int c = 0; c < 3; ++c) ASSERT_NEAR(back[c], xyz[c], 1e-9 * white[c]) << c;
+        std::array<double, 3> notWhite = white;
+        notWhite[i % 3] = i % 2 ? 0.0 : -white[i % 3];
+        ASSERT_TRUE(std::isnan(nxbase::CielabOf(xyz, notWhite)[0]));
+
+        // A white on 0..1 and one on 0..100 adapt as the same two whites do.
+        const nxbase::Tristimulus d65{95.047, 100.0, 108.883};
+        const double k = scale(random);
+        const nxbase::Tristimulus small{white[0] / k, white[1] / k, white[2] / k};
+        const auto method = nxbase::AdaptationMethod::kBradford;
+        const nxbase::Tristimulus same =
+            nxbase::Apply(nxbase::AdaptationMatrix(white, d65, method), xyz);
+        const nxbase::Tristimulus mixed =
+            nxbase::Apply(nxbase::AdaptationMatrix(small, d65, method), xyz);
+        for (int c = 0; c < 3; ++c)
+            ASSERT_NEAR(mixed[c], same[c], 1e-9 * std::fabs(same[c]) + 1e-12);
+    }
+    EXPECT_THROW(
+        nxbase::AdaptationMatrix({0, 0, 0}, {95, 100, 108}, nxbase::AdaptationMethod::kBradford),
+        std::invalid_argument);
+    // Grey: a and b of a computed grey lie within the float path's rounding.
+    EXPECT_EQ(nxbase::HueOfComputedLab(0.0, 1.19e-5), 360.0);
+    EXPECT_EQ(nxbase::HueOfComputedLab(-8.9e-5, 3e-5), 360.0);
+    EXPECT_NEAR(nxbase::HueOfComputedLab(0.0, 0.01), 90.0, 1e-12);
+    EXPECT_EQ(nxbase::HueOfComputedLab(1.0, 0.0), 360.0);
+    EXPECT_TRUE(std::isnan(nxbase::HueOfComputedLab(std::nan(""), 1.0)));
 }
 
 }  // namespace

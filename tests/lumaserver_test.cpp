@@ -444,7 +444,7 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
     ASSERT_TRUE(WIFEXITED(result)) << output;
     EXPECT_EQ(WEXITSTATUS(result), 0) << output;
     EXPECT_EQ(std::count(output.begin(), output.end(), '\n'), 4) << output;
-    EXPECT_NE(output.find("id,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
+    EXPECT_NE(output.find("id,name,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
     // The emulator measures the built-in chart: dark skin's values, to the
     // 1e-5 the server's integers keep.
     EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos)

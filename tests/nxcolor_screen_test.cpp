@@ -29,7 +29,7 @@ TEST(NxcolorScreen, RgbColumnsGiveLevelsAndTheirHex) {
     ASSERT_EQ(RunNxcolor("--rgb --format csv", &out, &err), 0) << err;
     auto lines = Lines(out);
     ASSERT_EQ(lines.size(), 25u);
-    EXPECT_EQ(lines[0], "id,X,Y,Z,L*,a*,b*,C*,h,R,G,B,hex");
+    EXPECT_EQ(lines[0], "id,name,X,Y,Z,L*,a*,b*,C*,h,R,G,B,hex");
     const std::regex row(R"(.*,(\d+),(\d+),(\d+),#([0-9A-F]{6}))");
     for (std::size_t i = 1; i < lines.size(); ++i) {
         std::smatch m;

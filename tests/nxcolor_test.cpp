@@ -56,8 +56,8 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     std::ostringstream csv;
     nxcolor::Writers().at("csv")(report, csv);
     const std::string text = csv.str();
-    EXPECT_EQ(text.substr(0, text.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
-    EXPECT_NE(text.find("\n1 dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"),
+    EXPECT_EQ(text.substr(0, text.find('\n')), "id,name,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
+    EXPECT_NE(text.find("\n1,dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"),
               std::string::npos)
         << text.substr(0, 200);
     std::ostringstream aligned;
@@ -120,7 +120,7 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     std::string err;
     ASSERT_EQ(RunNxcolor("--illuminant D65 --observer 10 --format csv --din99", &out, &err), 0)
         << err;
-    EXPECT_EQ(out.substr(0, out.find('\n')), "id,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
+    EXPECT_EQ(out.substr(0, out.find('\n')), "id,name,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 25);
     // Densities of a flat 10% reflector are 1 in every channel.
     nxtest::TempDir dir;
@@ -133,7 +133,7 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     ASSERT_EQ(RunNxcolor("--help", &out, &err), 0);
     EXPECT_NE(out.find("Usage: nxcolor"), std::string::npos);
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);
-    EXPECT_NE(out.find("\n1 dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"),
+    EXPECT_NE(out.find("\n1,dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"),
               std::string::npos)
         << out.substr(0, 200);
 }
@@ -151,7 +151,7 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
     EXPECT_NE(err.find(rows + ":3: every value is zero"), std::string::npos) << err;
     EXPECT_EQ(out.find("inf"), std::string::npos) << out;
     EXPECT_EQ(out.find("nan"), std::string::npos) << out;
-    EXPECT_NE(out.find("\n4 ok,"), std::string::npos) << out;
+    EXPECT_NE(out.find("\n4,ok,"), std::string::npos) << out;
 
     // An installed illuminant of absurd power is normalised like any other:
     // finite colours, no inf or nan.
@@ -195,7 +195,7 @@ TEST(NxcolorProgram, ReadsOtherGridsScalesAndNames) {
     ASSERT_EQ(RunNxcolor(five + " -f csv -p 2 -i d50 -v", &out, &err), 0) << err;
     // A 5 nm file: colour summed at 5 nm (the 10 nm path gives 11.81,10.33,
     // 5.17,38.42,13.69,... for the same patch).
-    EXPECT_NE(out.find("\n1 dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"),
+    EXPECT_NE(out.find("\n1,dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"),
               std::string::npos)
         << out;
     EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's "

@@ -28,8 +28,10 @@ NXBASE_EXPORT bool ParseAdaptationMethod(const char* pName, AdaptationMethod* pM
 NXBASE_EXPORT Matrix3 ConeResponseMatrix(AdaptationMethod axMethod);
 
 // The matrix taking XYZ seen under axSource's white to the corresponding
-// colour under axDestination's white. Throws std::invalid_argument for a white
-// point with a zero or non-finite cone response.
+// colour under axDestination's white. The whites may be on any scale (Y = 1
+// or Y = 100, each its own): only their chromaticities count, and the colour
+// keeps its scale. Throws std::invalid_argument for a white with a component
+// that is not positive and finite, or a zero cone response.
 NXBASE_EXPORT Matrix3 AdaptationMatrix(const Tristimulus& axSource,
                                        const Tristimulus& axDestination,
                                        AdaptationMethod axMethod = AdaptationMethod::kBradford);

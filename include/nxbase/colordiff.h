@@ -3,7 +3,8 @@
 // ISO 105-J03) and CIEDE2000 (CIE 142-2001, following the implementation notes
 // of Sharma, Wu and Dalal 2005, whose 34 test pairs it reproduces to 1e-4).
 //
-// All formulas run in double precision. The first argument is the reference
+// All formulas run in double precision; a triple holding NaN or infinity gives
+// NaN, never a match. The first argument is the reference
 // (standard), the second the sample: ΔE94 and CMC are not symmetric, and take
 // their weighting functions from the reference. A LABVector tagged DIN99 is
 // taken for CIELAB values as they stand; convert it first (GetCIELab).

@@ -152,8 +152,20 @@ class NXBASE_EXPORT LABVector : public ColorVector {
 
 class LCHmgVector;
 
+// The hue in degrees, within (0, 360], of a* and b* computed from a spectrum
+// in single precision (the batch path, nxcolor, the Python module): grey, 360,
+// when both are below kComputedNeutral. A perfect white's a* and b* come out
+// of float arithmetic at up to about 1e-4, which crosses LChVector's 0.00001
+// and would give it a hue of 90 or 158 degrees; 0.001 (a thousandth of a just
+// noticeable difference) is beyond that rounding. NaN in gives NaN.
+namespace nxbase {
+constexpr double kComputedNeutral = 0.001;
+NXBASE_EXPORT double HueOfComputedLab(double a, double b);
+}  // namespace nxbase
+
 // CIE 1976 LCh: C = sqrt(a^2 + b^2); h = atan2(b, a) in degrees within
-// (0, 360]; an exact 0 degrees and grey (|a|, |b| < 0.00001) give 360.
+// (0, 360]; an exact 0 degrees and grey (|a|, |b| < 0.00001) give 360. For
+// a* and b* computed from spectra, HueOfComputedLab tells grey reliably.
 class NXBASE_EXPORT LChVector : public ColorVector {
   public:
     LChVector() = default;

@@ -39,6 +39,13 @@ class NXBASE_EXPORT StringHelpers {
     // of fewer than two digits gives an empty string.
     static std::string BaseConverter(unsigned int alNumber, const std::string& asDigits);
 
+    // Numbers as files and messages show them, with a decimal point whatever
+    // the locale: `axValue` with `alDecimals` decimals (0..40), and the
+    // shortest text that reads back as the same double ("390", "382.5").
+    // NaN and infinities are written "nan", "inf", "-inf".
+    static std::string Fixed(double axValue, int alDecimals);
+    static std::string Shortest(double axValue);
+
     // Digit alphabets: "01", "01234567", "0123456789", "0123456789ABCDEF".
     static const std::string& CharactersBase2();
     static const std::string& CharactersBase8();

@@ -80,7 +80,7 @@ def test_values_agree_with_nxcolor(chart):
     out = subprocess.run([tool("nxcolor"), "-f", "csv", "-p", "4", "-i", "D65", "-o", "10", "--din99",
                           "-d", "Status T"], capture_output=True, text=True, check=True).stdout
     rows = [line.split(",") for line in out.strip().splitlines()[1:]]
-    printed = np.array([[float(v) for v in row[1:]] for row in rows])
+    printed = np.array([[float(v) for v in row[2:]] for row in rows])
     xyz = nxbase.spectra_to_XYZ(chart, illuminant="d65", observer=10)
     lab = nxbase.spectra_to_Lab(chart, illuminant="D65", observer="10")
     lch = nxbase.spectra_to_LCh(chart, illuminant="D65", observer=10)
@@ -173,7 +173,7 @@ def test_differences_resampling_and_screen_colours():
     xyz = nxbase.spectra_to_XYZ(fine, wavelengths=grid)
     printed = subprocess.run([tool("nxcolor"), five, "-f", "csv", "-p", "4"], capture_output=True, text=True,
                              check=True).stdout.splitlines()[1].split(",")
-    np.testing.assert_allclose(xyz[0], [float(v) for v in printed[1:4]], atol=1e-4)
+    np.testing.assert_allclose(xyz[0], [float(v) for v in printed[2:5]], atol=1e-4)
     lab_fine = nxbase.spectra_to_Lab(fine, wavelengths=grid)
     # Summed at 5 nm against the 10 nm tables: close for the chart's smooth
     # spectra, not equal (0.11 dE00 at most here).
@@ -230,3 +230,55 @@ def test_bad_input_raises_with_the_librarys_words(tmp_path):
         nxbase.spectra_to_Lab(np.stack([np.full(36, 0.5), np.full(36, 50.0)]))
     with pytest.raises(ValueError, match="gives Y "):
         nxbase.spectra_to_XYZ(np.full(36, 50.0))
+
+
+def test_every_function_answers_nan_or_refuses_and_keeps_its_properties():
+    """NaN or infinity in gives NaN out or a ValueError naming the item;
+    dE(x, x) = 0 and symmetry where the formula is; Lab round-trips; whites
+    that are not positive are refused and whites on different scales agree;
+    a computed grey is grey."""
+    seed = int.from_bytes(os.urandom(4), "little")
+    rng = np.random.default_rng(seed)
+    n = 4000
+    lab = np.column_stack([rng.uniform(0, 100, n), rng.uniform(-128, 128, (n, 2))])
+    other = np.column_stack([rng.uniform(0, 100, n), rng.uniform(-128, 128, (n, 2))])
+    broken = lab.copy()
+    broken[np.arange(n), rng.integers(0, 3, n)] = rng.choice([np.nan, np.inf, -np.inf], n)
+    for method in ("2000", "94", "94t", "cmc", "cmc11", "ab"):
+        assert np.all(nxbase.delta_E(lab, lab, method=method) == 0), (seed, method)
+        assert np.all(np.isnan(nxbase.delta_E(broken, other, method=method))), (seed, method)
+        assert np.all(np.isnan(nxbase.delta_E(other, broken, method=method))), (seed, method)
+    for method in ("2000", "ab"):
+        np.testing.assert_allclose(nxbase.delta_E(lab, other, method=method),
+                                   nxbase.delta_E(other, lab, method=method), atol=1e-9, err_msg=str(seed))
+    xyz = nxbase.Lab_to_XYZ(lab, "D65")
+    np.testing.assert_allclose(nxbase.XYZ_to_Lab(xyz, "D65"), lab, atol=1e-9, err_msg=str(seed))
+    for convert in (lambda v: nxbase.Lab_to_XYZ(v, "D65"), lambda v: nxbase.XYZ_to_Lab(v, "D65"),
+                    nxbase.Lab_to_LCh):
+        assert np.all(np.isnan(convert(broken))), seed
+    for white in ([0, 100, 100], [95, -100, 108], [95, np.nan, 108], [np.inf, 100, 108]):
+        with pytest.raises(ValueError, match="white must have X, Y and Z above zero"):
+            nxbase.XYZ_to_Lab(xyz, white)
+        with pytest.raises(ValueError, match="white must have X, Y and Z above zero"):
+            nxbase.chromatic_adaptation(xyz, white, "D50")
+    d65 = nxbase.Lab_to_XYZ([100, 0, 0], "D65")
+    np.testing.assert_allclose(nxbase.chromatic_adaptation(xyz, d65 / 100, "D50"),
+                               nxbase.chromatic_adaptation(xyz, "D65", "D50"), rtol=1e-12, atol=1e-12)
+    # Spectra with NaN or infinity are refused, naming the spectrum and the value.
+    spectra = rng.uniform(0.02, 0.95, (50, 36))
+    row, value = int(rng.integers(0, 50)), int(rng.integers(0, 36))
+    spectra[row, value] = np.nan
+    for convert in (nxbase.spectra_to_XYZ, nxbase.spectra_to_Lab):
+        with pytest.raises(ValueError, match=f"spectrum {row} holds NaN \\(value {value}\\)"):
+            convert(spectra)
+    fine = np.full((2, 351), 0.5)
+    fine[1, 7] = np.inf
+    with pytest.raises(ValueError, match="spectrum 1 holds an infinity \\(value 7\\)"):
+        nxbase.spectra_to_Lab(fine, wavelengths=np.arange(380, 731.0))
+    with pytest.raises(ValueError, match="cover 900..1000 nm, outside the visible"):
+        nxbase.spectra_to_Lab(np.full(11, 0.5), wavelengths=np.arange(900, 1001.0, 10))
+    # Greys, computed in single precision under every illuminant, are grey.
+    for illuminant in ("A", "C", "D50", "D65", "E", "FL2"):
+        for observer in (2, 10):
+            greys = np.ones((3, 36)) * np.array([[1.0], [0.5], [0.18]])
+            assert np.all(nxbase.spectra_to_LCh(greys, illuminant, observer)[:, 2] == 360), (illuminant, observer)

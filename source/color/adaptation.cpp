@@ -3,6 +3,7 @@
 
 #include <strings.h>
 
+#include <charconv>
 #include <cmath>
 #include <stdexcept>
 #include <string>
@@ -94,20 +95,43 @@ Matrix3 Invert(const Matrix3& m) {
     return inverse;
 }
 
+namespace {
+
+std::string Shown(const Tristimulus& axWhite) {
+    std::string text;
+    for (const double v : axWhite) {
+        char digits[32];
+        const auto result = std::to_chars(digits, digits + sizeof digits, v);
+        text += (text.empty() ? "" : " ") + std::string(digits, result.ptr);
+    }
+    return text;
+}
+
+// The white scaled to Y = 1, so that whites given on different scales (Y = 1
+// and Y = 100) adapt chromaticity only and keep the scale of the colour.
+Tristimulus Normalised(const Tristimulus& axWhite) {
+    for (const double v : axWhite) {
+        if (!(v > 0.0 && std::isfinite(v))) {
+            throw std::invalid_argument("white point " + Shown(axWhite) +
+                                        " cannot be adapted: X, Y and Z must be above zero");
+        }
+    }
+    return {axWhite[0] / axWhite[1], 1.0, axWhite[2] / axWhite[1]};
+}
+
+}  // namespace
+
 Matrix3 AdaptationMatrix(const Tristimulus& axSource, const Tristimulus& axDestination,
                          AdaptationMethod axMethod) {
     const Matrix3 cone = ConeResponseMatrix(axMethod);
-    const Tristimulus source = Apply(cone, axSource);
-    const Tristimulus destination = Apply(cone, axDestination);
+    const Tristimulus source = Apply(cone, Normalised(axSource));
+    const Tristimulus destination = Apply(cone, Normalised(axDestination));
     Matrix3 gain{};
     for (int i = 0; i < 3; ++i) {
         gain[i][i] = destination[i] / source[i];
         if (source[i] == 0.0 || !std::isfinite(gain[i][i])) {
-            throw std::invalid_argument(
-                "white point " + std::to_string(axSource[0]) + " " + std::to_string(axSource[1]) +
-                " " + std::to_string(axSource[2]) + " or " + std::to_string(axDestination[0]) +
-                " " + std::to_string(axDestination[1]) + " " + std::to_string(axDestination[2]) +
-                " cannot be adapted");
+            throw std::invalid_argument("white point " + Shown(axSource) + " or " +
+                                        Shown(axDestination) + " cannot be adapted");
         }
     }
     return Multiply(Invert(cone), Multiply(gain, cone));

@@ -5,6 +5,7 @@
 
 #include <cmath>
 #include <cstring>
+#include <limits>
 
 #include "nxbase/colorvector.h"
 
@@ -19,12 +20,24 @@ double Chroma(const LabValue& axLab) {
     return std::sqrt(axLab.a * axLab.a + axLab.b * axLab.b);
 }
 
-// ΔH² from Δa, Δb and ΔC; rounding can take it a hair below zero.
+// A square that rounding can take a hair below zero, clamped; NaN stays NaN,
+// so that a NaN in the input is never a perfect match.
+double NonNegative(double x) {
+    return x < 0.0 ? 0.0 : x;
+}
+
+// Every formula answers NaN for a triple that holds NaN or infinity.
+constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
+
+bool Finite(const LabValue& v) {
+    return std::isfinite(v.L) && std::isfinite(v.a) && std::isfinite(v.b);
+}
+
+// ΔH² from Δa, Δb and ΔC.
 double HueDifferenceSquared(const LabValue& axA, const LabValue& axB, double axDeltaC) {
     const double da = axA.a - axB.a;
     const double db = axA.b - axB.b;
-    const double dh2 = da * da + db * db - axDeltaC * axDeltaC;
-    return dh2 > 0.0 ? dh2 : 0.0;
+    return NonNegative(da * da + db * db - axDeltaC * axDeltaC);
 }
 
 double Pow7(double x) {
@@ -62,6 +75,7 @@ LabValue ToLabValue(const LABVector& axLab) {
 }
 
 double DeltaEab(const LabValue& axReference, const LabValue& axSample) {
+    if (!Finite(axReference) || !Finite(axSample)) return kNaN;
     const double dL = axSample.L - axReference.L;
     const double da = axSample.a - axReference.a;
     const double db = axSample.b - axReference.b;
@@ -78,6 +92,7 @@ double DeltaE94(const LabValue& axReference, const LabValue& axSample,
 
 double DeltaE94(const LabValue& axReference, const LabValue& axSample,
                 const Cie94Parameters& axParameters) {
+    if (!Finite(axReference) || !Finite(axSample)) return kNaN;
     const double c1 = Chroma(axReference);
     const double c2 = Chroma(axSample);
     const double dC = c1 - c2;
@@ -91,6 +106,7 @@ double DeltaE94(const LabValue& axReference, const LabValue& axSample,
 
 double DeltaECMC(const LabValue& axReference, const LabValue& axSample, double axLightness,
                  double axChroma) {
+    if (!Finite(axReference) || !Finite(axSample)) return kNaN;
     const double l1 = axReference.L;
     const double c1 = Chroma(axReference);
     const double h1 = HueDegrees(axReference.b, axReference.a);
@@ -173,7 +189,7 @@ DeltaE2000Parts DeltaE2000ByAngles(const LabValue& axReference, const LabValue& 
     const double tc = parts.dC / (axWeights.kC * sc);
     const double th = parts.dH / (axWeights.kH * sh);
     const double sum = tl * tl + tc * tc + th * th + rt * tc * th;
-    parts.dE = std::sqrt(sum > 0.0 ? sum : 0.0);
+    parts.dE = std::sqrt(NonNegative(sum));
     return parts;
 }
 
@@ -192,7 +208,7 @@ double Ciede2000Total(const DeltaE2000Parts& parts, double lMean, double cpMean,
     const double tc = parts.dC / (axWeights.kC * sc);
     const double th = parts.dH / (axWeights.kH * sh);
     const double sum = tl * tl + tc * tc + th * th + rt * tc * th;
-    return std::sqrt(sum > 0.0 ? sum : 0.0);
+    return std::sqrt(NonNegative(sum));
 }
 
 }  // namespace
@@ -204,6 +220,7 @@ double Ciede2000Total(const DeltaE2000Parts& parts, double lMean, double cpMean,
 // of two, and no sine of the hue difference or cosines of the mean hue.
 DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& axSample,
                                    const DeltaE2000Weights& axWeights) {
+    if (!Finite(axReference) || !Finite(axSample)) return {kNaN, kNaN, kNaN, kNaN};
     const LabValue& p1 = axReference;
     const LabValue& p2 = axSample;
     const auto [a1, a2, c1, c2] = Prime(p1, p2);
@@ -221,7 +238,7 @@ DeltaE2000Parts DeltaE2000Detailed(const LabValue& axReference, const LabValue& 
     parts.dL = p2.L - p1.L;
     parts.dC = c2 - c1;
     const double chord = 2.0 * (c12 - dot);
-    parts.dH = std::copysign(std::sqrt(chord > 0.0 ? chord : 0.0), cross);
+    parts.dH = std::copysign(std::sqrt(NonNegative(chord)), cross);
     const double inverse = 1.0 / bisector;
     const double cosHue = bx * inverse;
     const double sinHue = by * inverse;

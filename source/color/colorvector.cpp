@@ -147,6 +147,16 @@ float HueDegrees(float a, float b) {
     return static_cast<float>(h);
 }
 
+}  // namespace
+
+double nxbase::HueOfComputedLab(double a, double b) {
+    if (std::fabs(a) < kComputedNeutral && std::fabs(b) < kComputedNeutral) return 360.0;
+    const double h = std::atan2(b, a) * kDegreesPerRadian;
+    return h <= 0.0 ? h + 360.0 : h;
+}
+
+namespace {
+
 float Chroma(float a, float b) {
     return std::sqrt(a * a + b * b);
 }

@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <limits>
 #include <stdexcept>
 
 #include "klume/cmetry/data.h"
@@ -41,8 +42,22 @@ double LabFInverse(double f) {
 
 }  // namespace
 
+namespace {
+// A white every component of which is positive and finite (CIELAB divides
+// by it), and a colour of finite components: anything else has no colour.
+bool Usable(const std::array<double, 3>& axColour, const std::array<double, 3>& axWhite) {
+    for (int c = 0; c < 3; ++c) {
+        if (!(axWhite[c] > 0.0 && std::isfinite(axWhite[c]) && std::isfinite(axColour[c])))
+            return false;
+    }
+    return true;
+}
+constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
+}  // namespace
+
 std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
                                const std::array<double, 3>& axWhite) {
+    if (!Usable(axXYZ, axWhite)) return {kNaN, kNaN, kNaN};
     const double fx = LabF(axXYZ[0] / axWhite[0]);
     const double fy = LabF(axXYZ[1] / axWhite[1]);
     const double fz = LabF(axXYZ[2] / axWhite[2]);
@@ -51,6 +66,7 @@ std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
 
 std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
                                   const std::array<double, 3>& axWhite) {
+    if (!Usable(axLab, axWhite)) return {kNaN, kNaN, kNaN};
     const double fy = (axLab[0] + 16.0) / 116.0;
     return {LabFInverse(axLab[1] / 500.0 + fy) * axWhite[0], LabFInverse(fy) * axWhite[1],
             LabFInverse(fy - axLab[2] / 200.0) * axWhite[2]};

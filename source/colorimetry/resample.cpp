@@ -6,6 +6,7 @@
 #include <stdexcept>
 
 #include "nxbase/spectrafile.h"
+#include "nxbase/strhelp.h"
 #include "spectrafile_parse.h"
 
 namespace nxbase {
@@ -48,8 +49,10 @@ std::string VisibleCoverageProblem(const std::vector<double>& wavelengths) {
     if (wavelengths.empty()) return "no wavelengths";
     const double first = wavelengths.front(), last = wavelengths.back();
     if (first <= kVisibleFrom && last >= kVisibleTo) return "";
-    const std::string range = detail::Nm(first) + ".." + detail::Nm(last) + " nm";
-    const std::string visible = detail::Nm(kVisibleFrom) + ".." + detail::Nm(kVisibleTo) + " nm";
+    const std::string range =
+        StringHelpers::Shortest(first) + ".." + StringHelpers::Shortest(last) + " nm";
+    const std::string visible =
+        StringHelpers::Shortest(kVisibleFrom) + ".." + StringHelpers::Shortest(kVisibleTo) + " nm";
     if (last < kVisibleFrom || first > kVisibleTo)
         return "the spectra cover " + range + ", outside the visible " + visible;
     return "the spectra cover " + range + ", not the whole visible " + visible +
@@ -59,12 +62,13 @@ std::string VisibleCoverageProblem(const std::vector<double>& wavelengths) {
 std::string HeldEnds(const std::vector<double>& wavelengths, double from, double to) {
     std::string held;
     if (!wavelengths.empty() && wavelengths.front() > from) {
-        held = "the value at " + detail::Nm(wavelengths.front()) + " nm is held down to " +
-               detail::Nm(from) + " nm";
+        held = "the value at " + StringHelpers::Shortest(wavelengths.front()) +
+               " nm is held down to " + StringHelpers::Shortest(from) + " nm";
     }
     if (!wavelengths.empty() && wavelengths.back() < to) {
         held += (held.empty() ? "the value at " : ", the value at ") +
-                detail::Nm(wavelengths.back()) + " nm up to " + detail::Nm(to) + " nm";
+                StringHelpers::Shortest(wavelengths.back()) + " nm up to " +
+                StringHelpers::Shortest(to) + " nm";
     }
     return held;
 }

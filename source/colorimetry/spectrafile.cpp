@@ -16,6 +16,7 @@
 
 #include "nxbase/finegrid.h"
 #include "nxbase/resample.h"
+#include "nxbase/strhelp.h"
 #include "spectrafile_parse.h"
 
 namespace nxbase {
@@ -40,7 +41,7 @@ std::string Implausible(const SpectralSample& sample, const SpectralReadOptions&
     bool allZero = true;
     for (const float v : sample.values) {
         if (std::fabs(v) > kMaxPlausibleReflectance) {
-            return "value " + detail::Decimal(v, 6) +
+            return "value " + StringHelpers::Fixed(v, 6) +
                    " is not a reflectance factor (scale wrong? " + axOptions.percentChoice +
                    " reads percentages)";
         }
@@ -118,7 +119,7 @@ void GuessScale(SpectralSet* pSet, const SpectralReadOptions& axOptions,
         detail::AddError(pSet, source + ": the scale is unclear: " + LinesOf(onlyPercent) +
                                    (onlyPercent.size() == 1 ? " fits" : " fit") +
                                    " only percentages (values up to " +
-                                   detail::Decimal(largest, 2) + "), " + LinesOf(both) +
+                                   StringHelpers::Fixed(largest, 2) + "), " + LinesOf(both) +
                                    (both.size() == 1 ? " reads" : " read") +
                                    " as reflectance factors (or as dark patches in percent); " +
                                    choices + " says which the file holds");
@@ -134,7 +135,7 @@ void GuessScale(SpectralSet* pSet, const SpectralReadOptions& axOptions,
         pSet->scaleNote = source + ": read as percentages: " + counts +
                           " spectra have values above 1.5 or are brighter than any reflectance "
                           "(up to " +
-                          detail::Decimal(largest, 2) + "); " + axOptions.fractionChoice +
+                          StringHelpers::Fixed(largest, 2) + "); " + axOptions.fractionChoice +
                           " reads them as they stand";
         return;
     }
@@ -157,9 +158,9 @@ void CheckCoverage(SpectralSet* pSet, const std::string& source) {
     }
     const std::string held = HeldEnds(pSet->wavelengths, kFirstWavelength, kLastWavelength);
     if (!held.empty()) {
-        pSet->assumptions.push_back(source + ": the spectra cover " +
-                                    detail::Nm(pSet->wavelengths.front()) + ".." +
-                                    detail::Nm(pSet->wavelengths.back()) + " nm: " + held);
+        pSet->assumptions.push_back(
+            source + ": the spectra cover " + StringHelpers::Shortest(pSet->wavelengths.front()) +
+            ".." + StringHelpers::Shortest(pSet->wavelengths.back()) + " nm: " + held);
     }
 }
 
@@ -173,19 +174,6 @@ void AddError(SpectralSet* pSet, std::string message) {
     } else {
         ++pSet->suppressedErrors;
     }
-}
-
-std::string Nm(double wavelength) {
-    char text[32];
-    const auto result = std::to_chars(text, text + sizeof text, wavelength);
-    return std::string(text, result.ptr);
-}
-
-std::string Decimal(double value, int decimals) {
-    char text[400];
-    const auto result =
-        std::to_chars(text, text + sizeof text, value, std::chars_format::fixed, decimals);
-    return result.ec == std::errc() ? std::string(text, result.ptr) : Nm(value);
 }
 
 void FinishSet(SpectralSet* pSet, const SpectralReadOptions& axOptions, double axFileNorm,

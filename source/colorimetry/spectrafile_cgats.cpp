@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "nxbase/spectrafile.h"
+#include "nxbase/strhelp.h"
 #include "spectrafile_parse.h"
 
 namespace nxbase {
@@ -294,14 +295,14 @@ std::string StatedKeywords(cmsHANDLE it8) {
 std::string Contradiction(const Fields& spectral, const std::vector<double>& stated, char** names) {
     if (stated.size() != spectral.size()) {
         return std::to_string(spectral.size()) + " spectral fields (" +
-               detail::Nm(spectral.front().first) + ".." + detail::Nm(spectral.back().first) +
-               " nm)";
+               StringHelpers::Shortest(spectral.front().first) + ".." +
+               StringHelpers::Shortest(spectral.back().first) + " nm)";
     }
     for (std::size_t i = 0; i < stated.size(); ++i) {
         if (std::fabs(stated[i] - spectral[i].first) >= 1.0) {
             return "field " + detail::Shown(names[spectral[i].second]) + " (" +
-                   detail::Nm(spectral[i].first) + " nm where they put " +
-                   detail::Decimal(stated[i], 2) + " nm)";
+                   StringHelpers::Shortest(spectral[i].first) + " nm where they put " +
+                   StringHelpers::Fixed(stated[i], 2) + " nm)";
         }
     }
     return "";
@@ -316,7 +317,7 @@ std::string TakeGrid(cmsHANDLE it8, const Fields& spectral, char** names, Spectr
         return "more than " + std::to_string(kMaxBands) + " spectral fields";
     for (std::size_t i = 1; i < spectral.size(); ++i) {
         if (spectral[i].first == spectral[i - 1].first) {
-            return "two spectral fields for " + detail::Nm(spectral[i].first) + " nm";
+            return "two spectral fields for " + StringHelpers::Shortest(spectral[i].first) + " nm";
         }
     }
     const bool stated = cmsIT8GetProperty(it8, "SPECTRAL_BANDS") ||

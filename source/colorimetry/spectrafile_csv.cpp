@@ -5,6 +5,7 @@
 #include <cmath>
 
 #include "nxbase/spectrafile.h"
+#include "nxbase/strhelp.h"
 #include "spectrafile_parse.h"
 
 namespace nxbase {
@@ -134,7 +135,6 @@ std::string Shown(std::string_view field) {
 
 namespace {
 
-using detail::Nm;
 using detail::ParseNumber;
 using detail::Shown;
 using detail::WavelengthOf;
@@ -330,7 +330,8 @@ void CsvSpectraParser::Row(const std::vector<std::string>& fields, int line) {
         const std::size_t column = ids + (amDescending ? bands - 1 - k : k);
         const std::string& field = fields[column];
         const std::string where = "field " + std::to_string(column + 1) + " (" +
-                                  Nm(pSet->wavelengths[k]) + " nm): \"" + Shown(field) + "\"";
+                                  StringHelpers::Shortest(pSet->wavelengths[k]) + " nm): \"" +
+                                  Shown(field) + "\"";
         if (!ParseNumber(field, &value)) {
             Error(line, where + " is not a number");
             return;

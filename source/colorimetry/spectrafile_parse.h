@@ -18,10 +18,7 @@ bool ParseNumber(std::string_view text, double* value);
 // none (any case), optionally followed by "nm" ("r380", "SPECTRAL_NM380",
 // "380nm", "382.5"); else -1.
 double WavelengthOf(std::string_view field);
-// A wavelength as messages show it: "390", "382.5".
-std::string Nm(double wavelength);
-// `value` with `decimals` decimals and a decimal point, whatever the locale.
-std::string Decimal(double value, int decimals);
+
 // A field as shown in messages: at most 40 bytes, control bytes as "?".
 std::string Shown(std::string_view field);
 

@@ -127,16 +127,25 @@ const std::string& StringHelpers::CharactersBase16() {
     return digits;
 }
 
+std::string StringHelpers::Fixed(double axValue, int alDecimals) {
+    std::array<char, 320 + GString::kMaxDecimals> buffer;
+    const auto [end, error] =
+        std::to_chars(buffer.data(), buffer.data() + buffer.size(), axValue,
+                      std::chars_format::fixed, std::clamp(alDecimals, 0, GString::kMaxDecimals));
+    return error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
+}
+
+std::string StringHelpers::Shortest(double axValue) {
+    std::array<char, 32> buffer;
+    const auto [end, error] = std::to_chars(buffer.data(), buffer.data() + buffer.size(), axValue);
+    return error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
+}
+
 // ---------------------------------------------------------------- GString
 
 GString::GString(double axValue, int alDecimals, int alWidth, char axDecimalSeparator,
                  bool axZeroPad, bool axPlusSign) {
-    alDecimals = std::clamp(alDecimals, 0, kMaxDecimals);
-    // DBL_MAX has 309 integer digits; add sign, point and decimals.
-    std::array<char, 320 + kMaxDecimals> buffer;
-    auto [end, error] = std::to_chars(buffer.data(), buffer.data() + buffer.size(), axValue,
-                                      std::chars_format::fixed, alDecimals);
-    std::string text = error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
+    std::string text = StringHelpers::Fixed(axValue, alDecimals);
     const bool finite = std::isfinite(axValue);
     if (finite && text[0] == '-' && text.find_first_not_of("0.", 1) == std::string::npos) {
         text.erase(0, 1);  // -0.00 reads as 0.00

@@ -85,14 +85,13 @@ std::vector<Quantity> MakeQuantities() {
                  {{"C*", "LAB_C"}, {"h", "LAB_H"}},
                  [](const ReflectanceSpectrum& s, const MeasuringCondition& mc, float* out) {
                      ScopedLabType cie(LAB_CIE1976);
-                     const LChVector lch{LABVector(s, mc)};
-                     out[0] = lch[1];
-                     out[1] = lch[2];
+                     const LABVector lab(s, mc);
+                     out[0] = LChVector{lab}[1];
+                     out[1] = static_cast<float>(nxbase::HueOfComputedLab(lab[1], lab[2]));
                  },
                  [](const Triple&, const Triple& lab, const MeasuringCondition& mc, float* out) {
-                     const LChVector lch{LabOf(lab, mc)};
-                     out[0] = lch[1];
-                     out[1] = lch[2];
+                     out[0] = LChVector{LabOf(lab, mc)}[1];
+                     out[1] = static_cast<float>(nxbase::HueOfComputedLab(lab[1], lab[2]));
                  }});
     q.push_back({"din99",
                  {{"L99", "DIN99_L"}, {"a99", "DIN99_A"}, {"b99", "DIN99_B"}},
@@ -151,12 +150,15 @@ std::string CsvField(const std::string& text) {
     return out + "\"";
 }
 
+// The id and the name in columns of their own, as the readers take them back.
 void WriteCsv(const Report& report, std::ostream& out) {
-    out << "id";
+    out << "id,name";
     for (const Column& c : report.columns) out << ',' << CsvField(c.name);
     out << '\n';
     for (const ReportRow& row : report.rows) {
-        out << CsvField(row.id);
+        const bool split = !row.sampleId.empty() || !row.sampleName.empty();
+        out << CsvField(split ? row.sampleId : row.id) << ','
+            << CsvField(split ? row.sampleName : std::string());
         for (std::size_t i = 0; i < row.values.size(); ++i) {
             out << ',' << FormatCell(row.values[i], report.columns[i]);
         }
