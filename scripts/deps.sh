@@ -11,6 +11,8 @@ packages=(
     libgtest-dev libgmock-dev libbenchmark-dev help2man doxygen clang-format
     python3-dev pybind11-dev python3-numpy python3-pytest
     argyll
+    # the German locale the file readers and writers are tested under
+    locales
     # GUI loop adapters, the Qt user interface and the GUI examples (Xvfb for the screenshot)
     qt6-base-dev libglib2.0-dev xvfb
     # NumPy's vectorised BLAS, so that bench/python_bench.py compares with a fair peer

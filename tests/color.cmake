@@ -7,6 +7,8 @@ if(TARGET nxcolor)
     target_compile_definitions(nxcolor_test PRIVATE NXCOLOR_PATH="$<TARGET_FILE:nxcolor>")
     add_dependencies(nxcolor_test nxcolor)
     target_link_libraries(nxcolor_test PRIVATE PkgConfig::LCMS2)
+    # Every file reader and writer under a decimal-comma locale.
+    nxbase_add_test(locale_test locale_test.cpp LIBS nxcolor_core)
 endif()
 nxbase_add_test(colordiff_test colordiff_test.cpp)
 target_link_libraries(colordiff_test PRIVATE PkgConfig::LCMS2)

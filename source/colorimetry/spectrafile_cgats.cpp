@@ -398,7 +398,8 @@ SpectralSet ReadCgatsText(std::string_view text, const std::string& source,
     // The file's own scale: SPECTRAL_NORM is the value that stands for 1.0;
     // ArgyllCMS measurement files (CTI3) hold percentages.
     double fileNorm = NumericProperty(it8, "SPECTRAL_NORM");
-    std::string normReason = fileNorm > 0.0 ? "SPECTRAL_NORM " + std::to_string(fileNorm) : "";
+    std::string normReason =
+        fileNorm > 0.0 ? "SPECTRAL_NORM " + StringHelpers::Shortest(fileNorm) : "";
     const char* sheet = cmsIT8GetSheetType(it8);
     if (fileNorm <= 0.0 && sheet && std::string(sheet).rfind("CTI3", 0) == 0) {
         fileNorm = 100.0;
