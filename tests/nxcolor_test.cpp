@@ -74,6 +74,16 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     ASSERT_EQ(back.errors.size(), 1u);
     EXPECT_EQ(back.errors[0].rfind("out.cgats: spectral fields missing", 0), 0u) << back.errors[0];
     EXPECT_EQ(nxcolor::FormatNumber(-0.00001f, 2), "0.00");
+    // Names with double quotes come back as they were written.
+    nxcolor::Report quoted = report;
+    quoted.keepSpectra = true;
+    quoted.rows[0].sampleName = "12\" \"tile\"";
+    std::ostringstream withSpectra;
+    nxcolor::Writers().at("cgats")(quoted, withSpectra);
+    const auto names = nxcolor::ParseSpectra(withSpectra.str(), "q.cgats");
+    ASSERT_EQ(names.rows.size(), 24u)
+        << (names.errors.empty() ? withSpectra.str().substr(0, 2000) : names.errors[0]);
+    EXPECT_EQ(names.rows[0].sampleName, "12\" \"tile\"");
     // A spectrum that reached the report without the reader's checks and
     // gives infinite XYZ is left out with its line.
     nxcolor::SpectraTable wild = table;

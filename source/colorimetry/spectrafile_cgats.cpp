@@ -23,8 +23,9 @@ namespace {
 constexpr int kMostCgatsSets = 32766;
 
 // The whitespace-separated tokens of a CGATS line as LittleCMS reads them: a
-// token that starts with a double quote runs to the next one (so "a""b" is
-// two tokens and "" one empty token); "#" outside quotes starts a comment.
+// token that starts with a double or a single quote runs to the next one of
+// the same kind (so "a""b" is two tokens and "" one empty token); "#"
+// outside quotes starts a comment.
 std::size_t CountTokens(std::string_view line) {
     std::size_t count = 0;
     std::size_t at = 0;
@@ -34,15 +35,15 @@ std::size_t CountTokens(std::string_view line) {
             ++at;
         } else if (c == '#') {
             break;
-        } else if (c == '"') {
-            const std::size_t close = line.find('"', at + 1);
+        } else if (c == '"' || c == '\'') {
+            const std::size_t close = line.find(c, at + 1);
             ++count;
             if (close == std::string_view::npos) break;
             at = close + 1;
         } else {
             ++count;
             while (at < line.size() && line[at] != ' ' && line[at] != '\t' && line[at] != '\r' &&
-                   line[at] != '"')
+                   line[at] != '"' && line[at] != '\'')
                 ++at;
         }
     }

@@ -166,8 +166,15 @@ void WriteCsv(const Report& report, std::ostream& out) {
     }
 }
 
-// A CGATS string: double quotes, an inner quote written as a single quote.
+// A CGATS string. CGATS has no escapes: a text with double quotes is put in
+// single ones, which the CGATS parsers read alike; only a text holding both
+// kinds (or a line break, which no CGATS string can hold) has its double
+// quotes and line breaks written as single quotes.
 std::string CgatsString(const std::string& text) {
+    const bool doubles = text.find('"') != std::string::npos;
+    const bool singles = text.find('\'') != std::string::npos;
+    const bool breaks = text.find_first_of("\r\n") != std::string::npos;
+    if (doubles && !singles && !breaks) return "'" + text + "'";
     std::string out = "\"";
     for (char c : text) out += (c == '"' || c == '\n' || c == '\r') ? '\'' : c;
     return out + "\"";
