@@ -32,9 +32,10 @@ def table(path):
 
 
 def reference_lab(grid, values, illuminant, observer):
-    """CIE XYZ by summation at the data's own interval (regular grids finer
-    than 10 nm, as CIE 15 and ASTM E308 prescribe) or at 1 nm of the linearly
-    interpolated data (other grids); end values held; then CIELAB."""
+    """CIE XYZ by summation over 360..830 nm at the data's own interval
+    (regular grids finer than 10 nm, as CIE 15 and ASTM E308 prescribe) or
+    at 1 nm of the linearly interpolated data (other grids); the spectrum's
+    and the illuminant's end values held; then CIELAB."""
     cmf_nm, cmf = table(os.path.join(CIE, f"cmf_cie{'1931_2' if observer == 2 else '1964_10'}deg.csv"))
     ill_nm, power = table(os.path.join(CIE, "illuminants", f"{illuminant}.csv"))
     steps = np.diff(grid)
@@ -48,9 +49,7 @@ def reference_lab(grid, values, illuminant, observer):
     else:
         nm = np.arange(360.0, 831.0)
         r = np.array([np.interp(nm, grid, v) for v in values])
-    inside = nm <= ill_nm[-1]
-    nm, r = nm[inside], r[:, inside]
-    s = np.interp(nm, ill_nm, power[:, 0])
+    s = np.interp(nm, ill_nm, power[:, 0])  # held beyond the table, as CIE 15 allows
     weights = np.stack([s * np.interp(nm, cmf_nm, cmf[:, c]) for c in range(3)])
     k = 100.0 / weights[1].sum()
     xyz = k * r @ weights.T
