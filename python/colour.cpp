@@ -762,9 +762,9 @@ void RegisterColour(py::module_& m) {
     m.def("XYZ_to_Lab", &XYZToLab, py::arg("XYZ"), py::arg("white") = d50,
           py::arg("observer") = two,
           "CIE 1976 L*a*b* of XYZ (white Y = 100) of shape (..., 3). white: an illuminant name "
-          "(its white "
-          "point for the observer) or an XYZ triple. The library's constants (t > 0.008856). "
-          "float64.");
+          "(its white point for the observer) or an XYZ triple with X, Y and Z above zero (else "
+          "ValueError). The library's constants (t > 0.008856). A triple holding NaN or an "
+          "infinity gives NaN. float64.");
     m.def("Lab_to_XYZ", &LabToXYZ, py::arg("Lab"), py::arg("white") = d50,
           py::arg("observer") = two, "The inverse of XYZ_to_Lab. float64 (..., 3).");
     m.def("Lab_to_LCh", &LabToLCh, py::arg("Lab"),
@@ -775,7 +775,8 @@ void RegisterColour(py::module_& m) {
           py::arg("target"), py::arg("method") = "Bradford", py::arg("observer") = two,
           "XYZ seen under the source white as the corresponding colour under the target white, "
           "(..., 3). "
-          "source, target: illuminant names or XYZ triples; method: \"Bradford\", \"CAT02\", \"Von "
+          "source, target: illuminant names or XYZ triples above zero, each on any scale (Y = 1 "
+          "or 100: only their chromaticities count, the colour keeps its scale); method: \"Bradford\", \"CAT02\", \"Von "
           "Kries\" or "
           "\"XYZ Scaling\" (any case). float64.");
     m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),
