@@ -14,6 +14,7 @@
 
 #include "color_test_util.h"
 #include "nxbase/adaptation.h"
+#include "nxbase/colorconverter.h"
 #include "nxbase/colorvector.h"
 #include "nxbase/finegrid.h"
 
@@ -218,6 +219,11 @@ TEST(ColorFunctions, KeepTheirPropertiesOverRandomInput) {
     EXPECT_NEAR(nxbase::HueOfComputedLab(0.0, 0.01), 90.0, 1e-12);
     EXPECT_EQ(nxbase::HueOfComputedLab(1.0, 0.0), 360.0);
     EXPECT_TRUE(std::isnan(nxbase::HueOfComputedLab(std::nan(""), 1.0)));
+    const float infinite[6] = {50.0f, INFINITY, 0.0f, 50.0f, 0.0f, 0.0f};
+    float rgb[6];
+    nxbase::LabToScreenRGB(infinite, rgb, 2);
+    EXPECT_TRUE(std::isnan(rgb[0]) && std::isnan(rgb[1]) && std::isnan(rgb[2]));
+    EXPECT_TRUE(std::isfinite(rgb[3]));
 }
 
 }  // namespace

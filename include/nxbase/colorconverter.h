@@ -54,7 +54,8 @@ constexpr int kGammaTableSize = 512;
 
 // Lab (CIE 1976, L 0..100) to sRGB components 0..100 by the formula path of
 // RGBVector(LABVector), `count` triples at a time, without the ICC engine and
-// with one log-key check per call. Results equal RGBVector's bit for bit.
+// with one log-key check per call. Results equal RGBVector's bit for bit; a
+// triple holding NaN or an infinity gives NaN.
 NXBASE_EXPORT void LabToScreenRGB(const float* lab, float* rgb, std::size_t count);
 
 namespace detail {

@@ -254,7 +254,7 @@ def test_every_function_answers_nan_or_refuses_and_keeps_its_properties():
     xyz = nxbase.Lab_to_XYZ(lab, "D65")
     np.testing.assert_allclose(nxbase.XYZ_to_Lab(xyz, "D65"), lab, atol=1e-9, err_msg=str(seed))
     for convert in (lambda v: nxbase.Lab_to_XYZ(v, "D65"), lambda v: nxbase.XYZ_to_Lab(v, "D65"),
-                    nxbase.Lab_to_LCh):
+                    nxbase.Lab_to_LCh, nxbase.Lab_to_sRGB):
         assert np.all(np.isnan(convert(broken))), seed
     for white in ([0, 100, 100], [95, -100, 108], [95, np.nan, 108], [np.inf, 100, 108]):
         with pytest.raises(ValueError, match="white must have X, Y and Z above zero"):

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <limits>
 #include <mutex>
 #include <optional>
 
@@ -231,7 +232,15 @@ namespace nxbase {
 
 void LabToScreenRGB(const float* lab, float* rgb, std::size_t count) {
     const WhitePoint& white = D65White();
-    for (std::size_t i = 0; i < count; ++i) LabToSrgb(lab + 3 * i, rgb + 3 * i, white);
+    for (std::size_t i = 0; i < count; ++i) {
+        const float* in = lab + 3 * i;
+        float* out = rgb + 3 * i;
+        if (std::isfinite(in[0]) && std::isfinite(in[1]) && std::isfinite(in[2])) {
+            LabToSrgb(in, out, white);
+        } else {
+            out[0] = out[1] = out[2] = std::numeric_limits<float>::quiet_NaN();
+        }
+    }
     if (count > 0 && LogEnabled())
         Log(String("Lab -> RGB: ") + String::CreateFromInt(static_cast<long>(count)) +
             " values, first " + Components(lab) + " -> " + Components(rgb));
