@@ -776,7 +776,8 @@ void RegisterColour(py::module_& m) {
           "XYZ seen under the source white as the corresponding colour under the target white, "
           "(..., 3). "
           "source, target: illuminant names or XYZ triples above zero, each on any scale (Y = 1 "
-          "or 100: only their chromaticities count, the colour keeps its scale); method: \"Bradford\", \"CAT02\", \"Von "
+          "or 100: only their chromaticities count, the colour keeps its scale); method: "
+          "\"Bradford\", \"CAT02\", \"Von "
           "Kries\" or "
           "\"XYZ Scaling\" (any case). float64.");
     m.def("resample", &Resample, py::arg("wavelengths"), py::arg("values"),

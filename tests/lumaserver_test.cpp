@@ -19,6 +19,7 @@
 #include <functional>
 #include <iterator>
 #include <optional>
+#include <random>
 #include <sstream>
 #include <thread>
 
@@ -705,6 +706,40 @@ TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {
         int status = 0;
         ::waitpid(child, &status, 0);
         EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    }
+}
+
+// The spectrum answer against a model of it: decoded only when whole, of 36
+// values, each a reflectance factor no further from 0 than the plausible
+// bound; then bit for bit the server's integers over 100000.
+TEST(LumaSpectrumAnswer, DecodesExactlyTheAnswersItShouldOverRandomInput) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_int_distribution<int> plausible(-200000, 200000), wild(-2147483647, 2147483647);
+    for (int round = 0; round < 3000; ++round) {
+        const int count = round % 7 == 0 ? static_cast<int>(random() % 40) : 36;
+        std::vector<int> values(static_cast<std::size_t>(std::max(count, 0)));
+        for (int& v : values) v = round % 5 == 0 ? wild(random) : plausible(random);
+        MyMemoryBlock block;
+        block << String("patch " + std::to_string(round)) << count;
+        const std::size_t written =
+            round % 11 == 0 ? random() % (values.size() + 1) : values.size();
+        for (std::size_t k = 0; k < written; ++k) block << values[k];
+        bool expected = count == 36 && written == values.size();
+        for (const int v : values) expected = expected && std::abs(v / 100000.0) <= 2.0;
+        nxbase::MeasuredSpectrum out;
+        out.id = "untouched";
+        std::string error;
+        ASSERT_EQ(nxbase::DecodeSpectrumAnswer(block, &out, &error), expected) << round << error;
+        if (!expected) {
+            EXPECT_EQ(out.id, "untouched");
+            EXPECT_FALSE(error.empty());
+            continue;
+        }
+        EXPECT_EQ(out.id, "patch " + std::to_string(round));
+        for (int k = 0; k < 36; ++k)
+            ASSERT_EQ(out.values[k], static_cast<float>(values[k] / 100000.0)) << k;
     }
 }
 

@@ -51,7 +51,8 @@ NXBASE_EXPORT bool DecodeMeasurementAnswer(MyMemoryBlock& axAnswer, MeasurementT
 
 // Reads a SPECTRUM_REQUEST answer after its status byte: the patch id, the
 // number of values (36) and the values in 1/100000. False (with the reason)
-// for a malformed or short answer; *pOut is then unchanged.
+// for a malformed or short answer, or a value beyond kMaxPlausibleReflectance;
+// *pOut is then unchanged.
 NXBASE_EXPORT bool DecodeSpectrumAnswer(MyMemoryBlock& axAnswer, MeasuredSpectrum* pOut,
                                         std::string* pError);
 

@@ -77,8 +77,6 @@ constexpr std::size_t kMaxCgatsBytes = 512u << 20;
 constexpr std::size_t kMaxBands = 4096;
 // Error messages kept per input; further ones are counted.
 constexpr std::size_t kMaxErrorMessages = 200;
-// A reflectance factor further from 0 than this is taken for a wrong scale.
-constexpr double kMaxPlausibleReflectance = 2.0;
 
 enum class SpectralScale {
     kAuto,      // as the file says, else percent when a value exceeds 1.5

@@ -11,6 +11,10 @@ constexpr int kFirstWavelength = 380;
 constexpr int kWavelengthStep = 10;
 constexpr int kLastWavelength = kFirstWavelength + kWavelengthStep * (kSpectrumSize - 1);
 
+// A reflectance factor further from 0 than this is taken for a wrong scale
+// or a broken measurement (fluorescent samples stay below it).
+constexpr double kMaxPlausibleReflectance = 2.0;
+
 }  // namespace nxbase
 
 #endif  // NXBASE_SPECTRALGRID_H_

@@ -1,9 +1,12 @@
 // Measuring through LumaServer; see nxbase/lumaclient.h.
 #include "nxbase/lumaclient.h"
 
+#include <cmath>
+
 #include "nxbase/msgcat.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/progress.h"
+#include "nxbase/strhelp.h"
 
 namespace nxbase {
 namespace {
@@ -162,6 +165,15 @@ bool DecodeSpectrumAnswer(MyMemoryBlock& axAnswer, MeasuredSpectrum* pOut, std::
     if (axAnswer.ReadPastEnd()) {
         *pError = "LumaServer sent a short spectrum";
         return false;
+    }
+    // A value no reflectance has would print as a colour far from the sample's.
+    for (std::size_t k = 0; k < result.values.size(); ++k) {
+        if (std::fabs(result.values[k]) > kMaxPlausibleReflectance) {
+            *pError = "LumaServer sent " + StringHelpers::Shortest(result.values[k]) + " at " +
+                      std::to_string(kFirstWavelength + kWavelengthStep * static_cast<int>(k)) +
+                      " nm for patch " + result.id + ": not a reflectance factor";
+            return false;
+        }
     }
     *pOut = std::move(result);
     return true;
