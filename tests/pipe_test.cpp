@@ -352,6 +352,9 @@ TEST_F(PipeTest, PeersThatNeverReadAreCappedTogether) {
     EXPECT_TRUE(pipe->HasChannel("Deaf1"));
     EXPECT_TRUE(pipe->HasChannel("Deaf2"));
     EXPECT_FALSE(pipe->HasChannel("Deaf3"));
+    // The kept total: the two queues left, within the cap.
+    EXPECT_GT(pipe->QueuedBytes(), kEach);
+    EXPECT_LE(pipe->QueuedBytes(), nxbase::kMaxAllQueuedBytes);
     for (int fd : peers) ::close(fd);
 }
 

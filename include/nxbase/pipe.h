@@ -156,6 +156,8 @@ class NXBASE_EXPORT Pipe {
     std::size_t ChannelCount() const { return amAllChannels.size(); }
     // Bytes of partly read frames over all channels.
     std::size_t PartialBytes() const { return amPartialBytes; }
+    // Bytes written but not yet taken by the sockets, over all channels.
+    std::size_t QueuedBytes() const { return amQueuedBytes; }
     const std::string& GetOwnName() const { return amOwnName; }
     const std::string& GetSocketPath() const { return amSocketPath; }
     bool IsListening() const;
@@ -230,7 +232,8 @@ class NXBASE_EXPORT Pipe {
     std::uint64_t amNextChannelId = 1;
     std::uint64_t amLastSendChannel = 0;
     std::size_t amPartialBytes = 0;
-    std::unique_ptr<DDE> pmDDE;  // the older transport, for peers on the bus
+    std::size_t amQueuedBytes = 0;  // the sum of every channel's outgoing bytes
+    std::unique_ptr<DDE> pmDDE;     // the older transport, for peers on the bus
 };
 
 #endif  // NXBASE_PIPE_H_

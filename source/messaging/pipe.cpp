@@ -216,6 +216,7 @@ void Pipe::CloseAll(bool abOwner) {
     amAllChannels.clear();
     amChannels.clear();
     amStarting.clear();
+    amQueuedBytes = 0;
     if (pmListener) {
         boost::system::error_code ignored;
         pmListener->pause.cancel();
@@ -431,16 +432,15 @@ void Pipe::LimitPartialFrames() {
 }
 
 // Peers that never read would each hold up to their own limit: their sum is
-// capped too. Only looked at while some channel has bytes waiting.
+// capped too. The sum is kept as the queues change; the channels are only
+// looked at when it is over the cap.
 void Pipe::LimitQueuedBytes() {
-    while (true) {
-        std::size_t all = 0;
+    while (amQueuedBytes > nxbase::kMaxAllQueuedBytes) {
         ChannelPtr largest;
         for (const auto& [id, channel] : amAllChannels) {
-            all += channel->outgoing.size();
             if (!largest || channel->outgoing.size() > largest->outgoing.size()) largest = channel;
         }
-        if (all <= nxbase::kMaxAllQueuedBytes || !largest) return;
+        if (!largest) return;
         Close(largest, "outgoing frames of all channels above " +
                            std::to_string(nxbase::kMaxAllQueuedBytes >> 20) +
                            " MiB; this one's peer does not read " +
@@ -538,6 +538,7 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     }
     if (!axChannel->outgoing.empty()) {
         axChannel->outgoing += asFrame;
+        amQueuedBytes += asFrame.size();
         LimitQueuedBytes();
         return !axChannel->closed;  // goes out behind what waits, when the socket is writable
     }
@@ -546,6 +547,7 @@ bool Pipe::Write(const ChannelPtr& axChannel, const std::string& asFrame) {
     if (!SendWhatFits(axChannel, asFrame, done)) return false;
     if (done == asFrame.size()) return true;
     axChannel->outgoing.assign(asFrame, done, std::string::npos);
+    amQueuedBytes += asFrame.size() - done;
     FlushOutgoing(axChannel);
     LimitQueuedBytes();
     return !axChannel->closed;
@@ -594,6 +596,7 @@ void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
     std::size_t done = 0;
     if (!SendWhatFits(axChannel, out, done)) return;
     out.erase(0, done);
+    amQueuedBytes -= done;
     if (out.empty() || axChannel->writeArmed) return;
     // The socket is full: go on when the peer has read.
     axChannel->writeArmed = true;
@@ -617,6 +620,7 @@ void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
                 (axChannel->peer.empty() ? std::string("(unknown)") : axChannel->peer) +
                 " closed: " + asReason);
     amPartialBytes -= std::min(amPartialBytes, axChannel->reader.Buffered());
+    amQueuedBytes -= axChannel->outgoing.size();
     std::string().swap(axChannel->outgoing);  // a handler may still hold the channel
     boost::system::error_code ignored;
     axChannel->timer.cancel();
