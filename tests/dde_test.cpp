@@ -37,15 +37,8 @@ class DdeTest : public ::testing::Test {
   protected:
     void SetUp() override {
         if (::access("/usr/bin/dbus-daemon", X_OK) != 0) GTEST_SKIP() << "no dbus-daemon";
-        // A private bus, never the user's.
-        std::string address = "unix:path=" + sandbox.root() + "/bus";
-        daemon = ::fork();
-        if (daemon == 0) {
-            ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork",
-                    ("--address=" + address).c_str(), nullptr);
-            ::_exit(127);
-        }
-        sandbox.Env("DBUS_SESSION_BUS_ADDRESS", address);
+        StartBus();
+        sandbox.Env("DBUS_SESSION_BUS_ADDRESS", "unix:path=" + sandbox.root() + "/bus");
         ASSERT_TRUE(RunUntil([&] { return std::filesystem::exists(sandbox.root() + "/bus"); }, 5s));
         sandbox.RegisterAbsentServer();
         peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "ddepeer");
@@ -69,6 +62,16 @@ class DdeTest : public ::testing::Test {
         }
     }
     std::string Exe(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+    // A private bus, never the user's.
+    void StartBus() {
+        const std::string address = "--address=unix:path=" + sandbox.root() + "/bus";
+        daemon = ::fork();
+        if (daemon == 0) {
+            ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork", address.c_str(),
+                    nullptr);
+            ::_exit(127);
+        }
+    }
 
     nxtest::MessagingSandbox sandbox{"dde"};
     pid_t daemon = -1;
@@ -152,7 +155,7 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
     EXPECT_TRUE(RunUntil([] { return true; }));
 }
 
-TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffAndTheSocketsServeOn) {
+TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined) {
     ASSERT_EQ(std::system((server + " &").c_str()), 0);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
@@ -173,6 +176,15 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffAndTheSocketsServeOn) {
     })) << office->GetLastError();
     EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
                   .find("DDE is off: the session bus was lost"),
+              std::string::npos);
+    // The bus comes back at its address: this process and the server join it again.
+    std::filesystem::remove(sandbox.root() + "/bus");
+    StartBus();
+    EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 20s));
+    EXPECT_TRUE(RunUntil(
+        [] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }, 20s));
+    EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
+                  .find("DDE is on again: the session bus is back"),
               std::string::npos);
 }
 

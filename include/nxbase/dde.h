@@ -62,8 +62,10 @@ class NXBASE_EXPORT DDE {
     // is there but refuses the connection shows the error box "DDE-Server
     // kann nicht initialisiert werden." and quits the application. A bus
     // name that another connection owns turns it off, logged, the sockets
-    // serving on. A bus that goes away later (a logout, a restart of the bus) turns it off,
-    // logged; the sockets go on serving.
+    // serving on. A bus that goes away later (a logout, a restart of the bus)
+    // turns it off, logged; the sockets go on serving, and the object joins
+    // the bus again when it comes back (tried after 1 s, then at doubling
+    // intervals up to 30 s; logged when it succeeds).
     explicit DDE(const std::string& asOwnAppName);
     ~DDE();
     DDE(const DDE&) = delete;
@@ -71,8 +73,8 @@ class NXBASE_EXPORT DDE {
 
     static DDE* Instance();
     bool IsActive() const;
-    // Turns the transport off, logged with `asWhy`; the names stay with the
-    // bus (a forked child must not release its parent's).
+    // Turns the transport off for good, logged with `asWhy`; the names stay
+    // with the bus (a forked child must not release its parent's).
     void TurnOff(const std::string& asWhy);
     // TurnOff, and no longer the process's DDE object: a new one may be made
     // while this one waits to be deleted.
@@ -104,6 +106,10 @@ class NXBASE_EXPORT DDE {
 
   private:
     struct Bus;
+    struct Retry;
+    enum class Joined { kYes, kNoBus, kNameTaken, kFailed };
+    Joined Join();
+    void RejoinLater();
     void Arm();
     void Process();
     bool Connect(const std::string& asTopic);
@@ -112,6 +118,7 @@ class NXBASE_EXPORT DDE {
 
     std::string amOwnName;
     std::unique_ptr<Bus> pmBus;
+    std::unique_ptr<Retry> pmRetry;  // while the bus is lost
     std::deque<VELTRAEvent> amEvents;
     ReceiveFunction fmReceiveFunction = nullptr;
     std::function<void(const std::string&)> fmExecute;

@@ -80,6 +80,15 @@ bool RequestName(sdbus::IConnection& axConnection, const std::string& asName) {
 
 }  // namespace
 
+// The wait before the next attempt to join a bus that was lost.
+struct DDE::Retry {
+    static constexpr std::chrono::milliseconds kFirst{1000};
+    static constexpr std::chrono::milliseconds kLongest{30000};
+    explicit Retry(boost::asio::io_context& axContext) : timer(axContext) {}
+    boost::asio::steady_timer timer;
+    std::chrono::milliseconds wait = kFirst;
+};
+
 struct DDE::Bus {
     std::unique_ptr<sdbus::IConnection> connection;
     std::unique_ptr<sdbus::IObject> object;
@@ -95,10 +104,23 @@ struct DDE::Bus {
 DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
     NX_ASSERT(pThis == 0);  // one per process
     pThis = this;
-    if (!SessionBusConfigured()) {
-        Log("DDE is off: no session bus");
-        return;
+    switch (Join()) {
+        case Joined::kNoBus:
+            Log("DDE is off: no session bus");
+            break;
+        case Joined::kFailed:
+            UserInterface::Current()->ErrorBox("DDE-Server kann nicht initialisiert werden.");
+            Application::Get().Quit();
+            break;
+        case Joined::kYes:
+        case Joined::kNameTaken:
+            break;
     }
+}
+
+// Connects to the session bus, takes the two names and serves the object.
+DDE::Joined DDE::Join() {
+    if (!SessionBusConfigured()) return Joined::kNoBus;
     try {
         auto bus = std::make_unique<Bus>();
         bus->connection = sdbus::createSessionBusConnection();
@@ -110,7 +132,7 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
             LogFile::WriteToLog(
                 String("DDE is off: the bus name " + nxbase::DdeBusName(topic) + " is taken"),
                 String());
-            return;
+            return Joined::kNameTaken;
         }
         bus->object = sdbus::createObject(*bus->connection, nxbase::kDdeObjectPath);
         std::weak_ptr<bool> alive = amAlive;
@@ -164,11 +186,11 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
         bus->object->finishRegistration();
         pmBus = std::move(bus);
         Arm();
+        return Joined::kYes;
     } catch (const sdbus::Error& error) {
         pmBus.reset();
         Log(std::string("DDE: ") + error.getName() + ": " + error.getMessage());
-        UserInterface::Current()->ErrorBox("DDE-Server kann nicht initialisiert werden.");
-        Application::Get().Quit();
+        return Joined::kFailed;
     }
 }
 
@@ -238,10 +260,36 @@ void DDE::Process() {
         while (pmBus->connection->processPendingRequest()) {
         }
     } catch (const sdbus::Error& error) {
-        return TurnOff("the session bus was lost (" + error.getName() + ": " + error.getMessage() +
-                       ")");
+        TurnOff("the session bus was lost (" + error.getName() + ": " + error.getMessage() +
+                "); joined again when it comes back");
+        RejoinLater();
+        return;
     }
     Arm();
+}
+
+// A lost bus (a logout, a restarted bus daemon) may come back at the same
+// address: try again, less often the longer it stays away.
+void DDE::RejoinLater() {
+    if (!pmRetry) pmRetry = std::make_unique<Retry>(Application::Get().GetContext());
+    pmRetry->timer.expires_after(pmRetry->wait);
+    std::weak_ptr<bool> alive = amAlive;
+    pmRetry->timer.async_wait([this, alive](const boost::system::error_code& error) {
+        if (!alive.lock() || error || pmBus || pThis != this) return;
+        switch (Join()) {
+            case Joined::kYes:
+                LogFile::WriteToLog(String("DDE is on again: the session bus is back"), String());
+                pmRetry->wait = Retry::kFirst;
+                return;
+            case Joined::kNameTaken:
+                return;  // another connection serves the names now
+            case Joined::kNoBus:
+            case Joined::kFailed:
+                pmRetry->wait = std::min(2 * pmRetry->wait, Retry::kLongest);
+                RejoinLater();
+                return;
+        }
+    });
 }
 
 void DDE::Retire(const std::string& asWhy) {
@@ -250,6 +298,7 @@ void DDE::Retire(const std::string& asWhy) {
 }
 
 void DDE::TurnOff(const std::string& asWhy) {
+    if (pmRetry) pmRetry->timer.cancel();
     if (!pmBus) return;
     LogFile::WriteToLog(String("DDE is off: " + asWhy), String());
     if (pmBus->timer) pmBus->timer->cancel();
