@@ -36,10 +36,7 @@ std::string Shell(const std::string& command) {
 class DdeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        if (::access("/usr/bin/dbus-daemon", X_OK) != 0) GTEST_SKIP() << "no dbus-daemon";
-        StartBus();
-        sandbox.Env("DBUS_SESSION_BUS_ADDRESS", "unix:path=" + sandbox.root() + "/bus");
-        ASSERT_TRUE(RunUntil([&] { return std::filesystem::exists(sandbox.root() + "/bus"); }, 5s));
+        if (!sandbox.StartBus()) GTEST_SKIP() << "no dbus-daemon";
         sandbox.RegisterAbsentServer();
         peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "ddepeer");
         sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peer);
@@ -56,25 +53,10 @@ class DdeTest : public ::testing::Test {
         }
         while (::waitpid(-1, nullptr, WNOHANG) > 0) {
         }
-        if (daemon > 0) {
-            ::kill(daemon, SIGTERM);
-            ::waitpid(daemon, nullptr, 0);
-        }
+        sandbox.StopBus();
     }
     std::string Exe(const std::string& path) { return path.substr(path.rfind('/') + 1); }
-    // A private bus, never the user's.
-    void StartBus() {
-        const std::string address = "--address=unix:path=" + sandbox.root() + "/bus";
-        daemon = ::fork();
-        if (daemon == 0) {
-            ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork", address.c_str(),
-                    nullptr);
-            ::_exit(127);
-        }
-    }
-
     nxtest::MessagingSandbox sandbox{"dde"};
-    pid_t daemon = -1;
     std::string peer, server;
 };
 
@@ -164,9 +146,7 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined
                                        [] { return true; }));
     ASSERT_TRUE(DDE::Instance()->IsActive());
     // A logout, a restarted bus: neither this process nor the server ends.
-    ::kill(daemon, SIGKILL);
-    ::waitpid(daemon, nullptr, 0);
-    daemon = -1;
+    sandbox.StopBus();
     EXPECT_TRUE(RunUntil([] { return !DDE::Instance()->IsActive(); }, 5s));
     RunUntil([] { return false; }, 300ms);
     EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
@@ -178,14 +158,26 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined
                   .find("DDE is off: the session bus was lost"),
               std::string::npos);
     // The bus comes back at its address: this process and the server join it again.
-    std::filesystem::remove(sandbox.root() + "/bus");
-    StartBus();
+    ASSERT_TRUE(sandbox.StartBus());
     EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 20s));
     EXPECT_TRUE(RunUntil(
         [] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }, 20s));
     EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
                   .find("DDE is on again: the session bus is back"),
               std::string::npos);
+}
+
+TEST_F(DdeTest, AnOfficeMadeWhileTheBusRestartsServesOnSocketsAndJoinsItLater) {
+    sandbox.StopBus();  // the address is set, its daemon gone
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    EXPECT_FALSE(Application::Get().IsQuitting());
+    EXPECT_FALSE(DDE::Instance()->IsActive());
+    MyMemoryBlock request, answer;
+    EXPECT_TRUE(office->SendAndReceive("EchoPeer", GET_APP_VERSION, request, answer, [] {
+        return true;
+    })) << office->GetLastError();
+    ASSERT_TRUE(sandbox.StartBus());
+    EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 20s));
 }
 
 TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {

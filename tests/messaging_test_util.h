@@ -5,8 +5,10 @@
 #define NXBASE_TESTS_MESSAGING_TEST_UTIL_H_
 
 #include <dirent.h>
+#include <signal.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -129,6 +131,7 @@ class MessagingSandbox {
         std::filesystem::create_directories(root_ + "/log");
     }
     ~MessagingSandbox() {
+        StopBus();
         env_.clear();
         std::error_code ignored;
         std::filesystem::remove_all(root_, ignored);
@@ -158,9 +161,40 @@ class MessagingSandbox {
         return copy;
     }
 
+    // A private D-Bus session bus at <root>/bus, the process's session bus
+    // from then on (never the user's). StopBus kills it, as a logout does;
+    // StartBus brings it back at the same address. False without dbus-daemon.
+    bool StartBus() {
+        if (::access("/usr/bin/dbus-daemon", X_OK) != 0) return false;
+        const std::string socket = root_ + "/bus";
+        std::filesystem::remove(socket);
+        const std::string address = "--address=unix:path=" + socket;
+        bus_ = ::fork();
+        if (bus_ == 0) {
+            ::execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork", address.c_str(),
+                    nullptr);
+            ::_exit(127);
+        }
+        if (!busSet_) Env("DBUS_SESSION_BUS_ADDRESS", "unix:path=" + socket);
+        busSet_ = true;
+        const auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+        while (!std::filesystem::exists(socket) && std::chrono::steady_clock::now() < until)
+            ::usleep(1000);
+        return std::filesystem::exists(socket);
+    }
+    void StopBus() {
+        if (bus_ <= 0) return;
+        ::kill(bus_, SIGKILL);
+        ::waitpid(bus_, nullptr, 0);
+        bus_ = -1;
+    }
+    bool BusRunning() const { return bus_ > 0; }
+
   private:
     std::string root_;
     std::vector<std::unique_ptr<ScopedEnv>> env_;
+    pid_t bus_ = -1;
+    bool busSet_ = false;
 };
 
 }  // namespace nxtest

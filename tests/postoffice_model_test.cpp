@@ -1,8 +1,9 @@
 // A seeded random walk through the post office's requests: blocking and
 // asynchronous sends to three real peer processes, answers on time and late,
 // waits given up by time-out and by keep-waiting functions, peers killed and
-// started again by the next send, and the post office closed and made anew,
-// between steps or from a handler while a send waits. Every request carries its own id, which
+// started again by the next send, the session bus killed and started again,
+// and the post office closed and made anew, between steps or from a handler
+// while a send waits. Every request carries its own id, which
 // its peer echoes, so that the model is simple: an answer handed to a
 // request must carry that request's id, every asynchronous request is called
 // back exactly once, and a blocking wait that was not given up and whose
@@ -22,6 +23,7 @@
 #include <vector>
 
 #include "messaging_test_util.h"
+#include "nxbase/dde.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "test_util.h"
@@ -80,17 +82,20 @@ class PostOfficeModelTest : public ::testing::Test {
             sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", peers.back().c_str(),
                              path);
         }
+        haveBus = sandbox.StartBus();
         Application::Get().ResetQuit();
     }
     void TearDown() override {
         NxSingleton::DeleteAllSingleton();
         for (const std::string& peer : peers) KillEvery(peer);
+        sandbox.StopBus();
         while (::waitpid(-1, nullptr, 0) > 0) {
         }
     }
 
     nxtest::MessagingSandbox sandbox{"model"};
     std::vector<std::string> peers;
+    bool haveBus = false;
 };
 
 TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
@@ -130,7 +135,8 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
     reopen.SetTimeoutHdl(LINK(Reopener, &reopener, Reopen));
     reopener.Reopen(nullptr);
     reopened();
-    long answered = 0, givenUp = 0, wrong = 0, kills = 0, reopens = 0, blockingUnanswered = 0;
+    long answered = 0, givenUp = 0, wrong = 0, kills = 0, reopens = 0, blockingUnanswered = 0,
+         busLosses = 0;
     auto start = std::chrono::steady_clock::now();
     for (long id = 0; id < steps && !HasFailure(); ++id) {
         const int peer = below(kPeers);
@@ -189,6 +195,13 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
                 reopen.SetTimeout(static_cast<unsigned long>(1 + below(3)));
                 reopen.Start();
             }
+        } else if (haveBus && chance(0.02)) {  // the session bus dies, or comes back
+            if (sandbox.BusRunning()) {
+                sandbox.StopBus();
+                ++busLosses;
+            } else {
+                ASSERT_TRUE(sandbox.StartBus());
+            }
         } else if (chance(0.1)) {  // a peer dies; the next send starts it again
             // Until the loss is seen: a queued asynchronous send may start
             // the peer again at once.
@@ -207,6 +220,13 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
         return true;
     };
     ASSERT_TRUE(RunUntil(allCalled, 30s));
+    // Every process on the bus again once it is back.
+    if (haveBus) {
+        if (!sandbox.BusRunning()) {
+            ASSERT_TRUE(sandbox.StartBus());
+        }
+        EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 40s));
+    }
     RunUntil([] { return false; }, 50ms);  // nobody called twice
     for (const auto& [id, count] : calls) {
         EXPECT_LE(count, 1) << "asynchronous request " << id;
@@ -217,8 +237,8 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
     auto took = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
     std::printf(
         "seed %lu: %ld steps in %.1f s, %ld answered, %ld given up, %ld peers killed, %ld "
-        "offices closed\n",
-        seed, steps, took, answered, givenUp, kills, reopens);
+        "offices closed, %ld bus losses\n",
+        seed, steps, took, answered, givenUp, kills, reopens, busLosses);
     EXPECT_EQ(wrong, 0);
     EXPECT_EQ(blockingUnanswered, 0);
     EXPECT_GT(answered, steps / 2);

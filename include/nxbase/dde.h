@@ -58,9 +58,11 @@ NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender,
 class NXBASE_EXPORT DDE {
   public:
     // The process's one DDE object (a second is an assertion, "pThis == 0").
-    // Without a session bus the object exists but is off (logged); a bus that
-    // is there but refuses the connection shows the error box "DDE-Server
-    // kann nicht initialisiert werden." and quits the application. A bus
+    // Without a session bus the object exists but is off (logged); so it is
+    // while the configured bus does not answer (its daemon restarting), and
+    // it joins the bus when it does. A bus that is there but refuses the
+    // connection shows the error box "DDE-Server kann nicht initialisiert
+    // werden." and quits the application. A bus
     // name that another connection owns turns it off, logged, the sockets
     // serving on. A bus that goes away later (a logout, a restart of the bus)
     // turns it off, logged; the sockets go on serving, and the object joins
@@ -95,9 +97,9 @@ class NXBASE_EXPORT DDE {
     }
 
     // Pokes `asCommand` with the encoded block to the application `asApp`,
-    // starting it first when it is known but not on the bus.
+    // starting it first when it is known but not on the bus and `abMayStart`.
     bool Send(const std::string& asApp, const std::string& asCommand,
-              const std::string& asEncodedData);
+              const std::string& asEncodedData, bool abMayStart = true);
     // Whether a server for the service and topic is on the bus (its topic's
     // bus name has an owner; only that server can own it).
     bool IsAppRunning(const char* aService, const char* aTopic);
@@ -107,7 +109,7 @@ class NXBASE_EXPORT DDE {
   private:
     struct Bus;
     struct Retry;
-    enum class Joined { kYes, kNoBus, kNameTaken, kFailed };
+    enum class Joined { kYes, kNoBus, kBusAbsent, kNameTaken, kFailed };
     Joined Join();
     void RejoinLater();
     void Arm();

@@ -139,6 +139,12 @@ class NXBASE_EXPORT Pipe {
                        const MyMemoryBlock& axEncodedData);
     bool SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
                        std::string_view asEncodedData);
+    // The answer to a command that came by DDE (channel 0), back by DDE: the
+    // requester waits for it on that transport. Never starts `asApp`.
+    bool AnswerByDde(const std::string& asApp, const std::string& asCommand,
+                     const MyMemoryBlock& axEncodedData);
+    bool AnswerByDde(const std::string& asApp, const std::string& asCommand,
+                     std::string_view asEncodedData);
     // Why the last failed send failed.
     const std::string& GetLastError() const { return amLastError; }
     // Why this process cannot use sockets (a refused runtime directory);
@@ -201,7 +207,7 @@ class NXBASE_EXPORT Pipe {
     bool SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
-    bool SendByDde(const std::string& asApp, const std::string& asCommand,
+    bool SendByDde(const std::string& asApp, const std::string& asCommand, bool abMayStart,
                    std::string_view asEncodedData);
     bool OnDdeBus(const std::string& asApp);
     std::string OwnRequestText() const;

@@ -90,7 +90,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // Frames carry no request id: a peer answers its requests in the order
     // they came. So every request, blocking or asynchronous, takes its place
     // in one queue per peer and message number, in the order sent, and each
-    // answer goes to the oldest request in it. A request given up (time-out,
+    // answer goes to the oldest request in it that went out on the answer's
+    // connection (DDE counting as one): answers on two connections may
+    // overtake each other. A request given up (time-out,
     // keep-waiting, its caller's end) keeps its place until its answer comes,
     // and that answer is logged and dropped; the queue empties when the
     // channel is lost.

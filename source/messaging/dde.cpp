@@ -65,6 +65,13 @@ bool SessionBusConfigured() {
     return runtime && *runtime && ::access((std::string(runtime) + "/bus").c_str(), F_OK) == 0;
 }
 
+// The bus's address leads nowhere: its daemon is gone or not yet started.
+bool NobodyServes(const sdbus::Error& axError) {
+    return axError.getName() == "org.freedesktop.DBus.Error.FileNotFound" ||
+           axError.getName() == "System.Error.ECONNREFUSED" ||
+           axError.getName() == "System.Error.ENOENT";
+}
+
 // False when another connection owns the name; other failures throw.
 bool RequestName(sdbus::IConnection& axConnection, const std::string& asName) {
     try {
@@ -107,6 +114,12 @@ DDE::DDE(const std::string& asOwnAppName) : amOwnName(asOwnAppName) {
     switch (Join()) {
         case Joined::kNoBus:
             Log("DDE is off: no session bus");
+            break;
+        case Joined::kBusAbsent:
+            LogFile::WriteToLog(
+                String("DDE is off: the session bus does not answer; joined when it does"),
+                String());
+            RejoinLater();
             break;
         case Joined::kFailed:
             UserInterface::Current()->ErrorBox("DDE-Server kann nicht initialisiert werden.");
@@ -190,7 +203,7 @@ DDE::Joined DDE::Join() {
     } catch (const sdbus::Error& error) {
         pmBus.reset();
         Log(std::string("DDE: ") + error.getName() + ": " + error.getMessage());
-        return Joined::kFailed;
+        return NobodyServes(error) ? Joined::kBusAbsent : Joined::kFailed;
     }
 }
 
@@ -284,6 +297,7 @@ void DDE::RejoinLater() {
             case Joined::kNameTaken:
                 return;  // another connection serves the names now
             case Joined::kNoBus:
+            case Joined::kBusAbsent:
             case Joined::kFailed:
                 pmRetry->wait = std::min(2 * pmRetry->wait, Retry::kLongest);
                 RejoinLater();
@@ -394,11 +408,11 @@ bool DDE::IsAppRunning(const char* aService, const char* aTopic) {
 }
 
 bool DDE::Send(const std::string& asApp, const std::string& asCommand,
-               const std::string& asEncodedData) {
+               const std::string& asEncodedData, bool abMayStart) {
     Log("DDE - Send");
     if (!pmBus) return false;
     if (!Connect(asApp)) {
-        if (pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
+        if (!abMayStart || pmApplications == nullptr || !pmApplications->HasApplication(asApp)) {
             Log("DDE send abort: HasApplication == 0");
             return false;
         }

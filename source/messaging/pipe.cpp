@@ -858,7 +858,7 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
         amLastSendChannel = 0;
-        return SendByDde(asApp, asCommand, asEncodedData) ||
+        return SendByDde(asApp, asCommand, true, asEncodedData) ||
                Fail("DDE send to " + asApp + " failed");
     }
     std::optional<SendScope> own;
@@ -868,7 +868,7 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;
     amLastSendChannel = 0;
     if (byDde)
-        return SendByDde(asApp, asCommand, asEncodedData) ||
+        return SendByDde(asApp, asCommand, true, asEncodedData) ||
                Fail("DDE send to " + asApp + " failed");
     amLastSendChannel = channel->id;
     return WriteMessage(channel, asCommand, asEncodedData) ||
@@ -892,10 +892,30 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
            Fail("writing to " + channel->peer + " failed: " + channel->closedWhy);
 }
 
-bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand,
+bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand, bool abMayStart,
                      std::string_view asEncodedData) {
     if (!pmDDE || !pmDDE->IsActive()) return false;
-    return pmDDE->Send(asApp, asCommand, std::string(asEncodedData));
+    return pmDDE->Send(asApp, asCommand, std::string(asEncodedData), abMayStart);
+}
+
+bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,
+                       const MyMemoryBlock& axEncodedData) {
+    return AnswerByDde(asApp, asCommand, BytesOf(axEncodedData));
+}
+
+bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,
+                       std::string_view asEncodedData) {
+    Application::Get();
+    if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
+    NX_ASSERT(IsOwnThread());
+    if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
+    if (nxbase::detail::CommunicationLogged())
+        nxbase::Log("Pipe::Send (DDE) -> " + asApp + " " + asCommand);
+    amLastSendChannel = 0;
+    if (!pmDDE || !pmDDE->IsActive())
+        return Fail("DDE is off; the answer to " + asApp + " is lost");
+    return SendByDde(asApp, asCommand, false, asEncodedData) ||
+           Fail("DDE send to " + asApp + " failed");
 }
 
 std::uint64_t Pipe::ChannelId(const std::string& asApp) const {

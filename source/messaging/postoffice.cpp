@@ -260,10 +260,17 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
                             String(kLogKey));
         return;
     }
-    // A peer answers on the connection the request came in on; an answer on
-    // another (a peer that reconnected to deliver what an earlier post office
-    // of this name asked) belongs to no request of ours.
-    if (at->second.front()->channel != axEvent.GetChannel()) {
+    // A peer answers each connection's requests in order, on the connection
+    // (or by the transport) the request came by; answers on two of them may
+    // overtake each other. So the answer belongs to the oldest request sent
+    // on its connection. One on a connection none of ours went out on (a peer
+    // that reconnected to deliver what an earlier post office of this name
+    // asked) belongs to no request of ours.
+    auto& queue = at->second;
+    auto own = std::find_if(queue.begin(), queue.end(), [&](const RequestPtr& request) {
+        return request->channel == axEvent.GetChannel();
+    });
+    if (own == queue.end()) {
         LogFile::WriteToLog(String("Answer on another connection than its request's dropped: ") +
                                 String(axEvent.GetCommand()) + " from " +
                                 String(axEvent.GetSender()),
@@ -271,10 +278,10 @@ void PostOffice::HandleAnswer(VELTRAEvent& axEvent, int alNumber) {
         return;
     }
     NX_COMM_LOG(String("MessageQueue - Insert message") +
-                ", Queue size: " + Number(static_cast<long>(at->second.size())));
+                ", Queue size: " + Number(static_cast<long>(queue.size())));
     // The emptied queue stays for the next request: no allocation per request.
-    RequestPtr request = std::move(at->second.front());
-    at->second.pop_front();
+    RequestPtr request = std::move(*own);
+    queue.erase(own);
     if (request->finished) {
         LogFile::WriteToLog(String("Late answer dropped: ") + String(axEvent.GetCommand()) +
                                 " from " + String(axEvent.GetSender()) +
@@ -552,14 +559,16 @@ unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     const std::string& command = number >= 0 && number < ANZAHL_BOTSCHAFTEN
                                      ? AnswerText(number)
                                      : (unlisted = kAnswerPrefix + pCommand->GetCommand());
-    if (pCommand->GetChannel() == 0)
-        return SendCommand(pCommand->GetSender(), command, axData, {}, PeerStart::kNever);
     if (!OnOwnThread("Answer")) return false;
     Pipe* pipe = Pipe::Instance();
     bool sent = false;
+    // Back on the transport and connection the command came by: the
+    // requester takes its answer only there.
     if (pipe != nullptr) {
         StuffedData encoded(axData);
-        sent = pipe->SendOnChannel(pCommand->GetChannel(), command, encoded.Bytes());
+        sent = pCommand->GetChannel() == 0
+                   ? pipe->AnswerByDde(pCommand->GetSender(), command, encoded.Bytes())
+                   : pipe->SendOnChannel(pCommand->GetChannel(), command, encoded.Bytes());
     }
     if (sent) {
         NX_COMM_LOG(String("Sent: ") + String(command));

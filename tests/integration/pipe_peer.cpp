@@ -43,7 +43,7 @@ void SendDueAnswers() {
         if (answer.channel != 0) {
             Pipe::Instance()->SendOnChannel(answer.channel, command, answer.data);
         } else {
-            Pipe::Instance()->Send(answer.peer, command, answer.data);
+            Pipe::Instance()->AnswerByDde(answer.peer, command, answer.data);
         }
         gPending.pop_front();
     }
