@@ -207,6 +207,7 @@ class NXBASE_EXPORT Pipe {
     bool SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone);
     void Close(const ChannelPtr& axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
+    bool MaySend(const std::string& asTo, const std::string& asCommand);
     bool SendByDde(const std::string& asApp, const std::string& asCommand, bool abMayStart,
                    std::string_view asEncodedData);
     bool OnDdeBus(const std::string& asApp);

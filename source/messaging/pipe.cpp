@@ -847,14 +847,20 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
     return SendOnChannel(alChannel, asCommand, BytesOf(axEncodedData));
 }
 
-bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
-                std::string_view asEncodedData) {
+// What every send checks first: not a forked copy, on the loop's thread.
+bool Pipe::MaySend(const std::string& asTo, const std::string& asCommand) {
     Application::Get();
     if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
     NX_ASSERT(IsOwnThread());
     if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
     if (nxbase::detail::CommunicationLogged())
-        nxbase::Log("Pipe::Send -> " + asApp + " " + asCommand);
+        nxbase::Log("Pipe::Send -> " + asTo + " " + asCommand);
+    return true;
+}
+
+bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
+                std::string_view asEncodedData) {
+    if (!MaySend(asApp, asCommand)) return false;
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
         amLastSendChannel = 0;
@@ -877,16 +883,11 @@ bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
 
 bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
                          std::string_view asEncodedData) {
-    Application::Get();
-    if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
-    NX_ASSERT(IsOwnThread());
     auto at = amAllChannels.find(alChannel);
-    if (at == amAllChannels.end() || at->second->closed || at->second->stage != Stage::kOpen) {
-        return Fail("the channel the command came in on is closed");
-    }
-    if (nxbase::detail::CommunicationLogged()) {
-        nxbase::Log("Pipe::Send -> " + at->second->peer + " " + asCommand);
-    }
+    const bool open =
+        at != amAllChannels.end() && !at->second->closed && at->second->stage == Stage::kOpen;
+    if (!MaySend(open ? at->second->peer : "(closed channel)", asCommand)) return false;
+    if (!open) return Fail("the channel the command came in on is closed");
     ChannelPtr channel = at->second;
     return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + channel->peer + " failed: " + channel->closedWhy);
@@ -905,12 +906,7 @@ bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,
 
 bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,
                        std::string_view asEncodedData) {
-    Application::Get();
-    if (!amForkedFrom.empty()) return Fail(ForkedCopyError());
-    NX_ASSERT(IsOwnThread());
-    if (!IsOwnThread()) return Fail("Send called from another thread than the event loop's");
-    if (nxbase::detail::CommunicationLogged())
-        nxbase::Log("Pipe::Send (DDE) -> " + asApp + " " + asCommand);
+    if (!MaySend(asApp, asCommand)) return false;
     amLastSendChannel = 0;
     if (!pmDDE || !pmDDE->IsActive())
         return Fail("DDE is off; the answer to " + asApp + " is lost");
