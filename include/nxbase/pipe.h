@@ -205,7 +205,8 @@ class NXBASE_EXPORT Pipe {
                       std::string_view asEncodedData);
     void FlushOutgoing(const ChannelPtr& axChannel);
     bool SendWhatFits(const ChannelPtr& axChannel, const std::string& asBytes, std::size_t& alDone);
-    void Close(const ChannelPtr& axChannel, const std::string& asReason);
+    // By value: a caller may pass a map entry that the close erases.
+    void Close(ChannelPtr axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
     bool MaySend(const std::string& asTo, const std::string& asCommand);
     bool SendByDde(const std::string& asApp, const std::string& asCommand, bool abMayStart,

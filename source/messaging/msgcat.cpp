@@ -1,147 +1,168 @@
 #include "nxbase/msgcat.h"
 
+#include <iterator>
 #include <unordered_map>
 
 #include "nxbase/mymemblo.h"
 
+// Every message once, in the order of its number: the names below and the
+// check that each stands at its enum value come from this one list.
+#define NXBASE_MESSAGES(X)       \
+    X(CONNECT)                   \
+    X(DISCONNECT)                \
+    X(LOCK)                      \
+    X(UNLOCK)                    \
+    X(CANCEL_REQUEST)            \
+    X(IS_APP_READY)              \
+    X(GET_APP_VERSION)           \
+    X(GET_TOP_WINDOW_POS)        \
+    X(GET_SW_VERSION)            \
+    X(GET_SERIE_NR)              \
+    X(GET_DISPLAY_STRING)        \
+    X(IS_A_LPM)                  \
+    X(IS_A_DENSITOMETER)         \
+    X(GET_DEVICE_TYPE)           \
+    X(GET_DEVICE_NAME)           \
+    X(SPECTRUM_REQUEST)          \
+    X(INDEX_VALUE_REQUEST)       \
+    X(TIME_REQUEST)              \
+    X(TIME_DOWNLOAD)             \
+    X(STD_NAME_DOWNLOAD)         \
+    X(GET_VAL_NR_VALUE)          \
+    X(STD_NAME_REQUEST)          \
+    X(NAME_18_REQUEST)           \
+    X(DEL_VAL_NR)                \
+    X(GET_VAL_NR_LIB)            \
+    X(SET_VAL_NR_LIB)            \
+    X(PARAMETER_REQUEST)         \
+    X(PARAMETER_DOWNLOAD)        \
+    X(EXEC_MEASUREMENT)          \
+    X(EXEC_WHITE_MEASUREMENT)    \
+    X(EXEC_REF_MEASUREMENT)      \
+    X(WHITE_REF_REQUEST)         \
+    X(ALT_TAB_ACTIV_REQUEST)     \
+    X(GET_VAL_NR_TAB)            \
+    X(SET_VAL_NR_TAB)            \
+    X(NEW_MEASURE_REQUEST)       \
+    X(MEAS_CONTROL_DOWNLOAD)     \
+    X(MEAS_CONTROL_REQUEST)      \
+    X(NEW_USER_GUIDE_REQUEST)    \
+    X(USER_GUIDE_DOWNLOAD)       \
+    X(SET_VAL_NR_VALUE)          \
+    X(C_DOWNLOAD)                \
+    X(SPECTRUM_DOWNLOAD)         \
+    X(MESSUNG_AUSGELOEST)        \
+    X(STATUSAENDERUNG)           \
+    X(NOTIFY_MESSUNG)            \
+    X(NOTIFY_MESSUNG_AUS)        \
+    X(NOTIFY_STATUS)             \
+    X(IS_READY)                  \
+    X(OPTIONEN_EINSTELLEN)       \
+    X(SCAN_LPM)                  \
+    X(MOVE_ABSOLUT)              \
+    X(MOVE_RELATIVE)             \
+    X(MOVE_HOME)                 \
+    X(MOVE_UP)                   \
+    X(MOVE_DOWN)                 \
+    X(MOVE_WHITE_REF_POS)        \
+    X(OUTPUT_ACTUAL_POSITION)    \
+    X(INITIALIZE_DEVICE)         \
+    X(SCAN_LUMIPROBE)            \
+    X(SET_DEVICE_ONLINE)         \
+    X(SET_DEVICE_OFFLINE)        \
+    X(HOLD_PAPER)                \
+    X(RELEASE_PAPER)             \
+    X(SET_DIGITIZING_MODE)       \
+    X(OUTPUT_DIGITIZING_VALUES)  \
+    X(CHANGE_BAUDRATE)           \
+    X(CHANGE_HANDSHAKE)          \
+    X(OUTPUT_ACTUAL_KEY)         \
+    X(OUTPUT_LAST_KEY)           \
+    X(OUTPUT_STATUS)             \
+    X(CLEAR_STATUS)              \
+    X(SET_SPECIAL_STATUS)        \
+    X(CLEAR_SPECIAL_STATUS)      \
+    X(OUTPUT_SPECIAL_STATUS)     \
+    X(ACTUAL_ERROR_REQUEST)      \
+    X(OUTPUT_TYPE)               \
+    X(OUTPUT_SERIAL_NUMBER)      \
+    X(OUTPUT_ARTICLE_NUMBER)     \
+    X(OUTPUT_PRODUCTION_DATE)    \
+    X(OUTPUT_SOFTWARE_VERSION)   \
+    X(ENTER_KEY_PRESSED)         \
+    X(NOTIFY_ENTER_KEY)          \
+    X(NOTIFY_ENTER_KEY_AUS)      \
+    X(GET_SPECTRUM_AT_POS)       \
+    X(SET_TABLE_MODE)            \
+    X(SET_LIGHT_LEVEL)           \
+    X(SET_TRANSM_STANDBY_POS)    \
+    X(GET_ACCESS_CODE)           \
+    X(RETURN_ACCESS_CODE)        \
+    X(PROGRAM_KEY)               \
+    X(DOWNLOAD_PROGRAM)          \
+    X(DOWNLOAD_ORIGIN_OFFSET)    \
+    X(DOWNLOAD_TRANS_LAMP_MODE)  \
+    X(HASA_LUMITABLE)            \
+    X(HASA_LUMITABLE_T)          \
+    X(ISA_LUMIPROBE)             \
+    X(ISA_LPM)                   \
+    X(ISA_DENSITOMETER)          \
+    X(ISA_VIDIPROBE)             \
+    X(ISA_LUMI_VIEW)             \
+    X(FILTER_DOWNLOAD)           \
+    X(GET_CHILDREN)              \
+    X(HAS_CHILDREN)              \
+    X(GET_OBJECT)                \
+    X(GRADUS_CONNECT)            \
+    X(NEW_FORMULA)               \
+    X(MODIFY_OPTIONS)            \
+    X(FILE_ACT_DRIVE_REQUEST)    \
+    X(FILE_CHANGE_DRIVE)         \
+    X(FILE_FORMAT_DRIVE)         \
+    X(FILE_DISC_SPACE_REQUEST)   \
+    X(FILE_ACT_DIR_REQUEST)      \
+    X(FILE_CHANGE_DIR)           \
+    X(FILE_CREATE_DIR)           \
+    X(FILE_DELETE_DIR)           \
+    X(FILE_RENAME_DIR)           \
+    X(FILE_DELETE_FILE)          \
+    X(FILE_RENAME_FILE)          \
+    X(FILE_STATUS_REQUEST)       \
+    X(FILE_ENTRY_COUNT)          \
+    X(FILE_ENTRY_REQUEST)        \
+    X(FILE_CREATE_FILE)          \
+    X(FILE_ACCESS_START)         \
+    X(FILE_ACCESS_END)           \
+    X(FILE_WRITE_TO_FILE)        \
+    X(FILE_READ_FROM_FILE)       \
+    X(GET_DEVICE_CATEGORY)       \
+    X(NETGAUGE_GET_STATUS)       \
+    X(BRING_APP_WINDOW_TO_FRONT) \
+    X(GET_AVAILABLE_FILTERS)     \
+    X(CAN_MULTI_MEASUREMENT)     \
+    X(ENABLE_MULTI_MEASUREMENT)  \
+    X(DISABLE_MULTI_MEASUREMENT) \
+    X(GET_ACTIVE_FILTERS)
+
+#define NXBASE_MESSAGE_TEXT(name) #name,
 const char PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN + 1][kBotschaftNameWidth] = {
-    "CONNECT",
-    "DISCONNECT",
-    "LOCK",
-    "UNLOCK",
-    "CANCEL_REQUEST",
-    "IS_APP_READY",
-    "GET_APP_VERSION",
-    "GET_TOP_WINDOW_POS",
-    "GET_SW_VERSION",
-    "GET_SERIE_NR",
-    "GET_DISPLAY_STRING",
-    "IS_A_LPM",
-    "IS_A_DENSITOMETER",
-    "GET_DEVICE_TYPE",
-    "GET_DEVICE_NAME",
-    "SPECTRUM_REQUEST",
-    "INDEX_VALUE_REQUEST",
-    "TIME_REQUEST",
-    "TIME_DOWNLOAD",
-    "STD_NAME_DOWNLOAD",
-    "GET_VAL_NR_VALUE",
-    "STD_NAME_REQUEST",
-    "NAME_18_REQUEST",
-    "DEL_VAL_NR",
-    "GET_VAL_NR_LIB",
-    "SET_VAL_NR_LIB",
-    "PARAMETER_REQUEST",
-    "PARAMETER_DOWNLOAD",
-    "EXEC_MEASUREMENT",
-    "EXEC_WHITE_MEASUREMENT",
-    "EXEC_REF_MEASUREMENT",
-    "WHITE_REF_REQUEST",
-    "ALT_TAB_ACTIV_REQUEST",
-    "GET_VAL_NR_TAB",
-    "SET_VAL_NR_TAB",
-    "NEW_MEASURE_REQUEST",
-    "MEAS_CONTROL_DOWNLOAD",
-    "MEAS_CONTROL_REQUEST",
-    "NEW_USER_GUIDE_REQUEST",
-    "USER_GUIDE_DOWNLOAD",
-    "SET_VAL_NR_VALUE",
-    "C_DOWNLOAD",
-    "SPECTRUM_DOWNLOAD",
-    "MESSUNG_AUSGELOEST",
-    "STATUSAENDERUNG",
-    "NOTIFY_MESSUNG",
-    "NOTIFY_MESSUNG_AUS",
-    "NOTIFY_STATUS",
-    "IS_READY",
-    "OPTIONEN_EINSTELLEN",
-    "SCAN_LPM",
-    "MOVE_ABSOLUT",
-    "MOVE_RELATIVE",
-    "MOVE_HOME",
-    "MOVE_UP",
-    "MOVE_DOWN",
-    "MOVE_WHITE_REF_POS",
-    "OUTPUT_ACTUAL_POSITION",
-    "INITIALIZE_DEVICE",
-    "SCAN_LUMIPROBE",
-    "SET_DEVICE_ONLINE",
-    "SET_DEVICE_OFFLINE",
-    "HOLD_PAPER",
-    "RELEASE_PAPER",
-    "SET_DIGITIZING_MODE",
-    "OUTPUT_DIGITIZING_VALUES",
-    "CHANGE_BAUDRATE",
-    "CHANGE_HANDSHAKE",
-    "OUTPUT_ACTUAL_KEY",
-    "OUTPUT_LAST_KEY",
-    "OUTPUT_STATUS",
-    "CLEAR_STATUS",
-    "SET_SPECIAL_STATUS",
-    "CLEAR_SPECIAL_STATUS",
-    "OUTPUT_SPECIAL_STATUS",
-    "ACTUAL_ERROR_REQUEST",
-    "OUTPUT_TYPE",
-    "OUTPUT_SERIAL_NUMBER",
-    "OUTPUT_ARTICLE_NUMBER",
-    "OUTPUT_PRODUCTION_DATE",
-    "OUTPUT_SOFTWARE_VERSION",
-    "ENTER_KEY_PRESSED",
-    "NOTIFY_ENTER_KEY",
-    "NOTIFY_ENTER_KEY_AUS",
-    "GET_SPECTRUM_AT_POS",
-    "SET_TABLE_MODE",
-    "SET_LIGHT_LEVEL",
-    "SET_TRANSM_STANDBY_POS",
-    "GET_ACCESS_CODE",
-    "RETURN_ACCESS_CODE",
-    "PROGRAM_KEY",
-    "DOWNLOAD_PROGRAM",
-    "DOWNLOAD_ORIGIN_OFFSET",
-    "DOWNLOAD_TRANS_LAMP_MODE",
-    "HASA_LUMITABLE",
-    "HASA_LUMITABLE_T",
-    "ISA_LUMIPROBE",
-    "ISA_LPM",
-    "ISA_DENSITOMETER",
-    "ISA_VIDIPROBE",
-    "ISA_LUMI_VIEW",
-    "FILTER_DOWNLOAD",
-    "GET_CHILDREN",
-    "HAS_CHILDREN",
-    "GET_OBJECT",
-    "GRADUS_CONNECT",
-    "NEW_FORMULA",
-    "MODIFY_OPTIONS",
-    "FILE_ACT_DRIVE_REQUEST",
-    "FILE_CHANGE_DRIVE",
-    "FILE_FORMAT_DRIVE",
-    "FILE_DISC_SPACE_REQUEST",
-    "FILE_ACT_DIR_REQUEST",
-    "FILE_CHANGE_DIR",
-    "FILE_CREATE_DIR",
-    "FILE_DELETE_DIR",
-    "FILE_RENAME_DIR",
-    "FILE_DELETE_FILE",
-    "FILE_RENAME_FILE",
-    "FILE_STATUS_REQUEST",
-    "FILE_ENTRY_COUNT",
-    "FILE_ENTRY_REQUEST",
-    "FILE_CREATE_FILE",
-    "FILE_ACCESS_START",
-    "FILE_ACCESS_END",
-    "FILE_WRITE_TO_FILE",
-    "FILE_READ_FROM_FILE",
-    "GET_DEVICE_CATEGORY",
-    "NETGAUGE_GET_STATUS",
-    "BRING_APP_WINDOW_TO_FRONT",
-    "GET_AVAILABLE_FILTERS",
-    "CAN_MULTI_MEASUREMENT",
-    "ENABLE_MULTI_MEASUREMENT",
-    "DISABLE_MULTI_MEASUREMENT",
-    "GET_ACTIVE_FILTERS",
-    "ANZAHL_BOTSCHAFTEN",
-};
+    NXBASE_MESSAGES(NXBASE_MESSAGE_TEXT) "ANZAHL_BOTSCHAFTEN"};
+#undef NXBASE_MESSAGE_TEXT
+
+namespace {
+#define NXBASE_MESSAGE_NUMBER(name) name,
+constexpr int kNumbers[] = {NXBASE_MESSAGES(NXBASE_MESSAGE_NUMBER)};
+#undef NXBASE_MESSAGE_NUMBER
+
+constexpr bool EachAtItsNumber() {
+    for (int n = 0; n < static_cast<int>(std::size(kNumbers)); ++n) {
+        if (kNumbers[n] != n) return false;
+    }
+    return true;
+}
+static_assert(std::size(kNumbers) == ANZAHL_BOTSCHAFTEN, "one name per message");
+static_assert(EachAtItsNumber(), "the names stand in the order of the message numbers");
+}  // namespace
 
 namespace nxbase {
 

@@ -612,7 +612,7 @@ void Pipe::FlushOutgoing(const ChannelPtr& axChannel) {
                                  });
 }
 
-void Pipe::Close(const ChannelPtr& axChannel, const std::string& asReason) {
+void Pipe::Close(ChannelPtr axChannel, const std::string& asReason) {
     if (axChannel->closed) return;
     axChannel->closed = true;
     axChannel->closedWhy = asReason;
