@@ -468,7 +468,15 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
     EXPECT_TRUE(nxbase::FineGridTristimulus::Applies(Grid(380, 730, 5)));
     EXPECT_TRUE(nxbase::FineGridTristimulus::Applies(Grid(400, 700, 10.0 / 3.0)));
     EXPECT_FALSE(nxbase::FineGridTristimulus::Applies(Grid(380, 730, 10)));
-    EXPECT_FALSE(nxbase::FineGridTristimulus::Applies({380, 385, 395, 400}));
+    // Uneven grids with a step below 10 nm are summed at every nanometre;
+    // coarser ones, and grids that do not increase, are not for this class.
+    EXPECT_TRUE(nxbase::FineGridTristimulus::Applies({380, 385, 395, 400}));
+    EXPECT_FALSE(nxbase::FineGridTristimulus::Applies({380, 400, 410, 430}));
+    EXPECT_FALSE(nxbase::FineGridTristimulus::Applies({380, 385, 385, 400}));
+    const nxbase::FineGridTristimulus uneven(MeasuringCondition(), {360, 363, 420, 555, 556, 830});
+    EXPECT_NEAR(uneven.White()[1], 100.0, 1e-9);
+    const float grey[6] = {0.4f, 0.4f, 0.4f, 0.4f, 0.4f, 0.4f};
+    EXPECT_NEAR(uneven.ToXYZ(grey)[1], 40.0, 1e-5);
 
     // A lamp line: a narrow peak between the 10 nm points, on 1 nm and 5 nm
     // grids, against an independent summation of the CIE tables.

@@ -10,9 +10,13 @@
 // unmeasured wavelengths are added to the end samples' weights, as ASTM E308
 // does), and samples outside 360..830 nm get no weight. The illuminant is
 // interpolated linearly between its table points and the colour-matching
-// functions between their 1 nm values. Weights are double; the perfect
-// diffuser gives Y = 100 exactly up to rounding. Spectra on a 10 nm or
-// coarser grid stay on the ASTM E308 tables of the 36-point path.
+// functions between their 1 nm values. On an uneven grid with a step below
+// 10 nm somewhere (a file that samples a feature finely), the sum runs over
+// every whole nanometre of 360..830 nm with R interpolated linearly between
+// its samples, instead of thinning the fine part to 10 nm. Weights are
+// double; the perfect diffuser gives Y = 100 exactly up to rounding. Spectra
+// on a 10 nm or coarser grid stay on the ASTM E308 tables of the 36-point
+// path.
 //
 // An object is immutable after construction: any number of threads may use
 // one at once.
@@ -41,9 +45,9 @@ NXBASE_EXPORT std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axL
 
 class NXBASE_EXPORT FineGridTristimulus {
   public:
-    // True when `wavelengths` is a regular grid (equal steps within 0.01 nm)
-    // with a step below 10 nm and at least three points: the grids this
-    // class is for.
+    // True for at least three increasing wavelengths that form a regular grid
+    // (equal steps within 0.01 nm) with a step below 10 nm, or an uneven one
+    // with some step below 10 nm: the grids this class is for.
     static bool Applies(const std::vector<double>& wavelengths);
 
     // Weights for the illuminant and observer of `axCondition` on

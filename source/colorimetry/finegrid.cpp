@@ -72,34 +72,30 @@ std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
             LabFInverse(fy - axLab[2] / 200.0) * axWhite[2]};
 }
 
-bool FineGridTristimulus::Applies(const std::vector<double>& wavelengths) {
+namespace {
+
+using Weights = std::array<std::vector<double>, 3>;
+
+// The step of a regular grid (equal steps within kStepTolerance), or 0.
+double RegularStep(const std::vector<double>& wavelengths) {
     const std::size_t n = wavelengths.size();
-    if (n < 3) return false;
     const double step = (wavelengths.back() - wavelengths.front()) / static_cast<double>(n - 1);
-    if (!(step > 0.0) || step >= kCoarsestStep - kStepTolerance) return false;
     for (std::size_t k = 0; k < n; ++k) {
         if (std::fabs(wavelengths[k] - (wavelengths.front() + step * static_cast<double>(k))) >
             kStepTolerance) {
-            return false;
+            return 0.0;
         }
     }
-    return true;
+    return step;
 }
 
-FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
-                                         std::vector<double> wavelengths)
-    : amWavelengths(std::move(wavelengths)) {
-    if (!Applies(amWavelengths)) {
-        throw std::invalid_argument("FineGridTristimulus: not a regular grid finer than 10 nm");
-    }
-    const auto illuminant = axCondition.GetIllum().GetIlluminant();
-    const auto observer = axCondition.GetObserver().GetObserver();
-    const std::size_t n = amWavelengths.size();
-    const double first = amWavelengths.front();
-    const double step = (amWavelengths.back() - first) / static_cast<double>(n - 1);
-    for (auto& channel : amWeights) channel.assign(n, 0.0);
-    // Every grid wavelength within the summation range, the measured ones
-    // and those beyond the ends, where the end values are held.
+// On a regular grid: every grid wavelength within the summation range, the
+// measured ones and those beyond the ends, where the end values are held.
+double AddRegularWeights(const std::vector<double>& grid, double step,
+                         const klume::cmetry::IIlluminant& illuminant,
+                         const klume::cmetry::IObserver& observer, Weights& weights) {
+    const std::size_t n = grid.size();
+    const double first = grid.front();
     const long from = static_cast<long>(std::ceil((kSumFrom - first) / step - 1e-9));
     const long to = static_cast<long>(std::floor((kSumTo - first) / step + 1e-9));
     double ySum = 0.0;
@@ -107,10 +103,73 @@ FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
         const double nm = first + step * static_cast<double>(j);
         const std::size_t k =
             static_cast<std::size_t>(std::clamp<long>(j, 0, static_cast<long>(n) - 1));
-        const double power = illuminant->GetPower(nm);
-        for (int c = 0; c < 3; ++c) amWeights[c][k] += power * CmfAt(*observer, c, nm);
-        ySum += power * CmfAt(*observer, 1, nm);
+        const double power = illuminant.GetPower(nm);
+        for (int c = 0; c < 3; ++c) weights[c][k] += power * CmfAt(observer, c, nm);
+        ySum += power * CmfAt(observer, 1, nm);
     }
+    return ySum;
+}
+
+// On an uneven grid: every whole nanometre of the summation range, over the
+// samples interpolated linearly (held beyond the ends); each nanometre's
+// product goes to its two neighbouring samples in proportion.
+double AddUnevenWeights(const std::vector<double>& grid,
+                        const klume::cmetry::IIlluminant& illuminant,
+                        const klume::cmetry::IObserver& observer, Weights& weights) {
+    const std::size_t last = grid.size() - 1;
+    std::size_t k = 0;  // grid[k] <= nm < grid[k + 1] inside the grid
+    double ySum = 0.0;
+    for (double nm = kSumFrom; nm <= kSumTo; nm += 1.0) {
+        const double power = illuminant.GetPower(nm);
+        while (k + 1 < last && grid[k + 1] <= nm) ++k;
+        double share = 1.0;  // of sample k; the rest goes to k + 1
+        std::size_t at = k;
+        if (nm <= grid.front()) {
+            at = 0;
+        } else if (nm >= grid[last]) {
+            at = last;
+        } else {
+            share = (grid[k + 1] - nm) / (grid[k + 1] - grid[k]);
+        }
+        for (int c = 0; c < 3; ++c) {
+            const double product = power * CmfAt(observer, c, nm);
+            weights[c][at] += share * product;
+            if (share < 1.0) weights[c][at + 1] += (1.0 - share) * product;
+        }
+        ySum += power * CmfAt(observer, 1, nm);
+    }
+    return ySum;
+}
+
+}  // namespace
+
+bool FineGridTristimulus::Applies(const std::vector<double>& wavelengths) {
+    const std::size_t n = wavelengths.size();
+    if (n < 3) return false;
+    double smallest = std::numeric_limits<double>::infinity();
+    for (std::size_t k = 1; k < n; ++k) {
+        const double step = wavelengths[k] - wavelengths[k - 1];
+        if (!(step > 0.0) || !std::isfinite(step)) return false;
+        smallest = std::min(smallest, step);
+    }
+    const double regular = RegularStep(wavelengths);
+    return (regular > 0.0 ? regular : smallest) < kCoarsestStep - kStepTolerance;
+}
+
+FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
+                                         std::vector<double> wavelengths)
+    : amWavelengths(std::move(wavelengths)) {
+    if (!Applies(amWavelengths)) {
+        throw std::invalid_argument(
+            "FineGridTristimulus: not an increasing grid with steps below 10 nm");
+    }
+    const auto illuminant = axCondition.GetIllum().GetIlluminant();
+    const auto observer = axCondition.GetObserver().GetObserver();
+    for (auto& channel : amWeights) channel.assign(amWavelengths.size(), 0.0);
+    const double step = RegularStep(amWavelengths);
+    const double ySum =
+        step > 0.0 ? AddRegularWeights(amWavelengths, step, *illuminant, *observer, amWeights)
+                   : AddUnevenWeights(amWavelengths, *illuminant, *observer, amWeights);
     const double scale = ySum > 0.0 ? 100.0 / ySum : 0.0;
     for (int c = 0; c < 3; ++c) {
         double white = 0.0;
