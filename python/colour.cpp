@@ -609,7 +609,8 @@ void RaiseIfUnopenable(const std::string& path) {
     std::error_code ignored;
     int error = std::filesystem::is_directory(path, ignored) ? EISDIR : 0;
     if (error == 0) {
-        const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+        const int fd =
+            ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);  // a FIFO must not block
         if (fd < 0) error = errno;
         if (fd >= 0) ::close(fd);
     }
