@@ -6,6 +6,7 @@
 #include <mutex>
 #include <optional>
 
+#include "nxbase/cielab.h"
 #include "nxbase/cmetry.h"
 #include "nxbase/iccprofile.h"
 #include "nxbase/linalg.h"
@@ -78,11 +79,6 @@ const MeasuringCondition& RgbCondition() {
     return condition;
 }
 
-// CIE 15:2004 inverse of f, matching the colour vectors' own constants.
-inline float InverseF(float f) {
-    return f > 0.206893034423f ? f * f * f : (f - 16.0f / 116.0f) / 7.787f;
-}
-
 // sRGB companding (IEC 61966-2-1), scaled to 0..100.
 inline float Compand(float v) {
     return 100.0f *
@@ -93,7 +89,8 @@ inline void LabToSrgb(const float* lab, float* rgb, const WhitePoint& white) {
     float fy = (lab[0] + 16.0f) / 116.0f;
     float fx = lab[1] / 500.0f + fy;
     float fz = fy - lab[2] / 200.0f;
-    float xyz[3] = {white.x * InverseF(fx), InverseF(fy), white.z * InverseF(fz)};
+    using nxbase::cielab::FInverse;
+    float xyz[3] = {white.x * FInverse(fx), FInverse(fy), white.z * FInverse(fz)};
     // Row by row, as LinAlg::MxV sums, written out so that it inlines.
     for (int i = 0; i < 3; ++i) {
         const float* row = kSrgbMatrix + 3 * i;

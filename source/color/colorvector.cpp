@@ -17,7 +17,7 @@ using nxbase::detail::kLabEpsilon;
 using nxbase::detail::kLabExponent;
 using nxbase::detail::kLabKappa;
 using nxbase::detail::kLabOffset;
-constexpr float kLabInverseEpsilon = 0.206893034423f;  // f at or below is linear
+constexpr float kLabInverseEpsilon = nxbase::cielab::kInverseEpsilonF;
 
 // LCh hue: degrees per radian, and the neutral threshold for a and b.
 constexpr double kDegreesPerRadian = 57.29577951308232;

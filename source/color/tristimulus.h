@@ -5,6 +5,8 @@
 #ifndef NXBASE_SOURCE_COLOR_TRISTIMULUS_H_
 #define NXBASE_SOURCE_COLOR_TRISTIMULUS_H_
 
+#include "nxbase/cielab.h"
+
 namespace nxbase {
 namespace detail {
 
@@ -28,11 +30,12 @@ inline void LaneSums(const float* const pW[3], const float* pR, float pOut[3]) {
     }
 }
 
-// CIE 15:2004 CIELAB constants in single precision.
-constexpr float kLabExponent = 0.33333334f;
-constexpr float kLabEpsilon = 0.008856f;  // t at or below: linear branch
-constexpr float kLabKappa = 7.787f;
-constexpr float kLabOffset = 0.13793103448275862f;  // 16/116
+// CIELAB's constants in single precision, as the batch and the vectors use them.
+constexpr float kLabExponent = cielab::kExponentF;
+constexpr float kLabEpsilon = cielab::kEpsilonF;
+constexpr float kLabKappa = cielab::kKappaF;
+constexpr float kLabOffset = cielab::kOffsetF;
+static_assert(cielab::kOffsetF == 0.13793103448275862f, "16/116 in single precision");
 
 }  // namespace detail
 }  // namespace nxbase

@@ -7,6 +7,7 @@
 #include <stdexcept>
 
 #include "klume/cmetry/data.h"
+#include "nxbase/cielab.h"
 #include "nxbase/meascond.h"
 
 namespace nxbase {
@@ -31,15 +32,6 @@ double CmfAt(const klume::cmetry::IObserver& observer, int channel, double nm) {
     return cmf[below] + t * (cmf[below + 1] - cmf[below]);
 }
 
-// CIELAB's f(t) with the library's constants, and its inverse.
-double LabF(double t) {
-    return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0;
-}
-
-double LabFInverse(double f) {
-    return f > 0.206893034423 ? f * f * f : (f - 16.0 / 116.0) / 7.787;
-}
-
 }  // namespace
 
 namespace {
@@ -58,9 +50,9 @@ constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
 std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
                                const std::array<double, 3>& axWhite) {
     if (!Usable(axXYZ, axWhite)) return {kNaN, kNaN, kNaN};
-    const double fx = LabF(axXYZ[0] / axWhite[0]);
-    const double fy = LabF(axXYZ[1] / axWhite[1]);
-    const double fz = LabF(axXYZ[2] / axWhite[2]);
+    const double fx = cielab::F(axXYZ[0] / axWhite[0]);
+    const double fy = cielab::F(axXYZ[1] / axWhite[1]);
+    const double fz = cielab::F(axXYZ[2] / axWhite[2]);
     return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
 }
 
@@ -68,8 +60,8 @@ std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
                                   const std::array<double, 3>& axWhite) {
     if (!Usable(axLab, axWhite)) return {kNaN, kNaN, kNaN};
     const double fy = (axLab[0] + 16.0) / 116.0;
-    return {LabFInverse(axLab[1] / 500.0 + fy) * axWhite[0], LabFInverse(fy) * axWhite[1],
-            LabFInverse(fy - axLab[2] / 200.0) * axWhite[2]};
+    return {cielab::FInverse(axLab[1] / 500.0 + fy) * axWhite[0], cielab::FInverse(fy) * axWhite[1],
+            cielab::FInverse(fy - axLab[2] / 200.0) * axWhite[2]};
 }
 
 namespace {
