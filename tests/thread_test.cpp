@@ -1,15 +1,21 @@
 #include "nxbase/thread.h"
 
 #include <gtest/gtest.h>
+#include <pthread.h>
+#include <signal.h>
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <future>
 #include <stdexcept>
+#include <thread>
 
 #include "nxbase/logfile.h"
 #include "test_util.h"
+#include "toolkit/eintr.h"
 #include "toolkit/system.h"
 #include "toolkit/userinterface.h"
 
@@ -168,6 +174,39 @@ TEST(Thread, DestroyingARunningThreadIsReportedWithItsName) {
     ASSERT_EQ(boxes.size(), 1u);
     EXPECT_NE(boxes[0].text.find("*****ASSERT*****"), std::string::npos);
     EXPECT_NE(boxes[0].text.find("\"careless\" destroyed while running"), std::string::npos);
+}
+
+// A read that a signal interrupts (its handler installed without
+// SA_RESTART) is made again and gets the byte written after the signals.
+TEST(RetryOnEintr, ACallASignalInterruptedIsMadeAgain) {
+    int fds[2];
+    ASSERT_EQ(::pipe(fds), 0);
+    struct sigaction action {};
+    struct sigaction previous {};
+    action.sa_handler = [](int) {};
+    sigemptyset(&action.sa_mask);
+    ASSERT_EQ(::sigaction(SIGUSR1, &action, &previous), 0);
+    const pthread_t reader = ::pthread_self();
+    std::atomic<int> calls{0};
+    std::thread writer([&] {
+        while (calls.load() < 2) {  // until one read was interrupted and made again
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
+            ::pthread_kill(reader, SIGUSR1);
+        }
+        EXPECT_EQ(::write(fds[1], "x", 1), 1);
+    });
+    char byte = 0;
+    const ssize_t n = toolkit::RetryOnEintr([&] {
+        ++calls;
+        return ::read(fds[0], &byte, 1);
+    });
+    writer.join();
+    ::sigaction(SIGUSR1, &previous, nullptr);
+    ::close(fds[0]);
+    ::close(fds[1]);
+    EXPECT_EQ(n, 1);
+    EXPECT_EQ(byte, 'x');
+    EXPECT_GE(calls.load(), 2);
 }
 
 }  // namespace

@@ -19,6 +19,7 @@
 #include <mutex>
 #include <vector>
 
+#include "toolkit/eintr.h"
 #include "toolkit/fileio.h"
 #include "toolkit/system.h"
 
@@ -128,9 +129,9 @@ bool ReadWhole(const std::string& path, std::string& text, FileId& id, std::stri
     text.reserve(static_cast<std::size_t>(st.st_size));
     char buffer[65536];
     for (;;) {
-        ssize_t n = ::read(fd.get(), buffer, sizeof buffer);
+        const ssize_t n =
+            toolkit::RetryOnEintr([&] { return ::read(fd.get(), buffer, sizeof buffer); });
         if (n < 0) {
-            if (errno == EINTR) continue;
             error = ErrnoText(("cannot read \"" + path + "\"").c_str());
             return false;
         }
@@ -318,9 +319,8 @@ struct Config::Impl {
         }
         Fd lock(::open((target + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0666));
         if (lock.get() < 0) return Fail(ErrnoText("cannot open the lock file"));
-        while (::flock(lock.get(), LOCK_EX) != 0) {
-            if (errno != EINTR) return Fail(ErrnoText("cannot lock"));
-        }
+        if (toolkit::RetryOnEintr([&] { return ::flock(lock.get(), LOCK_EX); }) != 0)
+            return Fail(ErrnoText("cannot lock"));
 
         std::string text;
         FileId oldId;

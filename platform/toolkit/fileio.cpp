@@ -12,12 +12,13 @@
 #include <string>
 #include <vector>
 
+#include "toolkit/eintr.h"
+
 namespace toolkit {
 
 bool WriteAll(int fd, std::string_view bytes) {
     while (!bytes.empty()) {
-        const ssize_t n = ::write(fd, bytes.data(), bytes.size());
-        if (n < 0 && errno == EINTR) continue;
+        const ssize_t n = RetryOnEintr([&] { return ::write(fd, bytes.data(), bytes.size()); });
         if (n <= 0) {
             if (n == 0) errno = EIO;
             return false;

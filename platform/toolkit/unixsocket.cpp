@@ -10,6 +10,8 @@
 #include <cerrno>
 #include <cstring>
 
+#include "toolkit/eintr.h"
+
 namespace toolkit {
 
 namespace {
@@ -32,10 +34,8 @@ int SocketCalls::Connect(const std::string& path) {
     std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
     int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     if (fd < 0) return -1;
-    int result;
-    do {
-        result = ::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
-    } while (result != 0 && errno == EINTR);
+    const int result = RetryOnEintr(
+        [&] { return ::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address); });
     if (result != 0) {
         int error = errno;
         ::close(fd);
@@ -61,18 +61,13 @@ bool SocketCalls::PeerIsSameUser(int fd, std::string& why) {
 }
 
 ssize_t SocketCalls::Send(int fd, const char* data, std::size_t size) {
-    ssize_t n;
-    do {
-        n = ::send(fd, data, size, MSG_DONTWAIT | MSG_NOSIGNAL);
-    } while (n < 0 && errno == EINTR);
+    const ssize_t n =
+        RetryOnEintr([&] { return ::send(fd, data, size, MSG_DONTWAIT | MSG_NOSIGNAL); });
     return n;
 }
 
 ssize_t SocketCalls::Receive(int fd, char* data, std::size_t size) {
-    ssize_t n;
-    do {
-        n = ::recv(fd, data, size, MSG_DONTWAIT);
-    } while (n < 0 && errno == EINTR);
+    const ssize_t n = RetryOnEintr([&] { return ::recv(fd, data, size, MSG_DONTWAIT); });
     return n;
 }
 

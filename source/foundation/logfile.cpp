@@ -16,6 +16,7 @@
 #include <sstream>
 
 #include "nxbase/thread.h"
+#include "toolkit/eintr.h"
 #include "toolkit/system.h"
 
 namespace {
@@ -38,15 +39,10 @@ constexpr std::uint8_t kEnabled = 2;
 // The last component is never followed as a symlink.
 bool AppendToFile(const std::string& path, const std::string& bytes, bool truncate) {
     int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW | (truncate ? O_TRUNC : 0);
-    int fd;
-    do {
-        fd = ::open(path.c_str(), flags, 0644);
-    } while (fd < 0 && errno == EINTR);
+    const int fd = toolkit::RetryOnEintr([&] { return ::open(path.c_str(), flags, 0644); });
     if (fd < 0) return false;
-    ssize_t n;
-    do {
-        n = ::write(fd, bytes.data(), bytes.size());
-    } while (n < 0 && errno == EINTR);
+    const ssize_t n =
+        toolkit::RetryOnEintr([&] { return ::write(fd, bytes.data(), bytes.size()); });
     int writeError = n < 0 ? errno : ENOSPC;
     ::close(fd);
     if (n == static_cast<ssize_t>(bytes.size())) return true;

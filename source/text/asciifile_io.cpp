@@ -12,6 +12,7 @@
 #include <string_view>
 #include <vector>
 
+#include "toolkit/eintr.h"
 #include "toolkit/fileio.h"
 
 namespace nxbase::detail {
@@ -22,26 +23,17 @@ namespace {
 constexpr std::size_t kBufferSize = 64 * 1024;
 
 int OpenRetrying(const char* path, int flags, mode_t mode = 0) {
-    int fd;
-    do {
-        fd = ::open(path, flags | O_CLOEXEC, mode);
-    } while (fd < 0 && errno == EINTR);
+    const int fd = toolkit::RetryOnEintr([&] { return ::open(path, flags | O_CLOEXEC, mode); });
     return fd;
 }
 
 ssize_t ReadRetrying(int fd, char* data, std::size_t size) {
-    ssize_t n;
-    do {
-        n = ::read(fd, data, size);
-    } while (n < 0 && errno == EINTR);
+    const ssize_t n = toolkit::RetryOnEintr([&] { return ::read(fd, data, size); });
     return n;
 }
 
 bool FsyncRetrying(int fd) {
-    int result;
-    do {
-        result = ::fsync(fd);
-    } while (result != 0 && errno == EINTR);
+    const int result = toolkit::RetryOnEintr([&] { return ::fsync(fd); });
     return result == 0;
 }
 

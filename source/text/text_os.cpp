@@ -9,6 +9,7 @@
 #include <clocale>
 #include <cstdlib>
 
+#include "toolkit/eintr.h"
 #include "toolkit/string.h"
 
 namespace nxbase::detail {
@@ -47,9 +48,9 @@ bool ReadWholeFile(const std::string& path, std::string& bytes) {
             if (bytes.size() >= kMaxReadFileBytes) break;
             bytes.resize(bytes.size() + 4096);
         }
-        ssize_t got = ::read(fd.get(), &bytes[done], bytes.size() - done);
+        const ssize_t got = toolkit::RetryOnEintr(
+            [&] { return ::read(fd.get(), &bytes[done], bytes.size() - done); });
         if (got < 0) {
-            if (errno == EINTR) continue;
             bytes.clear();
             return false;
         }

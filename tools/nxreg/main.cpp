@@ -18,6 +18,7 @@
 #include "nxbase/files.h"
 #include "nxbase/registry.h"
 #include "nxbase/version.h"
+#include "toolkit/eintr.h"
 
 namespace {
 
@@ -218,8 +219,8 @@ constexpr std::size_t kHeadBytes = 64u << 10;
 bool ReadUpTo(int fd, std::string& text, std::size_t limit, const std::string& source) {
     char buffer[1 << 16];
     while (limit > 0) {
-        const ssize_t n = ::read(fd, buffer, std::min(sizeof buffer, limit));
-        if (n < 0 && errno == EINTR) continue;
+        const ssize_t n = toolkit::RetryOnEintr(
+            [&] { return ::read(fd, buffer, std::min(sizeof buffer, limit)); });
         if (n < 0) throw std::runtime_error("cannot read " + source + ": " + std::strerror(errno));
         if (n == 0) return true;
         text.append(buffer, static_cast<std::size_t>(n));
