@@ -13,6 +13,7 @@
 
 #include "nxbase/appsetti.h"
 #include "nxbase/files.h"
+#include "nxbase/registry.h"
 #include "test_util.h"
 #include "toolkit/config.h"
 #include "toolkit/userinterface.h"
@@ -101,6 +102,10 @@ TEST_F(AppConfigTest, TheUserDirectoryFollowsXdgThenHomeAndIsCreated) {
         EXPECT_EQ(UserConfig::GetConfigDirectoryPath(),
                   String(dir.File("home") + "/.config/K-Lume"));
         EXPECT_TRUE(std::filesystem::is_directory(dir.File("home") + "/.config/K-Lume"));
+        // The registry's hive lies in the same directory, by the same rule.
+        ScopedEnv hive("NXBASE_USER_REGISTRY", "");
+        EXPECT_EQ(nxbase::RegistryHiveFile(nxbase::RegistryHive::CurrentUser),
+                  dir.File("home") + "/.config/K-Lume/registry.sqlite");
     }
 }
 

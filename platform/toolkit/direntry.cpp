@@ -135,4 +135,17 @@ std::string HomeDirectory() {
     return std::string();
 }
 
+std::string ConfigDirectory() {
+    std::string base;
+    if (const char* xdg = std::getenv("XDG_CONFIG_HOME"); xdg != nullptr && xdg[0] == '/') {
+        base = xdg;
+    } else {
+        const std::string home = HomeDirectory();
+        if (home.empty()) return home;
+        base = home + "/.config";
+    }
+    while (base.size() > 1 && base.back() == '/') base.pop_back();
+    return base;
+}
+
 }  // namespace toolkit

@@ -239,17 +239,8 @@ UserConfig::~UserConfig() {
 }
 
 String UserConfig::GetConfigDirectoryPath() {
-    std::string base;
-    const char* xdg = std::getenv("XDG_CONFIG_HOME");
-    // Relative values are invalid by the XDG base directory rules.
-    if (xdg != nullptr && xdg[0] == '/') {
-        base = xdg;
-    } else {
-        std::string home = toolkit::HomeDirectory();
-        if (home.empty()) return String();
-        base = home + "/.config";
-    }
-    while (base.size() > 1 && base.back() == '/') base.pop_back();
+    const std::string base = toolkit::ConfigDirectory();
+    if (base.empty()) return String();
     DirEntry dir(base + "/K-Lume");
     if (!dir.IsDirectory()) dir.MakeDirs();
     return dir.GetFull();

@@ -12,7 +12,6 @@
 // prepared statements; a child process after fork() abandons its parent's
 // connections without closing them, as SQLite requires.
 #include <pthread.h>
-#include <pwd.h>
 #include <sqlite3.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -29,6 +28,7 @@
 #include <thread>
 
 #include "nxbase/registry.h"
+#include "toolkit/direntry.h"
 
 namespace nxbase {
 namespace {
@@ -116,12 +116,6 @@ std::string_view KeyView(const std::string& asKey, std::string& asBuffer) {
         return asBuffer;
     }
     return asKey;
-}
-
-std::string HomeDirectory() {
-    if (const char* home = std::getenv("HOME"); home && *home) return home;
-    if (const passwd* entry = ::getpwuid(::getuid()); entry && entry->pw_dir) return entry->pw_dir;
-    return "/";
 }
 
 bool FileExists(const std::string& asFile) {
@@ -591,9 +585,8 @@ std::string RegistryHiveFile(RegistryHive axHive) {
         return (file && *file) ? file : "/etc/k-lume/registry.sqlite";
     }
     if (const char* file = std::getenv("NXBASE_USER_REGISTRY"); file && *file) return file;
-    const char* config = std::getenv("XDG_CONFIG_HOME");
-    std::string base = (config && *config) ? config : HomeDirectory() + "/.config";
-    return base + "/K-Lume/registry.sqlite";
+    // Without a home the path is relative to the root, where opening it fails with a reason.
+    return toolkit::ConfigDirectory() + "/K-Lume/registry.sqlite";
 }
 
 // ---- RegistryStore ----

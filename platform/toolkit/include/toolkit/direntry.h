@@ -63,6 +63,11 @@ namespace toolkit {
 
 // The user's home directory: $HOME, else the password database; "" if unknown.
 NXBASE_EXPORT std::string HomeDirectory();
+// The user's configuration directory: $XDG_CONFIG_HOME when it is absolute
+// (a relative one is invalid by the XDG base directory rules), else
+// HomeDirectory() + "/.config", without a trailing "/"; "" if the home is
+// unknown.
+NXBASE_EXPORT std::string ConfigDirectory();
 
 }  // namespace toolkit
 
