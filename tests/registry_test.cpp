@@ -4,6 +4,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
 #include <thread>
 
@@ -215,7 +216,8 @@ TEST_F(RegistryTest, ProcessesCreatingOneFreshHiveAtOnceAllSucceed) {
     // without the transaction around both, all four would create the tables.
     constexpr int kRounds = 20;
     constexpr int kProcesses = 4;
-    nxtest::ScopedEnv pause("NXBASE_TEST_SCHEMA_PAUSE_MS", "20");
+    nxbase::detail::SetSchemaCheckHook(
+        [] { std::this_thread::sleep_for(std::chrono::milliseconds(20)); });
     int failures = 0;
     for (int round = 0; round < kRounds && failures == 0; ++round) {
         std::string file = dir.File("race/" + std::to_string(round) + ".sqlite");
@@ -243,6 +245,7 @@ TEST_F(RegistryTest, ProcessesCreatingOneFreshHiveAtOnceAllSucceed) {
         EXPECT_EQ(RegistryStore::Values(RegistryHive::CurrentUser, "Software\\Race").size(),
                   static_cast<std::size_t>(kProcesses));
     }
+    nxbase::detail::SetSchemaCheckHook(nullptr);
     EXPECT_EQ(failures, 0);
 }
 

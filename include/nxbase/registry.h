@@ -226,6 +226,13 @@ NXBASE_EXPORT bool SplitRegistryPath(const std::string& asPath, RegistryHive& ax
 // The hive's database file from the environment (see the top of this file).
 NXBASE_EXPORT std::string RegistryHiveFile(RegistryHive axHive);
 
+namespace detail {
+// For tests: called between seeing a fresh hive file and creating its
+// tables, the window racing creators would collide in without the
+// transaction around both. Null (the default) calls nothing.
+NXBASE_EXPORT void SetSchemaCheckHook(void (*fHook)());
+}  // namespace detail
+
 // Value types, numbered as Windows numbers them. Only String values are read
 // by the library's string readers; the others exist so that files written by
 // Windows' regedit import whole (and those readers raise the key-type error).

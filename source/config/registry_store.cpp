@@ -258,16 +258,7 @@ void Run(Connection& axConnection, sqlite3_stmt* pStatement, const char* asWhat)
     if (result != SQLITE_DONE && result != SQLITE_ROW) Fail(axConnection, result, asWhat);
 }
 
-// Test seam: $NXBASE_TEST_SCHEMA_PAUSE_MS widens the window between seeing a
-// fresh file and creating its tables, where racing creators would collide
-// without the transaction around both.
-void PauseBetweenCheckAndCreate() {
-    static const long pause = [] {
-        const char* text = std::getenv("NXBASE_TEST_SCHEMA_PAUSE_MS");
-        return text != nullptr ? std::strtol(text, nullptr, 10) : 0L;
-    }();
-    if (pause > 0) std::this_thread::sleep_for(std::chrono::milliseconds(pause));
-}
+std::atomic<void (*)()> gSchemaCheckHook{nullptr};
 
 // Creates the tables in a fresh file, or checks that an existing file is ours.
 // The check of a file that is not (yet) ours reads the application id and the
@@ -283,7 +274,7 @@ void PrepareSchema(Connection& axConnection) {
         long long tables =
             axConnection.QueryInt("SELECT count(*) FROM sqlite_master", "cannot read the schema");
         applicationId = axConnection.QueryInt("PRAGMA application_id", "cannot read");
-        PauseBetweenCheckAndCreate();
+        if (auto hook = gSchemaCheckHook.load(std::memory_order_relaxed)) hook();
         if (applicationId != kApplicationId && (applicationId != 0 || tables != 0)) {
             throw RegistryError(RegistryErrorKind::kCorrupt, 0,
                                 "Registry database '" + axConnection.File() +
@@ -587,6 +578,10 @@ std::string RegistryHiveFile(RegistryHive axHive) {
     if (const char* file = std::getenv("NXBASE_USER_REGISTRY"); file && *file) return file;
     // Without a home the path is relative to the root, where opening it fails with a reason.
     return toolkit::ConfigDirectory() + "/K-Lume/registry.sqlite";
+}
+
+void detail::SetSchemaCheckHook(void (*fHook)()) {
+    gSchemaCheckHook.store(fHook, std::memory_order_relaxed);
 }
 
 // ---- RegistryStore ----
