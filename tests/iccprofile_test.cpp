@@ -5,6 +5,7 @@
 
 #include <map>
 
+#include "log_test_util.h"
 #include "nxbase/appconfig.h"
 #include "nxbase/colorconverter.h"
 #include "nxbase/logfile.h"
@@ -30,6 +31,11 @@ cmsHPROFILE LutProfile(cmsProfileClassSignature deviceClass, cmsColorSpaceSignat
 }
 
 // Replaces the engine's configuration for one test and rebuilds the engine.
+// Tests here read the log back: a log of this process's own, which no other
+// test process writes or truncates.
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
+
 class IccTest : public ::testing::Test {
   protected:
     void Configure(const std::string& enable, const std::string& path) {

@@ -13,6 +13,7 @@
 #include <stdexcept>
 #include <thread>
 
+#include "log_test_util.h"
 #include "nxbase/logfile.h"
 #include "test_util.h"
 #include "toolkit/eintr.h"
@@ -22,6 +23,11 @@
 namespace {
 
 using namespace std::chrono_literals;
+
+// Tests here read the log back: a log of this process's own, which no other
+// test process writes or truncates.
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
 
 TEST(CriticalSection, NestsOnOneThreadAndExcludesOtherThreads) {
     std::atomic<bool> otherEntered{false};
