@@ -2,10 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <cerrno>
 #include <clocale>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
+#include <random>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -185,6 +188,39 @@ TEST(DynStringArray, SlotsOutsideTheArrayAreNeitherReadNorWritten) {
     array.Clear();
     EXPECT_EQ(array.GetSize(), 1ul);
     EXPECT_EQ(array.Get(0), nullptr);
+}
+
+// The whole-field parsers against a model: a grammar written here as a
+// regular expression, the value from the C library under the "C" locale.
+TEST(StringHelpers, ParsersTakeExactlyWholeFieldsOverRandomText) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    const std::string alphabet = "0123456789.-+eE x,";
+    const std::regex integer("-?[0-9]+");
+    const std::regex decimal("-?([0-9]+\\.?[0-9]*|\\.[0-9]+)([eE][-+]?[0-9]+)?");
+    for (int round = 0; round < 20000; ++round) {
+        std::string text;
+        const int length = static_cast<int>(random() % 12);
+        for (int i = 0; i < length; ++i) {
+            // Mostly digits, so that many draws are numbers.
+            text += random() % 3 ? alphabet[random() % 10] : alphabet[random() % alphabet.size()];
+        }
+        if (round % 97 == 0) text = std::string(round % 2 ? "1" : "-9") + std::string(30, '9');
+        long long i = 7;
+        errno = 0;
+        const long long modelInteger = std::strtoll(text.c_str(), nullptr, 10);
+        const bool integerOk = std::regex_match(text, integer) && errno != ERANGE;
+        ASSERT_EQ(StringHelpers::ParseInteger(text, i), integerOk) << "\"" << text << "\"";
+        EXPECT_EQ(i, integerOk ? modelInteger : 7) << text;
+        double d = 7.0;
+        errno = 0;
+        const double modelDecimal = std::strtod(text.c_str(), nullptr);
+        const bool decimalOk =
+            std::regex_match(text, decimal) && errno != ERANGE && std::isfinite(modelDecimal);
+        ASSERT_EQ(StringHelpers::ParseDecimal(text, d), decimalOk) << "\"" << text << "\"";
+        EXPECT_EQ(d, decimalOk ? modelDecimal : 7.0) << text;
+    }
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 #define NXBASE_STRHELP_H_
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -45,6 +46,12 @@ class NXBASE_EXPORT StringHelpers {
     // NaN and infinities are written "nan", "inf", "-inf".
     static std::string Fixed(double axValue, int alDecimals);
     static std::string Shortest(double axValue);
+    // A whole field as a number, whatever the locale: an optional "-",
+    // decimal digits and, for ParseDecimal, a "." and an exponent. False,
+    // with the value untouched, for anything else: blanks, "+", an empty
+    // field, a value out of range, NaN or infinity.
+    static bool ParseInteger(std::string_view asText, long long& axValue);
+    static bool ParseDecimal(std::string_view asText, double& axValue);
 
     // Digit alphabets: "01", "01234567", "0123456789", "0123456789ABCDEF".
     static const std::string& CharactersBase2();

@@ -88,10 +88,7 @@ namespace detail {
 bool ParseNumber(std::string_view text, double* value) {
     text = Trim(text);
     if (!text.empty() && text.front() == '+') text.remove_prefix(1);
-    if (text.empty()) return false;
-    const auto result = std::from_chars(text.data(), text.data() + text.size(), *value);
-    return result.ec == std::errc() && result.ptr == text.data() + text.size() &&
-           std::isfinite(*value);
+    return StringHelpers::ParseDecimal(text, *value);
 }
 
 double WavelengthOf(std::string_view field) {

@@ -141,6 +141,25 @@ std::string StringHelpers::Shortest(double axValue) {
     return error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
 }
 
+bool StringHelpers::ParseInteger(std::string_view asText, long long& axValue) {
+    long long value = 0;
+    const auto [end, error] = std::from_chars(asText.data(), asText.data() + asText.size(), value);
+    if (asText.empty() || error != std::errc() || end != asText.data() + asText.size())
+        return false;
+    axValue = value;
+    return true;
+}
+
+bool StringHelpers::ParseDecimal(std::string_view asText, double& axValue) {
+    double value = 0.0;
+    const auto [end, error] = std::from_chars(asText.data(), asText.data() + asText.size(), value);
+    if (asText.empty() || error != std::errc() || end != asText.data() + asText.size() ||
+        !std::isfinite(value))
+        return false;
+    axValue = value;
+    return true;
+}
+
 // ---------------------------------------------------------------- GString
 
 GString::GString(double axValue, int alDecimals, int alWidth, char axDecimalSeparator,

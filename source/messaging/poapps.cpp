@@ -10,6 +10,7 @@
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/registry.h"
+#include "nxbase/strhelp.h"
 #include "toolkit/process.h"
 
 namespace {
@@ -30,8 +31,7 @@ bool ParseVersion(const std::string& asText, double& axVersion) {
         std::count(asText.begin(), asText.end(), '.') > 1 || asText == ".") {
         return false;
     }
-    axVersion = std::strtod(asText.c_str(), nullptr);
-    return true;
+    return StringHelpers::ParseDecimal(asText, axVersion);
 }
 
 }  // namespace
@@ -63,9 +63,10 @@ namespace nxbase {
 int WaitTimeoutSeconds() {
     const char* text = std::getenv("NXBASE_WAIT_TIMEOUT");
     if (text == nullptr || *text == '\0') return 0;
-    char* end = nullptr;
-    long seconds = std::strtol(text, &end, 10);
-    return *end == '\0' && seconds > 0 && seconds < 86400 ? static_cast<int>(seconds) : 0;
+    long long seconds = 0;
+    return StringHelpers::ParseInteger(text, seconds) && seconds > 0 && seconds < 86400
+               ? static_cast<int>(seconds)
+               : 0;
 }
 
 std::string ServerRegistrationHint() {

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <boost/asio/steady_timer.hpp>
+#include <climits>
 #include <cstdlib>
 #include <optional>
 #include <stdexcept>
@@ -13,6 +14,7 @@
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/text.h"
 #include "toolkit/process.h"
 #include "toolkit/userinterface.h"
@@ -613,7 +615,10 @@ bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
 unsigned char PostOffice::Send(const std::string& asApp, String& asCommand, MyMemoryBlock& axData,
                                boost::function<bool()> fKeepTrying, PeerStart axStart) {
     std::string command = asCommand.str();
-    if (asCommand.IsNumeric()) command = nxbase::CommandTextOfNumber(std::atoi(command.c_str()));
+    long long number = 0;
+    if (asCommand.IsNumeric() && StringHelpers::ParseInteger(command, number) &&
+        number >= INT_MIN && number <= INT_MAX)
+        command = nxbase::CommandTextOfNumber(static_cast<int>(number));
     return SendCommand(asApp, command, axData, fKeepTrying, axStart);
 }
 
