@@ -30,10 +30,13 @@
 #ifndef NXBASE_DDE_H_
 #define NXBASE_DDE_H_
 
+#include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "nxbase/export.h"
 #include "nxbase/mymemblo.h"
@@ -52,6 +55,10 @@ NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
 // encoded block, decoded into `axBlock`. Without a ":" the sender is empty
 // and all of it is the block.
 NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender,
+                             MyMemoryBlock& axBlock);
+// The same on bytes of the caller's, decoded in place: the block is the only
+// copy of the data made.
+NXBASE_EXPORT void SplitPoke(char* pData, std::size_t alSize, std::string& asSender,
                              MyMemoryBlock& axBlock);
 }  // namespace nxbase
 
@@ -116,7 +123,7 @@ class NXBASE_EXPORT DDE {
     void Process();
     bool Connect(const std::string& asTopic);
     bool SpeaksFor(const std::string& asClaimed);
-    void OnPoke(const std::string& asItem, const std::string& asData);
+    void OnPoke(const std::string& asItem, std::vector<std::uint8_t>& axData);
 
     std::string amOwnName;
     std::unique_ptr<Bus> pmBus;

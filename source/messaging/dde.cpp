@@ -8,6 +8,7 @@
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
 
 #include "messaging_log.h"
@@ -34,14 +35,19 @@ std::string DdeBusName(const std::string& asTopic) {
     return kDdeBusPrefix + element;
 }
 
-void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock) {
-    std::size_t colon = asData.find(':');
-    asSender = colon == std::string::npos ? std::string() : asData.substr(0, colon);
-    std::string bytes = colon == std::string::npos ? asData : asData.substr(colon + 1);
-    bytes.resize(DecodeInPlace(bytes.data(), bytes.size()));
-    MyMemoryBlock block(static_cast<long>(bytes.size()));
-    block.Put(bytes.data(), static_cast<long>(bytes.size()));
+void SplitPoke(char* pData, std::size_t alSize, std::string& asSender, MyMemoryBlock& axBlock) {
+    char* colon = static_cast<char*>(std::memchr(pData, ':', alSize));
+    asSender = colon == nullptr ? std::string() : std::string(pData, colon);
+    char* bytes = colon == nullptr ? pData : colon + 1;
+    const std::size_t size = DecodeInPlace(bytes, alSize - static_cast<std::size_t>(bytes - pData));
+    MyMemoryBlock block(static_cast<long>(size));
+    block.Put(bytes, static_cast<long>(size));
     axBlock = std::move(block);
+}
+
+void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock) {
+    std::string copy = asData;
+    SplitPoke(copy.data(), copy.size(), asSender, axBlock);
 }
 
 }  // namespace nxbase
@@ -169,12 +175,12 @@ DDE::Joined DDE::Join() {
         bus->object->registerMethod("Poke")
             .onInterface(nxbase::kDdeInterface)
             .implementedAs([this, ownTopic](const std::string& topic, const std::string& item,
-                                            const std::vector<std::uint8_t>& data) {
+                                            std::vector<std::uint8_t> data) {
                 Log("DDE Callback function (POKE)");
                 if (!ownTopic(nxbase::kDdeService, topic)) return false;
                 std::string claimed(data.begin(), std::find(data.begin(), data.end(), ':'));
                 if (!SpeaksFor(claimed)) return false;
-                OnPoke(item, std::string(data.begin(), data.end()));
+                OnPoke(item, data);
                 return true;
             });
         bus->object->registerMethod("Execute")
@@ -319,10 +325,12 @@ void DDE::TurnOff(const std::string& asWhy) {
     pmBus.reset();
 }
 
-void DDE::OnPoke(const std::string& asItem, const std::string& asData) {
+// The data is decoded where the bus left it and copied once, into the block.
+void DDE::OnPoke(const std::string& asItem, std::vector<std::uint8_t>& axData) {
     std::string sender;
     MyMemoryBlock block;
-    nxbase::SplitPoke(asData, sender, block);
+    nxbase::SplitPoke(reinterpret_cast<char*>(axData.data()), axData.size(), sender, block);
+    std::vector<std::uint8_t>().swap(axData);  // freed before the event waits in the queue
     amEvents.emplace_back(std::move(sender), asItem, std::move(block));
     // Handled once the bus dispatch has returned: a handler may wait for an
     // answer, which needs the bus again.
@@ -434,8 +442,12 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
         }
         if (!pmBus) return false;  // turned off while it waited
     }
-    std::string payload = amOwnName + ":" + asEncodedData;
-    std::vector<std::uint8_t> bytes(payload.begin(), payload.end());
+    // "<sender>:<encoded data>", built once in the form the bus takes.
+    std::vector<std::uint8_t> bytes;
+    bytes.reserve(amOwnName.size() + 1 + asEncodedData.size());
+    bytes.insert(bytes.end(), amOwnName.begin(), amOwnName.end());
+    bytes.push_back(':');
+    bytes.insert(bytes.end(), asEncodedData.begin(), asEncodedData.end());
     try {
         Log("Sending");
         auto proxy = sdbus::createProxy(*pmBus->connection, nxbase::DdeBusName(asApp),
