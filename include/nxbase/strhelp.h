@@ -49,7 +49,8 @@ class NXBASE_EXPORT StringHelpers {
     // A whole field as a number, whatever the locale: an optional "-",
     // decimal digits and, for ParseDecimal, a "." and an exponent. False,
     // with the value untouched, for anything else: blanks, "+", an empty
-    // field, a value out of range, NaN or infinity.
+    // field, a value out of range (beyond the largest double, or so small it
+    // would read as 0; a subnormal is taken), NaN or infinity.
     static bool ParseInteger(std::string_view asText, long long& axValue);
     static bool ParseDecimal(std::string_view asText, double& axValue);
 
