@@ -201,6 +201,11 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
         "b.csv");
     EXPECT_TRUE(beyond.percent);
     EXPECT_EQ(beyond.rows.size(), 1u);
+    // Only such rows: each refused, and no scale note claims a choice.
+    const SpectraTable none =
+        nxbase::ParseSpectraCsv(Header() + "\n2,x," + Values(1e4) + "\n", "n.csv");
+    EXPECT_TRUE(none.rows.empty() && none.scaleNote.empty());
+    ExpectOnlyError(none, "n.csv:2: value 10000.000000 is not a reflectance factor");
     // Dark patches in percent beside a brighter one: 1.18 everywhere is
     // brighter than any reflectance as a factor, so only percent explains
     // it; 0.9 fits both: refused, not Y 118.

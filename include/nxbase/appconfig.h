@@ -6,8 +6,10 @@
 // between threads only with outside locking (the file is safe to share).
 //
 // Where the files live on Linux:
-// - per-user directory: $XDG_CONFIG_HOME/K-Lume, else $HOME/.config/K-Lume
-//   (created on first use, with ~/.config if that is missing too);
+// - per-user directory: $XDG_CONFIG_HOME/K-Lume when XDG_CONFIG_HOME is
+//   absolute, else $HOME/.config/K-Lume (created on first use, with
+//   ~/.config if that is missing too; the user's registry hive lies there
+//   too, by the same rule: toolkit::ConfigDirectory);
 // - UserConfig: <per-user directory>/<application name made a file name>.ini;
 // - LocalConfig: <per-user directory>/<short name>.ini;
 // - AppConfig and VELTRAConfig: wherever their creator points them.

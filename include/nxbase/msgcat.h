@@ -155,7 +155,8 @@ enum PO_Botschaften {
 // Width of one name field of the message table, zero bytes included.
 constexpr int kBotschaftNameWidth = 30;
 // The message table: field n holds the NUL-padded ASCII name of message n;
-// field ANZAHL_BOTSCHAFTEN holds that name and is never searched.
+// field ANZAHL_BOTSCHAFTEN holds that name and is never searched. It is made
+// from one list that the build checks against this enum, name for number.
 NXBASE_EXPORT extern const char PO_BotschaftenNamen[ANZAHL_BOTSCHAFTEN + 1][kBotschaftNameWidth];
 
 // The answer to message n is numbered kAnswerOffset + n; its command text is

@@ -17,8 +17,9 @@
 #include "nxbase/export.h"
 
 namespace nxbase {
-// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT, or 0
-// when it is unset or not a positive whole number: no limit.
+// Seconds a wait that nobody can abort may last: $NXBASE_WAIT_TIMEOUT when it
+// is decimal digits only giving 1..86399, else 0 (unset, "+20", " 20", "1.5",
+// a day or more): no limit.
 NXBASE_EXPORT int WaitTimeoutSeconds();
 // How long one send waits for an application it started: 10 s, or
 // $NXBASE_WAIT_TIMEOUT if that is shorter.
@@ -68,7 +69,8 @@ class NXBASE_EXPORT PostOfficeApplications {
 
     // Reads the table for the application `asOwnAppName`. A process that is
     // the server itself reads nothing. Otherwise a server that is missing or
-    // older than version 3.0 throws std::runtime_error with the texts
+    // older than version 3.0 (its Version digits with at most one ".", read
+    // without the locale) throws std::runtime_error with the texts
     // "LumaServer missing or old!", "Unknown LumaServer version! Please
     // reinstall LumaServer" or "Old LumaServer found! Please reinstall new
     // LumaServer."; peers whose executable does not exist are skipped.

@@ -114,6 +114,9 @@ void GuessScale(SpectralSet* pSet, const SpectralReadOptions& axOptions,
             both.push_back(sample.line);
         }
     }
+    // Nothing either scale explains: every row is refused as implausible,
+    // and no scale was chosen to say anything of.
+    if (onlyPercent.empty() && both.empty()) return;
     const std::string choices = axOptions.percentChoice + " or " + axOptions.fractionChoice;
     if (!onlyPercent.empty() && !both.empty()) {
         detail::AddError(pSet, source + ": the scale is unclear: " + LinesOf(onlyPercent) +
