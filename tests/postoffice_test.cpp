@@ -532,6 +532,40 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
 }
 
+TEST_F(PostOfficeTest, AnAsynchronousSendWaitsForAStartWithoutALongTurnOfTheLoop) {
+    std::string slow = root + "/bin/slowstart";
+    std::ofstream(slow) << "#!/bin/sh\nsleep 2\n";
+    std::filesystem::permissions(slow, std::filesystem::perms::owner_all);
+    sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "SlowPeer", slow);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    MyMemoryBlock request;
+    // The time-out covers the start; the loop's turns stay short meanwhile
+    // (a nested wait would make the turn that sends last the whole start).
+    for (auto [peer, timeout, expected] :
+         {std::tuple{"SlowPeer", 300ms, "within 300 ms"}, std::tuple{"EchoPeer", 10000ms, ""}}) {
+        std::optional<AnswerResult> result;
+        auto start = std::chrono::steady_clock::now();
+        office->SendAndReceiveAsync(
+            peer, GET_DEVICE_NAME, request, [&](AnswerResult& answer) { result = answer; },
+            timeout);
+        auto longestTurn = 0ms;
+        while (!result && std::chrono::steady_clock::now() - start < 10s) {
+            auto turn = std::chrono::steady_clock::now();
+            Application::Get().RunOneFor(20ms);
+            longestTurn =
+                std::max(longestTurn, std::chrono::duration_cast<std::chrono::milliseconds>(
+                                          std::chrono::steady_clock::now() - turn));
+        }
+        ASSERT_TRUE(result) << peer;
+        EXPECT_EQ(result->answered, *expected == '\0') << peer << ": " << result->error;
+        EXPECT_NE(result->error.find(expected), std::string::npos) << result->error;
+        EXPECT_LT(longestTurn.count(), 100) << peer;
+        if (!result->answered) {
+            EXPECT_LT(std::chrono::steady_clock::now() - start, 700ms);
+        }
+    }
+}
+
 TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
     PostOffice* office = PostOffice::CreatePostOffice("Host");
     MyMemoryBlock request, answer;

@@ -97,14 +97,16 @@ class NXBASE_EXPORT DDE {
     void SetApplications(const PostOfficeApplications* pApplications) {
         pmApplications = pApplications;
     }
-    // Asked while Send waits for an application it started (empty: wait
-    // the full time).
-    void SetStartWaitCheck(std::function<bool()> fKeepWaiting) {
-        fmKeepWaiting = std::move(fKeepWaiting);
-    }
+    // Starts application `asApp` and runs the loop until `fReady()` is true;
+    // false with the reason in `asWhy`. The transport that owns this object
+    // installs it, so that both transports start peers one way.
+    using Starter = std::function<bool(const std::string& asApp,
+                                       const std::function<bool()>& fReady, std::string& asWhy)>;
+    void SetStarter(Starter fStarter) { fmStart = std::move(fStarter); }
 
     // Pokes `asCommand` with the encoded block to the application `asApp`,
-    // starting it first when it is known but not on the bus and `abMayStart`.
+    // starting it first (through the starter) when it is known but not on the
+    // bus and `abMayStart`.
     bool Send(const std::string& asApp, const std::string& asCommand,
               const std::string& asEncodedData, bool abMayStart = true);
     // Whether a server for the service and topic is on the bus (its topic's
@@ -132,7 +134,7 @@ class NXBASE_EXPORT DDE {
     ReceiveFunction fmReceiveFunction = nullptr;
     std::function<void(const std::string&)> fmExecute;
     const PostOfficeApplications* pmApplications = nullptr;
-    std::function<bool()> fmKeepWaiting;
+    Starter fmStart;
     std::shared_ptr<bool> amAlive = std::make_shared<bool>(true);
 };
 

@@ -145,6 +145,18 @@ class NXBASE_EXPORT Pipe {
                      const MyMemoryBlock& axEncodedData);
     bool AnswerByDde(const std::string& asApp, const std::string& asCommand,
                      std::string_view asEncodedData);
+    // For a send that waits on a timer instead of running a loop of its own
+    // (an asynchronous send): IsReachable says, without waiting or starting
+    // anything, whether a send to `asApp` would find it (an open channel, a
+    // listener, its topic on the bus). StartForLater starts it as Send would
+    // (once, and never while another send's start of it lives) without the
+    // wait: true with the process id to watch (-1 when an instance that is
+    // coming up is waited for), false with GetLastError(). StartEnded says
+    // whether that process ended before `asApp` became reachable, and how.
+    bool IsReachable(const std::string& asApp);
+    bool StartForLater(const std::string& asApp, int& alPid);
+    bool StartEnded(const std::string& asApp, int alPid, std::string& asHow);
+
     // Why the last failed send failed.
     const std::string& GetLastError() const { return amLastError; }
     // Why this process cannot use sockets (a refused runtime directory);
@@ -187,6 +199,7 @@ class NXBASE_EXPORT Pipe {
     bool Reach(const std::string& asApp, const std::string& asCommand, ChannelPtr& axChannel,
                bool& abByDde);
     bool StartForScope(const std::string& asApp, const PostOfficeApplication& axApplication);
+    bool StartAndAwait(const std::string& asApp, const std::function<bool()>& fReady);
     toolkit::StartWait WaitForStart(const std::string& asApp, const std::function<bool()>& fReady,
                                     std::string& asWhy);
     bool Fail(const std::string& asReason);

@@ -226,6 +226,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     bool SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
                      const boost::function<bool()>& fKeepTrying, PeerStart axStart);
     void StartAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend, PeerStart axStart);
+    void AwaitStart(const RequestPtr& pRequest, std::shared_ptr<const MyMemoryBlock> pSend,
+                    int alPid, std::chrono::milliseconds pause);
+    void SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend, PeerStart axStart);
     void ArmAsync(const RequestPtr& pRequest);
     void Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlock axData,
                 std::string asError);

@@ -143,6 +143,27 @@ bool Application::RunOneFor(std::chrono::milliseconds timeout) {
     return ran;
 }
 
+Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
+                                           const std::function<bool()>& keepWaiting,
+                                           std::chrono::steady_clock::time_point deadline) {
+    using namespace std::chrono;
+    constexpr milliseconds kLongestTurn(50);
+    const unsigned long quits = quitCount_.load();
+    while (true) {
+        if (ready()) return WaitEnd::kReady;
+        // Before the keep-waiting function, which may ask a person.
+        if (quitCount_.load() != quits) return WaitEnd::kQuit;
+        if (keepWaiting && !keepWaiting()) return WaitEnd::kGivenUp;
+        auto now = steady_clock::now();
+        if (now >= deadline) return WaitEnd::kTimedOut;
+        // Rounded up, so that a turn ending just before the deadline is not
+        // followed by turns of 0 ms.
+        auto left = deadline - now;
+        RunOneFor(left < kLongestTurn ? duration_cast<milliseconds>(left) + milliseconds(1)
+                                      : kLongestTurn);
+    }
+}
+
 int Application::GetLoopDescriptor() {
     if (loopDescriptor_ >= 0) return loopDescriptor_;
     int loop = ::epoll_create1(EPOLL_CLOEXEC);

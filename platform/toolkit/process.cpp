@@ -123,33 +123,31 @@ StartWait WaitForStartedProcess(pid_t pid, const std::function<bool()>& ready,
                                 std::chrono::steady_clock::time_point deadline, std::string& why) {
     using namespace std::chrono;
     constexpr milliseconds kLongestPause(50);
-    milliseconds pause(2);
-    auto nextTry = steady_clock::now();
-    while (true) {
-        auto now = steady_clock::now();
-        if (now >= nextTry) {
-            if (ready()) return StartWait::kReady;
-            nextTry = now + pause;
-            pause = std::min(pause * 2, kLongestPause);
+    // `ready` may connect: it is tried at growing intervals, whether the
+    // process ended is looked at after every turn.
+    std::string status;
+    auto ended = [&] { return pid > 0 && StartedProcessEnded(pid, status); };
+    for (milliseconds pause(2);; pause = std::min(pause * 2, kLongestPause)) {
+        if (ready()) return StartWait::kReady;
+        auto nextTry = std::min(steady_clock::now() + pause, deadline);
+        switch (Application::Get().RunUntil(ended, keepWaiting, nextTry)) {
+            case Application::WaitEnd::kReady:
+                // It may have handed over to a process that is now reachable.
+                if (ready()) return StartWait::kReady;
+                why = "it " + status;
+                return StartWait::kExited;
+            case Application::WaitEnd::kQuit:
+                why = "the application quits";
+                return StartWait::kGivenUp;
+            case Application::WaitEnd::kGivenUp:
+                why = "the wait was given up";
+                return StartWait::kGivenUp;
+            case Application::WaitEnd::kTimedOut:
+                if (steady_clock::now() < deadline) continue;
+                if (ready()) return StartWait::kReady;
+                why = "it did not become reachable in time";
+                return StartWait::kTimedOut;
         }
-        std::string status;
-        if (pid > 0 && StartedProcessEnded(pid, status)) {
-            // It may have handed over to a process that is now reachable.
-            if (ready()) return StartWait::kReady;
-            why = "it " + status;
-            return StartWait::kExited;
-        }
-        if (keepWaiting && !keepWaiting()) {
-            why = "the wait was given up";
-            return StartWait::kGivenUp;
-        }
-        if (now >= deadline) {
-            why = "it did not become reachable in time";
-            return StartWait::kTimedOut;
-        }
-        auto until = std::min({nextTry, deadline, now + kLongestPause});
-        auto left = duration_cast<milliseconds>(until - now) + milliseconds(1);
-        Application::Get().RunOneFor(left);
     }
 }
 

@@ -106,6 +106,11 @@ bool SocketCalls::IsNameLocked(const std::string& lockPath) {
     return held;
 }
 
+bool SocketCalls::SocketExists(const std::string& path) {
+    struct stat status {};
+    return ::stat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
+}
+
 void SocketCalls::UnlockName(int fd, const std::string& lockPath) {
     if (fd < 0) return;
     ::unlink(lockPath.c_str());  // while still held, so nobody takes a doomed file

@@ -18,7 +18,6 @@
 #include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
-#include "toolkit/process.h"
 #include "toolkit/userinterface.h"
 
 namespace nxbase {
@@ -425,22 +424,16 @@ bool DDE::Send(const std::string& asApp, const std::string& asCommand,
             return false;
         }
         Log("DDE: WinExec");
-        std::string error;
-        int pid = pmApplications->GetApplicationInfo(asApp).Start(error);
-        if (pid < 0) {
-            Log("DDE send abort: " + error);
-            return false;
-        }
-        std::string why;
-        auto deadline = std::chrono::steady_clock::now() + nxbase::StartWaitLimit();
-        if (toolkit::WaitForStartedProcess(
-                pid, [&] { return Connect(asApp); }, fmKeepWaiting, deadline, why) !=
-            toolkit::StartWait::kReady) {
+        std::string why = "nothing starts applications";
+        // The wait runs the loop: this object may be turned off or retired meanwhile.
+        std::weak_ptr<bool> alive = amAlive;
+        if (!fmStart || !fmStart(
+                            asApp, [&] { return alive.lock() && pmBus && Connect(asApp); }, why)) {
             Log("DDE send abort: ConversationHandle:0, Topic:" + asApp +
                 ", Service:" + nxbase::kDdeService + " (" + why + ")");
             return false;
         }
-        if (!pmBus) return false;  // turned off while it waited
+        if (!alive.lock() || !pmBus) return false;  // turned off while it waited
     }
     // "<sender>:<encoded data>", built once in the form the bus takes.
     std::vector<std::uint8_t> bytes;

@@ -68,7 +68,6 @@ using Stage = detail::Channel::Stage;
 constexpr const char* kLogKey = "Communication";
 constexpr int kReadsPerTurn = 16;
 constexpr int kListenBacklog = 64;
-constexpr auto kLongestPause = std::chrono::milliseconds(50);
 constexpr auto kFirstAcceptPause = std::chrono::milliseconds(100);
 constexpr auto kLongestAcceptPause = std::chrono::milliseconds(1000);
 const std::string kDisconnect = "DISCONNECT";
@@ -152,6 +151,17 @@ Pipe* Pipe::CreatePipe(const std::string& asOwnAppName) {
         throw;
     }
     pipe->pmDDE = std::make_unique<DDE>(asOwnAppName);
+    // DDE starts the peers it sends to as the sockets do, in the caller's scope.
+    pipe->pmDDE->SetStarter(
+        [pipe](const std::string& asApp, const std::function<bool()>& fReady, std::string& asWhy) {
+            if (pipe->pmScope == nullptr || pipe->pmApplications == nullptr) {
+                asWhy = "no send to start it for";
+                return false;
+            }
+            if (pipe->StartAndAwait(asApp, fReady)) return true;
+            asWhy = pipe->amLastError;
+            return false;
+        });
     nxbase::gPipe = pipe;
     return pipe;
 }
@@ -644,10 +654,7 @@ Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting, bool
       fmKeepWaiting(std::move(fKeepWaiting)),
       amStart(std::chrono::steady_clock::now()),
       amMayStart(abMayStart) {
-    if (pmPipe == nullptr) return;
-    pmPipe->pmScope = this;
-    // DDE starts peers of a DDE-only process itself: the same caller decides.
-    if (pmPipe->pmDDE) pmPipe->pmDDE->SetStartWaitCheck(fmKeepWaiting);
+    if (pmPipe != nullptr) pmPipe->pmScope = this;
 }
 
 // Read when first needed: most sends never wait for anybody.
@@ -658,7 +665,6 @@ std::chrono::steady_clock::time_point Pipe::SendScope::Deadline() const {
 Pipe::SendScope::~SendScope() {
     if (pmPipe == nullptr) return;
     pmPipe->pmScope = pmOuter;
-    if (pmPipe->pmDDE) pmPipe->pmDDE->SetStartWaitCheck(pmOuter ? pmOuter->fmKeepWaiting : nullptr);
     if (pmOuter == nullptr && pmPipe->amDoomed) delete pmPipe;
 }
 
@@ -713,20 +719,18 @@ Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
 bool Pipe::AwaitHandshake(const ChannelPtr& axChannel) {
     auto deadline = std::chrono::steady_clock::now() + nxbase::kHandshakeLimit;
     if (pmScope != nullptr) deadline = std::min(deadline, pmScope->Deadline());
-    while (!axChannel->closed && axChannel->stage != Stage::kOpen) {
-        auto now = std::chrono::steady_clock::now();
-        if (now >= deadline) {
+    auto settled = [&] { return axChannel->closed || axChannel->stage == Stage::kOpen; };
+    switch (Application::Get().RunUntil(
+        settled, [this] { return KeepWaiting(); }, deadline)) {
+        case Application::WaitEnd::kReady:
+            break;
+        case Application::WaitEnd::kTimedOut:
             Close(axChannel, "no reply to the connection request in time");
             break;
-        }
-        if (!KeepWaiting()) {
+        case Application::WaitEnd::kQuit:
+        case Application::WaitEnd::kGivenUp:
             Close(axChannel, "the wait for the connection reply was given up");
             break;
-        }
-        Application::Get().RunOneFor(
-            std::min(nxbase::kLongestPause,
-                     std::chrono::duration_cast<std::chrono::milliseconds>(deadline - now) +
-                         std::chrono::milliseconds(1)));
     }
     if (axChannel->stage == Stage::kOpen && !axChannel->closed) return true;
     return Fail("no channel to " + axChannel->peer + ": it did not answer the connection request");
@@ -756,33 +760,68 @@ bool Pipe::Reach(const std::string& asApp, const std::string& asCommand, Channel
         scope.amHopeless = true;
         return Fail(asApp + " is not running, and this send does not start it");
     }
-    if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
-    PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
-    if (!StartForScope(asApp, application)) return false;
-    std::string why;
     auto reachable = [&] {
         // A send nested in this wait may have opened the channel already.
         if ((axChannel = ChannelTo(asApp))) return true;
         if (amRefusal.empty() && (axChannel = Connect(asApp))) return true;
         return (abByDde = OnDdeBus(asApp));
     };
+    return StartAndAwait(asApp, reachable);
+}
+
+// The one start of a peer, for both transports: starts `asApp` (at most once
+// per scope) and runs the loop until `fReady()`, within the scope's limit.
+// False, with the reason, when it could not be started or never got ready.
+bool Pipe::StartAndAwait(const std::string& asApp, const std::function<bool()>& fReady) {
+    SendScope& scope = *pmScope;
+    if (!scope.amStartFailure.empty()) return Fail(scope.amStartFailure);
+    PostOfficeApplication application = pmApplications->GetApplicationInfo(asApp);
+    if (!StartForScope(asApp, application)) return false;
+    std::string why;
     // Not started because an instance held the name: when that one has ended
-    // before becoming reachable, start one, once.
+    // before becoming ready, start one, once.
     bool startNow = false;
     toolkit::StartWait result = WaitForStart(
         asApp,
         [&] {
-            return reachable() ||
+            return fReady() ||
                    (startNow = !scope.amStarted && !nxbase::IsApplicationRunning(asApp));
         },
         why);
     if (startNow) {
         if (!StartForScope(asApp, application)) return false;
-        result = WaitForStart(asApp, reachable, why);
+        result = WaitForStart(asApp, fReady, why);
     }
-    if (result == toolkit::StartWait::kReady && (axChannel || abByDde)) return true;
+    if (result == toolkit::StartWait::kReady) return true;
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
                 "): " + why);
+}
+
+bool Pipe::IsReachable(const std::string& asApp) {
+    if (HasChannel(asApp) || OnDdeBus(asApp)) return true;
+    // The lock is taken before the socket is bound: a peer holding it whose
+    // socket is there listens, or is about to.
+    return amRefusal.empty() && nxbase::IsApplicationRunning(asApp) &&
+           toolkit::Sockets().SocketExists(nxbase::RequestSocketPath(asApp));
+}
+
+bool Pipe::StartForLater(const std::string& asApp, int& alPid) {
+    alPid = -1;
+    if (!MaySend(asApp, "(start)")) return false;
+    if (pmApplications == nullptr || !pmApplications->HasApplication(asApp))
+        return Fail(asApp + " is not running and not registered");
+    SendScope scope(this, nullptr);
+    if (!StartForScope(asApp, pmApplications->GetApplicationInfo(asApp))) return false;
+    alPid = scope.amStartedPid;
+    if (alPid > 0) amStarting.emplace(asApp, alPid);
+    return true;
+}
+
+bool Pipe::StartEnded(const std::string& asApp, int alPid, std::string& asHow) {
+    if (alPid <= 0 || !toolkit::StartedProcessEnded(alPid, asHow)) return false;
+    if (auto at = amStarting.find(asApp); at != amStarting.end() && at->second == alPid)
+        amStarting.erase(at);
+    return true;
 }
 
 // Starts `asApp` once per scope, unless it runs or another send started it
@@ -861,14 +900,14 @@ bool Pipe::MaySend(const std::string& asTo, const std::string& asCommand) {
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 std::string_view asEncodedData) {
     if (!MaySend(asApp, asCommand)) return false;
+    std::optional<SendScope> own;
+    if (pmScope == nullptr) own.emplace(this, nullptr);
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
         amLastSendChannel = 0;
         return SendByDde(asApp, asCommand, true, asEncodedData) ||
                Fail("DDE send to " + asApp + " failed");
     }
-    std::optional<SendScope> own;
-    if (pmScope == nullptr) own.emplace(this, nullptr);
     ChannelPtr channel = ChannelTo(asApp);
     bool byDde = false;
     if (!channel && !Reach(asApp, asCommand, channel, byDde)) return false;

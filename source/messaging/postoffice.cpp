@@ -26,7 +26,6 @@ namespace {
 constexpr const char* kLogKey = "Communication";
 constexpr unsigned long kTickMs = 100;
 constexpr int kMaxRetries = 4;
-constexpr auto kLongestPause = std::chrono::milliseconds(50);
 constexpr auto kAbortDialogAfter = std::chrono::milliseconds(6000);
 
 void Log(const String& asText) {
@@ -710,17 +709,15 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         if (nxbase::detail::CommunicationLogged()) {
             waiting.emplace(String("WaitForAnswer"), String(kLogKey));
         }
-        const unsigned long quits = Application::Get().GetQuitCount();
-        while (!request->finished) {
-            if (Application::Get().GetQuitCount() != quits) {
-                request->finished = true;
-                request->error = "no answer from " + asApp + "; the application quits";
-            } else if (fKeepWaiting && !fKeepWaiting()) {
-                request->finished = true;
-                request->error = "no answer from " + asApp + "; the wait was given up";
-            } else {
-                Application::Get().RunOneFor(kLongestPause);
-            }
+        std::function<bool()> keepWaiting;
+        if (fKeepWaiting) keepWaiting = [&fKeepWaiting] { return fKeepWaiting(); };
+        auto end =
+            Application::Get().RunUntil([&request] { return request->finished; }, keepWaiting);
+        if (end != Application::WaitEnd::kReady) {
+            request->finished = true;
+            request->error = "no answer from " + asApp +
+                             (end == Application::WaitEnd::kQuit ? "; the application quits"
+                                                                 : "; the wait was given up");
         }
     }
     if (!alive.lock()) return false;
@@ -798,9 +795,66 @@ void PostOffice::SendAndReceiveAsync(const std::string& asApp, int alMessage,
 }
 
 // The time-out covers the start of the peer as well: the send gives up at
-// the deadline.
+// the deadline. A peer that has to be started is waited for on the request's
+// timer, so that no turn of the loop lasts as long as the start.
 void PostOffice::StartAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
                             PeerStart axStart) {
+    const std::string& app = pRequest->key.first;
+    Pipe* pipe = Pipe::Instance();
+    if (axStart == PeerStart::kIfNeeded && pipe != nullptr &&
+        pRequest->key.second != kAnswerOffset + DISCONNECT && amApplications.HasApplication(app) &&
+        !pipe->IsReachable(app)) {
+        int pid = -1;
+        if (!pipe->StartForLater(app, pid)) {
+            Finish(pRequest, false, MyMemoryBlock(), pipe->GetLastError());
+            return;
+        }
+        AwaitStart(pRequest, std::make_shared<const MyMemoryBlock>(axSend), pid,
+                   std::chrono::milliseconds(2));
+        return;
+    }
+    SendAsync(pRequest, axSend, axStart);
+}
+
+// Looks for the started peer from 2 ms on, doubling up to the 100 ms tick.
+void PostOffice::AwaitStart(const RequestPtr& pRequest, std::shared_ptr<const MyMemoryBlock> pSend,
+                            int alPid, std::chrono::milliseconds pause) {
+    pRequest->timer->expires_at(
+        std::min(std::chrono::steady_clock::now() + pause, pRequest->deadline));
+    std::weak_ptr<bool> alive = amAlive;
+    pRequest->timer->async_wait([=, this](const boost::system::error_code& error) {
+        if (error || !alive.lock() || pRequest->finished) return;
+        const std::string& app = pRequest->key.first;
+        Pipe* pipe = Pipe::Instance();
+        std::string how;
+        int pid = alPid;
+        if (pipe == nullptr) {
+            Finish(pRequest, false, MyMemoryBlock(), "the transport was closed");
+        } else if (pipe->IsReachable(app)) {
+            SendAsync(pRequest, *pSend, PeerStart::kIfNeeded);
+        } else if (pipe->StartEnded(app, pid, how) && !pipe->IsReachable(app)) {
+            Finish(pRequest, false, MyMemoryBlock(), "no answer from " + app + ": it " + how);
+        } else if (std::chrono::steady_clock::now() >= pRequest->deadline) {
+            Finish(pRequest, false, MyMemoryBlock(),
+                   "no answer from " + app + " within " +
+                       std::to_string(pRequest->timeout.count()) +
+                       " ms (it did not become reachable in time)");
+        } else if (pRequest->keepWaiting && !pRequest->keepWaiting()) {
+            Finish(pRequest, false, MyMemoryBlock(),
+                   "no answer from " + app + "; the wait was given up");
+        } else if (pid <= 0 && !nxbase::IsApplicationRunning(app) &&
+                   !pipe->StartForLater(app, pid)) {
+            // The instance it waited for ended before it could be reached.
+            Finish(pRequest, false, MyMemoryBlock(), pipe->GetLastError());
+        } else {
+            AwaitStart(pRequest, pSend, pid,
+                       std::min(pause * 2, std::chrono::milliseconds(kTickMs)));
+        }
+    });
+}
+
+void PostOffice::SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
+                           PeerStart axStart) {
     std::weak_ptr<bool> alive = amAlive;
     boost::function<bool()> keepTrying = [pRequest] {
         return !pRequest->finished && std::chrono::steady_clock::now() < pRequest->deadline &&

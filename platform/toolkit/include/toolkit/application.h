@@ -94,6 +94,19 @@ class NXBASE_EXPORT Application {
     // dispatches this one) and returns true.
     bool RunOneFor(std::chrono::milliseconds timeout);
 
+    // How a RunUntil() ended.
+    enum class WaitEnd { kReady, kGivenUp, kTimedOut, kQuit };
+    // The one wait of the library: runs the loop (or the GUI's, see
+    // SetNestedWait) until `ready()` is true, Quit() is called,
+    // `keepWaiting()` (if set) says stop or `deadline` passes, in that order
+    // of precedence. Both functions are asked before the first turn, after
+    // every turn and at least every 50 ms; a handler a turn ran may destroy
+    // whatever they look at, so they must hold what they need.
+    WaitEnd RunUntil(const std::function<bool()>& ready,
+                     const std::function<bool()>& keepWaiting = {},
+                     std::chrono::steady_clock::time_point deadline =
+                         std::chrono::steady_clock::time_point::max());
+
     // For a foreign main loop: a descriptor that becomes readable whenever a
     // handler is ready (a socket ready, a timer due, an event posted from
     // another thread). Handlers made ready by calls outside any handler, on

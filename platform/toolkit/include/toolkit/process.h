@@ -32,10 +32,11 @@ NXBASE_EXPORT bool StartedProcessEnded(pid_t pid, std::string& status);
 // How a wait for a started process ended.
 enum class StartWait { kReady, kExited, kGivenUp, kTimedOut };
 
-// Runs the event loop until `ready()` is true, the started process `pid`
-// ends, `keepWaiting()` (if set) says stop, or `deadline` passes. `ready` and
-// `keepWaiting` are asked at least every 50 ms, with a growing pause between
-// tries of `ready`. `why` says what ended a wait that did not succeed.
+// Runs the event loop (Application::RunUntil) until `ready()` is true, the
+// started process `pid` ends, `keepWaiting()` (if set) says stop, Quit() is
+// called (kGivenUp) or `deadline` passes. `keepWaiting` is asked at least
+// every 50 ms, `ready` at growing intervals from 2 ms to 50 ms. `why` says
+// what ended a wait that did not succeed.
 NXBASE_EXPORT StartWait WaitForStartedProcess(pid_t pid, const std::function<bool()>& ready,
                                               const std::function<bool()>& keepWaiting,
                                               std::chrono::steady_clock::time_point deadline,

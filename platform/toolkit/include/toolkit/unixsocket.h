@@ -37,6 +37,8 @@ class NXBASE_EXPORT SocketCalls {
     virtual int LockName(const std::string& lockPath, std::string& why);
     // Whether some process holds the lock of `lockPath`.
     virtual bool IsNameLocked(const std::string& lockPath);
+    // Whether a socket file is at `path` (bound; not necessarily listened on).
+    virtual bool SocketExists(const std::string& path);
     // Removes the lock file and releases the lock taken by LockName.
     virtual void UnlockName(int fd, const std::string& lockPath);
 };
