@@ -499,6 +499,10 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     std::ofstream(unrunnable) << "#!/bin/sh\n";
     std::filesystem::permissions(unrunnable, std::filesystem::perms::owner_read);
     sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "Unrunnable", unrunnable);
+    std::string slow = root + "/bin/slowstart";
+    std::ofstream(slow) << "#!/bin/sh\nsleep 2\n";
+    std::filesystem::permissions(slow, std::filesystem::perms::owner_all);
+    sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "SlowPeer", slow);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     for (auto [peer, why] : {std::pair{"LumaServer", "No such file or directory"},
                              std::pair{"Unrunnable", "Permission denied"}}) {
@@ -529,6 +533,14 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 1400ms);
     EXPECT_LT(took, 3s);
+    EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
+    // Quit also ends the wait for a peer being started.
+    Application::Get().ResetQuit();
+    quit.SetTimeout(300);
+    quit.Start();
+    start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(office->SendAndReceive("SlowPeer", IS_APP_READY, request, answer));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1500ms);
     EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
 }
 

@@ -96,10 +96,10 @@ class NXBASE_EXPORT Pipe {
     static void SetSocketListening(bool abListen);
 
     // One send of the caller, retries included: at most one start of the
-    // peer, at most StartWaitLimit() of
-    // waiting for it, and `fKeepWaiting` (if set) asked at least every 50 ms
-    // while connecting, handshaking or waiting. Sends outside a scope are
-    // each a scope of their own.
+    // peer, at most StartWaitLimit() of waiting for it, and `fKeepWaiting`
+    // (if set) asked at least every 50 ms while connecting, handshaking or
+    // waiting; Application::Quit() ends every wait of the scope. Sends
+    // outside a scope are each a scope of their own.
     class NXBASE_EXPORT SendScope {
       public:
         // With `abMayStart` false a peer that does not run is not started:
@@ -108,9 +108,11 @@ class NXBASE_EXPORT Pipe {
         ~SendScope();
         SendScope(const SendScope&) = delete;
         SendScope& operator=(const SendScope&) = delete;
-        // Whether trying again is of no use: the start failed, or the peer
-        // does not run and must not be started.
-        bool Hopeless() const { return amHopeless; }
+        // Whether trying again is of no use: the start failed, the peer
+        // does not run and must not be started, or the application quits.
+        bool Hopeless() const { return amHopeless || Quitting(); }
+        // Whether Application::Quit() was called since the scope began.
+        bool Quitting() const;
 
       private:
         friend class Pipe;
@@ -119,6 +121,7 @@ class NXBASE_EXPORT Pipe {
         SendScope* pmOuter;
         std::function<bool()> fmKeepWaiting;
         std::chrono::steady_clock::time_point amStart;
+        unsigned long amQuits;
         bool amMayStart = true;
         bool amStarted = false;
         bool amHopeless = false;

@@ -653,6 +653,7 @@ Pipe::SendScope::SendScope(Pipe* pPipe, std::function<bool()> fKeepWaiting, bool
       pmOuter(pPipe ? pPipe->pmScope : nullptr),
       fmKeepWaiting(std::move(fKeepWaiting)),
       amStart(std::chrono::steady_clock::now()),
+      amQuits(Application::Get().GetQuitCount()),
       amMayStart(abMayStart) {
     if (pmPipe != nullptr) pmPipe->pmScope = this;
 }
@@ -668,9 +669,14 @@ Pipe::SendScope::~SendScope() {
     if (pmOuter == nullptr && pmPipe->amDoomed) delete pmPipe;
 }
 
+bool Pipe::SendScope::Quitting() const {
+    return Application::Get().GetQuitCount() != amQuits;
+}
+
 bool Pipe::KeepWaiting() const {
     if (amDoomed) return false;
-    return pmScope == nullptr || !pmScope->fmKeepWaiting || pmScope->fmKeepWaiting();
+    if (pmScope == nullptr) return true;
+    return !pmScope->Quitting() && (!pmScope->fmKeepWaiting || pmScope->fmKeepWaiting());
 }
 
 bool Pipe::Fail(const std::string& asReason) {
@@ -793,6 +799,7 @@ bool Pipe::StartAndAwait(const std::string& asApp, const std::function<bool()>& 
         result = WaitForStart(asApp, fReady, why);
     }
     if (result == toolkit::StartWait::kReady) return true;
+    if (scope.Quitting()) why = "the application quits";
     return Fail("no answer from " + asApp + " (" + application.GetExecutableWithPath() +
                 "): " + why);
 }
