@@ -2,8 +2,9 @@
 
 #include <charconv>
 #include <cmath>
-#include <fstream>
 #include <system_error>
+
+#include "toolkit/fileio.h"
 
 namespace klume {
 namespace cmetry {
@@ -134,26 +135,10 @@ bool ParseCsvTable(std::string_view text, const std::string& source, std::size_t
 }
 
 bool ReadTableFile(const std::string& path, std::string& text, std::string& error) {
-    std::ifstream in(path, std::ios::binary);
-    if (!in) {
-        error = path + ": cannot be opened";
-        return false;
-    }
-    text.clear();
-    char buffer[4096];
-    while (in) {
-        in.read(buffer, sizeof buffer);
-        text.append(buffer, static_cast<std::size_t>(in.gcount()));
-        if (text.size() > kMaxTableBytes) {
-            error = path + ": larger than " + std::to_string(kMaxTableBytes) + " bytes";
-            return false;
-        }
-    }
-    if (in.bad()) {
-        error = path + ": read error";
-        return false;
-    }
-    return true;
+    std::string why;
+    if (toolkit::ReadWholeFile(path, kMaxTableBytes, text, why, false)) return true;
+    error = path + ": " + why;
+    return false;
 }
 
 }  // namespace detail

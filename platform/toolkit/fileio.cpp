@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
@@ -26,6 +27,147 @@ bool WriteAll(int fd, std::string_view bytes) {
         bytes.remove_prefix(static_cast<std::size_t>(n));
     }
     return true;
+}
+
+namespace {
+
+int FlagsOf(File::Mode mode) {
+    switch (mode) {
+        case File::Mode::kRead:
+            return O_RDONLY;
+        case File::Mode::kTruncate:
+            return O_WRONLY | O_CREAT | O_TRUNC | O_NOCTTY;
+        case File::Mode::kAppend:
+            return O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW;
+        case File::Mode::kAppendTruncated:
+            return O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW | O_TRUNC;
+    }
+    return O_RDONLY;
+}
+
+}  // namespace
+
+File::File(const std::string& path, Mode mode) {
+    const mode_t permissions = mode == Mode::kTruncate ? 0666 : 0644;
+    fd_ =
+        RetryOnEintr([&] { return ::open(path.c_str(), FlagsOf(mode) | O_CLOEXEC, permissions); });
+}
+
+File& File::operator=(File&& other) noexcept {
+    if (this != &other) {
+        Close();
+        fd_ = other.fd_;
+        other.fd_ = -1;
+    }
+    return *this;
+}
+
+ssize_t File::Read(char* data, std::size_t size) const {
+    return RetryOnEintr([&] { return ::read(fd_, data, size); });
+}
+
+bool File::WriteAll(std::string_view bytes) const {
+    return fd_ >= 0 && toolkit::WriteAll(fd_, bytes);
+}
+
+bool File::WriteOnce(std::string_view bytes) const {
+    const ssize_t n = RetryOnEintr([&] { return ::write(fd_, bytes.data(), bytes.size()); });
+    if (n == static_cast<ssize_t>(bytes.size())) return true;
+    if (n >= 0) errno = ENOSPC;  // finishing it later would interleave with other writers
+    return false;
+}
+
+bool File::Sync() const {
+    return RetryOnEintr([&] { return ::fsync(fd_); }) == 0;
+}
+
+bool File::Truncate(std::uint64_t size) const {
+    return RetryOnEintr([&] { return ::ftruncate(fd_, static_cast<off_t>(size)); }) == 0;
+}
+
+bool File::IsRegular() const {
+    struct stat info {};
+    return fd_ >= 0 && ::fstat(fd_, &info) == 0 && S_ISREG(info.st_mode);
+}
+
+std::uint64_t File::Size() const {
+    struct stat info {};
+    return fd_ >= 0 && ::fstat(fd_, &info) == 0 ? static_cast<std::uint64_t>(info.st_size) : 0;
+}
+
+bool File::StillNamed() const {
+    struct stat info {};
+    return fd_ >= 0 && ::fstat(fd_, &info) == 0 && info.st_nlink > 0;
+}
+
+bool File::Close() {
+    if (fd_ < 0) return true;
+    const bool ok = ::close(fd_) == 0;  // never retried: the descriptor is gone either way
+    fd_ = -1;
+    return ok;
+}
+
+ReadEnd ReadUpTo(int fd, std::size_t limit, std::string& bytes) {
+    char buffer[1 << 16];
+    while (limit > 0) {
+        const ssize_t n =
+            RetryOnEintr([&] { return ::read(fd, buffer, std::min(sizeof buffer, limit)); });
+        if (n < 0) return ReadEnd::kError;
+        if (n == 0) return ReadEnd::kEnd;
+        bytes.append(buffer, static_cast<std::size_t>(n));
+        limit -= static_cast<std::size_t>(n);
+    }
+    return ReadEnd::kLimit;
+}
+
+bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& bytes, std::string& why,
+                   bool regularOnly) {
+    bytes.clear();
+    File file(path, File::Mode::kRead);
+    if (!file.IsOpen()) {
+        why = std::string("cannot open: ") + std::strerror(errno);
+        return false;
+    }
+    if (regularOnly && !file.IsRegular()) {
+        why = "not a regular file";
+        return false;
+    }
+    // The size is a hint: the file may grow or shrink while it is read.
+    bytes.reserve(static_cast<std::size_t>(std::min<std::uint64_t>(file.Size(), limit)));
+    std::string beyond;
+    const ReadEnd end = ReadUpTo(file.Descriptor(), limit, bytes);
+    if (end == ReadEnd::kLimit && ReadUpTo(file.Descriptor(), 1, beyond) == ReadEnd::kLimit) {
+        why = "larger than " + std::to_string(limit) + " bytes";
+    } else if (end == ReadEnd::kError) {
+        why = std::string("cannot read: ") + std::strerror(errno);
+    } else {
+        return true;
+    }
+    bytes.clear();
+    return false;
+}
+
+bool AppendInOneWrite(const std::string& path, std::string_view bytes, bool truncate) {
+    File file(path, truncate ? File::Mode::kAppendTruncated : File::Mode::kAppend);
+    if (!file.IsOpen()) return false;
+    const bool written = file.WriteOnce(bytes);
+    const int error = errno;
+    file.Close();
+    errno = error;
+    return written;
+}
+
+FileKind KindOf(const std::string& path) {
+    struct stat info {};
+    if (::stat(path.c_str(), &info) != 0) return FileKind::kNone;
+    if (S_ISREG(info.st_mode)) return FileKind::kRegular;
+    if (S_ISDIR(info.st_mode)) return FileKind::kDirectory;
+    if (S_ISSOCK(info.st_mode)) return FileKind::kSocket;
+    return FileKind::kOther;
+}
+
+bool IsReadableFile(const std::string& path) {
+    return KindOf(path) == FileKind::kRegular && ::access(path.c_str(), R_OK) == 0;
 }
 
 namespace {

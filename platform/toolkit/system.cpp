@@ -1,11 +1,16 @@
 #include "toolkit/system.h"
 
+#include <pwd.h>
+#include <sys/ioctl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
+#include <sys/utsname.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -42,6 +47,56 @@ std::string ExecutableFileName() {
 
 std::uint32_t CurrentThreadId() {
     return static_cast<std::uint32_t>(syscall(SYS_gettid));
+}
+
+std::uint32_t EffectiveUserId() {
+    return static_cast<std::uint32_t>(::geteuid());
+}
+
+std::string KernelRelease() {
+    utsname name{};
+    return ::uname(&name) == 0 ? std::string(name.release) : std::string();
+}
+
+std::string HostName() {
+    char buffer[HOST_NAME_MAX + 1] = {};
+    return ::gethostname(buffer, HOST_NAME_MAX) == 0 ? std::string(buffer) : std::string();
+}
+
+std::string LoginName() {
+    char buffer[LOGIN_NAME_MAX + 1] = {};
+    if (::getlogin_r(buffer, sizeof buffer) == 0 && buffer[0] != '\0') return buffer;
+    std::vector<char> storage(16384);
+    passwd entry{};
+    passwd* found = nullptr;
+    if (::getpwuid_r(::getuid(), &entry, storage.data(), storage.size(), &found) == 0 && found &&
+        found->pw_name != nullptr)
+        return found->pw_name;
+    return std::string();
+}
+
+unsigned int OnlineProcessorCount() {
+    const long count = ::sysconf(_SC_NPROCESSORS_ONLN);
+    return count > 0 ? static_cast<unsigned int>(count) : 1u;
+}
+
+int ProcessNiceValue() {
+    errno = 0;
+    const int nice = ::getpriority(PRIO_PROCESS, static_cast<id_t>(::getpid()));
+    return nice == -1 && errno != 0 ? 0 : nice;
+}
+
+bool SetThreadNiceValue(std::uint32_t threadId, int nice) {
+    return ::setpriority(PRIO_PROCESS, static_cast<id_t>(threadId), nice) == 0;
+}
+
+bool IsTerminal(int fd) {
+    return ::isatty(fd) == 1;
+}
+
+std::size_t TerminalColumns(int fd) {
+    struct winsize size {};
+    return ::ioctl(fd, TIOCGWINSZ, &size) == 0 ? size.ws_col : 0;
 }
 
 std::string EnsurePrivateDirectory(const std::string& path) {

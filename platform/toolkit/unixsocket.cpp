@@ -111,6 +111,26 @@ bool SocketCalls::SocketExists(const std::string& path) {
     return ::stat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
+void SocketCalls::RemoveSocketFile(const std::string& path) {
+    ::unlink(path.c_str());
+}
+
+void SocketCalls::MakeOwnerOnly(const std::string& path) {
+    ::chmod(path.c_str(), 0600);
+}
+
+void SocketCalls::KeepFromChildren(int fd) {
+    ::fcntl(fd, F_SETFD, FD_CLOEXEC);
+}
+
+void SocketCalls::Close(int fd) {
+    ::close(fd);
+}
+
+std::size_t MaxSocketPathLength() {
+    return sizeof(sockaddr_un::sun_path) - 1;
+}
+
 void SocketCalls::UnlockName(int fd, const std::string& lockPath) {
     if (fd < 0) return;
     ::unlink(lockPath.c_str());  // while still held, so nobody takes a doomed file

@@ -1,16 +1,13 @@
-// OSInfo on Linux: uname, gethostname, getlogin/getpwuid, sysconf and the
-// SSH variables of a remote session.
+// OSInfo on Linux: the toolkit's system queries and the SSH variables of a
+// remote session.
 #include "nxbase/osinfo.h"
-
-#include <pwd.h>
-#include <sys/utsname.h>
-#include <unistd.h>
 
 #include <charconv>
 #include <cstdlib>
 #include <cstring>
 
 #include "nxbase/logfile.h"
+#include "toolkit/system.h"
 
 namespace {
 
@@ -29,11 +26,9 @@ std::string Limited(const char* asText, std::size_t alLength) {
 }  // namespace
 
 unsigned long OSInfo::GetOSMajorVersion() {
-    utsname name;
-    if (::uname(&name) != 0) return 0;
+    const std::string release = toolkit::KernelRelease();
     unsigned long major = 0;
-    const char* end = name.release + std::strlen(name.release);
-    std::from_chars(name.release, end, major);
+    std::from_chars(release.data(), release.data() + release.size(), major);
     return major;
 }
 
@@ -48,26 +43,15 @@ bool OSInfo::IsTerminalServer() {
 }
 
 std::string OSInfo::GetMachineName() {
-    char buffer[kMachineNameLength + 1] = {};
-    std::string name;
-    if (::gethostname(buffer, kMachineNameLength) == 0) name = Limited(buffer, kMachineNameLength);
+    const std::string host = toolkit::HostName();
+    std::string name = Limited(host.c_str(), kMachineNameLength);
     LogFile::WriteToLog(String("Computername length: " + std::to_string(name.size())), String());
     return name;
 }
 
 std::string OSInfo::GetUserName() {
-    char buffer[kUserNameLength + 1] = {};
-    if (::getlogin_r(buffer, sizeof buffer) == 0 && buffer[0] != '\0') {
-        return Limited(buffer, kUserNameLength);
-    }
-    long size = ::sysconf(_SC_GETPW_R_SIZE_MAX);
-    std::string storage(size > 0 ? static_cast<std::size_t>(size) : 16384, '\0');
-    passwd entry;
-    passwd* found = nullptr;
-    if (::getpwuid_r(::getuid(), &entry, storage.data(), storage.size(), &found) == 0 && found &&
-        found->pw_name && *found->pw_name) {
-        return Limited(found->pw_name, kUserNameLength);
-    }
+    const std::string login = toolkit::LoginName();
+    if (!login.empty()) return Limited(login.c_str(), kUserNameLength);
     for (const char* variable : {"LOGNAME", "USER"}) {
         if (IsSet(variable)) return Limited(std::getenv(variable), kUserNameLength);
     }
@@ -75,6 +59,5 @@ std::string OSInfo::GetUserName() {
 }
 
 unsigned int OSInfo::GetCoreCount() {
-    long count = ::sysconf(_SC_NPROCESSORS_ONLN);
-    return count > 0 ? static_cast<unsigned int>(count) : 1u;
+    return toolkit::OnlineProcessorCount();
 }

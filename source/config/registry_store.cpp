@@ -13,8 +13,6 @@
 // connections without closing them, as SQLite requires.
 #include <pthread.h>
 #include <sqlite3.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -29,6 +27,7 @@
 
 #include "nxbase/registry.h"
 #include "toolkit/direntry.h"
+#include "toolkit/fileio.h"
 
 namespace nxbase {
 namespace {
@@ -119,8 +118,7 @@ std::string_view KeyView(const std::string& asKey, std::string& asBuffer) {
 }
 
 bool FileExists(const std::string& asFile) {
-    struct stat info;
-    return ::stat(asFile.c_str(), &info) == 0;
+    return toolkit::KindOf(asFile) != toolkit::FileKind::kNone;
 }
 
 void HiveFileInto(RegistryHive axHive, std::string& asFile) {

@@ -1,9 +1,6 @@
 #include "nxbase/logfile.h"
 
-#include <fcntl.h>
 #include <pthread.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <boost/stacktrace.hpp>
 #include <cerrno>
@@ -16,7 +13,7 @@
 #include <sstream>
 
 #include "nxbase/thread.h"
-#include "toolkit/eintr.h"
+#include "toolkit/fileio.h"
 #include "toolkit/system.h"
 
 namespace {
@@ -30,29 +27,8 @@ constexpr const char* kThreadId = kLogOptionThreadId;
 constexpr std::uint8_t kAvailable = 1;
 constexpr std::uint8_t kEnabled = 2;
 
-// ---- operating-system seam: one whole line per write() on O_APPEND ----
-
-// Appends `bytes` to `path` (truncating first when asked) in one write(), so
-// that lines stay whole across threads and processes. False, with errno set,
-// when the file cannot be opened or the write comes up short (a full disk):
-// finishing a short write later would interleave with other writers' lines.
-// The last component is never followed as a symlink.
-bool AppendToFile(const std::string& path, const std::string& bytes, bool truncate) {
-    int flags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW | (truncate ? O_TRUNC : 0);
-    const int fd = toolkit::RetryOnEintr([&] { return ::open(path.c_str(), flags, 0644); });
-    if (fd < 0) return false;
-    const ssize_t n =
-        toolkit::RetryOnEintr([&] { return ::write(fd, bytes.data(), bytes.size()); });
-    int writeError = n < 0 ? errno : ENOSPC;
-    ::close(fd);
-    if (n == static_cast<ssize_t>(bytes.size())) return true;
-    errno = writeError;
-    return false;
-}
-
 bool IsDirectory(const std::string& path) {
-    struct stat info {};
-    return ::stat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+    return toolkit::KindOf(path) == toolkit::FileKind::kDirectory;
 }
 
 // Bytes of stack between the caller's frame and the end of its thread's stack.
@@ -356,7 +332,7 @@ void LogFile::WriteLog(const String& text, const String& key) {
             line.insert(0, restartNote);
             restartNote.clear();
         }
-        written = AppendToFile(fileName, line, truncate);
+        written = toolkit::AppendInOneWrite(fileName, line, truncate);
         if (written)
             ++loggedLines;
         else

@@ -1,8 +1,5 @@
 #include "nxbase/thread.h"
 
-#include <sys/resource.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
@@ -54,9 +51,7 @@ constexpr const char* kCleanCriticalSections = "CleanCriticalSections";
 // value (a program started under `nice` keeps its threads below normal):
 // normal, one step below, one step above, within the range Linux allows.
 int NiceValue(ThreadPriorityTYPE priority) {
-    errno = 0;
-    int base = getpriority(PRIO_PROCESS, static_cast<id_t>(getpid()));
-    if (base == -1 && errno != 0) base = 0;
+    const int base = toolkit::ProcessNiceValue();
     int step = priority == BELOW_NORMAL_PRIORITY ? 1 : priority == ABOVE_NORMAL_PRIORITY ? -1 : 0;
     return std::clamp(base + step, -20, 19);
 }
@@ -68,7 +63,8 @@ bool IsValidPriority(int priority) {
 // Raising a priority needs privileges; a refusal leaves the thread as it is.
 void ApplyNice(int systemThreadId, ThreadPriorityTYPE priority) {
     if (systemThreadId != 0) {
-        setpriority(PRIO_PROCESS, static_cast<id_t>(systemThreadId), NiceValue(priority));
+        toolkit::SetThreadNiceValue(static_cast<std::uint32_t>(systemThreadId),
+                                    NiceValue(priority));
     }
 }
 

@@ -1,7 +1,6 @@
 #include "nxbase/dde.h"
 
 #include <sdbus-c++/sdbus-c++.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <boost/asio/posix/stream_descriptor.hpp>
@@ -18,6 +17,8 @@
 #include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
+#include "toolkit/fileio.h"
+#include "toolkit/system.h"
 #include "toolkit/userinterface.h"
 
 namespace nxbase {
@@ -67,7 +68,8 @@ bool SessionBusConfigured() {
     const char* address = std::getenv("DBUS_SESSION_BUS_ADDRESS");
     if (address && *address) return true;
     const char* runtime = std::getenv("XDG_RUNTIME_DIR");
-    return runtime && *runtime && ::access((std::string(runtime) + "/bus").c_str(), F_OK) == 0;
+    return runtime && *runtime &&
+           toolkit::KindOf(std::string(runtime) + "/bus") != toolkit::FileKind::kNone;
 }
 
 // The bus's address leads nowhere: its daemon is gone or not yet started.
@@ -370,7 +372,8 @@ bool DDE::SpeaksFor(const std::string& asClaimed) {
     const std::string sender = message->getSender();
     std::string owner;
     try {
-        if (message->getCredsUid() != ::geteuid()) return RefusePoke(sender, asClaimed);
+        if (message->getCredsUid() != toolkit::EffectiveUserId())
+            return RefusePoke(sender, asClaimed);
         auto bus =
             sdbus::createProxy(*pmBus->connection, "org.freedesktop.DBus", "/org/freedesktop/DBus");
         bus->callMethod("GetNameOwner")

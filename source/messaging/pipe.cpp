@@ -1,10 +1,5 @@
 #include "nxbase/pipe.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <sys/un.h>
-#include <unistd.h>
-
 #include <array>
 #include <boost/asio/local/stream_protocol.hpp>
 #include <boost/asio/steady_timer.hpp>
@@ -232,12 +227,12 @@ void Pipe::CloseAll(bool abOwner) {
         pmListener->pause.cancel();
         pmListener->acceptor.close(ignored);
         pmListener.reset();
-        if (abOwner) ::unlink(amSocketPath.c_str());
+        if (abOwner) toolkit::Sockets().RemoveSocketFile(amSocketPath);
     }
     if (abOwner) {
         toolkit::Sockets().UnlockName(amLockFd, amSocketPath + ".lock");
     } else if (amLockFd >= 0) {
-        ::close(amLockFd);  // the parent's descriptor keeps the lock
+        toolkit::Sockets().Close(amLockFd);  // the parent's descriptor keeps the lock
     }
     amLockFd = -1;
 }
@@ -270,7 +265,7 @@ void Pipe::Listen() {
         return;
     }
     amSocketPath = directory + "/" + nxbase::PipeName(nxbase::kPipeRequestPrefix + amOwnName);
-    if (amSocketPath.size() >= sizeof(sockaddr_un::sun_path)) {
+    if (amSocketPath.size() > toolkit::MaxSocketPathLength()) {
         throw std::runtime_error("Pipe: socket path too long: " + amSocketPath);
     }
     // The lock on <socket>.lock is held for the listener's lifetime: of two
@@ -283,7 +278,7 @@ void Pipe::Listen() {
             "Pipe: " + amOwnName + " " +
             (why == "running already" ? why + " (" + amSocketPath + ")" : why));
     }
-    ::unlink(amSocketPath.c_str());
+    toolkit::Sockets().RemoveSocketFile(amSocketPath);
     auto& context = Application::Get().GetContext();
     pmListener = std::make_unique<Listener>(context);
     boost::system::error_code error;
@@ -294,9 +289,9 @@ void Pipe::Listen() {
     if (error) {
         throw std::runtime_error("Pipe: cannot listen on " + amSocketPath + ": " + error.message());
     }
-    ::chmod(amSocketPath.c_str(), 0600);
+    toolkit::Sockets().MakeOwnerOnly(amSocketPath);
     // Started peers must not inherit the listener (they would keep the name alive).
-    ::fcntl(pmListener->acceptor.native_handle(), F_SETFD, FD_CLOEXEC);
+    toolkit::Sockets().KeepFromChildren(pmListener->acceptor.native_handle());
     Accept();
 }
 
@@ -314,7 +309,7 @@ void Pipe::Accept() {
             pmListener->nextPause = nxbase::kFirstAcceptPause;
             // asio accepts without SOCK_CLOEXEC: a program started later
             // must not hold the channel open.
-            ::fcntl(channel->socket.native_handle(), F_SETFD, FD_CLOEXEC);
+            toolkit::Sockets().KeepFromChildren(channel->socket.native_handle());
             std::string why;
             if (toolkit::Sockets().PeerIsSameUser(channel->socket.native_handle(), why)) {
                 AddChannel(channel);
@@ -700,7 +695,7 @@ Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
     if (fd < 0) return nullptr;
     std::string why;
     if (!toolkit::Sockets().PeerIsSameUser(fd, why)) {
-        ::close(fd);
+        toolkit::Sockets().Close(fd);
         Fail("refused to talk to " + asApp + ": " + why);
         return nullptr;
     }
@@ -708,7 +703,7 @@ Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
     boost::system::error_code error;
     channel->socket.assign(boost::asio::local::stream_protocol(), fd, error);
     if (error) {
-        ::close(fd);
+        toolkit::Sockets().Close(fd);
         return nullptr;
     }
     channel->peer = asApp;

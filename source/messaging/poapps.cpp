@@ -1,7 +1,5 @@
 #include "nxbase/poapps.h"
 
-#include <sys/stat.h>
-
 #include <algorithm>
 #include <cctype>
 #include <cstdlib>
@@ -11,6 +9,7 @@
 #include "nxbase/logfile.h"
 #include "nxbase/registry.h"
 #include "nxbase/strhelp.h"
+#include "toolkit/fileio.h"
 #include "toolkit/process.h"
 
 namespace {
@@ -21,8 +20,7 @@ constexpr const char* kPeersKey = "Software\\K-Lume\\ChromaLink\\Applications";
 constexpr double kOldestServerVersion = 3.0;
 
 bool FileExists(const std::string& asPath) {
-    struct stat info {};
-    return ::stat(asPath.c_str(), &info) == 0;
+    return toolkit::KindOf(asPath) != toolkit::FileKind::kNone;
 }
 
 // A version text as a number: digits with at most one ".", nothing else.

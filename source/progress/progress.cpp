@@ -1,8 +1,5 @@
 #include "nxbase/progress.h"
 
-#include <sys/ioctl.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
@@ -12,6 +9,7 @@
 #include "nxbase/check.h"
 #include "toolkit/application.h"
 #include "toolkit/fileio.h"
+#include "toolkit/system.h"
 
 namespace {
 
@@ -40,17 +38,15 @@ void CheckProgress(double axProgress) {
         Check::AssertFailed("axProgress >= 0.0 && axProgress <= 1.0", kSource, __LINE__);
 }
 
-// Terminal seam: the progress family's own operating-system calls.
 namespace term {
 
 bool IsTerminal(int fd) {
-    return ::isatty(fd) == 1;
+    return toolkit::IsTerminal(fd);
 }
 
 std::size_t Width(int fd) {
-    struct winsize size {};
-    if (::ioctl(fd, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) return size.ws_col;
-    return kDefaultTerminalWidth;
+    const std::size_t columns = toolkit::TerminalColumns(fd);
+    return columns > 0 ? columns : kDefaultTerminalWidth;
 }
 
 }  // namespace term

@@ -1,9 +1,5 @@
 #include "asciifile_io.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
@@ -12,7 +8,6 @@
 #include <string_view>
 #include <vector>
 
-#include "toolkit/eintr.h"
 #include "toolkit/fileio.h"
 
 namespace nxbase::detail {
@@ -22,24 +17,9 @@ namespace {
 // Bytes moved per read() or write().
 constexpr std::size_t kBufferSize = 64 * 1024;
 
-int OpenRetrying(const char* path, int flags, mode_t mode = 0) {
-    const int fd = toolkit::RetryOnEintr([&] { return ::open(path, flags | O_CLOEXEC, mode); });
-    return fd;
-}
-
-ssize_t ReadRetrying(int fd, char* data, std::size_t size) {
-    const ssize_t n = toolkit::RetryOnEintr([&] { return ::read(fd, data, size); });
-    return n;
-}
-
-bool FsyncRetrying(int fd) {
-    const int result = toolkit::RetryOnEintr([&] { return ::fsync(fd); });
-    return result == 0;
-}
-
 }  // namespace
 
-// A std::streambuf over one file descriptor, for reading or for writing.
+// A std::streambuf over one open file, for reading or for writing.
 //
 // Written text reaches the descriptor in whole lines: when the buffer fills,
 // everything up to its last line feed is written and the rest kept (a line
@@ -48,8 +28,8 @@ bool FsyncRetrying(int fd) {
 // it never ends in a part of a line.
 class DescriptorBuffer : public std::streambuf {
   public:
-    DescriptorBuffer(int fd, bool writing, bool regularFile = false)
-        : fd_(fd), regularFile_(regularFile), buffer_(kBufferSize) {
+    DescriptorBuffer(toolkit::File file, bool writing, bool regularFile = false)
+        : file_(std::move(file)), regularFile_(regularFile), buffer_(kBufferSize) {
         if (writing) {
             setp(buffer_.data(), buffer_.data() + buffer_.size());
         } else {
@@ -60,15 +40,15 @@ class DescriptorBuffer : public std::streambuf {
     DescriptorBuffer(const DescriptorBuffer&) = delete;
     DescriptorBuffer& operator=(const DescriptorBuffer&) = delete;
 
-    int fd() const { return fd_; }
+    const toolkit::File& file() const { return file_; }
 
     // Reads up to `count` bytes (at most the buffer's size) into the get
     // area, as far as the input goes; returns how many are there.
     std::size_t Prime(std::size_t count) {
         std::size_t want = std::min(count, buffer_.size());
         std::size_t have = 0;
-        while (fd_ >= 0 && have < want) {
-            ssize_t n = ReadRetrying(fd_, buffer_.data() + have, want - have);
+        while (file_.IsOpen() && have < want) {
+            ssize_t n = file_.Read(buffer_.data() + have, want - have);
             if (n <= 0) break;
             have += static_cast<std::size_t>(n);
         }
@@ -85,18 +65,13 @@ class DescriptorBuffer : public std::streambuf {
         if (pbase() != nullptr) setp(buffer_.data(), buffer_.data() + buffer_.size());
     }
 
-    bool CloseDescriptor() {
-        if (fd_ < 0) return true;
-        bool ok = ::close(fd_) == 0;
-        fd_ = -1;
-        return ok;
-    }
+    bool CloseDescriptor() { return file_.Close(); }
 
   protected:
     int_type underflow() override {
         if (gptr() < egptr()) return traits_type::to_int_type(*gptr());
-        if (fd_ < 0) return traits_type::eof();
-        ssize_t n = ReadRetrying(fd_, buffer_.data(), buffer_.size());
+        if (!file_.IsOpen()) return traits_type::eof();
+        ssize_t n = file_.Read(buffer_.data(), buffer_.size());
         if (n <= 0) return traits_type::eof();
         setg(buffer_.data(), buffer_.data(), buffer_.data() + n);
         return traits_type::to_int_type(*gptr());
@@ -147,17 +122,17 @@ class DescriptorBuffer : public std::streambuf {
 
     bool Write(const char* data, std::size_t size) {
         if (size == 0) return true;
-        if (fd_ >= 0 && toolkit::WriteAll(fd_, std::string_view(data, size))) {
+        if (file_.WriteAll(std::string_view(data, size))) {
             written_ += size;
             return true;
         }
         failed_ = true;
         // A part of a line may have reached the file; take it back.
-        if (fd_ >= 0 && regularFile_) (void)::ftruncate(fd_, static_cast<off_t>(written_));
+        if (file_.IsOpen() && regularFile_) (void)file_.Truncate(written_);
         return false;
     }
 
-    int fd_;
+    toolkit::File file_;
     bool regularFile_;
     bool failed_ = false;
     std::uint64_t written_ = 0;
@@ -173,14 +148,12 @@ DataFileStream::~DataFileStream() {
 std::unique_ptr<DataFileStream> DataFileStream::OpenForReading(const std::string& path,
                                                                std::size_t probe) {
     std::unique_ptr<DataFileStream> file(new DataFileStream());
-    int fd = OpenRetrying(path.c_str(), O_RDONLY);
-    file->buffer_ = std::make_unique<DescriptorBuffer>(fd, false);
+    toolkit::File opened(path, toolkit::File::Mode::kRead);
+    const bool open = opened.IsOpen();
+    if (open && opened.IsRegular()) file->size_ = opened.Size();
+    file->buffer_ = std::make_unique<DescriptorBuffer>(std::move(opened), false);
     file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
-    if (fd >= 0) {
-        struct stat info {};
-        if (::fstat(fd, &info) == 0 && S_ISREG(info.st_mode)) {
-            file->size_ = static_cast<std::uint64_t>(info.st_size);
-        }
+    if (open) {
         // The line-feed probe reads the head of the file into the buffer, so
         // that the bytes are read once and pipes work as well as files.
         file->buffer_->Prime(probe);
@@ -195,25 +168,23 @@ std::unique_ptr<DataFileStream> DataFileStream::OpenForWriting(const std::string
     // Truncated in place: owner, permissions and hard links stay as they
     // are, a symbolic link is followed, and a directory closed to new files
     // is no obstacle when the file itself is writable.
-    const int fd = OpenRetrying(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOCTTY, 0666);
-    struct stat info {};
-    file->regular_ = fd >= 0 && ::fstat(fd, &info) == 0 && S_ISREG(info.st_mode);
-    file->buffer_ = std::make_unique<DescriptorBuffer>(fd, true, file->regular_);
+    toolkit::File opened(path, toolkit::File::Mode::kTruncate);
+    const bool open = opened.IsOpen();
+    file->regular_ = opened.IsRegular();
+    file->buffer_ = std::make_unique<DescriptorBuffer>(std::move(opened), true, file->regular_);
     file->stream_ = std::make_unique<std::iostream>(file->buffer_.get());
-    if (fd < 0) file->stream_->setstate(std::ios::badbit);
+    if (!open) file->stream_->setstate(std::ios::badbit);
     return file;
 }
 
 bool DataFileStream::Flush() {
     if (!writing_ || closed_) return true;
     stream_->flush();
-    return !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0 && StillNamed();
+    return !stream_->fail() && !buffer_->failed() && buffer_->file().IsOpen() && StillNamed();
 }
 
 bool DataFileStream::StillNamed() const {
-    if (!regular_) return true;
-    struct stat info {};
-    return ::fstat(buffer_->fd(), &info) == 0 && info.st_nlink > 0;
+    return !regular_ || buffer_->file().StillNamed();
 }
 
 bool DataFileStream::Close(bool commit) {
@@ -229,8 +200,8 @@ bool DataFileStream::Close(bool commit) {
         return true;
     }
     stream_->flush();
-    bool ok = !stream_->fail() && !buffer_->failed() && buffer_->fd() >= 0 && StillNamed();
-    if (ok && regular_) ok = FsyncRetrying(buffer_->fd());
+    bool ok = !stream_->fail() && !buffer_->failed() && buffer_->file().IsOpen() && StillNamed();
+    if (ok && regular_) ok = buffer_->file().Sync();
     return buffer_->CloseDescriptor() && ok;
 }
 

@@ -1,8 +1,5 @@
 // nxreg: inspects and changes the registry hives of NxBase from the command
 // line, and moves keys in and out as REGEDIT4 text.
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
@@ -18,7 +15,7 @@
 #include "nxbase/files.h"
 #include "nxbase/registry.h"
 #include "nxbase/version.h"
-#include "toolkit/eintr.h"
+#include "toolkit/fileio.h"
 
 namespace {
 
@@ -217,33 +214,23 @@ constexpr std::size_t kHeadBytes = 64u << 10;
 
 // Appends up to `limit` more bytes of `fd` to `text`; true at the end of input.
 bool ReadUpTo(int fd, std::string& text, std::size_t limit, const std::string& source) {
-    char buffer[1 << 16];
-    while (limit > 0) {
-        const ssize_t n = toolkit::RetryOnEintr(
-            [&] { return ::read(fd, buffer, std::min(sizeof buffer, limit)); });
-        if (n < 0) throw std::runtime_error("cannot read " + source + ": " + std::strerror(errno));
-        if (n == 0) return true;
-        text.append(buffer, static_cast<std::size_t>(n));
-        limit -= static_cast<std::size_t>(n);
-    }
-    return false;
+    const toolkit::ReadEnd end = toolkit::ReadUpTo(fd, limit, text);
+    if (end == toolkit::ReadEnd::kError)
+        throw std::runtime_error("cannot read " + source + ": " + std::strerror(errno));
+    return end == toolkit::ReadEnd::kEnd;
 }
 
 int Import(const std::vector<std::string>& asArguments) {
     if (asArguments.size() != 1) throw UsageError("import takes one file");
     const std::string& file = asArguments[0];
     const std::string source = file == "-" ? "<stdin>" : file;
-    int fd = 0;
+    toolkit::File opened;
     if (file != "-") {
-        fd = ::open(file.c_str(), O_RDONLY | O_CLOEXEC);
-        if (fd < 0) throw std::runtime_error("cannot read " + file + ": " + std::strerror(errno));
+        opened = toolkit::File(file, toolkit::File::Mode::kRead);
+        if (!opened.IsOpen())
+            throw std::runtime_error("cannot read " + file + ": " + std::strerror(errno));
     }
-    struct Closer {
-        int fd;
-        ~Closer() {
-            if (fd > 0) ::close(fd);
-        }
-    } closer{fd};
+    const int fd = file == "-" ? 0 : opened.Descriptor();
     // The header is checked before the rest is read, so that a wrong file
     // is refused at once, whatever its size.
     std::string text;

@@ -1,9 +1,15 @@
-// Writing files so that nothing is half done: every byte of a write, or an
-// error; a whole file replaced, or the old one kept. Any thread may call
-// these.
+// The library's file layer: an open file that closes itself, a capped
+// whole-file read, a whole write, an append that is one write(), and what a
+// path names. Writing never leaves anything half done: every byte of a write
+// or an error; a whole file replaced, or the old one kept. Every call goes on
+// after signals. Any thread may call these.
 #ifndef TOOLKIT_FILEIO_H_
 #define TOOLKIT_FILEIO_H_
 
+#include <sys/types.h>
+
+#include <cstddef>
+#include <cstdint>
 #include <string>
 #include <string_view>
 
@@ -11,7 +17,79 @@
 
 namespace toolkit {
 
-// Writes all of `bytes` to `fd`, going on after signals and short writes;
+// One open file descriptor (close-on-exec), closed with the object.
+class NXBASE_EXPORT File {
+  public:
+    enum class Mode {
+        kRead,
+        // Created with mode 0666 under the umask, or truncated in place (its
+        // owner, permissions and links stay); a symbolic link is followed.
+        kTruncate,
+        // Appends; created with mode 0644; the last component of the path is
+        // never followed as a symbolic link.
+        kAppend,
+        // kAppend, emptied first.
+        kAppendTruncated,
+    };
+    File() = default;
+    // Opens `path`; IsOpen() is false, errno set, when it cannot be opened.
+    File(const std::string& path, Mode mode);
+    ~File() { Close(); }
+    File(File&& other) noexcept : fd_(other.fd_) { other.fd_ = -1; }
+    File& operator=(File&& other) noexcept;
+    File(const File&) = delete;
+    File& operator=(const File&) = delete;
+
+    bool IsOpen() const { return fd_ >= 0; }
+    int Descriptor() const { return fd_; }
+    // One read(): the count (0 at the end), or -1 with errno set.
+    ssize_t Read(char* data, std::size_t size) const;
+    // Every byte, going on after short writes (see WriteAll below).
+    bool WriteAll(std::string_view bytes) const;
+    // One write() that must take every byte: false, errno set (ENOSPC for a
+    // short write), otherwise. Appends stay whole lines across processes.
+    bool WriteOnce(std::string_view bytes) const;
+    bool Sync() const;
+    bool Truncate(std::uint64_t size) const;
+    // What the open file is: a regular file, its size, and whether it still
+    // has a name (a removed file keeps its data only while it is open).
+    bool IsRegular() const;
+    std::uint64_t Size() const;
+    bool StillNamed() const;
+    // Closes now; false when close() reported an error.
+    bool Close();
+
+  private:
+    int fd_ = -1;
+};
+
+// How ReadUpTo ended.
+enum class ReadEnd { kEnd, kLimit, kError };
+// Appends at most `limit` more bytes of descriptor `fd` to `bytes`: kEnd at
+// the end of the input, kLimit when `limit` bytes came first, kError with
+// errno set.
+NXBASE_EXPORT ReadEnd ReadUpTo(int fd, std::size_t limit, std::string& bytes);
+
+// Reads the whole file at `path` into `bytes`, at most `limit` bytes, and
+// (with `regularOnly`) only a regular file. False with `bytes` empty and
+// `why` set ("cannot open: No such file or directory", "not a regular file",
+// "larger than 1024 bytes", "cannot read: ...") otherwise.
+NXBASE_EXPORT bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& bytes,
+                                 std::string& why, bool regularOnly = true);
+
+// Appends `bytes` to the file at `path` in one write() (File::kAppend, or
+// kAppendTruncated with `truncate`): lines stay whole across threads and
+// processes. False, errno set, when it cannot be opened or the write is short.
+NXBASE_EXPORT bool AppendInOneWrite(const std::string& path, std::string_view bytes,
+                                    bool truncate = false);
+
+// What `path` names, symbolic links followed.
+enum class FileKind { kNone, kRegular, kDirectory, kSocket, kOther };
+NXBASE_EXPORT FileKind KindOf(const std::string& path);
+// A regular file this process may read.
+NXBASE_EXPORT bool IsReadableFile(const std::string& path);
+
+// Writes all of `fd`, going on after signals and short writes;
 // false with errno set (EIO for a write that took nothing) on failure.
 NXBASE_EXPORT bool WriteAll(int fd, std::string_view bytes);
 

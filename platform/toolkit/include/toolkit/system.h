@@ -4,6 +4,7 @@
 #ifndef TOOLKIT_SYSTEM_H_
 #define TOOLKIT_SYSTEM_H_
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
 
@@ -38,6 +39,26 @@ NXBASE_EXPORT std::string ExecutableFileName();
 
 // The calling thread's operating-system id (gettid).
 NXBASE_EXPORT std::uint32_t CurrentThreadId();
+// The process's effective user id: whose peers it may talk to.
+NXBASE_EXPORT std::uint32_t EffectiveUserId();
+
+// The kernel's release text ("6.1.0-13-amd64"), "" when unknown.
+NXBASE_EXPORT std::string KernelRelease();
+// This machine's host name, "" when unknown.
+NXBASE_EXPORT std::string HostName();
+// The login name of the session, else the name of the process's user in the
+// user database, else ""; `$LOGNAME` and `$USER` are the caller's last resort.
+NXBASE_EXPORT std::string LoginName();
+// Processors online, at least 1.
+NXBASE_EXPORT unsigned int OnlineProcessorCount();
+// The process's nice value (0 when it cannot be read), and setting a
+// thread's (by its CurrentThreadId()); false when refused (raising a
+// priority needs privileges).
+NXBASE_EXPORT int ProcessNiceValue();
+NXBASE_EXPORT bool SetThreadNiceValue(std::uint32_t threadId, int nice);
+// Whether `fd` is a terminal, and its width in columns (0 when unknown).
+NXBASE_EXPORT bool IsTerminal(int fd);
+NXBASE_EXPORT std::size_t TerminalColumns(int fd);
 
 // Creates `path` (and missing parents) with mode 0700 when it does not exist.
 // Returns "" when `path` is then a directory (not a symlink), owned by the

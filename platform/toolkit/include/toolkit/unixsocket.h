@@ -39,9 +39,20 @@ class NXBASE_EXPORT SocketCalls {
     virtual bool IsNameLocked(const std::string& lockPath);
     // Whether a socket file is at `path` (bound; not necessarily listened on).
     virtual bool SocketExists(const std::string& path);
+    // Removes the socket file at `path` (a listener's, or one left behind).
+    virtual void RemoveSocketFile(const std::string& path);
+    // Lets only this user connect to the socket file at `path` (mode 0600).
+    virtual void MakeOwnerOnly(const std::string& path);
+    // Keeps `fd` from programs this process starts (close-on-exec).
+    virtual void KeepFromChildren(int fd);
+    // Closes a descriptor these calls gave.
+    virtual void Close(int fd);
     // Removes the lock file and releases the lock taken by LockName.
     virtual void UnlockName(int fd, const std::string& lockPath);
 };
+
+// The longest path a socket address holds.
+NXBASE_EXPORT std::size_t MaxSocketPathLength();
 
 // The calls in use: the system's unless a test replaced them.
 NXBASE_EXPORT SocketCalls& Sockets();
