@@ -224,6 +224,18 @@ TEST(StringHelpers, ParsersTakeExactlyWholeFieldsOverRandomText) {
             std::regex_match(text, decimal) && !outOfRange && std::isfinite(modelDecimal);
         ASSERT_EQ(StringHelpers::ParseDecimal(text, d), decimalOk) << "\"" << text << "\"";
         EXPECT_EQ(d, decimalOk ? modelDecimal : 7.0) << text;
+        // Other bases: the same text with some digits turned into letters.
+        const int base = round % 3 == 0 ? 16 : round % 3 == 1 ? 8 : 2;
+        for (char& c : text)
+            if (random() % 4 == 0 && c >= '0' && c <= '9') c = "abcdefABCDEF"[random() % 12];
+        const std::regex digits(base == 16 ? "-?[0-9a-fA-F]+" : base == 8 ? "-?[0-7]+" : "-?[01]+");
+        errno = 0;
+        const long long modelBased = std::strtoll(text.c_str(), nullptr, base);
+        const bool basedOk = std::regex_match(text, digits) && errno != ERANGE;
+        i = 7;
+        ASSERT_EQ(StringHelpers::ParseInteger(text, i, base), basedOk)
+            << base << " \"" << text << "\"";
+        EXPECT_EQ(i, basedOk ? modelBased : 7) << text;
     }
 }
 

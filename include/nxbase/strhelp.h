@@ -47,11 +47,12 @@ class NXBASE_EXPORT StringHelpers {
     static std::string Fixed(double axValue, int alDecimals);
     static std::string Shortest(double axValue);
     // A whole field as a number, whatever the locale: an optional "-",
-    // decimal digits and, for ParseDecimal, a "." and an exponent. False,
-    // with the value untouched, for anything else: blanks, "+", an empty
-    // field, a value out of range (beyond the largest double, or so small it
-    // would read as 0; a subnormal is taken), NaN or infinity.
-    static bool ParseInteger(std::string_view asText, long long& axValue);
+    // digits of `alBase` (2 to 36; letters in either case, no "0x") and, for
+    // ParseDecimal, decimal digits, a "." and an exponent. False, with the
+    // value untouched, for anything else: blanks, "+", an empty field, a
+    // value out of range (beyond the largest double, or so small it would
+    // read as 0; a subnormal is taken), NaN or infinity.
+    static bool ParseInteger(std::string_view asText, long long& axValue, int alBase = 10);
     static bool ParseDecimal(std::string_view asText, double& axValue);
 
     // Digit alphabets: "01", "01234567", "0123456789", "0123456789ABCDEF".

@@ -1,9 +1,11 @@
 // REGEDIT4 text: reading it into store changes and writing keys out as it.
 #include <charconv>
+#include <cstdint>
 #include <stdexcept>
 #include <string_view>
 
 #include "nxbase/registry.h"
+#include "nxbase/strhelp.h"
 #include "toolkit/string.h"
 
 namespace nxbase {
@@ -17,6 +19,12 @@ class ParseError : public std::runtime_error {
   public:
     using std::runtime_error::runtime_error;
 };
+
+// Hexadecimal digits only, the whole field (no sign).
+bool IsHexField(std::string_view asDigits, long long& axValue) {
+    return !asDigits.empty() && asDigits.front() != '-' &&
+           StringHelpers::ParseInteger(asDigits, axValue, 16);
+}
 
 // The start of the offending text, with control bytes written as \xNN so
 // that an error message never carries them to a terminal.
@@ -122,10 +130,8 @@ std::string ReadHexBytes(std::string_view asList) {
     while (!asList.empty()) {
         std::size_t comma = asList.find(',');
         std::string_view pair = TrimLeft(TrimRight(asList.substr(0, comma)));
-        unsigned value = 0;
-        auto [end, error] = std::from_chars(pair.data(), pair.data() + pair.size(), value, 16);
-        if (pair.empty() || pair.size() > 2 || error != std::errc() ||
-            end != pair.data() + pair.size()) {
+        long long value = 0;
+        if (pair.size() > 2 || !IsHexField(pair, value)) {
             throw ParseError("hex data must be byte pairs separated by commas");
         }
         bytes += static_cast<char>(value);
@@ -157,11 +163,11 @@ RegistryValue ReadHexValue(std::string_view asData, std::string asName, bool abW
     if (!asData.empty() && asData.front() == '(') {
         std::size_t close = asData.find(')');
         std::string_view digits = asData.substr(1, close == std::string_view::npos ? 0 : close - 1);
-        auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), type, 16);
-        if (close == std::string_view::npos || digits.empty() || error != std::errc() ||
-            end != digits.data() + digits.size()) {
+        long long number = 0;
+        if (close == std::string_view::npos || !IsHexField(digits, number) || number > UINT32_MAX) {
             throw ParseError("hex(N) needs a hexadecimal type number");
         }
+        type = static_cast<std::uint32_t>(number);
         asData.remove_prefix(close + 1);
     }
     if (asData.empty() || asData.front() != ':') throw ParseError("missing : after hex");
@@ -203,14 +209,11 @@ RegistryValue ReadData(std::string_view asData, std::string asName, bool& axDele
     constexpr std::string_view kDword = "dword:";
     if (asData.substr(0, kDword.size()) == kDword) {
         std::string_view digits = asData.substr(kDword.size());
-        std::uint32_t number = 0;
-        auto [end, error] =
-            std::from_chars(digits.data(), digits.data() + digits.size(), number, 16);
-        if (digits.empty() || digits.size() > kMaxDwordDigits || error != std::errc() ||
-            end != digits.data() + digits.size()) {
+        long long number = 0;
+        if (digits.size() > kMaxDwordDigits || !IsHexField(digits, number)) {
             throw ParseError("a dword needs 1 to 8 hexadecimal digits");
         }
-        return RegistryValue::Dword(asName, number);
+        return RegistryValue::Dword(asName, static_cast<std::uint32_t>(number));
     }
     if (asData.substr(0, 3) == "hex") return ReadHexValue(asData, std::move(asName), abWide);
     throw ParseError("a value must be \"text\", dword:XXXXXXXX, hex...: or -");

@@ -141,9 +141,10 @@ std::string StringHelpers::Shortest(double axValue) {
     return error == std::errc() ? std::string(buffer.data(), end) : std::string("nan");
 }
 
-bool StringHelpers::ParseInteger(std::string_view asText, long long& axValue) {
+bool StringHelpers::ParseInteger(std::string_view asText, long long& axValue, int alBase) {
     long long value = 0;
-    const auto [end, error] = std::from_chars(asText.data(), asText.data() + asText.size(), value);
+    const auto [end, error] =
+        std::from_chars(asText.data(), asText.data() + asText.size(), value, alBase);
     if (asText.empty() || error != std::errc() || end != asText.data() + asText.size())
         return false;
     axValue = value;

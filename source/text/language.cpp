@@ -4,7 +4,7 @@
 
 #include <algorithm>
 #include <cctype>
-#include <charconv>
+#include <climits>
 #include <clocale>
 #include <iterator>
 #include <string_view>
@@ -12,6 +12,7 @@
 #include "nxbase/check.h"
 #include "nxbase/configuration.h"
 #include "nxbase/logfile.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/text.h"
 #include "text_os.h"
 #include "toolkit/system.h"
@@ -394,11 +395,9 @@ Language::Language(ConfigInterface* pConfigArg, std::unique_ptr<LanguageAccessCh
     : NxSingleton("Language"), pConfig(pConfigArg), pChecker(std::move(pCheckerArg)) {
     std::string stored;
     if (pConfig != nullptr) stored = pConfig->ReadKey(kSettingsGroup, kLanguageKey, "");
-    int code = 0;
-    std::string_view text = Trim(stored);
-    auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), code);
+    long long code = 0;
     unsigned short language = kEnglish;
-    if (!text.empty() && error == std::errc() && end == text.data() + text.size() &&
+    if (StringHelpers::ParseInteger(Trim(stored), code) && code >= INT_MIN && code <= INT_MAX &&
         CountryCodeToLanguage(static_cast<LanguageCode>(code), language)) {
         amLanguage = language;
         Log("Language from configuration: " + std::to_string(code));

@@ -20,6 +20,7 @@
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"
 #include "nxbase/registry.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/version.h"
 #include "spectra_csv.h"
 #include "toolkit/application.h"
@@ -258,12 +259,12 @@ int main(int argc, char** argv) {
             chartFile = value("a file");
         } else if (argument == "--trigger-every") {
             std::string ms = value("milliseconds");
-            char* end = nullptr;
-            triggerEvery = std::strtol(ms.c_str(), &end, 10);
-            if (*end != '\0' || triggerEvery < 1) {
+            long long every = 0;
+            if (!StringHelpers::ParseInteger(ms, every) || every < 1 || every > 86400000) {
                 std::cerr << "lumaserver: --trigger-every needs a positive number\n";
                 return kExitUsage;
             }
+            triggerEvery = static_cast<long>(every);
         } else if (argument == "--dde-only") {
             Pipe::SetSocketListening(false);
         } else if (argument == "-S") {

@@ -2,7 +2,6 @@
 // densities) under a chosen illuminant, observer and density standard, from a
 // CSV or CGATS file or the built-in ColorChecker chart.
 #include <cctype>
-#include <charconv>
 #include <cmath>
 #include <cstdio>
 #include <iostream>
@@ -15,6 +14,7 @@
 #include "measure.h"
 #include "nxbase/colorvector.h"
 #include "nxbase/progress.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/version.h"
 #include "report.h"
 #include "screen.h"
@@ -32,12 +32,7 @@ constexpr int kMaxPrecision = 9;
 
 // A finite decimal number that fills the whole text.
 bool ParseWholeNumber(const std::string& text, double* value) {
-    double x = 0.0;
-    const auto r = std::from_chars(text.data(), text.data() + text.size(), x);
-    if (r.ec != std::errc() || r.ptr != text.data() + text.size() || !std::isfinite(x))
-        return false;
-    *value = x;
-    return true;
+    return StringHelpers::ParseDecimal(text, *value);
 }
 // Inputs from this many spectra on get a progress bar (on a terminal).
 constexpr std::size_t kProgressMinRows = 20000;
@@ -197,13 +192,11 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
         } else if (arg == "-p" || arg == "--precision") {
             std::string text;
             if (!take(&text)) return arg + " needs a number";
-            int n = -1;
-            const auto r = std::from_chars(text.data(), text.data() + text.size(), n);
-            if (r.ec != std::errc() || r.ptr != text.data() + text.size() || n < 0 ||
-                n > kMaxPrecision) {
+            long long n = -1;
+            if (!StringHelpers::ParseInteger(text, n) || n < 0 || n > kMaxPrecision) {
                 return "precision must be 0..9, not \"" + text + "\"";
             }
-            options->precision = n;
+            options->precision = static_cast<int>(n);
             options->precisionGiven = true;
         } else if (arg == "--percent" && !hasValue) {
             options->read.scale = nxbase::SpectralScale::kPercent;
@@ -224,12 +217,11 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
         } else if (arg == "--measure") {
             std::string text;
             if (!take(&text)) return arg + " needs a number of patches";
-            int n = 0;
-            const auto r = std::from_chars(text.data(), text.data() + text.size(), n);
-            if (r.ec != std::errc() || r.ptr != text.data() + text.size() || n < 1 || n > 100000) {
+            long long n = 0;
+            if (!StringHelpers::ParseInteger(text, n) || n < 1 || n > 100000) {
                 return "--measure needs a number of patches from 1 to 100000, not \"" + text + "\"";
             }
-            options->measure = n;
+            options->measure = static_cast<int>(n);
         } else if (arg == "--compare" && !hasValue) {
             options->compare = true;
         } else if (arg == "--by-order" && !hasValue) {

@@ -9,12 +9,14 @@
 #include <iostream>
 #include <sstream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/poapps.h"
 #include "nxbase/postoffice.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/version.h"
 #include "toolkit/application.h"
 
@@ -55,13 +57,21 @@ struct UsageError : std::runtime_error {
     using std::runtime_error::runtime_error;
 };
 
+// A value of b:, s: or i:: decimal, or hexadecimal after "0x", with an
+// optional "-" ("010" is ten, not octal eight).
 long ParseNumber(const std::string& text, long low, long high) {
-    char* end = nullptr;
-    long value = std::strtol(text.c_str(), &end, 0);
-    if (text.empty() || *end != '\0' || value < low || value > high) {
+    std::string_view digits(text);
+    const bool negative = digits.substr(0, 1) == "-";
+    if (negative) digits.remove_prefix(1);
+    const bool hex = digits.substr(0, 2) == "0x" || digits.substr(0, 2) == "0X";
+    if (hex) digits.remove_prefix(2);
+    long long magnitude = 0;
+    if (digits.substr(0, 1) == "-" ||
+        !StringHelpers::ParseInteger(digits, magnitude, hex ? 16 : 10) ||
+        (negative ? -magnitude : magnitude) < low || (negative ? -magnitude : magnitude) > high) {
         throw UsageError("not a number in range: " + text);
     }
-    return value;
+    return static_cast<long>(negative ? -magnitude : magnitude);
 }
 
 void AppendValue(MyMemoryBlock& block, const std::string& value) {
@@ -120,9 +130,8 @@ int MessageNumber(const std::string& message) {
                          " (names such as GET_DEVICE_NAME, or numbers 0 to " +
                          std::to_string(ANZAHL_BOTSCHAFTEN - 1) + ")");
     }
-    char* end = nullptr;
-    const long value = std::strtol(message.c_str(), &end, 10);
-    if (*end != '\0' || value >= ANZAHL_BOTSCHAFTEN) {
+    long long value = 0;
+    if (!StringHelpers::ParseInteger(message, value) || value >= ANZAHL_BOTSCHAFTEN) {
         throw UsageError("no message has the number " + message + " (0 to " +
                          std::to_string(ANZAHL_BOTSCHAFTEN - 1) + ")");
     }

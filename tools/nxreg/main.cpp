@@ -2,7 +2,6 @@
 // line, and moves keys in and out as REGEDIT4 text.
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <cstdio>
 #include <cstring>
 #include <fstream>
@@ -14,6 +13,7 @@
 
 #include "nxbase/files.h"
 #include "nxbase/registry.h"
+#include "nxbase/strhelp.h"
 #include "nxbase/version.h"
 #include "toolkit/fileio.h"
 
@@ -89,12 +89,12 @@ std::uint32_t ParseDword(const std::string& asText) {
         digits.remove_prefix(2);
         base = 16;
     }
-    std::uint32_t value = 0;
-    auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), value, base);
-    if (digits.empty() || error != std::errc() || end != digits.data() + digits.size()) {
+    long long value = 0;
+    if (digits.substr(0, 1) == "-" || !StringHelpers::ParseInteger(digits, value, base) ||
+        value > UINT32_MAX) {
         throw UsageError("not a 32-bit unsigned number: " + asText);
     }
-    return value;
+    return static_cast<std::uint32_t>(value);
 }
 
 std::string Describe(const nxbase::RegistryValue& axValue) {
