@@ -184,65 +184,150 @@ MessageHandler SetMessageHandler(MessageHandler handler) {
     return gMessageHandler.exchange(handler);
 }
 
-boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& name,
-                                                          std::string* error) {
-    const BuiltIns& b = GetBuiltIns();
-    const auto builtIn = b.illuminants.find(name);
-    if (builtIn != b.illuminants.end()) return Unowned(builtIn->second);
+namespace {
+
+// What differs between the two kinds of table that may be installed or added
+// from a file: where they live, how a file is read into one, the words of
+// their messages.
+template <typename T>
+struct Kind;
+
+template <>
+struct Kind<IIlluminant> {
+    static constexpr const char* kTitle = "Illuminant";
+    static constexpr const char* kDefault = kDefaultIlluminant;
+    static auto& BuiltIn() { return GetBuiltIns().illuminants; }
+    static auto& Installed(InstalledCache& cache) { return cache.illuminants; }
+    static auto& Added(InstalledCache& cache) { return cache.addedIlluminants; }
+    static std::string Unknown(const std::string& name) {
+        return "unknown illuminant \"" + name + "\"";
+    }
+    static std::string NotInstalled(const std::string& name) {
+        return Unknown(name) + " (" + kDataDirVariable + " not set)";
+    }
+    static std::string PathOf(const std::string& dir, const std::string& name) {
+        return dir + "/illuminants/" + name + ".csv";
+    }
+    static std::string NameOf(const std::string& path) {
+        return std::filesystem::path(path).stem().string();
+    }
+    static boost::shared_ptr<IIlluminant> Make(const std::string& name, const std::string& path,
+                                               detail::CsvTable& table, std::string& message) {
+        if (table.columns.size() != 2) {
+            message = "expected the columns wavelength,value";
+            return {};
+        }
+        return MakeIlluminant(name, "Illuminant " + name + " (" + path + ")",
+                              std::move(table.wavelengths), std::move(table.values[0]), &message);
+    }
+};
+
+template <>
+struct Kind<IDensityStandard> {
+    static constexpr const char* kTitle = "Density standard";
+    static constexpr const char* kDefault = kDefaultDensityStandard;
+    static auto& BuiltIn() { return GetBuiltIns().standards; }
+    static auto& Installed(InstalledCache& cache) { return cache.standards; }
+    static auto& Added(InstalledCache& cache) { return cache.addedStandards; }
+    static std::string Unknown(const std::string& name) {
+        return "unknown density standard \"" + name + "\"";
+    }
+    static std::string NotInstalled(const std::string& name) {
+        return "density standard \"" + name + "\" is not installed (" + kDataDirVariable +
+               " not set)";
+    }
+    static std::string PathOf(const std::string& dir, const std::string& name) {
+        return dir + "/density/" + DensityFileStem(name) + "_log10.csv";
+    }
+    static std::string NameOf(const std::string& path) {
+        std::string stem = std::filesystem::path(path).stem().string();
+        const std::string suffix = "_log10";
+        if (stem.size() > suffix.size() &&
+            stem.compare(stem.size() - suffix.size(), suffix.size(), suffix) == 0) {
+            stem.resize(stem.size() - suffix.size());
+        }
+        return stem;
+    }
+    static boost::shared_ptr<IDensityStandard> Make(const std::string& name, const std::string&,
+                                                    detail::CsvTable& table, std::string& message) {
+        std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
+        return detail::MakeDensityStandard(name, channels, table.wavelengths, table.values,
+                                           message);
+    }
+};
+
+// A built-in table, one added from a file, or one installed in the data
+// directory (read once per process).
+template <typename T>
+boost::shared_ptr<T> FindTable(const std::string& name, std::string* error) {
+    const auto builtIn = Kind<T>::BuiltIn().find(name);
+    if (builtIn != Kind<T>::BuiltIn().end()) return Unowned(builtIn->second);
+    InstalledCache& cache = GetInstalled();
     {
-        InstalledCache& cache = GetInstalled();
         std::lock_guard<std::mutex> lock(cache.mutex);
-        const auto added = cache.addedIlluminants.find(name);
-        if (added != cache.addedIlluminants.end()) return Unowned(added->second);
+        const auto added = Kind<T>::Added(cache).find(name);
+        if (added != Kind<T>::Added(cache).end()) return Unowned(added->second);
     }
     if (!IsSafeFileName(name)) {
-        SetError(error, "unknown illuminant \"" + name + "\"");
+        SetError(error, Kind<T>::Unknown(name));
         return {};
     }
     const std::string dir = DataDirectory();
     if (dir.empty()) {
-        SetError(error, "unknown illuminant \"" + name + "\" (" + kDataDirVariable + " not set)");
+        SetError(error, Kind<T>::NotInstalled(name));
         return {};
     }
-    const std::string path = dir + "/illuminants/" + name + ".csv";
-    InstalledCache& cache = GetInstalled();
+    const std::string path = Kind<T>::PathOf(dir, name);
     std::lock_guard<std::mutex> lock(cache.mutex);
-    const auto cached = cache.illuminants.find(path);
-    if (cached != cache.illuminants.end()) return Unowned(cached->second);
+    const auto cached = Kind<T>::Installed(cache).find(path);
+    if (cached != Kind<T>::Installed(cache).end()) return Unowned(cached->second);
     detail::CsvTable table;
     if (!LoadTable(path, 2, table, error)) return {};
-    if (table.columns.size() != 2) {
-        SetError(error, path + ": expected the columns wavelength,value");
-        return {};
-    }
     std::string message;
-    boost::shared_ptr<IIlluminant> illuminant =
-        MakeIlluminant(name, "Illuminant " + name + " (" + path + ")", std::move(table.wavelengths),
-                       std::move(table.values[0]), &message);
-    if (!illuminant) {
+    boost::shared_ptr<T> made = Kind<T>::Make(name, path, table, message);
+    if (!made) {
         SetError(error, path + ": " + message);
         return {};
     }
-    cache.illuminants[path] = illuminant;
-    return Unowned(illuminant);
+    Kind<T>::Installed(cache)[path] = made;
+    return Unowned(made);
+}
+
+template <typename T>
+bool AddTableFile(const std::string& path, std::string* name, std::string* error) {
+    detail::CsvTable table;
+    if (!LoadTable(path, 2, table, error)) return false;
+    const std::string added = Kind<T>::NameOf(path);
+    std::string message;
+    boost::shared_ptr<T> made = Kind<T>::Make(added, path, table, message);
+    if (!made) return SetError(error, path + ": " + message);
+    InstalledCache& cache = GetInstalled();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    Kind<T>::Added(cache)[added] = made;
+    *name = added;
+    return true;
+}
+
+// The table, or the default one with a message saying why.
+template <typename T>
+boost::shared_ptr<T> TableOrDefault(const std::string& name) {
+    std::string error;
+    boost::shared_ptr<T> table = FindTable<T>(name, &error);
+    if (table) return table;
+    Report(std::string(Kind<T>::kTitle) + " \"" + name + "\" not available (" + error +
+           "); using \"" + Kind<T>::kDefault + "\"");
+    return Unowned(Kind<T>::BuiltIn().at(Kind<T>::kDefault));
+}
+
+}  // namespace
+
+boost::shared_ptr<IIlluminant> IlluminantRepository::Find(const std::string& name,
+                                                          std::string* error) {
+    return FindTable<IIlluminant>(name, error);
 }
 
 bool IlluminantRepository::AddFile(const std::string& path, std::string* name, std::string* error) {
-    detail::CsvTable table;
-    if (!LoadTable(path, 2, table, error)) return false;
-    if (table.columns.size() != 2)
-        return SetError(error, path + ": expected the columns wavelength,value");
-    const std::string stem = std::filesystem::path(path).stem().string();
-    std::string message;
-    boost::shared_ptr<IIlluminant> illuminant =
-        MakeIlluminant(stem, "Illuminant " + stem + " (" + path + ")", std::move(table.wavelengths),
-                       std::move(table.values[0]), &message);
-    if (!illuminant) return SetError(error, path + ": " + message);
-    InstalledCache& cache = GetInstalled();
-    std::lock_guard<std::mutex> lock(cache.mutex);
-    cache.addedIlluminants[stem] = illuminant;
-    *name = stem;
-    return true;
+    return AddTableFile<IIlluminant>(path, name, error);
 }
 
 std::string IlluminantRepository::CanonicalName(const std::string& name) {
@@ -271,12 +356,7 @@ std::vector<std::string> IlluminantRepository::GetInstalledNames() {
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::Get(const std::string& name) {
-    std::string error;
-    boost::shared_ptr<IIlluminant> illuminant = Find(name, &error);
-    if (illuminant) return illuminant;
-    Report("Illuminant \"" + name + "\" not available (" + error + "); using \"" +
-           kDefaultIlluminant + "\"");
-    return GetDefault();
+    return TableOrDefault<IIlluminant>(name);
 }
 
 boost::shared_ptr<IIlluminant> IlluminantRepository::GetDefault() {
@@ -307,73 +387,16 @@ std::vector<std::string> ObserverRepository::GetNames() {
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Find(const std::string& name,
                                                                     std::string* error) {
-    const BuiltIns& b = GetBuiltIns();
-    const auto builtIn = b.standards.find(name);
-    if (builtIn != b.standards.end()) return Unowned(builtIn->second);
-    {
-        InstalledCache& cache = GetInstalled();
-        std::lock_guard<std::mutex> lock(cache.mutex);
-        const auto added = cache.addedStandards.find(name);
-        if (added != cache.addedStandards.end()) return Unowned(added->second);
-    }
-    if (!IsSafeFileName(name)) {
-        SetError(error, "unknown density standard \"" + name + "\"");
-        return {};
-    }
-    const std::string dir = DataDirectory();
-    if (dir.empty()) {
-        SetError(error, "density standard \"" + name + "\" is not installed (" + kDataDirVariable +
-                            " not set)");
-        return {};
-    }
-    const std::string path = dir + "/density/" + DensityFileStem(name) + "_log10.csv";
-    InstalledCache& cache = GetInstalled();
-    std::lock_guard<std::mutex> lock(cache.mutex);
-    const auto cached = cache.standards.find(path);
-    if (cached != cache.standards.end()) return Unowned(cached->second);
-    detail::CsvTable table;
-    if (!LoadTable(path, 2, table, error)) return {};
-    std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
-    std::string message;
-    boost::shared_ptr<IDensityStandard> standard =
-        detail::MakeDensityStandard(name, channels, table.wavelengths, table.values, message);
-    if (!standard) {
-        SetError(error, path + ": " + message);
-        return {};
-    }
-    cache.standards[path] = standard;
-    return Unowned(standard);
+    return FindTable<IDensityStandard>(name, error);
 }
 
 bool DensityStandardRepository::AddFile(const std::string& path, std::string* name,
                                         std::string* error) {
-    detail::CsvTable table;
-    if (!LoadTable(path, 2, table, error)) return false;
-    std::string stem = std::filesystem::path(path).stem().string();
-    const std::string suffix = "_log10";
-    if (stem.size() > suffix.size() &&
-        stem.compare(stem.size() - suffix.size(), suffix.size(), suffix) == 0) {
-        stem.resize(stem.size() - suffix.size());
-    }
-    std::vector<std::string> channels(table.columns.begin() + 1, table.columns.end());
-    std::string message;
-    boost::shared_ptr<IDensityStandard> standard =
-        detail::MakeDensityStandard(stem, channels, table.wavelengths, table.values, message);
-    if (!standard) return SetError(error, path + ": " + message);
-    InstalledCache& cache = GetInstalled();
-    std::lock_guard<std::mutex> lock(cache.mutex);
-    cache.addedStandards[stem] = standard;
-    *name = stem;
-    return true;
+    return AddTableFile<IDensityStandard>(path, name, error);
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::Get(const std::string& name) {
-    std::string error;
-    boost::shared_ptr<IDensityStandard> standard = Find(name, &error);
-    if (standard) return standard;
-    Report("Density standard \"" + name + "\" not available (" + error + "); using \"" +
-           kDefaultDensityStandard + "\"");
-    return GetDefault();
+    return TableOrDefault<IDensityStandard>(name);
 }
 
 boost::shared_ptr<IDensityStandard> DensityStandardRepository::GetDefault() {

@@ -5,6 +5,7 @@
 #include <mutex>
 #include <stdexcept>
 
+#include "named_types.h"
 #include "nxbase/logfile.h"
 
 namespace {
@@ -14,12 +15,7 @@ using klume::cmetry::IlluminantRepository;
 using klume::cmetry::IObserver;
 using klume::cmetry::ObserverRepository;
 
-struct IllumName {
-    IllumType type;
-    const char* name;
-};
-
-constexpr IllumName kIllumNames[] = {
+constexpr nxbase::detail::NamedType<IllumType> kIllumNames[] = {
     {ILLUM_A, "A"},     {ILLUM_C, "C"},       {ILLUM_D65, "D65"},   {ILLUM_D50, "D50"},
     {ILLUM_FL1, "FL1"}, {ILLUM_FL2, "FL2"},   {ILLUM_FL3, "FL3"},   {ILLUM_FL4, "FL4"},
     {ILLUM_FL5, "FL5"}, {ILLUM_FL6, "FL6"},   {ILLUM_FL7, "FL7"},   {ILLUM_FL8, "FL8"},
@@ -96,18 +92,11 @@ std::string IllumClass::GetDisplayString() const {
 }
 
 IllumType IllumClass::GetIllumType() const {
-    const std::string& name = amIlluminant->GetName();
-    for (const IllumName& entry : kIllumNames) {
-        if (name == entry.name) return entry.type;
-    }
-    return ILLUM_UNKNOWN;
+    return nxbase::detail::TypeNamed(kIllumNames, amIlluminant->GetName(), ILLUM_UNKNOWN);
 }
 
 std::string IllumClass::NameOfType(IllumType type) {
-    for (const IllumName& entry : kIllumNames) {
-        if (entry.type == type) return entry.name;
-    }
-    return std::string();
+    return nxbase::detail::NameOf(kIllumNames, type);
 }
 
 // ---------------------------------------------------------------------------

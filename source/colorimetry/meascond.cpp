@@ -4,6 +4,7 @@
 #include <map>
 #include <mutex>
 
+#include "named_types.h"
 #include "nxbase/spectrum.h"
 
 namespace {
@@ -41,12 +42,7 @@ String FilterTypeName(ValueFilterType type) {
     return String::CreateFromInt(static_cast<long>(type));
 }
 
-struct DStdName {
-    DStdType type;
-    const char* name;
-};
-
-constexpr DStdName kDStdNames[] = {
+constexpr nxbase::detail::NamedType<DStdType> kDStdNames[] = {
     {DSTD_STATUS_A, "Status A"}, {DSTD_STATUS_T, "Status T"}, {DSTD_DIN, "DIN"},
     {DSTD_DIN_NB, "DIN NB"},     {DSTD_SPI, "SPI"},           {DSTD_STATUS_M, "Status M"},
     {DSTD_STATUS_E, "Status E"}, {DSTD_STATUS_I, "Status I"},
@@ -162,18 +158,11 @@ std::string DStdClass::GetDisplayString() const {
 }
 
 DStdType DStdClass::GetDStdType() const {
-    const std::string& name = amStandard->GetName();
-    for (const DStdName& entry : kDStdNames) {
-        if (name == entry.name) return entry.type;
-    }
-    return DSTD_UNKNOWN;
+    return nxbase::detail::TypeNamed(kDStdNames, amStandard->GetName(), DSTD_UNKNOWN);
 }
 
 std::string DStdClass::NameOfType(DStdType type) {
-    for (const DStdName& entry : kDStdNames) {
-        if (entry.type == type) return entry.name;
-    }
-    return std::string();
+    return nxbase::detail::NameOf(kDStdNames, type);
 }
 
 // ---------------------------------------------------------------------------
