@@ -4,8 +4,11 @@
 
 #include <gtest/gtest.h>
 
+#include <boost/make_shared.hpp>
 #include <limits>
+#include <random>
 #include <stdexcept>
+#include <string>
 #include <vector>
 
 namespace {
@@ -99,6 +102,41 @@ TEST(Spectrum, ArithmeticIsElementWiseAndFollowsIeeeRules) {
     EXPECT_NE(zero[0], zero[0]);  // 0 / 0 is NaN
     EXPECT_FLOAT_EQ(Spectrum::CreateWhiteSpectrum().Summe(), 36.0f);
     EXPECT_NE(ramp, ramp + Spectrum(1e-7f));
+}
+
+// Both types' binary operators against element-wise float arithmetic on
+// random spectra; a reflectance result keeps its left operand's conditions
+// and information, whichever side a factor stands on.
+TEST(Spectrum, BinaryOperatorsOfBothTypesMatchElementWiseFloatArithmetic) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<float> value(-2.0f, 2.0f);
+    PhysicalConditions physical;
+    physical.SetSurfaceType(static_cast<PhysicalConditions::SurfaceType>(1));
+    for (int round = 0; round < 200; ++round) {
+        std::vector<float> x(Spectrum::kSize), y(Spectrum::kSize);
+        for (int i = 0; i < Spectrum::kSize; ++i) x[i] = value(random), y[i] = value(random);
+        const double factor = value(random) + 3.0;  // never 0
+        ReflectanceSpectrum r(x, physical);
+        r.SetAdditionalInfo(boost::make_shared<Note>(kFirstKey, round));
+        const Spectrum a(x), b(y);
+        const Spectrum results[] = {a + b, a - b, a * factor, factor * a, a / factor};
+        const ReflectanceSpectrum reflectances[] = {r + b, r - b, r * factor, factor * r,
+                                                    r / factor};
+        const float f = static_cast<float>(factor);
+        for (int i = 0; i < Spectrum::kSize; ++i) {
+            const float expected[] = {x[i] + y[i], x[i] - y[i], x[i] * f, x[i] * f, x[i] / f};
+            for (int op = 0; op < 5; ++op) {
+                ASSERT_EQ(results[op][i], expected[op]) << op << " at " << i;
+                ASSERT_EQ(reflectances[op][i], expected[op]) << op << " at " << i;
+            }
+        }
+        for (const ReflectanceSpectrum& result : reflectances) {
+            EXPECT_EQ(result.GetPhysicalConditions(), physical);
+            EXPECT_EQ(result.GetAdditionalInfo(kFirstKey), r.GetAdditionalInfo(kFirstKey));
+        }
+    }
 }
 
 TEST(ReflectanceSpectrum, CopySharesTheInformationButAssignmentKeepsTheReceivers) {

@@ -10,6 +10,7 @@
 
 #include <boost/shared_ptr.hpp>
 #include <map>
+#include <type_traits>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -92,12 +93,6 @@ class NXBASE_EXPORT Spectrum {
     float amValues[kSize] = {};
 };
 
-NXBASE_EXPORT Spectrum operator+(const Spectrum& a, const Spectrum& b);
-NXBASE_EXPORT Spectrum operator-(const Spectrum& a, const Spectrum& b);
-NXBASE_EXPORT Spectrum operator*(const Spectrum& a, double factor);
-NXBASE_EXPORT Spectrum operator*(double factor, const Spectrum& a);
-NXBASE_EXPORT Spectrum operator/(const Spectrum& a, double divisor);
-
 class NXBASE_EXPORT ReflectanceSpectrum : public Spectrum {
   public:
     using InfoMap =
@@ -156,12 +151,37 @@ class NXBASE_EXPORT ReflectanceSpectrum : public Spectrum {
     InfoMap amInfo;
 };
 
-// Copies of the left operand (physical conditions and information included)
-// with the operation applied.
-NXBASE_EXPORT ReflectanceSpectrum operator+(const ReflectanceSpectrum& a, const Spectrum& b);
-NXBASE_EXPORT ReflectanceSpectrum operator-(const ReflectanceSpectrum& a, const Spectrum& b);
-NXBASE_EXPORT ReflectanceSpectrum operator*(const ReflectanceSpectrum& a, double factor);
-NXBASE_EXPORT ReflectanceSpectrum operator*(double factor, const ReflectanceSpectrum& a);
-NXBASE_EXPORT ReflectanceSpectrum operator/(const ReflectanceSpectrum& a, double divisor);
+// The binary operators of Spectrum and ReflectanceSpectrum: a copy of the
+// spectrum operand (of a ReflectanceSpectrum, its physical conditions and
+// information included) with the operation applied; factors are taken as
+// float, as by the compound operators.
+template <class S>
+using SpectrumResult = std::enable_if_t<std::is_base_of_v<Spectrum, S>, S>;
+
+template <class S>
+SpectrumResult<S> operator+(S a, const Spectrum& b) {
+    a += b;
+    return a;
+}
+template <class S>
+SpectrumResult<S> operator-(S a, const Spectrum& b) {
+    a -= b;
+    return a;
+}
+template <class S>
+SpectrumResult<S> operator*(S a, double factor) {
+    a *= static_cast<float>(factor);
+    return a;
+}
+template <class S>
+SpectrumResult<S> operator*(double factor, S a) {
+    a *= static_cast<float>(factor);
+    return a;
+}
+template <class S>
+SpectrumResult<S> operator/(S a, double divisor) {
+    a /= static_cast<float>(divisor);
+    return a;
+}
 
 #endif  // NXBASE_SPECTRUM_H_

@@ -128,34 +128,6 @@ bool Spectrum::operator==(const Spectrum& other) const {
     return std::equal(amValues, amValues + kSize, other.amValues);
 }
 
-Spectrum operator+(const Spectrum& a, const Spectrum& b) {
-    Spectrum result(a);
-    result += b;
-    return result;
-}
-
-Spectrum operator-(const Spectrum& a, const Spectrum& b) {
-    Spectrum result(a);
-    result -= b;
-    return result;
-}
-
-Spectrum operator*(const Spectrum& a, double factor) {
-    Spectrum result(a);
-    result *= static_cast<float>(factor);
-    return result;
-}
-
-Spectrum operator*(double factor, const Spectrum& a) {
-    return a * factor;
-}
-
-Spectrum operator/(const Spectrum& a, double divisor) {
-    Spectrum result(a);
-    result /= static_cast<float>(divisor);
-    return result;
-}
-
 ReflectanceSpectrum::ReflectanceSpectrum(const float* values, const PhysicalConditions& physical)
     : Spectrum(values), amPhysical(physical) {}
 
@@ -233,32 +205,4 @@ ReflectanceSpectrum& ReflectanceSpectrum::operator/=(float divisor) {
 
 bool ReflectanceSpectrum::operator==(const ReflectanceSpectrum& other) const {
     return Spectrum::operator==(other) && amPhysical == other.amPhysical;
-}
-
-ReflectanceSpectrum operator+(const ReflectanceSpectrum& a, const Spectrum& b) {
-    ReflectanceSpectrum result(a);
-    result += b;
-    return result;
-}
-
-ReflectanceSpectrum operator-(const ReflectanceSpectrum& a, const Spectrum& b) {
-    ReflectanceSpectrum result(a);
-    result -= b;
-    return result;
-}
-
-ReflectanceSpectrum operator*(const ReflectanceSpectrum& a, double factor) {
-    ReflectanceSpectrum result(a);
-    result *= static_cast<float>(factor);
-    return result;
-}
-
-ReflectanceSpectrum operator*(double factor, const ReflectanceSpectrum& a) {
-    return a * factor;
-}
-
-ReflectanceSpectrum operator/(const ReflectanceSpectrum& a, double divisor) {
-    ReflectanceSpectrum result(a);
-    result /= static_cast<float>(divisor);
-    return result;
 }
