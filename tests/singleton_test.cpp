@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <optional>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -49,6 +51,20 @@ class Plain : public NxSingleton {
     explicit Plain(const std::string& name) : NxSingleton(name) {}
     ~Plain() override { destroyed.push_back(GetIdentifier()); }
 };
+
+// Stores itself in its instance pointer when built, as some services do.
+class SelfStoring : public NxSingleton {
+  public:
+    SelfStoring(const std::string& name, bool store) : NxSingleton(name) {
+        if (store) smInstance = this;
+    }
+    ~SelfStoring() override {
+        destroyed.push_back(GetIdentifier());
+        if (smInstance == this) smInstance = nullptr;
+    }
+    static SelfStoring* smInstance;
+};
+SelfStoring* SelfStoring::smInstance = nullptr;
 
 class NxSingletonTest : public ::testing::Test {
   protected:
@@ -109,6 +125,52 @@ TEST_F(NxSingletonTest, LazyInstanceCreatesRegistersAndLoadsOnce) {
     EXPECT_EQ(first, again);
     EXPECT_EQ(loads, 1);
     EXPECT_EQ(NxSingleton::RegisteredCount(), 1u);
+}
+
+// Replacement against a model (the live name, the names destroyed, the
+// registry's size) over random sequences of create, install again, install
+// another, uninstall and tear down.
+TEST_F(NxSingletonTest, ReplacingAgreesWithAModelOverRandomSequences) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::optional<std::string> live;
+    std::vector<std::string> gone;
+    for (int step = 0; step < 2000; ++step) {
+        const std::string name = "s" + std::to_string(step);
+        auto retire = [&] {
+            if (live) gone.push_back(*live);
+            live.reset();
+        };
+        switch (random() % 5) {
+            case 0:  // create (the constructor may store itself)
+                retire();
+                nxbase::CreateOrReplaceSingleton(SelfStoring::smInstance, name, random() % 2 == 0);
+                live = name;
+                break;
+            case 1:  // the live one again: nothing changes
+                nxbase::InstallSingleton(SelfStoring::smInstance, SelfStoring::smInstance);
+                break;
+            case 2:  // another, made elsewhere
+                retire();
+                nxbase::InstallSingleton(SelfStoring::smInstance, new SelfStoring(name, false));
+                live = name;
+                break;
+            case 3:
+                retire();
+                nxbase::InstallSingleton<SelfStoring>(SelfStoring::smInstance, nullptr);
+                break;
+            default:
+                retire();
+                NxSingleton::DeleteAllSingleton();
+                break;
+        }
+        ASSERT_EQ(destroyed, gone) << "step " << step;
+        ASSERT_EQ(NxSingleton::RegisteredCount(), live ? 1u : 0u) << "step " << step;
+        ASSERT_EQ(SelfStoring::smInstance ? SelfStoring::smInstance->GetIdentifier() : "",
+                  live.value_or(""))
+            << "step " << step;
+    }
 }
 
 }  // namespace

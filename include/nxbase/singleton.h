@@ -36,6 +36,7 @@ class NXBASE_EXPORT NxSingleton {
 
     // Number of registered singletons (for diagnostics and tests).
     static std::size_t RegisteredCount();
+    static bool IsRegistered(const NxSingleton* p);
 
   private:
     std::string identifier;
@@ -44,21 +45,31 @@ class NXBASE_EXPORT NxSingleton {
 
 namespace nxbase {
 
-// The create-or-replace step every service's CreateX() shares: a live
-// instance is unregistered and deleted first (its destructor nulls
-// `instance`), then a new T(args...) is made, stored and inserted at the front.
-template <class T, class... Args>
-T* CreateOrReplaceSingleton(T*& instance, Args&&... args) {
-    if (instance != nullptr) {
+// The one replacement of a service: the live instance (if another) is
+// unregistered and deleted, then `successor` (may be null) is stored and,
+// unless it is registered already, inserted at the front. (A constructor
+// may have stored itself in `instance`.)
+template <class T>
+T* InstallSingleton(T*& instance, T* successor) {
+    if (instance != nullptr && instance != successor) {
         T* previous = instance;
         NxSingleton::Remove(previous);
-        delete previous;
-        instance = nullptr;
+        delete previous;  // its destructor may null `instance`
     }
-    T* created = new T(std::forward<Args>(args)...);
-    instance = created;
-    NxSingleton::Insert(created);
-    return created;
+    instance = successor;
+    if (successor != nullptr && !NxSingleton::IsRegistered(successor)) {
+        NxSingleton::Insert(successor);
+    }
+    return successor;
+}
+
+// The create-or-replace step every service's CreateX() shares: the live
+// instance goes before a new T(args...) is made (they may hold the same
+// names or files).
+template <class T, class... Args>
+T* CreateOrReplaceSingleton(T*& instance, Args&&... args) {
+    InstallSingleton<T>(instance, nullptr);
+    return InstallSingleton(instance, new T(std::forward<Args>(args)...));
 }
 
 // Strict Instance(): the instance, or std::logic_error(message) when absent.
@@ -72,12 +83,7 @@ T* StrictSingletonInstance(T* instance, const char* message) {
 // new object) when absent.
 template <class T, class Load>
 T* LazySingletonInstance(T*& instance, Load load) {
-    if (instance == nullptr) {
-        T* created = new T();
-        instance = created;
-        NxSingleton::Insert(created);
-        load(*created);
-    }
+    if (instance == nullptr) load(*InstallSingleton(instance, new T()));
     return instance;
 }
 

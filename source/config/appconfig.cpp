@@ -122,14 +122,7 @@ bool AppDir::IsInitialized() {
 }
 
 void AppDir::SetAppDir(AppDir* pAppDir) {
-    if (smInstance == pAppDir) return;
-    if (smInstance != nullptr) {
-        AppDir* previous = smInstance;
-        NxSingleton::Remove(previous);
-        delete previous;
-    }
-    smInstance = pAppDir;
-    if (pAppDir != nullptr) NxSingleton::Insert(pAppDir);
+    nxbase::InstallSingleton(smInstance, pAppDir);
 }
 
 DirEntry AppDir::BinDirEntry() const {
@@ -218,14 +211,7 @@ bool AppConfig::IsInitialized() {
 }
 
 void AppConfig::SetAppConfig(AppConfig* pAppConfig) {
-    if (smInstance == pAppConfig) return;
-    if (smInstance != nullptr) {
-        AppConfig* previous = smInstance;
-        NxSingleton::Remove(previous);
-        delete previous;
-    }
-    smInstance = pAppConfig;
-    if (pAppConfig != nullptr) NxSingleton::Insert(pAppConfig);
+    nxbase::InstallSingleton(smInstance, pAppConfig);
 }
 
 // --------------------------------------------------------------- UserConfig

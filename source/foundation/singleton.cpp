@@ -47,3 +47,8 @@ void NxSingleton::DeleteAllSingleton() {
 std::size_t NxSingleton::RegisteredCount() {
     return mListOfSingletons.size();
 }
+
+bool NxSingleton::IsRegistered(const NxSingleton* p) {
+    return std::find(mListOfSingletons.begin(), mListOfSingletons.end(), p) !=
+           mListOfSingletons.end();
+}

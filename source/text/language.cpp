@@ -372,14 +372,8 @@ Language* Language::CreateLanguage(ConfigInterface* pConfig, String& asTextBase)
 Language* Language::CreateLanguage(ConfigInterface* pConfig,
                                    const LanguageAccessChecker& axChecker) {
     std::unique_ptr<LanguageAccessChecker> checker = axChecker.Clone();
-    if (smInstance != nullptr) {
-        Language* previous = smInstance;
-        NxSingleton::Remove(previous);
-        delete previous;
-    }
-    smInstance = new Language(pConfig, std::move(checker));
-    NxSingleton::Insert(smInstance);
-    return smInstance;
+    nxbase::InstallSingleton<Language>(smInstance, nullptr);
+    return nxbase::InstallSingleton(smInstance, new Language(pConfig, std::move(checker)));
 }
 
 Language* Language::Instance() {
