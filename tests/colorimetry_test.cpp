@@ -505,7 +505,7 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
     const nxbase::SpectraTable chart = [] {
         nxbase::SpectraTable t;
         std::string error;
-        nxbase::ReadSpectraFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t,
+        nxbase::ReadSpectralFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t,
                                 &error);
         return t;
     }();

@@ -35,7 +35,7 @@ std::string Header(int first = 380, int last = 730) {
 TEST(NxcolorCsv, EmbeddedChartIsTheChartFile) {
     nxcolor::SpectraTable file;
     std::string error;
-    ASSERT_TRUE(nxcolor::ReadSpectraFile(nxtest::ChartPath(), {}, &file, &error)) << error;
+    ASSERT_TRUE(nxcolor::ReadSpectralFile(nxtest::ChartPath(), {}, &file, &error)) << error;
     const nxcolor::SpectraTable embedded = ParseSpectraCsv(nxcolor::EmbeddedChart(), "chart");
     ASSERT_EQ(file.rows.size(), 24u);
     ASSERT_EQ(embedded.rows.size(), 24u);
@@ -244,7 +244,7 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
     // And the library's reader gives the same spectra and ids back.
     nxbase::SpectraTable back;
     std::string error;
-    ASSERT_TRUE(nxbase::ReadSpectraFile(written, {}, &back, &error)) << error;
+    ASSERT_TRUE(nxbase::ReadSpectralFile(written, {}, &back, &error)) << error;
     const auto chart = ParseSpectraCsv(nxcolor::EmbeddedChart(), "chart");
     ASSERT_EQ(back.rows.size(), 24u);
     for (std::size_t i = 0; i < 24; ++i) {
@@ -256,7 +256,7 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
     // computes the same XYZ from its spectra; the library reads it back.
     const std::string ti3 = dir.File("argyll.ti3");
     ASSERT_EQ(RunNxcolor("-f ti3 -i D65 > " + ti3 + "; cat " + ti3, &out, &err), 0) << err;
-    ASSERT_TRUE(ReadSpectraFile(ti3, {}, &back, &error)) << error;
+    ASSERT_TRUE(ReadSpectralFile(ti3, {}, &back, &error)) << error;
     ASSERT_EQ(back.rows.size(), 24u);
     EXPECT_TRUE(back.scaleNote.empty()) << "a CTI3 file states its scale";
     for (std::size_t i = 0; i < 24; ++i) {

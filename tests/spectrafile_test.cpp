@@ -38,7 +38,7 @@ std::string Header(int first = 380, int last = 730, int step = 10, const char* p
 SpectraTable Chart() {
     SpectraTable table;
     std::string error;
-    EXPECT_TRUE(nxbase::ReadSpectraFile(nxtest::ChartPath(), {}, &table, &error)) << error;
+    EXPECT_TRUE(nxbase::ReadSpectralFile(nxtest::ChartPath(), {}, &table, &error)) << error;
     return table;
 }
 
@@ -150,7 +150,7 @@ TEST(SpectraFile, LargeGridFilesAgreeWithTheTenNanometreChart) {
         SpectraTable table;
         std::string error;
         const std::string path = std::string(NXBASE_TEST_DATA_DIR) + "/spectra/" + name;
-        ASSERT_TRUE(nxbase::ReadSpectraFile(path, {}, &table, &error)) << error;
+        ASSERT_TRUE(nxbase::ReadSpectralFile(path, {}, &table, &error)) << error;
         ASSERT_TRUE(table.errors.empty()) << table.errors[0];
         ASSERT_EQ(table.rows.size(), 24u) << name;
         EXPECT_EQ(table.percent, std::string(name).find("percent") != std::string::npos) << name;

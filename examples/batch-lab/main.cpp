@@ -20,7 +20,7 @@ namespace {
 // Reads a file onto the 36-point grid; false (with the reason printed) when it cannot.
 bool Read(const char* path, nxbase::SpectraTable& table) {
     std::string error;
-    if (!nxbase::ReadSpectraFile(path, {}, &table, &error)) {
+    if (!nxbase::ReadSpectralFile(path, {}, &table, &error)) {
         std::fprintf(stderr, "%s: %s\n", path, error.c_str());
         return false;
     }

@@ -191,7 +191,7 @@ void MeasureWindow::ShowMeasured() {
 bool MeasureWindow::LoadReference(const std::string& path) {
     nxbase::SpectraTable table;
     std::string error;
-    if (!nxbase::ReadSpectraFile(path, {}, &table, &error) || table.rows.empty()) {
+    if (!nxbase::ReadSpectralFile(path, {}, &table, &error) || table.rows.empty()) {
         SetStatus(QStringLiteral("Reference not read: ") +
                   QString::fromStdString(error.empty() ? "no spectra" : error));
         return false;

@@ -180,9 +180,9 @@ NXBASE_EXPORT SpectraTable ParseSpectraCsv(std::string_view text, const std::str
                                            const SpectralReadOptions& axOptions = {});
 NXBASE_EXPORT SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
                                              const SpectralReadOptions& axOptions = {});
-// As ReadSpectralFile, onto the 36-point grid.
-NXBASE_EXPORT bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
-                                   SpectraTable* pTable, std::string* pError);
+// ReadSpectralFile onto the 36-point grid: the set read, then ToStandardGrid.
+NXBASE_EXPORT bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
+                                    SpectraTable* pTable, std::string* pError);
 
 }  // namespace nxbase
 

@@ -412,7 +412,7 @@ SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
     return ToStandardGrid(detail::ReadCgatsText(text, source, axOptions));
 }
 
-bool ReadSpectraFile(const std::string& path, const SpectralReadOptions& axOptions,
+bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
                      SpectraTable* pTable, std::string* pError) {
     SpectralSet set;
     const bool read = ReadSpectralFile(path, axOptions, &set, pError);

@@ -282,7 +282,7 @@ int main(int argc, char** argv) {
     std::string error;
     if (chartFile.empty()) {
         chart = nxcolor::ParseSpectra(nxcolor::EmbeddedChart(), nxcolor::EmbeddedChartName());
-    } else if (!nxcolor::ReadSpectraFile(chartFile, {}, &chart, &error)) {
+    } else if (!nxcolor::ReadSpectralFile(chartFile, {}, &chart, &error)) {
         std::cerr << "lumaserver: " << error << "\n";
         return kExitUsage;
     }

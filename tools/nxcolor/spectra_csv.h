@@ -18,7 +18,7 @@ using nxbase::LooksLikeCgats;
 using nxbase::ParseSpectra;
 using nxbase::ParseSpectraCgats;
 using nxbase::ParseSpectraCsv;
-using nxbase::ReadSpectraFile;
+using nxbase::ReadSpectralFile;
 using nxbase::SpectraTable;
 using nxbase::SpectrumRow;
 
