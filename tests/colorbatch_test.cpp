@@ -4,7 +4,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <random>
+#include <string>
 #include <vector>
 
 #include "color_test_util.h"
@@ -129,6 +131,48 @@ TEST(ColorBatch, HandlesEveryTailLengthAndWritesNothingBeyond) {
         }
         for (int i = 0; i < 3; ++i) EXPECT_EQ(out[3 * count + i], -999.0f) << "count " << count;
     }
+}
+
+// Every instruction set the machine has against the baseline kernels, bit
+// for bit, on random spectra and counts (float and double input, XYZ, Lab
+// and the cube root).
+TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBits) {
+    using nxbase::detail::BatchIsa;
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<float> value(-0.1f, 1.5f);
+    const BatchIsa chosen = nxbase::detail::BatchIsaInUse();
+    const ColorBatch batch;
+    for (int round = 0; round < 40; ++round) {
+        const std::size_t count = random() % 300;
+        std::vector<double> doubles(36 * count);
+        for (double& v : doubles) v = value(random) * (random() % 9 == 0 ? 0.003 : 1.0);
+        const std::vector<float> floats(doubles.begin(), doubles.end());
+        auto results = [&] {
+            std::vector<float> all(15 * count), part(3 * count);
+            batch.ToXYZ(floats.data(), count, part.data());
+            std::copy(part.begin(), part.end(), all.begin());
+            batch.ToLab(floats.data(), count, part.data());
+            std::copy(part.begin(), part.end(), all.begin() + 3 * count);
+            batch.ToXYZ(doubles.data(), count, part.data());
+            std::copy(part.begin(), part.end(), all.begin() + 6 * count);
+            batch.ToLab(doubles.data(), count, part.data());
+            std::copy(part.begin(), part.end(), all.begin() + 9 * count);
+            nxbase::detail::BatchCbrt(floats.data(), 3 * count, all.data() + 12 * count);
+            return all;
+        };
+        ASSERT_TRUE(nxbase::detail::UseBatchIsa(BatchIsa::kBaseline));
+        const std::vector<float> baseline = results();
+        for (BatchIsa isa : {BatchIsa::kAvx2, BatchIsa::kAvx512}) {
+            if (!nxbase::detail::UseBatchIsa(isa)) continue;
+            const std::vector<float> wider = results();
+            // Compared as bits: NaN from a negative cube root is NaN in both.
+            ASSERT_EQ(std::memcmp(wider.data(), baseline.data(), sizeof(float) * wider.size()), 0)
+                << "instruction set " << static_cast<int>(isa) << ", " << count << " spectra";
+        }
+    }
+    nxbase::detail::UseBatchIsa(chosen);
 }
 
 TEST(ColorBatch, ThreadSplitGivesTheSameResults) {

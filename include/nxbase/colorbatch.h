@@ -119,6 +119,12 @@ namespace detail {
 // The batch cube root: pOut[i] = t^(1/3) for positive normal pIn[i], to a few
 // units in the last place. Exposed for the tests.
 NXBASE_EXPORT void BatchCbrt(const float* pIn, std::size_t alCount, float* pOut);
+// The instruction sets the kernels are built for. The fastest the machine
+// has is used; UseBatchIsa switches (false when the machine lacks it), for
+// the tests only: never while a conversion runs.
+enum class BatchIsa { kBaseline, kAvx2, kAvx512 };
+NXBASE_EXPORT bool UseBatchIsa(BatchIsa isa);
+NXBASE_EXPORT BatchIsa BatchIsaInUse();
 }  // namespace detail
 
 }  // namespace nxbase

@@ -1,0 +1,45 @@
+// Internal: the entry points of the batch kernels, one set per instruction
+// set, each built in a file of its own with that set's flags (see
+// CMakeLists.txt); colorbatch.cpp picks one. What the kernels share is in
+// colorbatch_simd.h.
+#ifndef NXBASE_SOURCE_COLOR_COLORBATCH_KERNELS_H_
+#define NXBASE_SOURCE_COLOR_COLORBATCH_KERNELS_H_
+
+#include <cstddef>
+
+#include "nxbase/colorbatch.h"
+
+namespace nxbase::batch {
+
+using PaddedWeights = detail::BatchTables;
+using Kernel = void (*)(const PaddedWeights& w, const float* src, std::size_t count, float* out);
+using DoubleKernel = void (*)(const PaddedWeights& w, const double* src, std::size_t count,
+                              float* out);
+
+// Eight spectra per step, any count.
+struct NarrowKernels {
+    Kernel xyz;
+    Kernel lab;
+    void (*cbrt)(const float* in, std::size_t count, float* out);
+};
+// Sixteen spectra per step; count a multiple of sixteen.
+struct WideKernels {
+    Kernel xyz;
+    Kernel lab;
+    DoubleKernel xyzDouble;
+    DoubleKernel labDouble;
+};
+
+// colorbatch_baseline.cpp: the compiler's default target.
+NarrowKernels BaselineKernels();
+// colorbatch_avx2.cpp (x86-64-v3) and colorbatch_avx512.cpp (AVX-512 F, DQ,
+// VL): built on x86-64 with GCC only.
+NarrowKernels Avx2Kernels();
+WideKernels Avx512Kernels();
+
+constexpr int kSamples = BatchWeights::kSamples;
+constexpr int kLanes = 8;
+
+}  // namespace nxbase::batch
+
+#endif  // NXBASE_SOURCE_COLOR_COLORBATCH_KERNELS_H_

@@ -1,0 +1,264 @@
+// Internal: what every batch kernel file shares. Each kernel file is compiled
+// with its own instruction-set flags and gets its own copy of what is here:
+// everything is in an unnamed namespace, so that no copy built for a wider
+// instruction set can stand in for another file's. The kernel files define
+// nothing else the linker could share between files (a test checks their
+// symbols).
+#ifndef NXBASE_SOURCE_COLOR_COLORBATCH_SIMD_H_
+#define NXBASE_SOURCE_COLOR_COLORBATCH_SIMD_H_
+
+#include <cstdint>
+#include <cstring>
+
+#include "colorbatch_kernels.h"
+#include "tristimulus.h"
+
+namespace nxbase::batch {
+namespace {
+
+static_assert(detail::BatchTables::kChunks * kLanes - 4 == kSamples,
+              "five chunks, the last overlapping");
+
+typedef float V8 __attribute__((vector_size(kLanes * sizeof(float))));
+typedef std::int32_t I8 __attribute__((vector_size(kLanes * sizeof(std::int32_t))));
+typedef float V16 __attribute__((vector_size(16 * sizeof(float))));
+typedef std::int32_t I16 __attribute__((vector_size(16 * sizeof(std::int32_t))));
+
+// The integer vector of the same width as a float vector.
+template <class V>
+struct IntOf;
+template <>
+struct IntOf<V8> {
+    using type = I8;
+};
+template <>
+struct IntOf<V16> {
+    using type = I16;
+};
+
+using detail::kLabEpsilon;
+using detail::kLabKappa;
+using detail::kLabOffset;
+
+// The helpers are forced inline so that each kernel is one function of its
+// file's instruction set.
+template <class V = V8>
+[[gnu::always_inline]] inline V Splat(float v) {
+    return V{} + v;
+}
+
+[[gnu::always_inline]] inline V8 Load(const float* p) {
+    V8 v;
+    std::memcpy(&v, p, sizeof v);
+    return v;
+}
+
+[[gnu::always_inline]] inline void Store(float* p, V8 v) {
+    std::memcpy(p, &v, sizeof v);
+}
+
+// Cube root of positive normal floats: an exponent-thirding first guess
+// (relative error below 4%) refined by two Halley steps (cubic convergence:
+// 4e-2 -> 2e-5 -> below float resolution). Zero, negative and non-finite
+// lanes give meaningless values that callers mask out. (Newton steps on the
+// inverse cube root avoid the divisions but measure slower here.)
+template <class V>
+[[gnu::always_inline]] inline V CbrtV(V t) {
+    using I = typename IntOf<V>::type;
+    I bits;
+    std::memcpy(&bits, &t, sizeof bits);
+    // bits/3 + magic, with the division done in float (exact enough for a guess).
+    const V third = __builtin_convertvector(bits, V) * Splat<V>(1.0f / 3.0f);
+    I guessBits = __builtin_convertvector(third, I) + 0x2a5137a0;
+    V y;
+    std::memcpy(&y, &guessBits, sizeof y);
+    for (int i = 0; i < 2; ++i) {
+        // Halley written as a correction, so that its rounding stays small.
+        const V y3 = y * y * y;
+        y = y + y * (t - y3) / (y3 + y3 + t);
+    }
+    return y;
+}
+
+// f(t) of CIELAB: t^(1/3) above kLabEpsilon, 7.787 t + 16/116 at or below.
+template <class V>
+[[gnu::always_inline]] inline V LabF(V t) {
+    using I = typename IntOf<V>::type;
+    const I cube = t > Splat<V>(kLabEpsilon);  // all ones where the cube root applies
+    const V root = CbrtV(t);
+    const V linear = Splat<V>(kLabKappa) * t + Splat<V>(kLabOffset);
+    I rootBits;
+    I linearBits;
+    std::memcpy(&rootBits, &root, sizeof rootBits);
+    std::memcpy(&linearBits, &linear, sizeof linearBits);
+    const I mixed = (rootBits & cube) | (linearBits & ~cube);
+    V out;
+    std::memcpy(&out, &mixed, sizeof out);
+    return out;
+}
+
+// Lane s of the result is the sum of the eight lanes of p[s]: a pairwise
+// tree of shuffles and adds (14 shuffles, 7 adds for 64 numbers).
+[[gnu::always_inline]] inline V8 SumLanes(const float (*p)[kLanes]) {
+    V8 q[4];
+    for (int i = 0; i < 4; ++i) {
+        const V8 a = Load(p[2 * i]);
+        const V8 b = Load(p[2 * i + 1]);
+        q[i] = __builtin_shufflevector(a, b, 0, 8, 2, 10, 4, 12, 6, 14) +
+               __builtin_shufflevector(a, b, 1, 9, 3, 11, 5, 13, 7, 15);
+    }
+    V8 h[2];
+    for (int i = 0; i < 2; ++i) {
+        const V8 a = q[2 * i];
+        const V8 b = q[2 * i + 1];
+        h[i] = __builtin_shufflevector(a, b, 0, 1, 8, 9, 4, 5, 12, 13) +
+               __builtin_shufflevector(a, b, 2, 3, 10, 11, 6, 7, 14, 15);
+    }
+    return __builtin_shufflevector(h[0], h[1], 0, 1, 2, 3, 8, 9, 10, 11) +
+           __builtin_shufflevector(h[0], h[1], 4, 5, 6, 7, 12, 13, 14, 15);
+}
+
+// Weighted sums of eight spectra (src holds 8 x 36 floats). Each spectrum is
+// read as five 8-float chunks (the last at offset 28, overlapping the fourth,
+// whose first four weights are zero in the padded table) and multiplied with
+// the weights laid out the same way; the eight partial sums per channel are
+// then reduced across lanes for all eight spectra at once. The order of the
+// operations is the one detail::LaneSums spells out for a single spectrum.
+[[gnu::always_inline]] inline void SumBlock(const PaddedWeights& w, const float* src, V8 sums[3]) {
+    alignas(32) float part[3][kLanes][kLanes];
+    for (int s = 0; s < kLanes; ++s) {
+        const float* r = src + s * kSamples;
+        const V8 r0 = Load(r);
+        const V8 r1 = Load(r + 8);
+        const V8 r2 = Load(r + 16);
+        const V8 r3 = Load(r + 24);
+        const V8 r4 = Load(r + 28);
+        for (int c = 0; c < 3; ++c) {
+            const V8 acc = (r0 * Load(w.chunks[c][0]) + r1 * Load(w.chunks[c][1])) +
+                           (r2 * Load(w.chunks[c][2]) + r3 * Load(w.chunks[c][3])) +
+                           r4 * Load(w.chunks[c][4]);
+            Store(part[c][s], acc);
+        }
+    }
+    for (int c = 0; c < 3; ++c) sums[c] = SumLanes(part[c]);
+}
+
+// XYZ from the weighted sums, in place: 100 * S / sum_1, as XYZVector.
+template <class V>
+[[gnu::always_inline]] inline void XyzOfSums(const PaddedWeights& w, V v[3]) {
+    const V sumY = Splat<V>(w.sumY);
+    for (int c = 0; c < 3; ++c) v[c] = v[c] / sumY * Splat<V>(100.0f);
+}
+
+// Lab from the weighted sums, in place: t = S / sum_c, which LABVector gets
+// through XYZ as X * sum_1 / sum_c / 100; taken as one multiplication by
+// 1 / sum_c instead of a division and two multiplications.
+template <class V>
+[[gnu::always_inline]] inline void LabOfSums(const PaddedWeights& w, V v[3]) {
+    V f[3];
+    for (int c = 0; c < 3; ++c) f[c] = LabF(v[c] * Splat<V>(w.inverseSums[c]));
+    v[0] = Splat<V>(116.0f) * f[1] - Splat<V>(16.0f);
+    v[1] = Splat<V>(500.0f) * (f[0] - f[1]);
+    v[2] = Splat<V>(200.0f) * (f[1] - f[2]);
+}
+
+[[gnu::always_inline]] inline void XyzBlock(const PaddedWeights& w, const float* src, V8 xyz[3]) {
+    SumBlock(w, src, xyz);
+    XyzOfSums(w, xyz);
+}
+
+[[gnu::always_inline]] inline void LabBlock(const PaddedWeights& w, const float* src, V8 lab[3]) {
+    SumBlock(w, src, lab);
+    LabOfSums(w, lab);
+}
+
+// Eight (x, y, z) triples from three channel vectors into 24 floats in
+// memory order: two two-input shuffles per output vector.
+// (Streaming the stores past the cache measured no faster for results far
+// larger than the cache: the input dominates the memory traffic.)
+[[gnu::always_inline]] inline void InterleaveVectors(const V8 v[3], V8 o[3]) {
+    const V8 t0 =
+        __builtin_shufflevector(v[0], v[1], 0, 8, 0, 1, 9, 1, 2, 10);  // x0 y0 . x1 y1 . x2 y2
+    o[0] = __builtin_shufflevector(t0, v[2], 0, 1, 8, 3, 4, 9, 6, 7);  // z0, z1 in
+    const V8 t1 =
+        __builtin_shufflevector(v[0], v[1], 2, 3, 11, 3, 4, 12, 4, 5);    // . x3 y3 . x4 y4 . x5
+    o[1] = __builtin_shufflevector(t1, v[2], 10, 1, 2, 11, 4, 5, 12, 7);  // z2, z3, z4 in
+    const V8 t2 =
+        __builtin_shufflevector(v[0], v[1], 13, 5, 6, 14, 6, 7, 15, 7);   // y5 . x6 y6 . x7 y7 .
+    o[2] = __builtin_shufflevector(t2, v[2], 0, 13, 2, 3, 14, 5, 6, 15);  // z5, z6, z7 in
+}
+
+[[gnu::always_inline]] inline void InterleaveFull(const V8 v[3], float* out) {
+    V8 o[3];
+    InterleaveVectors(v, o);
+    for (int k = 0; k < 3; ++k) Store(out + 8 * k, o[k]);
+}
+
+[[gnu::always_inline]] inline void Interleave(const V8 v[3], float* out, int lanes) {
+    if (lanes == kLanes) {
+        InterleaveFull(v, out);
+        return;
+    }
+    alignas(32) float lane[3][kLanes];
+    for (int c = 0; c < 3; ++c) Store(lane[c], v[c]);
+    for (int s = 0; s < lanes; ++s) {
+        for (int c = 0; c < 3; ++c) out[3 * s + c] = lane[c][s];
+    }
+}
+
+template <bool kLab>
+[[gnu::always_inline]] inline void RunBlocks(const PaddedWeights& w, const float* src,
+                                             std::size_t count, float* out) {
+    V8 v[3];
+    std::size_t i = 0;
+    for (; i + kLanes <= count; i += kLanes) {
+        if (kLab) {
+            LabBlock(w, src + i * kSamples, v);
+        } else {
+            XyzBlock(w, src + i * kSamples, v);
+        }
+        Interleave(v, out + 3 * i, kLanes);
+    }
+    if (i < count) {
+        // The tail goes through a zero-padded block.
+        alignas(32) float block[kLanes * kSamples] = {};
+        const int rest = static_cast<int>(count - i);
+        std::memcpy(block, src + i * kSamples, sizeof(float) * kSamples * rest);
+        if (kLab) {
+            LabBlock(w, block, v);
+        } else {
+            XyzBlock(w, block, v);
+        }
+        Interleave(v, out + 3 * i, rest);
+    }
+}
+
+void RunXyz(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+    RunBlocks<false>(w, src, count, out);
+}
+
+void RunLab(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+    RunBlocks<true>(w, src, count, out);
+}
+
+inline void RunCbrt(const float* in, std::size_t count, float* out) {
+    std::size_t i = 0;
+    for (; i + kLanes <= count; i += kLanes) Store(out + i, CbrtV(Load(in + i)));
+    if (i < count) {
+        alignas(32) float block[kLanes];
+        for (int s = 0; s < kLanes; ++s) block[s] = 1.0f;
+        std::memcpy(block, in + i, sizeof(float) * (count - i));
+        Store(block, CbrtV(Load(block)));
+        std::memcpy(out + i, block, sizeof(float) * (count - i));
+    }
+}
+
+// This file's eight-lane kernels.
+[[maybe_unused]] NarrowKernels ThisFilesNarrowKernels() {
+    return {&RunXyz, &RunLab, &RunCbrt};
+}
+
+}  // namespace
+}  // namespace nxbase::batch
+
+#endif  // NXBASE_SOURCE_COLOR_COLORBATCH_SIMD_H_
