@@ -506,7 +506,7 @@ TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathF
         nxbase::SpectraTable t;
         std::string error;
         nxbase::ReadSpectralFile(nxtest::ChartPath(), {nxbase::SpectralScale::kFraction}, &t,
-                                &error);
+                                 &error);
         return t;
     }();
     ASSERT_EQ(chart.rows.size(), 24u);

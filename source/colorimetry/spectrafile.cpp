@@ -413,7 +413,7 @@ SpectraTable ParseSpectraCgats(std::string_view text, const std::string& source,
 }
 
 bool ReadSpectralFile(const std::string& path, const SpectralReadOptions& axOptions,
-                     SpectraTable* pTable, std::string* pError) {
+                      SpectraTable* pTable, std::string* pError) {
     SpectralSet set;
     const bool read = ReadSpectralFile(path, axOptions, &set, pError);
     *pTable = ToStandardGrid(set);

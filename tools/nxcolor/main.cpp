@@ -308,7 +308,8 @@ bool ReadInput(const std::string& file, const Options& options, nxcolor::Spectra
         *table = nxcolor::ParseSpectraCsv(nxcolor::EmbeddedChart(), *source, chart);
     } else {
         *source = file == "-" ? "<stdin>" : file;
-        if (!nxcolor::ReadSpectralFile(file, options.read, table, &error) && table->errors.empty()) {
+        if (!nxcolor::ReadSpectralFile(file, options.read, table, &error) &&
+            table->errors.empty()) {
             std::cerr << "nxcolor: " << error << '\n';
             return false;
         }
