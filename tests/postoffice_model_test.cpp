@@ -15,6 +15,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstdio>
 #include <cstdlib>
 #include <map>
 #include <random>
@@ -75,6 +76,7 @@ class PostOfficeModelTest : public ::testing::Test {
   protected:
     void SetUp() override {
         sandbox.Env("NXBASE_PEER_NAMED_AFTER_FILE", "1");
+        sandbox.Env("NXBASE_PEER_DIES_WITH_PARENT", "1");
         sandbox.RegisterAbsentServer();
         for (int p = 0; p < kPeers; ++p) {
             std::string path = sandbox.CopyProgram(NXBASE_PIPE_PEER, "model" + std::to_string(p));
@@ -103,6 +105,9 @@ TEST_F(PostOfficeModelTest, EveryAnswerReachesTheRequestItBelongsTo) {
     const long steps =
         static_cast<long>(EnvNumber("NXBASE_MODEL_STEPS", nxtest::kSanitized ? 20000 : 100000));
     SCOPED_TRACE("NXBASE_MODEL_SEED=" + std::to_string(seed));
+    // At once, so that a run that hangs and is killed still names its seed.
+    std::printf("NXBASE_MODEL_SEED=%lu\n", seed);
+    std::fflush(stdout);
     std::mt19937_64 random(seed);
     auto chance = [&](double p) { return std::uniform_real_distribution<>(0, 1)(random) < p; };
     auto below = [&](int n) { return static_cast<int>(random() % static_cast<unsigned>(n)); };

@@ -249,10 +249,14 @@ void DDE::Arm() {
         pmBus->timer = std::make_unique<boost::asio::steady_timer>(context);
     }
     std::weak_ptr<bool> alive = amAlive;
+    // A handler already due when the bus is lost (or joined anew) runs after
+    // its wait was cancelled: it must find the connection it was armed for.
+    const Bus* armedFor = pmBus.get();
+    auto stillArmed = [this, alive, armedFor] { return alive.lock() && pmBus.get() == armedFor; };
     pmBus->waiting = true;
     pmBus->descriptor->async_wait(boost::asio::posix::stream_descriptor::wait_read,
-                                  [this, alive](const boost::system::error_code& error) {
-                                      if (!alive.lock() || error) return;
+                                  [this, stillArmed](const boost::system::error_code& error) {
+                                      if (error || !stillArmed()) return;
                                       pmBus->waiting = false;
                                       pmBus->timer->cancel();
                                       Process();
@@ -265,8 +269,8 @@ void DDE::Arm() {
         auto wait = std::chrono::microseconds(
             poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0);
         pmBus->timer->expires_after(wait);
-        pmBus->timer->async_wait([this, alive](const boost::system::error_code& error) {
-            if (!alive.lock() || error) return;
+        pmBus->timer->async_wait([this, stillArmed](const boost::system::error_code& error) {
+            if (error || !stillArmed()) return;
             pmBus->descriptor->cancel();
             pmBus->waiting = false;
             Process();

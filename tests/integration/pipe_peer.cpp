@@ -7,6 +7,8 @@
 // begins with "LATE" and a 4-byte little-endian count of milliseconds is
 // answered that much later; answers always leave in the order their
 // commands came, as a post office's handlers answer.
+#include <signal.h>
+#include <sys/prctl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -84,6 +86,9 @@ void Echo(VELTRAEvent& event) {
 int main(int argc, char** argv) {
     // Started by the transport, the arguments are "-S -LNG <code>": the name
     // is "EchoPeer", or the file's own with $NXBASE_PEER_NAMED_AFTER_FILE.
+    // A test that may crash asks its peers to go with it: orphans would keep
+    // the test runner waiting on their output.
+    if (std::getenv("NXBASE_PEER_DIES_WITH_PARENT")) ::prctl(PR_SET_PDEATHSIG, SIGKILL);
     std::string name = argc > 1 && argv[1][0] != '-' ? argv[1] : "EchoPeer";
     if (argc > 1 && argv[1][0] == '-' && std::getenv("NXBASE_PEER_NAMED_AFTER_FILE")) {
         name = argv[0];
