@@ -38,6 +38,7 @@ const char kUsage[] =
     "\n"
     "VALUEs are written into the data block in order:\n"
     "  b:5  one byte   s:49  a 16-bit short   i:-3  a 32-bit int\n"
+    "  (numbers decimal, or hexadecimal after 0x: b:0x1f)\n"
     "  str:text  a string (with its closing zero byte)   hex:0a0b  raw bytes\n"
     "\n"
     "  --as NAME        the sender's application name (default nxmsg)\n"
