@@ -3,7 +3,9 @@
 #include <lcms2.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdlib>
+#include <random>
 #include <regex>
 #include <string>
 
@@ -158,6 +160,78 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     EXPECT_FALSE(nxcolor::WriteSvgReport(report, MeasuringCondition(),
                                          dir.File("no/such/dir/x.svg"), &error));
     EXPECT_NE(error.find("cannot write"), std::string::npos);
+}
+
+// The spectral plot of random reports: a line piece per run of finite
+// values, every point inside the frame (nothing clipped, whatever the
+// range), a legend entry for the first 24 samples, and well-formed XML.
+TEST(NxcolorScreen, PlotDrawsEveryFiniteValueInsideItsFrame) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<float> unit(0.0f, 1.0f);
+    nxtest::TempDir dir;
+    const std::string svg = dir.File("plot.svg");
+    const bool python = std::system("python3 -c 'import xml.etree.ElementTree' 2>/dev/null") == 0;
+    for (int round = 0; round < 12; ++round) {
+        nxcolor::Report report;
+        report.source = round % 2 ? "lot <" + std::to_string(round) + ">" : "chart.csv";
+        report.illuminant = "D65";
+        report.observer = "10";
+        const std::size_t count = random() % 40;
+        const float scale = round % 3 == 0 ? 1.0f : round % 3 == 1 ? 3.0f : 250.0f;
+        std::size_t expectedPieces = 0;
+        for (std::size_t i = 0; i < count; ++i) {
+            nxcolor::ReportRow row;
+            row.id = "s" + std::to_string(i) + (i % 7 == 0 ? " & <x>" : "");
+            bool inPiece = false;
+            for (float& v : row.spectrum) {
+                const bool gap = random() % 30 == 0;
+                v = gap ? NAN : scale * unit(random) - (random() % 10 == 0 ? 0.2f : 0.0f);
+                if (!gap && !inPiece) ++expectedPieces;
+                inPiece = !gap;
+            }
+            report.rows.push_back(row);
+        }
+        std::string error;
+        ASSERT_TRUE(nxcolor::WriteSvgPlot(report, MeasuringCondition(), svg, &error)) << error;
+        const std::string text = nxtest::ReadFile(svg);
+        auto count_of = [&](const std::string& needle) {
+            std::size_t n = 0;
+            for (auto at = text.find(needle); at != std::string::npos;
+                 at = text.find(needle, at + 1))
+                ++n;
+            return n;
+        };
+        EXPECT_EQ(count_of("<g class=\"curve\""), count);
+        EXPECT_EQ(count_of("<polyline"), expectedPieces);
+        EXPECT_EQ(count_of("<g class=\"legend\""), std::min<std::size_t>(count, 24));
+        const std::regex frame(
+            "<rect x=\"(\\d+)\" y=\"(\\d+)\" width=\"(\\d+)\" height=\"(\\d+)\"");
+        std::smatch box;
+        ASSERT_TRUE(std::regex_search(text, box, frame));
+        const double left = std::stod(box[1]), top = std::stod(box[2]);
+        const double right = left + std::stod(box[3]), bottom = top + std::stod(box[4]);
+        const std::regex point("(-?[0-9.]+),(-?[0-9.]+)");
+        const std::regex points("points=\"([^\"]*)\"");
+        for (auto it = std::sregex_iterator(text.begin(), text.end(), points);
+             it != std::sregex_iterator(); ++it) {
+            const std::string list = (*it)[1];
+            for (auto p = std::sregex_iterator(list.begin(), list.end(), point);
+                 p != std::sregex_iterator(); ++p) {
+                const double x = std::stod((*p)[1]), y = std::stod((*p)[2]);
+                ASSERT_TRUE(x >= left && x <= right && y >= top - 0.05 && y <= bottom + 0.05)
+                    << x << "," << y << " outside the frame";
+            }
+        }
+        if (python) {
+            EXPECT_EQ(std::system(("python3 -c 'import sys, xml.etree.ElementTree as E; "
+                                   "E.parse(sys.argv[1])' " +
+                                   svg)
+                                      .c_str()),
+                      0);
+        }
+    }
 }
 
 }  // namespace

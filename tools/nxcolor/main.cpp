@@ -88,9 +88,11 @@ const char kUsage[] =
     "                          and hex, through the ICC display profile when one\n"
     "                          is configured (user configuration nxcolor.ini,\n"
     "                          group Settings: ICCProfile=1, ICCProfilePath=FILE)\n"
-    "      --icc-profile FILE  use this ICC display profile for --rgb and --report\n"
+    "      --icc-profile FILE  use this ICC display profile for --rgb, --report, --plot\n"
     "      --report FILE.svg   also draw the chart: a swatch per sample in its\n"
     "                          screen colour, with its id, Lab and reflectance curve\n"
+    "      --plot FILE.svg     also plot the spectral curves: reflectance against\n"
+    "                          wavelength, a line per sample in its screen colour\n"
     "      --measure N         measure N patches through the measuring-device\n"
     "                          server LumaServer (started from the registry when\n"
     "                          needed, locked for the run) instead of reading FILE\n"
@@ -137,6 +139,7 @@ struct Options {
     bool rgb = false;
     std::string iccProfile;
     std::string svgReport;
+    std::string svgPlot;
     bool listIlluminants = false;
     bool help = false;
     int measure = 0;  // patches to measure through LumaServer; 0: read a file
@@ -213,6 +216,9 @@ std::string ParseOptions(int argc, char** argv, Options* options) {
                 return arg + " needs a file";
         } else if (arg == "--report") {
             if (!take(&options->svgReport) || options->svgReport.empty())
+                return arg + " needs a file name";
+        } else if (arg == "--plot") {
+            if (!take(&options->svgPlot) || options->svgPlot.empty())
                 return arg + " needs a file name";
         } else if (arg == "--measure") {
             std::string text;
@@ -450,14 +456,15 @@ int Run(Options& options) {
     if (!options.density.empty()) quantities.push_back("density");
     // A CTI3 file carries the screen colours as its device values.
     if (options.rgb || options.format == "ti3") quantities.push_back("rgb");
-    if (options.rgb || options.format == "ti3" || !options.svgReport.empty()) {
+    if (options.rgb || options.format == "ti3" || !options.svgReport.empty() ||
+        !options.svgPlot.empty()) {
         const std::string warning = nxcolor::SetUpScreenColors(options.iccProfile);
         // A profile asked for on the command line that cannot be used is an
         // error; one from the configuration falls back to the formulas.
         if (!warning.empty() && !options.iccProfile.empty()) return UsageError(warning);
         if (!warning.empty()) std::cerr << "nxcolor: " << warning << '\n';
     } else if (!options.iccProfile.empty()) {
-        return UsageError("--icc-profile needs --rgb or --report");
+        return UsageError("--icc-profile needs --rgb, --report or --plot");
     }
     // A bar on stderr for large inputs, drawn only when stderr is a terminal.
     std::unique_ptr<nxbase::TerminalProgressListener> bar;
@@ -478,6 +485,14 @@ int Run(Options& options) {
             return kExitUsage;
         }
         std::cerr << "nxcolor: chart picture written to " << options.svgReport << '\n';
+    }
+    if (!options.svgPlot.empty()) {
+        std::string error;
+        if (!nxcolor::WriteSvgPlot(report, condition, options.svgPlot, &error)) {
+            std::cerr << "nxcolor: " << error << '\n';
+            return kExitUsage;
+        }
+        std::cerr << "nxcolor: spectral plot written to " << options.svgPlot << '\n';
     }
     writer->second(report, std::cout);
     std::cout.flush();

@@ -236,4 +236,161 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
     return true;
 }
 
+namespace {
+
+// Layout of the plot, in SVG user units (px).
+constexpr int kPlotLeft = 70;
+constexpr int kPlotTop = 64;
+constexpr int kPlotWidth = 640;
+constexpr int kPlotHeight2 = 360;
+constexpr int kLegendColumns = 4;
+constexpr int kLegendRowHeight = 18;
+
+// The reflectance axis: from min(0, lowest) to max(1, highest), on steps of
+// 0.1, 0.2, 0.5 or 1 so that it has at most twelve.
+struct Axis {
+    double low = 0.0;
+    double high = 1.0;
+    double step = 0.1;
+};
+
+Axis ReflectanceAxis(const std::vector<ReportRow>& rows, std::size_t count) {
+    double low = 0.0, high = 1.0;
+    for (std::size_t i = 0; i < count; ++i) {
+        for (float v : rows[i].spectrum) {
+            if (!std::isfinite(v)) continue;
+            low = std::min(low, static_cast<double>(v));
+            high = std::max(high, static_cast<double>(v));
+        }
+    }
+    Axis axis;
+    for (double step :
+         {0.1, 0.2, 0.5, 1.0, 2.0, 5.0, 10.0, 20.0, 50.0, 100.0, 1e3, 1e4, 1e5, 1e6}) {
+        axis.step = step;
+        axis.low = std::floor(low / step) * step;
+        axis.high = std::ceil(high / step) * step;
+        if ((axis.high - axis.low) / step <= 12.0) break;
+    }
+    return axis;
+}
+
+}  // namespace
+
+bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
+                  const std::string& path, std::string* error) {
+    const std::size_t count = std::min(report.rows.size(), kMaxSvgSamples);
+    const std::size_t legend = std::min(count, kMaxLegendSamples);
+    const int legendRows = static_cast<int>((legend + kLegendColumns - 1) / kLegendColumns);
+    const int width = kPlotLeft + kPlotWidth + 30;
+    const int bottom = kPlotTop + kPlotHeight2;
+    const int height = bottom + 56 + legendRows * kLegendRowHeight + 10;
+    const Axis axis = ReflectanceAxis(report.rows, count);
+    auto xOf = [](int sample) {
+        return kPlotLeft + kPlotWidth * sample / double(kSpectrumSize - 1);
+    };
+    auto yOf = [&](double r) {
+        return bottom - kPlotHeight2 * (r - axis.low) / (axis.high - axis.low);
+    };
+
+    std::ostringstream out;
+    out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
+        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\"" << height
+        << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
+        << "<style>\n"
+        << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; fill: #222; }\n"
+        << "  .title { font-size: 16px; font-weight: bold; }\n"
+        << "  .sub, .tick, .legend { font-size: 11px; }\n"
+        << "  .sub { fill: #555; }\n"
+        << "  .axis { font-size: 12px; }\n"
+        << "  .frame { fill: #fff; stroke: #888; stroke-width: 1; }\n"
+        << "  .grid { stroke: #e4e4e4; stroke-width: 1; }\n"
+        << "  .curve { fill: none; stroke-width: 1.6; stroke-linejoin: round; }\n"
+        << "</style>\n"
+        << "<rect width=\"100%\" height=\"100%\" fill=\"#f4f4f2\"/>\n";
+    std::string title = report.source + ": " + std::to_string(report.rows.size()) + " spectra";
+    if (count < report.rows.size()) title += ", the first " + std::to_string(count) + " drawn";
+    out << "<text x=\"" << kPlotLeft << "\" y=\"24\" class=\"title\">" << Escape(title)
+        << "</text>\n"
+        << "<text x=\"" << kPlotLeft
+        << "\" y=\"42\" class=\"sub\">lines in the screen colour under "
+        << "illuminant " << Escape(report.illuminant) << ", observer " << Escape(report.observer)
+        << "\xC2\xB0 (" << Escape(ScreenColorSource()) << ")</text>\n";
+    out << "<rect x=\"" << kPlotLeft << "\" y=\"" << kPlotTop << "\" width=\"" << kPlotWidth
+        << "\" height=\"" << kPlotHeight2 << "\" class=\"frame\"/>\n";
+    // Grid and ticks: every 50 nm from 400, every step of reflectance.
+    for (int nm = 400; nm <= 700; nm += 50) {
+        const std::string x = Num(xOf((nm - kFirstWavelength) / kWavelengthStep), 1);
+        out << "<line class=\"grid\" x1=\"" << x << "\" x2=\"" << x << "\" y1=\"" << kPlotTop
+            << "\" y2=\"" << bottom << "\"/>\n"
+            << "<text class=\"tick\" x=\"" << x << "\" y=\"" << bottom + 16
+            << "\" text-anchor=\"middle\">" << nm << "</text>\n";
+    }
+    const int ticks = static_cast<int>(std::lround((axis.high - axis.low) / axis.step));
+    const int decimals = axis.step < 1.0 ? 1 : 0;
+    for (int t = 0; t <= ticks; ++t) {
+        const double r = axis.low + t * axis.step;
+        const std::string y = Num(yOf(r), 1);
+        out << "<line class=\"grid\" x1=\"" << kPlotLeft << "\" x2=\"" << kPlotLeft + kPlotWidth
+            << "\" y1=\"" << y << "\" y2=\"" << y << "\"/>\n"
+            << "<text class=\"tick\" x=\"" << kPlotLeft - 6 << "\" y=\"" << y
+            << "\" dy=\"4\" text-anchor=\"end\">" << Num(r, decimals) << "</text>\n";
+    }
+    out << "<text class=\"axis\" x=\"" << kPlotLeft + kPlotWidth / 2 << "\" y=\"" << bottom + 34
+        << "\" text-anchor=\"middle\">Wavelength (nm)</text>\n"
+        << "<text class=\"axis\" transform=\"translate(18," << kPlotTop + kPlotHeight2 / 2
+        << ") rotate(-90)\" text-anchor=\"middle\">Reflectance</text>\n";
+    // One group per sample; a value that is not a number ends a line piece.
+    std::vector<std::string> colours(count);
+    for (std::size_t i = 0; i < count; ++i) {
+        const ReportRow& row = report.rows[i];
+        const bool finite = std::all_of(row.spectrum.begin(), row.spectrum.end(),
+                                        [](float v) { return std::isfinite(v); });
+        colours[i] =
+            finite ? CurveColour(ScreenColorOf(
+                         ReflectanceSpectrum(row.spectrum.data(), PhysicalConditions()), condition))
+                   : "#888888";
+        out << "<g class=\"curve\" stroke=\"" << colours[i] << "\"><title>" << Escape(row.id)
+            << "</title>";
+        std::string points;
+        auto flush = [&] {
+            if (!points.empty()) out << "<polyline points=\"" << points << "\"/>";
+            points.clear();
+        };
+        for (int k = 0; k < kSpectrumSize; ++k) {
+            if (!std::isfinite(row.spectrum[k])) {
+                flush();
+                continue;
+            }
+            points +=
+                (points.empty() ? "" : " ") + Num(xOf(k), 1) + "," + Num(yOf(row.spectrum[k]), 1);
+        }
+        flush();
+        out << "</g>\n";
+    }
+    // The legend, below the axis label.
+    const int legendTop = bottom + 56;
+    const int legendWidth = kPlotWidth / kLegendColumns;
+    for (std::size_t i = 0; i < legend; ++i) {
+        const int x = kPlotLeft + static_cast<int>(i % kLegendColumns) * legendWidth;
+        const int y = legendTop + static_cast<int>(i / kLegendColumns) * kLegendRowHeight;
+        out << "<g class=\"legend\"><line x1=\"" << x << "\" x2=\"" << x + 22 << "\" y1=\"" << y - 4
+            << "\" y2=\"" << y - 4 << "\" stroke=\"" << colours[i]
+            << "\" stroke-width=\"3\"/><text x=\"" << x + 28 << "\" y=\"" << y << "\">"
+            << Escape(Shortened(report.rows[i].id)) << "</text></g>\n";
+    }
+    if (count > legend) {
+        out << "<text class=\"sub\" x=\"" << kPlotLeft << "\" y=\"" << height - 6
+            << "\">legend: the first " << legend << " of " << count << "</text>\n";
+    }
+    out << "</svg>\n";
+
+    try {
+        nxbase::WriteWholeFile(path, out.str());
+    } catch (const std::exception& failure) {
+        *error = failure.what();
+        return false;
+    }
+    return true;
+}
+
 }  // namespace nxcolor

@@ -41,6 +41,17 @@ constexpr std::size_t kMaxSvgSamples = 2000;
 bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
                     const std::string& path, std::string* error);
 
+// Writes one SVG plot of the report's spectral curves: reflectance against
+// wavelength (380..730 nm), one line per sample in its screen colour, with a
+// grid, axis labels and a legend of the first kMaxLegendSamples samples. The
+// reflectance axis spans every finite value (fluorescent peaks above 1 and
+// values below 0 included): nothing is clipped. A value that is not a number
+// leaves a gap in its line, then grey. At most kMaxSvgSamples curves are drawn (the
+// title says so when there are more). Written as WriteSvgReport writes.
+constexpr std::size_t kMaxLegendSamples = 24;
+bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
+                  const std::string& path, std::string* error);
+
 }  // namespace nxcolor
 
 #endif  // NXCOLOR_SCREEN_H_
