@@ -151,7 +151,8 @@ class NXBASE_EXPORT Pipe {
     // For a send that waits on a timer instead of running a loop of its own
     // (an asynchronous send): IsReachable says, without waiting or starting
     // anything, whether a send to `asApp` would find it (an open channel, a
-    // listener, its topic on the bus). StartForLater starts it as Send would
+    // listener, its topic on the bus); a start of it still pending is then
+    // over. StartForLater starts it as Send would
     // (once, and never while another send's start of it lives) without the
     // wait: true with the process id to watch (-1 when an instance that is
     // coming up is waited for), false with GetLastError(). StartEnded says

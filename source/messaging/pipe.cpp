@@ -800,11 +800,14 @@ bool Pipe::StartAndAwait(const std::string& asApp, const std::function<bool()>& 
 }
 
 bool Pipe::IsReachable(const std::string& asApp) {
-    if (HasChannel(asApp) || OnDdeBus(asApp)) return true;
     // The lock is taken before the socket is bound: a peer holding it whose
     // socket is there listens, or is about to.
-    return amRefusal.empty() && nxbase::IsApplicationRunning(asApp) &&
-           toolkit::Sockets().SocketExists(nxbase::RequestSocketPath(asApp));
+    const bool reachable = HasChannel(asApp) || OnDdeBus(asApp) ||
+                           (amRefusal.empty() && nxbase::IsApplicationRunning(asApp) &&
+                            toolkit::Sockets().SocketExists(nxbase::RequestSocketPath(asApp)));
+    // Reachable, it is no longer being started (as after a wait for its start).
+    if (reachable) amStarting.erase(asApp);
+    return reachable;
 }
 
 bool Pipe::StartForLater(const std::string& asApp, int& alPid) {
