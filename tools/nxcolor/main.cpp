@@ -478,21 +478,20 @@ int Run(Options& options) {
     report.keepSpectra = options.keepSpectra;
     report.originator = std::string("nxcolor ") + nxbase::Version();
     for (const std::string& error : report.errors) std::cerr << "nxcolor: " << error << '\n';
-    if (!options.svgReport.empty()) {
+    using Picture = bool (*)(const nxcolor::Report&, const MeasuringCondition&, const std::string&,
+                             std::string*);
+    const std::pair<const std::string*, std::pair<Picture, const char*>> pictures[] = {
+        {&options.svgReport, {&nxcolor::WriteSvgReport, "chart picture"}},
+        {&options.svgPlot, {&nxcolor::WriteSvgPlot, "spectral plot"}},
+    };
+    for (const auto& [path, picture] : pictures) {
+        if (path->empty()) continue;
         std::string error;
-        if (!nxcolor::WriteSvgReport(report, condition, options.svgReport, &error)) {
+        if (!picture.first(report, condition, *path, &error)) {
             std::cerr << "nxcolor: " << error << '\n';
             return kExitUsage;
         }
-        std::cerr << "nxcolor: chart picture written to " << options.svgReport << '\n';
-    }
-    if (!options.svgPlot.empty()) {
-        std::string error;
-        if (!nxcolor::WriteSvgPlot(report, condition, options.svgPlot, &error)) {
-            std::cerr << "nxcolor: " << error << '\n';
-            return kExitUsage;
-        }
-        std::cerr << "nxcolor: spectral plot written to " << options.svgPlot << '\n';
+        std::cerr << "nxcolor: " << picture.second << " written to " << *path << '\n';
     }
     writer->second(report, std::cout);
     std::cout.flush();

@@ -98,6 +98,26 @@ std::string Shortened(const std::string& id) {
     return id.substr(0, cut) + "...";
 }
 
+// The XML declaration and the opening svg element of a picture.
+void Open(std::ostream& out, int width, int height) {
+    out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
+        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\"" << height
+        << "\" viewBox=\"0 0 " << width << " " << height << "\">\n";
+}
+
+// Closes the picture and makes it the file at `path` (beside it first, then
+// renamed); false with the reason on failure.
+bool CloseAndWrite(std::ostringstream& out, const std::string& path, std::string* error) {
+    out << "</svg>\n";
+    try {
+        nxbase::WriteWholeFile(path, out.str());
+    } catch (const std::exception& failure) {
+        *error = failure.what();
+        return false;
+    }
+    return true;
+}
+
 class ScopedLab {
   public:
     ScopedLab() : previous_(LABVector::GetColorSpaceType()) {
@@ -196,10 +216,8 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
     const int height = kTitleHeight + kMargin + std::max(rows, 1) * kCell;
 
     std::ostringstream out;
-    out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\"" << height
-        << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
-        << "<style>\n"
+    Open(out, width, height);
+    out << "<style>\n"
         << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; }\n"
         << "  .title, .sub, .id, .lab { fill: #222; }\n"
         << "  .title { font-size: 18px; font-weight: bold; }\n"
@@ -225,15 +243,7 @@ bool WriteSvgReport(const Report& report, const MeasuringCondition& condition,
         int y = kTitleHeight + kMargin + static_cast<int>(i / columns) * kCell;
         WriteCell(out, report.rows[i], condition, x, y);
     }
-    out << "</svg>\n";
-
-    try {
-        nxbase::WriteWholeFile(path, out.str());
-    } catch (const std::exception& failure) {
-        *error = failure.what();
-        return false;
-    }
-    return true;
+    return CloseAndWrite(out, path, error);
 }
 
 namespace {
@@ -293,10 +303,8 @@ bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
     };
 
     std::ostringstream out;
-    out << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-        << "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" << width << "\" height=\"" << height
-        << "\" viewBox=\"0 0 " << width << " " << height << "\">\n"
-        << "<style>\n"
+    Open(out, width, height);
+    out << "<style>\n"
         << "  text { font-family: 'DejaVu Sans', Verdana, sans-serif; fill: #222; }\n"
         << "  .title { font-size: 16px; font-weight: bold; }\n"
         << "  .sub, .tick, .legend { font-size: 11px; }\n"
@@ -382,15 +390,7 @@ bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
         out << "<text class=\"sub\" x=\"" << kPlotLeft << "\" y=\"" << height - 6
             << "\">legend: the first " << legend << " of " << count << "</text>\n";
     }
-    out << "</svg>\n";
-
-    try {
-        nxbase::WriteWholeFile(path, out.str());
-    } catch (const std::exception& failure) {
-        *error = failure.what();
-        return false;
-    }
-    return true;
+    return CloseAndWrite(out, path, error);
 }
 
 }  // namespace nxcolor
