@@ -310,7 +310,8 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
 // 10 nm, else brought onto the 36 points first.
 py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
                                    const std::string& illuminant, const py::object& observer,
-                                   const std::vector<double>& grid, const py::object& progress) {
+                                   const std::vector<double>& grid, const py::object& progress,
+                                   unsigned threads) {
     const FloatArray input = AsFloatRows(spectra, static_cast<py::ssize_t>(grid.size()), "spectra");
     const std::size_t count =
         static_cast<std::size_t>(input.size() / static_cast<py::ssize_t>(grid.size()));
@@ -321,16 +322,25 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
             py::gil_scoped_release unlocked;
             resampler.ResampleMany(input.data(), count, standard.mutable_data());
         }
-        return SpectraTo(quantity, standard, illuminant, observer, py::none(), progress);
+        return SpectraTo(quantity, standard, illuminant, observer, py::none(), progress,
+                         threads ? py::cast(threads) : py::none());
     }
     const auto fine = FineGridFor(illuminant, observer, grid);
     py::array_t<float> result(ResultShape(input, 3));
     float* out = result.mutable_data();
     const float* in = input.data();
     const std::size_t bands = grid.size();
+    // A spectrum costs in proportion to its values: a thread pays off from
+    // fewer of them than on the 36-point grid.
+    const std::size_t minPerThread = std::max<std::size_t>(64, kMinPerThread * kBands / bands);
     RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
-        quantity == Quantity::kXYZ ? fine->ToXYZ(in + begin * bands, end - begin, out + 3 * begin)
-                                   : fine->ToLab(in + begin * bands, end - begin, out + 3 * begin);
+        const std::size_t n = end - begin;
+        const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
+        nxbase::RunInParts(n, parts, minPerThread, 1, [&](std::size_t first, std::size_t many) {
+            const std::size_t at = begin + first;
+            quantity == Quantity::kXYZ ? fine->ToXYZ(in + at * bands, many, out + 3 * at)
+                                       : fine->ToLab(in + at * bands, many, out + 3 * at);
+        });
     });
     const long implausible = FirstImplausible(out, count, quantity);
     if (implausible >= 0) {
@@ -347,7 +357,7 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
     const unsigned threads = ThreadCount(threadsWanted);
     if (!wavelengths.is_none()) {
         return SpectraOnGridTo(quantity, spectra, illuminant, observer, GridOf(wavelengths),
-                               progress);
+                               progress, threads);
     }
     const SpectraRows input = AsSpectraRows(spectra);
     const auto batch = BatchFor(illuminant, observer);

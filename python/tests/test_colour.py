@@ -180,6 +180,14 @@ def test_differences_resampling_and_screen_colours():
     assert 0 < np.max(nxbase.delta_E(lab_fine, nxbase.spectra_to_Lab(standard))) < 0.25
     np.testing.assert_array_equal(nxbase.spectra_to_Lab(standard, wavelengths=np.arange(380, 731, 10.0)),
                                   nxbase.spectra_to_Lab(standard))
+    # Fine grids are split across threads too, with the same numbers; a
+    # thread pays off from fewer spectra than on the 36-point grid.
+    many = np.tile(fine, (800, 1))  # 19 200 spectra of 71 values: two parts or more
+    one = nxbase.spectra_to_Lab(many, wavelengths=grid, threads=1)
+    for threads in (2, 3, None):
+        np.testing.assert_array_equal(nxbase.spectra_to_XYZ(many, wavelengths=grid, threads=threads)[-24:],
+                                      xyz)
+        np.testing.assert_array_equal(nxbase.spectra_to_Lab(many, wavelengths=grid, threads=threads), one)
     rgb = nxbase.Lab_to_sRGB(np.array([[100, 0, 0], [0, 0, 0]], dtype=np.float32))
     assert rgb.shape == (2, 3) and rgb[0, 0] > 99 and rgb[1, 0] < 1
 
