@@ -106,11 +106,6 @@ bool SocketCalls::IsNameLocked(const std::string& lockPath) {
     return held;
 }
 
-bool SocketCalls::SocketExists(const std::string& path) {
-    struct stat status {};
-    return ::stat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
-}
-
 void SocketCalls::RemoveSocketFile(const std::string& path) {
     ::unlink(path.c_str());
 }

@@ -19,6 +19,7 @@
 #include "nxbase/mymemblo.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
+#include "toolkit/fileio.h"
 #include "toolkit/process.h"
 #include "toolkit/system.h"
 #include "toolkit/unixsocket.h"
@@ -800,11 +801,14 @@ bool Pipe::StartAndAwait(const std::string& asApp, const std::function<bool()>& 
 }
 
 bool Pipe::IsReachable(const std::string& asApp) {
-    // The lock is taken before the socket is bound: a peer holding it whose
-    // socket is there listens, or is about to.
-    const bool reachable = HasChannel(asApp) || OnDdeBus(asApp) ||
-                           (amRefusal.empty() && nxbase::IsApplicationRunning(asApp) &&
-                            toolkit::Sockets().SocketExists(nxbase::RequestSocketPath(asApp)));
+    // The cheap looks first; the bus is asked last. The lock is taken before
+    // the socket is bound: a peer holding it whose socket is there listens,
+    // or is about to.
+    const bool reachable =
+        HasChannel(asApp) ||
+        (amRefusal.empty() && nxbase::IsApplicationRunning(asApp) &&
+         toolkit::KindOf(nxbase::RequestSocketPath(asApp)) == toolkit::FileKind::kSocket) ||
+        OnDdeBus(asApp);
     // Reachable, it is no longer being started (as after a wait for its start).
     if (reachable) amStarting.erase(asApp);
     return reachable;

@@ -257,7 +257,8 @@ constexpr int kLegendColumns = 4;
 constexpr int kLegendRowHeight = 18;
 
 // The reflectance axis: from min(0, lowest) to max(1, highest), on steps of
-// 0.1, 0.2, 0.5 or 1 so that it has at most twelve.
+// 1, 2 or 5 times a power of ten, so that it has at most twelve, whatever
+// the range.
 struct Axis {
     double low = 0.0;
     double high = 1.0;
@@ -274,12 +275,12 @@ Axis ReflectanceAxis(const std::vector<ReportRow>& rows, std::size_t count) {
         }
     }
     Axis axis;
-    for (double step :
-         {0.1, 0.2, 0.5, 1.0, 2.0, 5.0, 10.0, 20.0, 50.0, 100.0, 1e3, 1e4, 1e5, 1e6}) {
-        axis.step = step;
-        axis.low = std::floor(low / step) * step;
-        axis.high = std::ceil(high / step) * step;
-        if ((axis.high - axis.low) / step <= 12.0) break;
+    const double power = std::pow(10.0, std::floor(std::log10((high - low) / 12.0)));
+    for (double factor : {1.0, 2.0, 5.0, 10.0, 20.0}) {
+        axis.step = factor * power;
+        axis.low = std::floor(low / axis.step) * axis.step;
+        axis.high = std::ceil(high / axis.step) * axis.step;
+        if ((axis.high - axis.low) / axis.step <= 12.0) break;
     }
     return axis;
 }
@@ -334,7 +335,8 @@ bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
             << "\" text-anchor=\"middle\">" << nm << "</text>\n";
     }
     const int ticks = static_cast<int>(std::lround((axis.high - axis.low) / axis.step));
-    const int decimals = axis.step < 1.0 ? 1 : 0;
+    // Enough decimals for the step (0.1 -> 1, 0.05 -> 2), none from 1 on.
+    const int decimals = std::max(0, static_cast<int>(std::ceil(-std::log10(axis.step) - 1e-9)));
     for (int t = 0; t <= ticks; ++t) {
         const double r = axis.low + t * axis.step;
         const std::string y = Num(yOf(r), 1);

@@ -37,8 +37,6 @@ class NXBASE_EXPORT SocketCalls {
     virtual int LockName(const std::string& lockPath, std::string& why);
     // Whether some process holds the lock of `lockPath`.
     virtual bool IsNameLocked(const std::string& lockPath);
-    // Whether a socket file is at `path` (bound; not necessarily listened on).
-    virtual bool SocketExists(const std::string& path);
     // Removes the socket file at `path` (a listener's, or one left behind).
     virtual void RemoveSocketFile(const std::string& path);
     // Lets only this user connect to the socket file at `path` (mode 0600).
