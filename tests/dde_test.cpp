@@ -226,4 +226,29 @@ TEST_F(DdeTest, APokeSpeaksOnlyForTheConnectionThatOwnsItsName) {
         office->SendAndReceive("LumaServer", GET_DEVICE_NAME, level, answer, [] { return true; }));
 }
 
+TEST_F(DdeTest, ALargePokeIsHeldAtMostTwiceByItsReceiver) {
+    ASSERT_EQ(std::system((server + " --dde-only &").c_str()), 0);
+    PostOffice* office = PostOffice::CreatePostOffice("Tester");
+    ASSERT_TRUE(
+        RunUntil([&] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }));
+    const std::string status =
+        "/proc/" + std::to_string(std::stol(Shell("pgrep -f " + server))) + "/status";
+    MyMemoryBlock small, answer;
+    auto ask = [&](MyMemoryBlock& request) {
+        return office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
+                                      [] { return true; });
+    };
+    ASSERT_TRUE(ask(small));
+    const long base = nxtest::ProcStatusField(status, "VmHWM");
+    constexpr long kBytes = 60L << 20;
+    MyMemoryBlock large(kBytes);
+    large.Put(std::string(kBytes, 'a').data(), kBytes);
+    ASSERT_TRUE(ask(large));
+    const long held = nxtest::ProcStatusField(status, "VmHWM") - base;
+    std::printf("a 60 MiB poke raised the receiver by %ld KiB\n", held);
+    if (!nxtest::kSanitized) {
+        EXPECT_LT(held, 2 * (kBytes >> 10) + 8 * 1024);
+    }
+}
+
 }  // namespace

@@ -1,10 +1,16 @@
-// The message catalogue, the byte stuffing and the application table.
+// The message catalogue, the byte stuffing (whole, in pieces, in a poke)
+// and the application table.
 #include "nxbase/msgcat.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
+#include <random>
+#include <string>
+#include <vector>
 
+#include "nxbase/dde.h"
 #include "nxbase/mymemblo.h"
 #include "nxbase/poapps.h"
 #include "nxbase/registry.h"
@@ -69,6 +75,58 @@ TEST(MessageCatalogue, ByteStuffingRemovesZeroBytesAndComesBack) {
         unsigned char value = 0;
         block >> value;
         ASSERT_EQ(value, byte);
+    }
+}
+
+// The decoding as a reader of the stuffing rules would write it, whole.
+std::string ModelDecode(const std::string& stuffed) {
+    std::string plain;
+    for (std::size_t i = 0; i < stuffed.size(); ++i) {
+        if (stuffed[i] != '\x01') {
+            plain += stuffed[i];
+        } else {
+            plain += i + 1 < stuffed.size() && stuffed[i + 1] == '\x0A' ? '\x00' : '\x01';
+            ++i;
+        }
+    }
+    return plain;
+}
+
+TEST(MessageCatalogue, StuffedDataDecodesAlikeInAnyPiecesAndAPokeSplitsAsAWhole) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    const char kTricky[] = {'\x00', '\x01', '\x0A', ':', 'a'};
+    for (int round = 0; round < 2000; ++round) {
+        std::string data(random() % 300, '\0');
+        for (char& c : data)
+            c = random() % 2 ? kTricky[random() % 5] : static_cast<char>(random() % 256);
+        // Random cuts, so that escapes and the ":" fall on the edges.
+        std::vector<std::size_t> cuts{0, data.size()};
+        for (unsigned n = random() % 6; n > 0; --n) cuts.push_back(random() % (data.size() + 1));
+        std::sort(cuts.begin(), cuts.end());
+        std::string decoded, work = data;
+        nxbase::StuffedDecoder decoder;
+        nxbase::PokeSplitter splitter(random() % 2 ? data.size() : 0);
+        std::string pieces = data;
+        for (std::size_t i = 1; i < cuts.size(); ++i) {
+            char* piece = work.data() + cuts[i - 1];
+            decoded.append(piece, decoder.Decode(piece, cuts[i] - cuts[i - 1]));
+            splitter.Take(pieces.data() + cuts[i - 1], cuts[i] - cuts[i - 1]);
+        }
+        if (decoder.EndsWithLoneEscape()) decoded += '\x01';
+        ASSERT_EQ(decoded, ModelDecode(data));
+        ASSERT_EQ(nxbase::DecodeBytes(data.data(), data.size()), decoded);
+        std::string plain = data.substr(0, random() % (data.size() + 1));
+        ASSERT_EQ(ModelDecode(nxbase::EncodeBytes(plain.data(), plain.size())), plain);
+
+        std::string sender;
+        MyMemoryBlock block;
+        splitter.Finish(sender, block);
+        const std::size_t colon = data.find(':');
+        ASSERT_EQ(sender, colon == std::string::npos ? "" : data.substr(0, colon));
+        ASSERT_EQ(std::string(block.GetDatenZeiger(), static_cast<std::size_t>(block.Len())),
+                  ModelDecode(colon == std::string::npos ? data : data.substr(colon + 1)));
     }
 }
 

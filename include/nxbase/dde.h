@@ -39,10 +39,14 @@
 #include <vector>
 
 #include "nxbase/export.h"
+#include "nxbase/msgcat.h"
 #include "nxbase/mymemblo.h"
 #include "nxbase/veltraevent.h"
 
 class PostOfficeApplications;
+namespace sdbus {
+class MethodCall;
+}
 
 namespace nxbase {
 inline constexpr const char* kDdeService = "VELTRAApplication";
@@ -56,10 +60,25 @@ NXBASE_EXPORT std::string DdeBusName(const std::string& asTopic);
 // and all of it is the block.
 NXBASE_EXPORT void SplitPoke(const std::string& asData, std::string& asSender,
                              MyMemoryBlock& axBlock);
-// The same on bytes of the caller's, decoded in place: the block is the only
-// copy of the data made.
-NXBASE_EXPORT void SplitPoke(char* pData, std::size_t alSize, std::string& asSender,
-                             MyMemoryBlock& axBlock);
+// The same on data that arrives in pieces, each decoded in place into the
+// block as it comes: the block is the only copy of the data made.
+class NXBASE_EXPORT PokeSplitter {
+  public:
+    explicit PokeSplitter(std::size_t alExpectedSize = 0);
+    void Take(char* pData, std::size_t alSize);
+    // The bytes before the first ":" so far, and whether the ":" has come.
+    const std::string& Sender() const { return amSender; }
+    bool SenderComplete() const { return amColonSeen; }
+    // After the last piece; the splitter is spent.
+    void Finish(std::string& asSender, MyMemoryBlock& axBlock);
+
+  private:
+    void Decode(char* pData, std::size_t alSize);
+    std::string amSender;
+    bool amColonSeen = false;
+    StuffedDecoder amDecoder;
+    MyMemoryBlock amBlock;
+};
 }  // namespace nxbase
 
 class NXBASE_EXPORT DDE {
@@ -125,7 +144,8 @@ class NXBASE_EXPORT DDE {
     void Process();
     bool Connect(const std::string& asTopic);
     bool SpeaksFor(const std::string& asClaimed);
-    void OnPoke(const std::string& asItem, std::vector<std::uint8_t>& axData);
+    bool TakePoke(sdbus::MethodCall& axCall, const std::string& asItem);
+    void Enqueue(VELTRAEvent&& axEvent);
 
     std::string amOwnName;
     std::unique_ptr<Bus> pmBus;

@@ -190,6 +190,19 @@ NXBASE_EXPORT std::string DecodeBytes(const char* pData, std::size_t alSize);
 // Decodes `alSize` bytes at `pData` in place (decoding never grows them);
 // returns the decoded length.
 NXBASE_EXPORT std::size_t DecodeInPlace(char* pData, std::size_t alSize);
+// The same on data that arrives in pieces, each decoded in place: a 0x01
+// that ends one piece pairs with the first byte of the next.
+class NXBASE_EXPORT StuffedDecoder {
+  public:
+    // Decodes a piece; returns its decoded length.
+    std::size_t Decode(char* pData, std::size_t alSize);
+    // After the last piece: true when it ended in a lone 0x01, which stands
+    // for itself.
+    bool EndsWithLoneEscape() const { return amEscaped; }
+
+  private:
+    bool amEscaped = false;
+};
 
 // The status byte that begins every answer block.
 enum AnswerStatus : signed char { kDone = 0, kRefused = 1, kNotSupported = 2 };

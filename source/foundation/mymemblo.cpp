@@ -1,6 +1,7 @@
 #include "nxbase/mymemblo.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <cstring>
 #include <functional>
 #include <istream>
@@ -16,12 +17,21 @@ namespace {
 constexpr std::int32_t kMaxCapacity = std::numeric_limits<std::int32_t>::max();
 constexpr int kWordBits = 64;
 
-// Array new that reports failure through the pointer check instead of
-// throwing std::bad_alloc.
+// The storage is malloc's, so that growing a large block can move its pages
+// (realloc) instead of holding the old and the new copy at once. A failure
+// is reported through the pointer check instead of std::bad_alloc.
 char* AllocateBytes(std::int32_t alCount) {
-    char* p = new (std::nothrow) char[static_cast<std::size_t>(std::max<std::int32_t>(alCount, 0))];
-    Check::POINTER(p, "mymemblo", __DATE__, __TIME__, __LINE__);
+    char* p = static_cast<char*>(std::malloc(static_cast<std::size_t>(std::max(alCount, 1))));
+    if (p == nullptr) Check::POINTER(nullptr, "mymemblo", __DATE__, __TIME__, __LINE__);
     return p;
+}
+
+// Resizes the storage, keeping its bytes; on failure `p` is left as it was.
+char* ResizeBytes(char* p, std::int32_t alCount) {
+    char* resized =
+        static_cast<char*>(std::realloc(p, static_cast<std::size_t>(std::max(alCount, 1))));
+    if (resized == nullptr) Check::POINTER(nullptr, "mymemblo", __DATE__, __TIME__, __LINE__);
+    return resized;
 }
 
 std::int32_t ClampCapacity(long alCapacity) {
@@ -177,7 +187,7 @@ MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     if (this == &axOther) return *this;
     // Allocate before freeing, so that a failed allocation leaves this block intact.
     char* fresh = AllocateBytes(axOther.capacity);
-    delete[] data;
+    std::free(data);
     data = fresh;
     capacity = axOther.capacity;
     length = 0;
@@ -193,7 +203,7 @@ MyMemoryBlock::MyMemoryBlock(MyMemoryBlock&& axOther) noexcept {
 
 MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
     if (this == &axOther) return *this;
-    delete[] data;
+    std::free(data);
     data = std::exchange(axOther.data, nullptr);
     getPointer = std::exchange(axOther.getPointer, nullptr);
     putPointer = std::exchange(axOther.putPointer, nullptr);
@@ -206,18 +216,18 @@ MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
 }
 
 MyMemoryBlock::~MyMemoryBlock() {
-    delete[] data;
+    std::free(data);
 }
 
 void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
-    char* fresh = AllocateBytes(alCapacity);
-    if (length > 0) std::memcpy(fresh, data, static_cast<std::size_t>(length));
-    getPointer = fresh + (getPointer - data);
-    putPointer = fresh + (putPointer - data);
-    rememberedRead = fresh + (rememberedRead - data);
-    rememberedWrite = fresh + (rememberedWrite - data);
-    delete[] data;
-    data = fresh;
+    // Positions as offsets: the old pointers are not to be used once moved.
+    const auto get = getPointer - data, put = putPointer - data;
+    const auto readMark = rememberedRead - data, writeMark = rememberedWrite - data;
+    data = ResizeBytes(data, alCapacity);
+    getPointer = data + get;
+    putPointer = data + put;
+    rememberedRead = data + readMark;
+    rememberedWrite = data + writeMark;
     capacity = alCapacity;
 }
 

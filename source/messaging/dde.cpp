@@ -1,14 +1,17 @@
 #include "nxbase/dde.h"
 
+#include <poll.h>  // the flags of the connection's poll data
 #include <sdbus-c++/sdbus-c++.h>
 
 #include <algorithm>
+#include <array>
 #include <boost/asio/posix/stream_descriptor.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
+#include <utility>
 
 #include "messaging_log.h"
 #include "nxbase/check.h"
@@ -35,19 +38,42 @@ std::string DdeBusName(const std::string& asTopic) {
     return kDdeBusPrefix + element;
 }
 
-void SplitPoke(char* pData, std::size_t alSize, std::string& asSender, MyMemoryBlock& axBlock) {
-    char* colon = static_cast<char*>(std::memchr(pData, ':', alSize));
-    asSender = colon == nullptr ? std::string() : std::string(pData, colon);
-    char* bytes = colon == nullptr ? pData : colon + 1;
-    const std::size_t size = DecodeInPlace(bytes, alSize - static_cast<std::size_t>(bytes - pData));
-    MyMemoryBlock block(static_cast<long>(size));
-    block.Put(bytes, static_cast<long>(size));
-    axBlock = std::move(block);
+PokeSplitter::PokeSplitter(std::size_t alExpectedSize)
+    : amBlock(static_cast<long>(std::min<std::size_t>(alExpectedSize, kMaxFrameLength))) {}
+
+void PokeSplitter::Take(char* pData, std::size_t alSize) {
+    if (!amColonSeen) {
+        const char* colon = static_cast<const char*>(std::memchr(pData, ':', alSize));
+        const std::size_t head =
+            colon == nullptr ? alSize : static_cast<std::size_t>(colon - pData);
+        amSender.append(pData, head);
+        if (colon == nullptr) return;
+        amColonSeen = true;
+        pData += head + 1;
+        alSize -= head + 1;
+    }
+    Decode(pData, alSize);
+}
+
+void PokeSplitter::Decode(char* pData, std::size_t alSize) {
+    amBlock.Put(pData, static_cast<long>(amDecoder.Decode(pData, alSize)));
+}
+
+void PokeSplitter::Finish(std::string& asSender, MyMemoryBlock& axBlock) {
+    if (!amColonSeen) {
+        Decode(amSender.data(), amSender.size());  // no sender: all of it is the block
+        amSender.clear();
+    }
+    if (amDecoder.EndsWithLoneEscape()) amBlock << '\x01';
+    asSender = std::move(amSender);
+    axBlock = std::move(amBlock);
 }
 
 void SplitPoke(const std::string& asData, std::string& asSender, MyMemoryBlock& axBlock) {
     std::string copy = asData;
-    SplitPoke(copy.data(), copy.size(), asSender, axBlock);
+    PokeSplitter splitter(copy.size());
+    splitter.Take(copy.data(), copy.size());
+    splitter.Finish(asSender, axBlock);
 }
 
 }  // namespace nxbase
@@ -109,7 +135,8 @@ struct DDE::Bus {
     std::string topics[2];
     std::unique_ptr<boost::asio::posix::stream_descriptor> descriptor;
     std::unique_ptr<boost::asio::steady_timer> timer;
-    bool waiting = false;
+    bool readWait = false;
+    bool writeWait = false;
     ~Bus() {
         if (descriptor) descriptor->release();  // the connection owns the descriptor
     }
@@ -173,16 +200,17 @@ DDE::Joined DDE::Join() {
             .implementedAs([](const std::string&, const std::string&) {
                 Log("DDE Callback function (DISCONNECT)");
             });
-        bus->object->registerMethod("Poke")
-            .onInterface(nxbase::kDdeInterface)
-            .implementedAs([this, ownTopic](const std::string& topic, const std::string& item,
-                                            std::vector<std::uint8_t> data) {
+        // Read by hand: the data goes from the bus message into the event's
+        // block piece by piece, never into a third copy.
+        bus->object->registerMethod(
+            nxbase::kDdeInterface, "Poke", "ssay", "b", [this, ownTopic](sdbus::MethodCall call) {
                 Log("DDE Callback function (POKE)");
-                if (!ownTopic(nxbase::kDdeService, topic)) return false;
-                std::string claimed(data.begin(), std::find(data.begin(), data.end(), ':'));
-                if (!SpeaksFor(claimed)) return false;
-                OnPoke(item, data);
-                return true;
+                std::string topic, item;
+                call >> topic >> item;
+                const bool taken = ownTopic(nxbase::kDdeService, topic) && TakePoke(call, item);
+                auto reply = call.createReply();
+                reply << taken;
+                reply.send();
             });
         bus->object->registerMethod("Execute")
             .onInterface(nxbase::kDdeInterface)
@@ -238,9 +266,11 @@ bool DDE::IsActive() const {
     return pmBus != nullptr;
 }
 
-// Waits on the loop for the connection's descriptor or its time-out.
+// Waits on the loop for what the connection needs next: its descriptor to
+// be readable, to be writable while a message is not yet all written (a
+// large poke leaves the bus in parts), or its time-out.
 void DDE::Arm() {
-    if (!pmBus || pmBus->waiting) return;
+    if (!pmBus) return;
     auto& context = Application::Get().GetContext();
     sdbus::IConnection::PollData poll = pmBus->connection->getEventLoopPollData();
     if (!pmBus->descriptor) {
@@ -253,29 +283,32 @@ void DDE::Arm() {
     // its wait was cancelled: it must find the connection it was armed for.
     const Bus* armedFor = pmBus.get();
     auto stillArmed = [this, alive, armedFor] { return alive.lock() && pmBus.get() == armedFor; };
-    pmBus->waiting = true;
-    pmBus->descriptor->async_wait(boost::asio::posix::stream_descriptor::wait_read,
-                                  [this, stillArmed](const boost::system::error_code& error) {
-                                      if (error || !stillArmed()) return;
-                                      pmBus->waiting = false;
-                                      pmBus->timer->cancel();
-                                      Process();
-                                  });
-    if (poll.timeout_usec != UINT64_MAX) {
-        timespec now{};
-        ::clock_gettime(CLOCK_MONOTONIC, &now);
-        std::uint64_t nowUsec = static_cast<std::uint64_t>(now.tv_sec) * 1000000u +
-                                static_cast<std::uint64_t>(now.tv_nsec) / 1000u;
-        auto wait = std::chrono::microseconds(
-            poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0);
-        pmBus->timer->expires_after(wait);
-        pmBus->timer->async_wait([this, stillArmed](const boost::system::error_code& error) {
-            if (error || !stillArmed()) return;
-            pmBus->descriptor->cancel();
-            pmBus->waiting = false;
-            Process();
-        });
+    using Wait = boost::asio::posix::stream_descriptor::wait_type;
+    auto awaitDescriptor = [&](Wait wait, bool Bus::*waiting) {
+        if (pmBus.get()->*waiting) return;
+        pmBus.get()->*waiting = true;
+        pmBus->descriptor->async_wait(
+            wait, [this, stillArmed, waiting](const boost::system::error_code& error) {
+                if (!stillArmed()) return;
+                pmBus.get()->*waiting = false;
+                if (!error) Process();
+            });
+    };
+    awaitDescriptor(Wait::wait_read, &Bus::readWait);
+    if (poll.events & POLLOUT) awaitDescriptor(Wait::wait_write, &Bus::writeWait);
+    if (poll.timeout_usec == UINT64_MAX) {
+        pmBus->timer->cancel();
+        return;
     }
+    timespec now{};
+    ::clock_gettime(CLOCK_MONOTONIC, &now);
+    std::uint64_t nowUsec = static_cast<std::uint64_t>(now.tv_sec) * 1000000u +
+                            static_cast<std::uint64_t>(now.tv_nsec) / 1000u;
+    pmBus->timer->expires_after(
+        std::chrono::microseconds(poll.timeout_usec > nowUsec ? poll.timeout_usec - nowUsec : 0));
+    pmBus->timer->async_wait([this, stillArmed](const boost::system::error_code& error) {
+        if (!error && stillArmed()) Process();
+    });
 }
 
 void DDE::Process() {
@@ -330,15 +363,10 @@ void DDE::TurnOff(const std::string& asWhy) {
     pmBus.reset();
 }
 
-// The data is decoded where the bus left it and copied once, into the block.
-void DDE::OnPoke(const std::string& asItem, std::vector<std::uint8_t>& axData) {
-    std::string sender;
-    MyMemoryBlock block;
-    nxbase::SplitPoke(reinterpret_cast<char*>(axData.data()), axData.size(), sender, block);
-    std::vector<std::uint8_t>().swap(axData);  // freed before the event waits in the queue
-    amEvents.emplace_back(std::move(sender), asItem, std::move(block));
-    // Handled once the bus dispatch has returned: a handler may wait for an
-    // answer, which needs the bus again.
+// Queues the poke's event; it is handled once the bus dispatch has returned:
+// a handler may wait for an answer, which needs the bus again.
+void DDE::Enqueue(VELTRAEvent&& axEvent) {
+    amEvents.push_back(std::move(axEvent));
     Log(Application::Get().IsInExecute() ? "DDE - PostUserEvent" : "DDE - ExecuteUserEvent");
     std::weak_ptr<bool> alive = amAlive;
     Application::Get().Post([alive] {
@@ -349,7 +377,7 @@ void DDE::OnPoke(const std::string& asItem, std::vector<std::uint8_t>& axData) {
 void DDE::UserEvent(unsigned long, void*) {
     if (pThis == nullptr || pThis->amEvents.empty()) return;
     Log("DDE - UserEvent (in Queue:" + std::to_string(pThis->amEvents.size()) + ")");
-    VELTRAEvent event = pThis->amEvents.front();
+    VELTRAEvent event = std::move(pThis->amEvents.front());
     pThis->amEvents.pop_front();
     NX_ASSERT_TEXT(pThis->fmReceiveFunction != 0, "pThis->pReceiveFunction != 0");
     if (pThis->fmReceiveFunction) pThis->fmReceiveFunction(event);
@@ -365,6 +393,32 @@ bool RefusePoke(const std::string& asSender, const std::string& asClaimed) {
 }
 
 }  // namespace
+
+// The poke's data, read from the message in pieces. It must name its sender
+// in its first bytes: no application's name is longer.
+bool DDE::TakePoke(sdbus::MethodCall& axCall, const std::string& asItem) {
+    constexpr std::size_t kLongestSender = 4096;
+    if (!axCall.enterContainer("y")) return false;
+    nxbase::PokeSplitter splitter;
+    std::array<char, 16 * 1024> piece;
+    std::size_t filled = 0;
+    for (std::uint8_t byte = 0; axCall >> byte;) {
+        piece[filled++] = static_cast<char>(byte);
+        if (filled < piece.size()) continue;
+        splitter.Take(piece.data(), std::exchange(filled, 0));
+        if (!splitter.SenderComplete() && splitter.Sender().size() > kLongestSender)
+            return RefusePoke(axCall.getSender(), "(no sender in its first 4096 bytes)");
+    }
+    axCall.clearFlags();
+    axCall.exitContainer();
+    splitter.Take(piece.data(), filled);
+    if (!SpeaksFor(splitter.Sender())) return false;
+    std::string sender;
+    MyMemoryBlock block;
+    splitter.Finish(sender, block);
+    Enqueue(VELTRAEvent(std::move(sender), asItem, std::move(block)));
+    return true;
+}
 
 // A poke speaks for the application it names only when it comes from the
 // connection that owns that application's bus name, of this user: a socket

@@ -232,17 +232,27 @@ std::string DecodeBytes(const char* pData, std::size_t alSize) {
     return out;
 }
 
-std::size_t DecodeInPlace(char* pData, std::size_t alSize) {
+std::size_t StuffedDecoder::Decode(char* pData, std::size_t alSize) {
     std::size_t out = 0;
     for (std::size_t i = 0; i < alSize; ++i) {
-        char c = pData[i];
-        if (c == '\x01') {
-            // A lone 0x01 at the end has no second byte and gives 0x01.
-            c = i + 1 < alSize && pData[i + 1] == '\x0A' ? '\x00' : '\x01';
-            if (i + 1 < alSize) ++i;
+        const char c = pData[i];
+        if (amEscaped) {
+            amEscaped = false;
+            pData[out++] = c == '\x0A' ? '\x00' : '\x01';
+        } else if (c == '\x01') {
+            amEscaped = true;
+        } else {
+            pData[out++] = c;
         }
-        pData[out++] = c;
     }
+    return out;
+}
+
+std::size_t DecodeInPlace(char* pData, std::size_t alSize) {
+    StuffedDecoder decoder;
+    std::size_t out = decoder.Decode(pData, alSize);
+    // The lone 0x01 gave no byte yet, so there is room for it.
+    if (decoder.EndsWithLoneEscape()) pData[out++] = '\x01';
     return out;
 }
 
