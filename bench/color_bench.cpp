@@ -8,7 +8,10 @@
 // - DRAM-resident (a fixed size beyond any cache of these machines): the
 //   batch path against one read of the same bytes with the same software
 //   prefetch (the memory-bandwidth bound), for float and double spectra, on
-//   one thread and on two.
+//   one thread and on two;
+// - fine grids (FineGridTristimulus at 1 nm, 471 values, and 5 nm, 95
+//   values, 360..830 nm): the same float bytes read as spectra of that
+//   length, against the same read, on one thread and on two.
 // One-thread cases run pinned to CPU 0, two-thread cases on CPUs 0 and 1.
 #include <benchmark/benchmark.h>
 
@@ -27,6 +30,8 @@
 #include "interleaved.h"
 #include "nxbase/colorbatch.h"
 #include "nxbase/colorvector.h"
+#include "nxbase/finegrid.h"
+#include "nxbase/meascond.h"
 
 namespace {
 
@@ -204,6 +209,31 @@ nxbench::Pair DramPair(const char* type, std::size_t count, unsigned threads) {
             [=](benchmark::State& s) { BatchLab<T>(s, count, threads); }};
 }
 
+// Lab of the DRAM-resident float bytes read as spectra of a fine grid.
+void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigned threads) {
+    std::vector<double> grid;
+    for (double nm = 360.0; nm <= 830.0 + 1e-9; nm += step) grid.push_back(nm);
+    static std::map<double, nxbase::FineGridTristimulus> made;
+    auto it = made.find(step);
+    if (it == made.end()) it = made.emplace(step, nxbase::FineGridTristimulus({}, grid)).first;
+    const nxbase::FineGridTristimulus& fine = it->second;
+    const std::size_t count = dram * kSamples / grid.size();
+    const float* spectra = Spectra<float>(dram).data();
+    float* lab = Results(count);
+    Timed(state, count, threads, [&] {
+        threads == 1 ? fine.ToLab(spectra, count, lab)
+                     : fine.ToLabParallel(spectra, count, lab, threads);
+    });
+}
+
+nxbench::Pair FinePair(double step, std::size_t dram, unsigned threads) {
+    const std::string name = std::string("FineGridLab_vs_ReadOnce_DramResident_") +
+                             (step == 1.0 ? "1nm_" : "5nm_") +
+                             (threads == 1 ? "OneThread" : "TwoThreads");
+    return {name, [=](benchmark::State& s) { ReadOnce<float>(s, dram, threads); },
+            [=](benchmark::State& s) { FineGridLab(s, step, dram, threads); }};
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -219,6 +249,10 @@ int main(int argc, char** argv) {
         DramPair<float>("float", dram, 2),
         DramPair<double>("double", dram, 1),
         DramPair<double>("double", dram, 2),
+        FinePair(1.0, dram, 1),
+        FinePair(1.0, dram, 2),
+        FinePair(5.0, dram, 1),
+        FinePair(5.0, dram, 2),
     };
     std::printf(
         "DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "

@@ -330,17 +330,12 @@ py::array_t<float> SpectraOnGridTo(Quantity quantity, const py::object& spectra,
     float* out = result.mutable_data();
     const float* in = input.data();
     const std::size_t bands = grid.size();
-    // A spectrum costs in proportion to its values: a thread pays off from
-    // fewer of them than on the 36-point grid.
-    const std::size_t minPerThread = std::max<std::size_t>(64, kMinPerThread * kBands / bands);
     RunWithProgress(count, progress, [&](std::size_t begin, std::size_t end) {
         const std::size_t n = end - begin;
         const unsigned parts = threads ? threads : (n >= kParallelFrom ? 0u : 1u);
-        nxbase::RunInParts(n, parts, minPerThread, 1, [&](std::size_t first, std::size_t many) {
-            const std::size_t at = begin + first;
-            quantity == Quantity::kXYZ ? fine->ToXYZ(in + at * bands, many, out + 3 * at)
-                                       : fine->ToLab(in + at * bands, many, out + 3 * at);
-        });
+        quantity == Quantity::kXYZ
+            ? fine->ToXYZParallel(in + begin * bands, n, out + 3 * begin, parts)
+            : fine->ToLabParallel(in + begin * bands, n, out + 3 * begin, parts);
     });
     const long implausible = FirstImplausible(out, count, quantity);
     if (implausible >= 0) {

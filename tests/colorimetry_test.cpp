@@ -5,6 +5,7 @@
 #include <atomic>
 #include <cmath>
 #include <filesystem>
+#include <random>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -463,6 +464,56 @@ std::vector<double> Grid(double from, double to, double step) {
 }
 
 }  // namespace
+
+// Random regular and uneven fine grids and spectra: one spectrum against a
+// plain sum of the object's own weights in long double; the batch forms the
+// one-spectrum values narrowed, bit for bit, on any number of threads.
+TEST(FineGridTristimulus, BatchesAndThreadsGiveTheOneSpectrumValues) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<double> unit(0.0, 1.0);
+    const MeasuringCondition condition;
+    for (int round = 0; round < 12; ++round) {
+        std::vector<double> grid;
+        if (round % 3 == 2) {
+            for (double nm = 350 + 20 * unit(random); nm < 840; nm += 0.5 + 12 * unit(random))
+                grid.push_back(nm);
+        } else {
+            const double from = 340 + 60 * unit(random), step = 0.5 + 9 * unit(random);
+            grid = Grid(from, from + 300 + 200 * unit(random), step);
+        }
+        if (!nxbase::FineGridTristimulus::Applies(grid)) continue;
+        const nxbase::FineGridTristimulus fine(condition, grid);
+        // Every fourth round has enough spectra for the threads to share them
+        // (a thread takes about 600 000 values).
+        const std::size_t n = grid.size();
+        const std::size_t count = round % 4 ? 1 + random() % 200 : 2 * 589824 / n + random() % 999;
+        std::vector<float> spectra(count * n);
+        for (float& v : spectra) v = static_cast<float>(1.2 * unit(random));
+        std::vector<float> xyz(3 * count), lab(3 * count), threaded(3 * count);
+        fine.ToXYZ(spectra.data(), count, xyz.data());
+        fine.ToLab(spectra.data(), count, lab.data());
+        for (std::size_t i = 0; i < count; i += 1 + i / 8) {
+            const float* r = &spectra[i * n];
+            const std::array<double, 3> one = fine.ToXYZ(r), oneLab = fine.ToLab(r);
+            for (int c = 0; c < 3; ++c) {
+                long double model = 0;
+                for (std::size_t k = 0; k < n; ++k) model += fine.Weight(c, k) * r[k];
+                ASSERT_NEAR(one[c], static_cast<double>(model), 1e-12 * (1 + std::fabs(one[c])))
+                    << "grid of " << n << ", spectrum " << i << ", channel " << c;
+                ASSERT_EQ(xyz[3 * i + c], static_cast<float>(one[c]));
+                ASSERT_EQ(lab[3 * i + c], static_cast<float>(oneLab[c]));
+            }
+        }
+        for (unsigned threads : {2u, 3u, 0u}) {
+            fine.ToLabParallel(spectra.data(), count, threaded.data(), threads);
+            ASSERT_EQ(threaded, lab) << threads << " threads, " << count << " spectra";
+            fine.ToXYZParallel(spectra.data(), count, threaded.data(), threads);
+            ASSERT_EQ(threaded, xyz) << threads << " threads, " << count << " spectra";
+        }
+    }
+}
 
 TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathForSmoothSpectra) {
     EXPECT_TRUE(nxbase::FineGridTristimulus::Applies(Grid(380, 730, 5)));

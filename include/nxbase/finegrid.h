@@ -65,11 +65,26 @@ class NXBASE_EXPORT FineGridTristimulus {
     // CIE 1976 L*a*b* relative to White(): CielabOf(ToXYZ(...), White()).
     std::array<double, 3> ToLab(const float* pValues) const;
     // alCount spectra, spectrum i at pSpectra + i * Wavelengths().size(), into
-    // pOut[3i..3i+2] as float.
+    // pOut[3i..3i+2] as float: the one-spectrum values, narrowed.
     void ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const;
     void ToLab(const float* pSpectra, std::size_t alCount, float* pOut) const;
+    // The same with the spectra split over alThreads threads (0: one per
+    // core), the calling thread one of them; identical results. Counts too
+    // small to gain from a thread (about 600 000 values per thread) stay on
+    // the calling thread.
+    void ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pOut,
+                       unsigned alThreads = 0) const;
+    void ToLabParallel(const float* pSpectra, std::size_t alCount, float* pOut,
+                       unsigned alThreads = 0) const;
 
   private:
+    void Sum(const float* pSpectra, std::size_t alCount, double* pXYZ) const;
+    template <bool kLab>
+    void Convert(const float* pSpectra, std::size_t alCount, float* pOut) const;
+    template <bool kLab>
+    void ConvertParallel(const float* pSpectra, std::size_t alCount, float* pOut,
+                         unsigned alThreads) const;
+
     std::vector<double> amWavelengths;
     std::array<std::vector<double>, 3> amWeights;
     std::array<double, 3> amWhite{};
