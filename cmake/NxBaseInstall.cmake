@@ -26,11 +26,19 @@ write_basic_package_version_file(${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake
 install(FILES ${PROJECT_BINARY_DIR}/NxBaseConfig.cmake
     ${PROJECT_BINARY_DIR}/NxBaseConfigVersion.cmake DESTINATION ${NXBASE_CMAKE_DIR} COMPONENT dev)
 
-# From <prefix>/<libdir>/pkgconfig back to <prefix>: one ".." per component.
-file(RELATIVE_PATH NXBASE_PC_TO_PREFIX
-    /nxbase-prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /nxbase-prefix)
-configure_file(cmake/nxbase.pc.in ${PROJECT_BINARY_DIR}/nxbase.pc @ONLY)
-install(FILES ${PROJECT_BINARY_DIR}/nxbase.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)
+# pkg-config files name the prefix they are installed to, as a plain path
+# (/usr/include, not a way back from the file's own directory): written at
+# install time, when `cmake --install --prefix` may have changed it.
+function(nxbase_install_pc template name component)
+    set(NXBASE_PC_PREFIX "@NXBASE_PC_PREFIX@")  # kept for the install step
+    configure_file(${template} ${PROJECT_BINARY_DIR}/${name}.pc.in @ONLY)
+    install(CODE "set(NXBASE_PC_PREFIX \"\${CMAKE_INSTALL_PREFIX}\")
+        configure_file(\"${PROJECT_BINARY_DIR}/${name}.pc.in\" \"${PROJECT_BINARY_DIR}/${name}.pc\" @ONLY)"
+        COMPONENT ${component})
+    install(FILES ${PROJECT_BINARY_DIR}/${name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig
+            COMPONENT ${component})
+endfunction()
+nxbase_install_pc(${PROJECT_SOURCE_DIR}/cmake/nxbase.pc.in nxbase dev)
 
 # The GUI adapters, each a library of its own with a runtime and a
 # development component: find_package(NxBase COMPONENTS glib qt), or
@@ -44,9 +52,7 @@ function(nxbase_install_gui component target export headers pc_name pc_requires)
     set(NXBASE_PC_NAME ${pc_name})
     set(NXBASE_PC_REQUIRES ${pc_requires})
     set(NXBASE_PC_LIB ${target})
-    configure_file(${PROJECT_SOURCE_DIR}/cmake/nxbase-gui.pc.in ${PROJECT_BINARY_DIR}/${pc_name}.pc @ONLY)
-    install(FILES ${PROJECT_BINARY_DIR}/${pc_name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig
-            COMPONENT ${component}dev)
+    nxbase_install_pc(${PROJECT_SOURCE_DIR}/cmake/nxbase-gui.pc.in ${pc_name} ${component}dev)
 endfunction()
 if(TARGET nxbase-glib)
     nxbase_install_gui(glib nxbase-glib NxBaseGlibTargets "glibloop.h" nxbase-glib "nxbase glib-2.0")
@@ -54,6 +60,12 @@ endif()
 if(TARGET nxbase-qt)
     nxbase_install_gui(qt nxbase-qt NxBaseQtTargets "qtloop.h;qtuserinterface.h" nxbase-qt "nxbase Qt6Widgets")
 endif()
+
+# The guides and the format documents, beside the API reference: the
+# installed first-hour page points to them.
+install(FILES doc/first-hour.md doc/messaging.md doc/asciifile.md doc/textfile.md doc/logfile.md
+              doc/memblock_format.md doc/registry.md doc/configuration.md doc/finegrid.md
+        DESTINATION ${CMAKE_INSTALL_DATAROOTDIR}/doc/libnxbase-dev COMPONENT dev)
 
 # The API reference (target "docs", with Doxygen): the public headers and
 # doc/first-hour.md as the first page; installed with the development

@@ -17,6 +17,8 @@ packages=(
     qt6-base-dev libglib2.0-dev xvfb
     # NumPy's vectorised BLAS, so that bench/python_bench.py compares with a fair peer
     libopenblas0-pthread
+    # Debian's package checker, run on the built packages
+    lintian
 )
 
 missing=()

@@ -30,6 +30,15 @@ ls -l "$build/packages/"*.deb
 fail() { echo "packages: $*"; exit 1; }
 deb() { ls "$build/packages/${1}_"*.deb; }
 
+# Debian's checker: no error, and no warning but those packaging/README.md
+# explains (listed in packaging/lintian-expected).
+lintian_out=$(lintian --tag-display-limit 0 "$build/packages/"*.deb 2>&1 | grep -E '^[EW]: ' || true)
+echo "$lintian_out"
+grep -q '^E: ' <<< "$lintian_out" && fail "lintian reports errors"
+unexplained=$(sed -E 's/^W: [^:]+: ([^ ]+).*/\1/' <<< "$lintian_out" | sort -u |
+              grep -vxF -f <(grep -v '^#' "$root/packaging/lintian-expected") || true)
+[ -z "$unexplained" ] || fail "lintian warnings not explained in packaging/README.md: $unexplained"
+
 # What the runtime packages ask for: Debian 12's library packages, never a
 # -dev package; the ABI version in the library package's name and shlibs.
 for p in libnxbase0 nxbase-tools python3-nxbase libnxbase-glib0 libnxbase-qt0; do
@@ -50,6 +59,9 @@ grep -q "libnxbase.so.0 -> " <<< "$contents" || fail "no libnxbase.so.0 in libnx
 contents=$(dpkg-deb -c "$(deb libnxbase-dev)")
 grep -q "usr/share/doc/libnxbase-dev/html/index.html" <<< "$contents" || fail "no API reference in libnxbase-dev"
 grep -q "usr/share/doc/libnxbase-dev/examples/batch-lab/main.cpp" <<< "$contents" || fail "no examples in libnxbase-dev"
+for page in first-hour messaging asciifile textfile logfile memblock_format registry configuration finegrid; do
+    grep -q "usr/share/doc/libnxbase-dev/$page.md" <<< "$contents" || fail "no $page.md in libnxbase-dev"
+done
 for p in "${packages[@]}"; do
     contents=$(dpkg-deb -c "$(deb "$p")")
     grep -q "usr/share/doc/$p/copyright" <<< "$contents" || fail "$p has no copyright file"
@@ -82,6 +94,8 @@ cmake --build "$work/consumer" > "$work/build.log" || { cat "$work/build.log"; e
 echo "consumer configured and built against /usr in $((SECONDS - started)) s"
 "$work/consumer/consumer"
 c++ -std=c++17 "$root/examples/consumer/main.cpp" $(pkg-config --cflags --libs nxbase) -o "$work/consumer-pc"
+[ "$(pkg-config --variable=includedir nxbase)" = /usr/include ] ||
+    fail "nxbase.pc names $(pkg-config --variable=includedir nxbase), not /usr/include"
 "$work/consumer-pc"
 
 # The GUI examples against the adapters' packages (CMake components), and
@@ -109,7 +123,7 @@ NXBASE_MACHINE_REGISTRY="$work/m.sqlite" NXBASE_USER_REGISTRY="$work/u.sqlite" n
 lumaserver --version > /dev/null || fail "lumaserver"
 nxmsg --help > /dev/null || fail "nxmsg"
 for tool in nxcolor nxreg nxmsg lumaserver; do
-    test -s "/usr/share/man/man1/$tool.1" || fail "no manual page for $tool"
+    test -s "/usr/share/man/man1/$tool.1.gz" || fail "no manual page for $tool"
 done
 # The module from Debian's python3, without any path given.
 (cd "$work" && env -u PYTHONPATH /usr/bin/python3 -c \

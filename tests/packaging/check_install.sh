@@ -23,7 +23,7 @@ LD_LIBRARY_PATH="$work/prefix/lib:$work/prefix/lib/x86_64-linux-gnu" NXBASE_LOG_
     "$work/consumer/consumer"
 grep -q "consumer started" "$work/log.txt"
 
-# The .pc file finds its prefix from where it lies (no --define-prefix).
+# The .pc file names the prefix it was installed to.
 pcdir=$(dirname "$(find "$work/prefix" -name nxbase.pc | head -n 1)")
 flags=$(PKG_CONFIG_PATH="$pcdir" pkg-config --cflags --libs nxbase)
 case "$flags" in *"$work/prefix"*) ;; *) echo "pkg-config points elsewhere: $flags"; exit 1 ;; esac
@@ -44,7 +44,7 @@ if [ -x "$work/prefix/bin/nxreg" ]; then
     # A manual page per program, when help2man made them.
     if command -v help2man > /dev/null; then
         for tool in nxcolor nxreg nxmsg lumaserver; do
-            test -s "$work/prefix/share/man/man1/$tool.1" || { echo "no manual page for $tool"; exit 1; }
+            test -s "$work/prefix/share/man/man1/$tool.1.gz" || { echo "no manual page for $tool"; exit 1; }
         done
     fi
 fi
