@@ -10,6 +10,8 @@ packages=(
     libsdbus-c++-dev dbus-daemon dbus-bin procps
     libgtest-dev libgmock-dev libbenchmark-dev help2man doxygen clang-format
     python3-dev pybind11-dev python3-numpy python3-pytest
+    # pip install . into a virtual environment, offline
+    python3-venv python3-setuptools python3-wheel
     argyll
     # the German locale the file readers and writers are tested under
     locales
