@@ -12,6 +12,8 @@ packages=(
     python3-dev pybind11-dev python3-numpy python3-pytest
     # pip install . into a virtual environment, offline
     python3-venv python3-setuptools python3-wheel
+    # the Dask example and its test
+    python3-dask python3-distributed
     argyll
     # the German locale the file readers and writers are tested under
     locales
