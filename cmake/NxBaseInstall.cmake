@@ -9,7 +9,8 @@ install(TARGETS nxbase EXPORT NxBaseTargets
     RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT runtime)
 # The GUI adapters' headers go with their own development packages (below).
 install(DIRECTORY include/nxbase DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev
-        PATTERN "glibloop.h" EXCLUDE PATTERN "qtloop.h" EXCLUDE PATTERN "qtuserinterface.h" EXCLUDE)
+        PATTERN "glibloop.h" EXCLUDE PATTERN "qtloop.h" EXCLUDE PATTERN "qtuserinterface.h" EXCLUDE
+        PATTERN "qtspectrumview.h" EXCLUDE)
 # Shipped texts, found relative to the installed library (LibraryDataDirectory).
 install(DIRECTORY data/lng DESTINATION ${CMAKE_INSTALL_DATADIR}/nxbase COMPONENT runtime)
 install(DIRECTORY platform/toolkit/include/toolkit DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
@@ -58,7 +59,8 @@ if(TARGET nxbase-glib)
     nxbase_install_gui(glib nxbase-glib NxBaseGlibTargets "glibloop.h" nxbase-glib "nxbase glib-2.0")
 endif()
 if(TARGET nxbase-qt)
-    nxbase_install_gui(qt nxbase-qt NxBaseQtTargets "qtloop.h;qtuserinterface.h" nxbase-qt "nxbase Qt6Widgets")
+    nxbase_install_gui(qt nxbase-qt NxBaseQtTargets "qtloop.h;qtuserinterface.h;qtspectrumview.h" nxbase-qt
+                       "nxbase Qt6Widgets")
 endif()
 
 # The guides and the format documents, beside the API reference: the

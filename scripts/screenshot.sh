@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Makes doc/qt-measure.png: the qt-measure example under Xvfb, measuring the
 # built-in chart through a LumaServer registered in a private hive, compared
-# with a reference in which three patches are darker. Needs a built tree
+# with a reference in which three patches are darker, patch 5's spectrum and
+# its reference drawn. Needs a built tree
 # (build/default) and Xvfb.
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -27,5 +28,5 @@ Xvfb -displayfd "$displayfd" -screen 0 800x900x24 -nolisten tcp > "$work/xvfb.lo
 xvfb=$!
 read -r -t 10 -u "$displayfd" display || { cat "$work/xvfb.log"; exit 1; }
 DISPLAY=":$display" QT_QPA_PLATFORM=xcb "$build/examples/qt-measure" \
-    --reference "$work/reference.csv" --measure --screenshot doc/qt-measure.png
+    --reference "$work/reference.csv" --measure --select 5 --screenshot doc/qt-measure.png
 echo "doc/qt-measure.png written"

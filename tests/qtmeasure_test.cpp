@@ -114,6 +114,17 @@ TEST_F(QtMeasureTest, MeasuresTheChartAsNxcolorDoesAndMarksTheThreeFarthestFromT
         }
     }
     EXPECT_EQ(marked, (std::vector<int>{4, 10, 16}));
+
+    // A selected patch's spectrum is drawn with its reference, dashed: here
+    // the chart's, four fifths of it.
+    window->SelectPatch(4);
+    const auto& curves = window->Spectrum().Curves();
+    ASSERT_EQ(curves.size(), 2u);
+    EXPECT_EQ(curves[0].name.toStdString(), "5 blue flower");
+    EXPECT_TRUE(curves[1].dashed && !curves[0].dashed);
+    ASSERT_EQ(curves[1].values.size(), 36u);
+    for (std::size_t k = 0; k < 36; ++k)
+        EXPECT_NEAR(curves[1].values[k], 0.8 * curves[0].values[k], 1e-4) << k;
 }
 
 TEST_F(QtMeasureTest, SurvivesTheServerKilledMidMeasurementAndTheNextMeasurementRestartsIt) {

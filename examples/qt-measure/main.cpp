@@ -3,8 +3,9 @@
 // waiting dialog are Qt widgets (QtUserInterface); the server is started on
 // demand from the registry (lumaserver --register does it).
 //
-//   qt-measure [--reference FILE] [--measure [--screenshot PNG]]
-//   --measure measures at once; --screenshot then saves the window and ends.
+//   qt-measure [--reference FILE] [--measure [--select N] [--screenshot PNG]]
+//   --measure measures at once; --select then shows patch N's spectrum,
+//   --screenshot saves the window and ends.
 #include <nxbase/postoffice.h>
 #include <nxbase/qtloop.h>
 #include <nxbase/qtuserinterface.h>
@@ -34,13 +35,16 @@ int main(int argc, char** argv) {
         int shot = static_cast<int>(arguments.indexOf(QStringLiteral("--screenshot")));
         QString screenshot =
             shot > 0 && shot + 1 < arguments.size() ? arguments[shot + 1] : QString();
+        int select = static_cast<int>(arguments.indexOf(QStringLiteral("--select")));
+        const int patch =
+            select > 0 && select + 1 < arguments.size() ? arguments[select + 1].toInt() : 0;
         if (arguments.contains(QStringLiteral("--measure"))) {
-            if (!screenshot.isEmpty()) {
-                window.SetMeasuredHandler([&window, screenshot] {
-                    bool saved = window.grab().save(screenshot);
-                    QApplication::exit(saved ? 0 : 1);
-                });
-            }
+            window.SetMeasuredHandler([&window, screenshot, patch] {
+                if (patch > 0) window.SelectPatch(patch - 1);
+                if (screenshot.isEmpty()) return;
+                bool saved = window.grab().save(screenshot);
+                QApplication::exit(saved ? 0 : 1);
+            });
             QTimer::singleShot(0, &window, [&window] { window.Measure(); });
         }
         window.show();

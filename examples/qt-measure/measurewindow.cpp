@@ -62,6 +62,11 @@ MeasureWindow::MeasureWindow(PostOffice& office) : office_(office) {
     table_->setColumnWidth(kSwatch, 28);
     table_->verticalHeader()->hide();
     table_->setEditTriggers(QAbstractItemView::NoEditTriggers);
+    table_->setSelectionBehavior(QAbstractItemView::SelectRows);
+    table_->setSelectionMode(QAbstractItemView::SingleSelection);
+    spectrum_ = new nxbase::qt::SpectrumView(this);
+    spectrum_->setObjectName(QStringLiteral("spectrum"));
+    spectrum_->setMinimumHeight(220);
     notices_ = new QListWidget(this);
     notices_->setMaximumHeight(80);
     status_ = new QLabel(this);
@@ -79,12 +84,15 @@ MeasureWindow::MeasureWindow(PostOffice& office) : office_(office) {
     layout->addLayout(buttons);
     layout->addWidget(progress_);
     layout->addWidget(table_, 1);
+    layout->addWidget(spectrum_, 1);
     layout->addWidget(new QLabel(QStringLiteral("Notices from LumaServer"), this));
     layout->addWidget(notices_);
     layout->addWidget(status_);
-    resize(520, 640);
+    resize(560, 820);
 
     connect(measure_, &QPushButton::clicked, this, &MeasureWindow::Measure);
+    connect(table_, &QTableWidget::currentCellChanged, this,
+            [this](int row) { ShowSpectrum(row); });
     connect(abort_, &QPushButton::clicked, this, [this] {
         aborted_ = true;
         if (session_) session_->Abort();
@@ -186,6 +194,36 @@ void MeasureWindow::ShowMeasured() {
         for (int c = 0; c < 3; ++c) table_->setItem(row, kL + c, Number(lab_[i][c]));
     }
     Compare();
+    ShowSpectrum(table_->currentRow());
+}
+
+// The patch's measured curve in its screen colour, and its reference
+// (the row of the same position) dashed; the latest patch while no row is
+// selected.
+void MeasureWindow::ShowSpectrum(int row) {
+    if (row < 0) row = static_cast<int>(measured_.size()) - 1;
+    std::vector<nxbase::qt::SpectrumView::Curve> curves;
+    std::vector<double> wavelengths(nxbase::kSpectrumSize);
+    for (int k = 0; k < nxbase::kSpectrumSize; ++k) wavelengths[k] = 380.0 + 10.0 * k;
+    const auto i = static_cast<std::size_t>(row);
+    if (row >= 0 && i < measured_.size()) {
+        const auto& values = measured_[i].values;
+        curves.push_back({QString::fromStdString(measured_[i].id),
+                          wavelengths,
+                          {values.begin(), values.end()},
+                          ScreenColour(lab_[i])});
+    }
+    if (row >= 0 && i < referenceTable_.rows.size()) {
+        const auto& reference = referenceTable_.rows[i];
+        curves.push_back({QStringLiteral("reference ") + QString::fromStdString(reference.id),
+                          wavelengths,
+                          {reference.values.begin(), reference.values.end()},
+                          QColor(90, 90, 90),
+                          true});
+    }
+    spectrum_->SetTitle(curves.empty() ? QStringLiteral("Spectrum")
+                                       : QStringLiteral("Spectrum of patch %1").arg(row + 1));
+    spectrum_->SetCurves(std::move(curves));
 }
 
 bool MeasureWindow::LoadReference(const std::string& path) {
@@ -201,6 +239,7 @@ bool MeasureWindow::LoadReference(const std::string& path) {
                   .arg(referenceTable_.rows.size())
                   .arg(QString::fromStdString(path)));
     Compare();
+    ShowSpectrum(table_->currentRow());
     return true;
 }
 

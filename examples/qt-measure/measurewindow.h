@@ -1,11 +1,13 @@
 // The window of qt-measure: measures N patches through LumaServer on the
 // event loop (a MeasurementSession) with a progress bar and an abort button, shows each patch as a
 // swatch with its CIELAB values, compares with a reference file (CIEDE2000 per patch, the worst
-// three marked) and lists the server's notices as they come.
+// three marked), draws the spectrum of the selected patch (the latest while none is selected)
+// with its reference, and lists the server's notices as they come.
 #ifndef QT_MEASURE_MEASUREWINDOW_H_
 #define QT_MEASURE_MEASUREWINDOW_H_
 
 #include <nxbase/lumaclient.h>
+#include <nxbase/qtspectrumview.h>
 #include <nxbase/qtuserinterface.h>
 #include <nxbase/spectrafile.h>
 
@@ -42,6 +44,9 @@ class MeasureWindow : public QWidget {
     const std::vector<std::array<float, 3>>& Lab() const { return lab_; }
     QString Status() const { return status_->text(); }
     int NoticeCount() const { return notices_->count(); }
+    const nxbase::qt::SpectrumView& Spectrum() const { return *spectrum_; }
+    // Selects a patch (from 0): its spectrum is drawn.
+    void SelectPatch(int row) { table_->selectRow(row); }
 
     // The server's notice that a patch was measured (MESSUNG_AUSGELOEST).
     long OnNotice(void* event);
@@ -51,6 +56,7 @@ class MeasureWindow : public QWidget {
     void Finished(bool ok, const std::string& error);
     void ShowMeasured();
     void Compare();
+    void ShowSpectrum(int row);
     void SetStatus(const QString& text);
 
     PostOffice& office_;
@@ -60,6 +66,7 @@ class MeasureWindow : public QWidget {
     QPushButton* reference_;
     QProgressBar* progress_;
     QTableWidget* table_;
+    nxbase::qt::SpectrumView* spectrum_;
     QListWidget* notices_;
     QLabel* status_;
     std::vector<nxbase::MeasuredSpectrum> measured_;

@@ -14,6 +14,7 @@
 #include "nxbase/colorconverter.h"
 #include "nxbase/files.h"
 #include "nxbase/iccprofile.h"
+#include "nxbase/plotaxis.h"
 #include "toolkit/string.h"
 
 namespace nxcolor {
@@ -259,13 +260,7 @@ constexpr int kLegendRowHeight = 18;
 // The reflectance axis: from min(0, lowest) to max(1, highest), on steps of
 // 1, 2 or 5 times a power of ten, so that it has at most twelve, whatever
 // the range.
-struct Axis {
-    double low = 0.0;
-    double high = 1.0;
-    double step = 0.1;
-};
-
-Axis ReflectanceAxis(const std::vector<ReportRow>& rows, std::size_t count) {
+nxbase::PlotAxis ReflectanceAxis(const std::vector<ReportRow>& rows, std::size_t count) {
     double low = 0.0, high = 1.0;
     for (std::size_t i = 0; i < count; ++i) {
         for (float v : rows[i].spectrum) {
@@ -274,15 +269,7 @@ Axis ReflectanceAxis(const std::vector<ReportRow>& rows, std::size_t count) {
             high = std::max(high, static_cast<double>(v));
         }
     }
-    Axis axis;
-    const double power = std::pow(10.0, std::floor(std::log10((high - low) / 12.0)));
-    for (double factor : {1.0, 2.0, 5.0, 10.0, 20.0}) {
-        axis.step = factor * power;
-        axis.low = std::floor(low / axis.step) * axis.step;
-        axis.high = std::ceil(high / axis.step) * axis.step;
-        if ((axis.high - axis.low) / axis.step <= 12.0) break;
-    }
-    return axis;
+    return nxbase::NiceAxis(low, high, 12);
 }
 
 }  // namespace
@@ -295,7 +282,7 @@ bool WriteSvgPlot(const Report& report, const MeasuringCondition& condition,
     const int width = kPlotLeft + kPlotWidth + 30;
     const int bottom = kPlotTop + kPlotHeight2;
     const int height = bottom + 56 + legendRows * kLegendRowHeight + 10;
-    const Axis axis = ReflectanceAxis(report.rows, count);
+    const nxbase::PlotAxis axis = ReflectanceAxis(report.rows, count);
     auto xOf = [](int sample) {
         return kPlotLeft + kPlotWidth * sample / double(kSpectrumSize - 1);
     };
