@@ -4,14 +4,20 @@
 #include <pthread.h>
 #include <signal.h>
 #include <sys/resource.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <future>
+#include <mutex>
+#include <random>
+#include <set>
 #include <stdexcept>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "log_test_util.h"
 #include "nxbase/logfile.h"
@@ -213,6 +219,82 @@ TEST(RetryOnEintr, ACallASignalInterruptedIsMadeAgain) {
     EXPECT_EQ(n, 1);
     EXPECT_EQ(byte, 'x');
     EXPECT_GE(calls.load(), 2);
+}
+
+// Random calls from four threads at once, a fifth of them calling again from
+// inside a part: every index is done exactly once, by parts that start on
+// the granule, and no call waits for another's helpers.
+TEST(RunInParts, EveryIndexOnceFromCallersAtOnceAndFromInsideAPart) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::atomic<int> wrong{0};
+    auto caller = [&](unsigned callerSeed) {
+        std::mt19937 random(callerSeed);
+        for (int call = 0; call < 40; ++call) {
+            const std::size_t count = random() % 200000, granule = 1 + random() % 64;
+            const unsigned threads = random() % 5;
+            std::vector<std::atomic<unsigned char>> done(count);
+            const bool nest = random() % 5 == 0;
+            nxbase::RunInParts(
+                count, threads, 1 + random() % 5000, granule,
+                [&](std::size_t first, std::size_t n) {
+                    if (first % granule != 0) ++wrong;
+                    if (nest) {
+                        nxbase::RunInParts(n, 2, 1, 1, [&](std::size_t f, std::size_t m) {
+                            for (std::size_t i = first + f; i < first + f + m; ++i) ++done[i];
+                        });
+                        return;
+                    }
+                    for (std::size_t i = first; i < first + n; ++i) ++done[i];
+                });
+            for (std::size_t i = 0; i < count; ++i)
+                if (done[i] != 1) ++wrong;
+        }
+    };
+    std::vector<std::thread> callers;
+    for (unsigned c = 0; c < 4; ++c) callers.emplace_back(caller, seed + c);
+    for (std::thread& t : callers) t.join();
+    EXPECT_EQ(wrong.load(), 0);
+}
+
+// A child forked while the parent's helpers are busy has none of them: its
+// own calls are served by helpers of its own.
+TEST(RunInParts, AForkedChildServesItsOwnCalls) {
+    std::atomic<bool> stop{false};
+    std::thread busy([&] {
+        while (!stop)
+            nxbase::RunInParts(400000, 2, 1, 1, [](std::size_t, std::size_t) {
+                std::this_thread::sleep_for(std::chrono::microseconds(50));
+            });
+    });
+    std::this_thread::sleep_for(20ms);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        // Slow parts, so that a helper surely takes some: two threads work.
+        std::vector<std::atomic<int>> done(100000);
+        std::mutex mutex;
+        std::set<std::thread::id> workers;
+        nxbase::RunInParts(done.size(), 2, 1, 1, [&](std::size_t first, std::size_t n) {
+            for (std::size_t i = first; i < first + n; ++i) ++done[i];
+            std::lock_guard<std::mutex> lock(mutex);
+            workers.insert(std::this_thread::get_id());
+            std::this_thread::sleep_for(std::chrono::milliseconds(2));
+        });
+        const bool once =
+            std::all_of(done.begin(), done.end(), [](const auto& d) { return d == 1; });
+        ::_exit(once ? (workers.size() == 2 ? 0 : 2) : 1);
+    }
+    stop = true;
+    busy.join();
+    int status = -1;
+    for (int i = 0; i < 1000 && ::waitpid(child, &status, WNOHANG) == 0; ++i)
+        std::this_thread::sleep_for(10ms);
+    if (!WIFEXITED(status)) {
+        ::kill(child, SIGKILL);
+        ::waitpid(child, &status, 0);
+        FAIL() << "the child hung in RunInParts";
+    }
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "1: an index not done once; 2: no helper in the child";
 }
 
 }  // namespace

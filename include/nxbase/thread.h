@@ -108,8 +108,12 @@ namespace nxbase {
 // one per core; fewer when alCount / alMinPerThread is smaller), the calling
 // thread one of them. The range is cut into parts whose starts are multiples
 // of alGranule, eight or so per thread, taken by whichever thread is free;
-// the call returns when all are done. With one thread, or when no thread can
-// be started, the work is done on the calling thread. fPart must not throw.
+// the call returns when all are done. The other threads are kept between
+// calls (asleep when idle; a forked child starts its own); a call from one
+// of them, or from several threads at once, is served as helpers come free,
+// the calling thread always working too. With one thread, or when no thread
+// can be started, the work is done on the calling thread. fPart must not
+// throw.
 NXBASE_EXPORT void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread,
                               std::size_t alGranule,
                               const std::function<void(std::size_t, std::size_t)>& fPart);

@@ -1,5 +1,6 @@
 #include "toolkit/system.h"
 
+#include <pthread.h>
 #include <pwd.h>
 #include <sys/ioctl.h>
 #include <sys/resource.h>
@@ -9,6 +10,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -144,6 +146,17 @@ std::string NormalizePath(const std::string& path) {
     std::string result(path);
     std::replace(result.begin(), result.end(), '\\', '/');
     return result;
+}
+
+namespace {
+std::atomic<unsigned> gForkGeneration{0};
+// A handler may do no more than this in the child; registered as the library loads.
+const int kForkHandler = ::pthread_atfork(
+    nullptr, nullptr, [] { gForkGeneration.fetch_add(1, std::memory_order_relaxed); });
+}  // namespace
+
+unsigned ForkGeneration() {
+    return gForkGeneration.load(std::memory_order_relaxed);
 }
 
 }  // namespace toolkit

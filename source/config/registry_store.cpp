@@ -11,7 +11,6 @@
 // Each thread keeps its own connections (one per hive file) with their
 // prepared statements; a child process after fork() abandons its parent's
 // connections without closing them, as SQLite requires.
-#include <pthread.h>
 #include <sqlite3.h>
 
 #include <algorithm>
@@ -28,6 +27,7 @@
 #include "nxbase/registry.h"
 #include "toolkit/direntry.h"
 #include "toolkit/fileio.h"
+#include "toolkit/system.h"
 
 namespace nxbase {
 namespace {
@@ -401,18 +401,16 @@ std::unique_ptr<Connection> Open(const std::string& asFile, RegistryHive axHive,
     return connection;
 }
 
-// Counts fork() calls, so that a child notices that its connections are its
-// parent's without a getpid() system call on every access.
-std::atomic<unsigned> gForkGeneration{0};
-const int kForkHandler = ::pthread_atfork(nullptr, nullptr, [] { ++gForkGeneration; });
+// A child notices by the fork generation that its connections are its
+// parent's, without a getpid() system call on every access.
 
 // The calling thread's connections.
 struct ConnectionCache {
-    unsigned amGeneration = gForkGeneration.load();
+    unsigned amGeneration = toolkit::ForkGeneration();
     std::vector<std::unique_ptr<Connection>> amConnections;  // most recently used last
 
     ~ConnectionCache() {
-        if (amGeneration != gForkGeneration.load()) Abandon();
+        if (amGeneration != toolkit::ForkGeneration()) Abandon();
     }
     void Abandon() {
         for (auto& connection : amConnections) connection.release();  // never closed here
@@ -425,9 +423,9 @@ thread_local ConnectionCache tlCache;
 // The connection to a hive; null when the hive has no file yet and
 // `forWrite` is false. For writing, the file and its directory are created.
 Connection* Connect(RegistryHive axHive, bool abForWrite) {
-    if (tlCache.amGeneration != gForkGeneration.load(std::memory_order_relaxed)) {
+    if (tlCache.amGeneration != toolkit::ForkGeneration()) {
         tlCache.Abandon();
-        tlCache.amGeneration = gForkGeneration.load();
+        tlCache.amGeneration = toolkit::ForkGeneration();
     }
     // Resolved on every call, since the environment may point elsewhere, but
     // into a buffer that is reused.

@@ -1,11 +1,16 @@
 #include "nxbase/thread.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <condition_variable>
+#include <deque>
 #include <exception>
 #include <map>
+#include <mutex>
 #include <system_error>
+#include <thread>
 
 #include "nxbase/check.h"
 #include "nxbase/logfile.h"
@@ -208,6 +213,92 @@ std::vector<std::string> Thread::GetRunningThreads() {
 }
 
 namespace nxbase {
+namespace {
+
+// Helper threads kept between calls: starting one per call costs as much as
+// converting tens of thousands of spectra. Idle helpers sleep on a condition
+// variable (no wake-ups). A caller always works on its own job too and, once
+// its parts are done, withdraws the places no helper has taken, so that it
+// never waits for a helper busy elsewhere: nested and concurrent calls
+// cannot deadlock. A child after fork() has none of its parent's threads:
+// it makes a pool of its own and leaves the parent's (and its locks) alone.
+class PartPool {
+  public:
+    static PartPool& Instance() {
+        static std::atomic<PartPool*> pool{nullptr};
+        static std::mutex making;
+        PartPool* current = pool.load(std::memory_order_acquire);
+        if (current != nullptr && current->generation_ == toolkit::ForkGeneration())
+            return *current;
+        std::lock_guard<std::mutex> lock(making);
+        current = pool.load(std::memory_order_relaxed);
+        if (current == nullptr || current->generation_ != toolkit::ForkGeneration()) {
+            current = new PartPool;  // never deleted: helpers may outlive main
+            pool.store(current, std::memory_order_release);
+        }
+        return *current;
+    }
+
+    // Runs `take` on the calling thread and on up to `helpers` pool threads.
+    void Run(unsigned helpers, const std::function<void()>& take) {
+        Job job(&take, helpers);
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            Grow(helpers);
+            jobs_.push_back(&job);
+        }
+        wake_.notify_all();
+        take();
+        std::unique_lock<std::mutex> lock(mutex_);
+        auto at = std::find(jobs_.begin(), jobs_.end(), &job);
+        if (at != jobs_.end()) jobs_.erase(at);
+        job.finished.wait(lock, [&] { return job.running == 0; });
+    }
+
+  private:
+    struct Job {
+        Job(const std::function<void()>* work, unsigned helpers) : take(work), places(helpers) {}
+        const std::function<void()>* take;
+        unsigned places;       // helpers it may still take
+        unsigned running = 0;  // helpers in it now
+        std::condition_variable finished;
+    };
+
+    // Starts helpers up to `count` (fewer when the system has no thread to give).
+    void Grow(unsigned count) {
+        for (; threads_ < count; ++threads_) {
+            try {
+                std::thread([this] { Serve(); }).detach();
+            } catch (const std::system_error&) {
+                return;
+            }
+        }
+    }
+
+    void Serve() {
+        std::unique_lock<std::mutex> lock(mutex_);
+        for (;;) {
+            wake_.wait(lock, [&] { return !jobs_.empty(); });
+            Job* job = jobs_.front();
+            if (--job->places == 0) jobs_.pop_front();
+            ++job->running;
+            lock.unlock();
+            (*job->take)();
+            lock.lock();
+            // Under the lock: the caller cannot see `running` fall and
+            // destroy the job before this notification is done with it.
+            if (--job->running == 0) job->finished.notify_all();
+        }
+    }
+
+    const unsigned generation_ = toolkit::ForkGeneration();
+    std::mutex mutex_;
+    std::condition_variable wake_;
+    std::deque<Job*> jobs_;
+    unsigned threads_ = 0;
+};
+
+}  // namespace
 
 void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThread,
                 std::size_t alGranule, const std::function<void(std::size_t, std::size_t)>& fPart) {
@@ -225,22 +316,13 @@ void RunInParts(std::size_t alCount, unsigned alThreads, std::size_t alMinPerThr
     const std::size_t part =
         std::max(granule * 256, (alCount / (8 * threads) + granule - 1) / granule * granule);
     std::atomic<std::size_t> next{0};
-    const auto take = [&] {
+    const std::function<void()> take = [&] {
         for (std::size_t first = next.fetch_add(part); first < alCount;
              first = next.fetch_add(part)) {
             fPart(first, std::min(part, alCount - first));
         }
     };
-    std::vector<std::thread> workers;
-    for (unsigned t = 1; t < threads; ++t) {
-        try {
-            workers.emplace_back(take);
-        } catch (const std::system_error&) {
-            break;  // no thread to be had: the others take its parts
-        }
-    }
-    take();
-    for (std::thread& worker : workers) worker.join();
+    PartPool::Instance().Run(threads - 1, take);
 }
 
 }  // namespace nxbase

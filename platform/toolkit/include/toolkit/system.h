@@ -51,6 +51,10 @@ NXBASE_EXPORT std::string HostName();
 NXBASE_EXPORT std::string LoginName();
 // Processors online, at least 1.
 NXBASE_EXPORT unsigned int OnlineProcessorCount();
+// How many fork() calls lie between the original process and this one (0
+// there): an object that remembers the value it was made under sees by a
+// change that its threads and locks are its parent's.
+NXBASE_EXPORT unsigned ForkGeneration();
 // The process's nice value (0 when it cannot be read), and setting a
 // thread's (by its CurrentThreadId()); false when refused (raising a
 // priority needs privileges).
