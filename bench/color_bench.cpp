@@ -11,7 +11,9 @@
 //   one thread and on two;
 // - fine grids (FineGridTristimulus at 1 nm, 471 values, and 5 nm, 95
 //   values, 360..830 nm): the same float bytes read as spectra of that
-//   length, against the same read, on one thread and on two.
+//   length, against the same read, on one thread and on two;
+// - two threads against one on calls of 32 768, 65 536 and 262 144 spectra
+//   (the helper threads are kept between calls).
 // One-thread cases run pinned to CPU 0, two-thread cases on CPUs 0 and 1.
 #include <benchmark/benchmark.h>
 
@@ -234,6 +236,14 @@ nxbench::Pair FinePair(double step, std::size_t dram, unsigned threads) {
             [=](benchmark::State& s) { FineGridLab(s, step, dram, threads); }};
 }
 
+// A second thread on a call of `count` spectra, against one thread: what
+// the kept helper threads gain on the sizes applications convert at once.
+nxbench::Pair ThreadGainPair(std::size_t count) {
+    return {"LabBatch_TwoThreads_vs_OneThread_" + std::to_string(count) + "Spectra",
+            [=](benchmark::State& s) { BatchLab<float>(s, count, 1); },
+            [=](benchmark::State& s) { BatchLab<float>(s, count, 2); }};
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -253,6 +263,9 @@ int main(int argc, char** argv) {
         FinePair(1.0, dram, 2),
         FinePair(5.0, dram, 1),
         FinePair(5.0, dram, 2),
+        ThreadGainPair(32768),
+        ThreadGainPair(65536),
+        ThreadGainPair(262144),
     };
     std::printf(
         "DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "

@@ -12,7 +12,7 @@ if(TARGET nxcolor)
 endif()
 nxbase_add_test(colordiff_test colordiff_test.cpp)
 target_link_libraries(colordiff_test PRIVATE PkgConfig::LCMS2)
-add_test(NAME ColorBatch.KernelFilesDefineOnlyTheirEntryPoints
+add_test(NAME KernelFiles.DefineOnlyTheirEntryPoints
     COMMAND sh ${CMAKE_CURRENT_SOURCE_DIR}/color/check_kernel_symbols.sh
-            $<TARGET_OBJECTS:nxbase_color>
+            $<TARGET_OBJECTS:nxbase_color> $<TARGET_OBJECTS:nxbase_colorimetry>
     COMMAND_EXPAND_LISTS)

@@ -6,6 +6,7 @@
 #include <limits>
 #include <stdexcept>
 
+#include "finegrid_sum.h"
 #include "klume/cmetry/data.h"
 #include "nxbase/cielab.h"
 #include "nxbase/meascond.h"
@@ -176,49 +177,32 @@ FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
 
 namespace {
 
-// Partial sums per channel kept apart: independent chains that the compiler
-// holds in vector registers. Their order of additions is fixed and the file
-// is built without fused multiply-adds, so every instruction set below gives
-// the same bits.
-constexpr std::size_t kLanes = 8;
 // Spectra per thread below which starting a thread costs more than it saves,
 // for spectra of 36 values; longer spectra need proportionally fewer.
 constexpr std::size_t kMinValuesPerThread = 16384 * 36;
 
-#if defined(__GNUC__) && !defined(__clang__) && defined(__x86_64__)
-__attribute__((target_clones("arch=x86-64-v4", "arch=x86-64-v3", "default")))
+// The instruction set's sum, chosen once.
+finegrid::SumFunction ChosenSum() {
+#ifdef NXBASE_FINEGRID_X86_KERNELS
+    if (__builtin_cpu_supports("x86-64-v3") && __builtin_cpu_supports("avx512f") &&
+        __builtin_cpu_supports("avx512dq") && __builtin_cpu_supports("avx512vl"))
+        return &finegrid::SumAvx512;
+    if (__builtin_cpu_supports("x86-64-v3")) return &finegrid::SumAvx2;
 #endif
-void SumSpectra(const double* w0, const double* w1, const double* w2, std::size_t n,
-                const float* spectra, std::size_t count, double* xyz) {
-    for (std::size_t i = 0; i < count; ++i, spectra += n, xyz += 3) {
-        double lane[3][kLanes] = {};
-        std::size_t k = 0;
-        for (; k + kLanes <= n; k += kLanes) {
-            for (std::size_t l = 0; l < kLanes; ++l) {
-                const double r = spectra[k + l];
-                lane[0][l] += w0[k + l] * r;
-                lane[1][l] += w1[k + l] * r;
-                lane[2][l] += w2[k + l] * r;
-            }
-        }
-        for (std::size_t l = 0; k < n; ++k, ++l) {
-            const double r = spectra[k];
-            lane[0][l] += w0[k] * r;
-            lane[1][l] += w1[k] * r;
-            lane[2][l] += w2[k] * r;
-        }
-        for (int c = 0; c < 3; ++c) {
-            const double* p = lane[c];
-            xyz[c] = ((p[0] + p[4]) + (p[1] + p[5])) + ((p[2] + p[6]) + (p[3] + p[7]));
-        }
-    }
+    return &finegrid::SumBaseline;
 }
 
 }  // namespace
 
+void finegrid::SumBaseline(const double* w0, const double* w1, const double* w2, std::size_t n,
+                           const float* spectra, std::size_t count, double* xyz) {
+    finegrid::SumSpectra(w0, w1, w2, n, spectra, count, xyz);
+}
+
 void FineGridTristimulus::Sum(const float* pSpectra, std::size_t alCount, double* pXYZ) const {
-    SumSpectra(amWeights[0].data(), amWeights[1].data(), amWeights[2].data(), amWavelengths.size(),
-               pSpectra, alCount, pXYZ);
+    static const finegrid::SumFunction sum = ChosenSum();
+    sum(amWeights[0].data(), amWeights[1].data(), amWeights[2].data(), amWavelengths.size(),
+        pSpectra, alCount, pXYZ);
 }
 
 std::array<double, 3> FineGridTristimulus::ToXYZ(const float* pValues) const {

@@ -1,5 +1,6 @@
 #!/bin/sh
-# The batch kernel files built for other instruction sets must define nothing
+# The kernel files built for other instruction sets (the batch's and the
+# fine grid's) must define nothing
 # the linker could share with the rest of the library (a weak copy of an
 # inline function, built with AVX instructions, could be the one every file
 # calls): one external symbol each, their entry point.
@@ -7,7 +8,11 @@
 status=0
 checked=0
 for object in "$@"; do
-    case "$object" in *colorbatch_baseline.cpp.o|*colorbatch_avx2.cpp.o|*colorbatch_avx512.cpp.o) ;; *) continue ;; esac
+    case "$object" in
+        *colorbatch_baseline.cpp.o|*colorbatch_avx2.cpp.o|*colorbatch_avx512.cpp.o) ;;
+        *finegrid_avx2.cpp.o|*finegrid_avx512.cpp.o) ;;
+        *) continue ;;
+    esac
     checked=$((checked + 1))
     # DW.ref.* are the exception-handling personality's data references
     # (no code), which builds without optimisation keep.
