@@ -260,6 +260,9 @@ TEST(RunInParts, EveryIndexOnceFromCallersAtOnceAndFromInsideAPart) {
 // A child forked while the parent's helpers are busy has none of them: its
 // own calls are served by helpers of its own.
 TEST(RunInParts, AForkedChildServesItsOwnCalls) {
+#if defined(__SANITIZE_THREAD__)
+    GTEST_SKIP() << "ThreadSanitizer cannot start threads in a child of a multi-threaded process";
+#endif
     std::atomic<bool> stop{false};
     std::thread busy([&] {
         while (!stop)
