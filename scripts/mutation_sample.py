@@ -119,8 +119,13 @@ def main():
                 killed = result != 0
                 caught += killed
                 where = f"{path.relative_to(ROOT)}:{number + 1}"
+                # Which tests caught it: the candidates for keeping when tests are pruned.
+                failed = build / "Testing" / "Temporary" / "LastTestsFailed.log"
+                catchers = ",".join(line.split(":", 1)[-1].strip()
+                                    for line in failed.read_text().splitlines()) \
+                    if killed and failed.exists() else ""
                 out.write(f"{where}\t{'caught' if killed else 'missed'}\t"
-                          f"{mutated_line.strip()}\t{time.time() - start:.0f}s\n")
+                          f"{mutated_line.strip()}\t{time.time() - start:.0f}s\t{catchers}\n")
                 out.flush()
                 print(f"{tried:3d} {where} {'caught' if killed else 'MISSED'}", flush=True)
             finally:
