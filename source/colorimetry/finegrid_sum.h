@@ -29,10 +29,17 @@ namespace {
 // are built without fused multiply-adds, so every instruction set gives the
 // same bits.
 constexpr std::size_t kLanes = 8;
+// How far ahead of the spectrum being summed the following ones are fetched,
+// as the batch kernels fetch: the hardware's stream prefetcher alone leaves
+// compute and memory taking turns (a third of the read's rate at 1 nm).
+constexpr std::size_t kPrefetchBytes = 9 * 1024;
 
 inline void SumSpectra(const double* w0, const double* w1, const double* w2, std::size_t n,
                        const float* spectra, std::size_t count, double* xyz) {
     for (std::size_t i = 0; i < count; ++i, spectra += n, xyz += 3) {
+        const char* ahead = reinterpret_cast<const char*>(spectra) + kPrefetchBytes;
+        for (std::size_t line = 0; line < n * sizeof(float); line += 64)
+            __builtin_prefetch(ahead + line, 0, 3);
         double lane[3][kLanes] = {};
         std::size_t k = 0;
         for (; k + kLanes <= n; k += kLanes) {
