@@ -224,17 +224,18 @@ namespace {
 // it makes a pool of its own and leaves the parent's (and its locks) alone.
 class PartPool {
   public:
+    // Without a lock, so that a child forked while another thread made the
+    // pool cannot find one held: a pool made in vain had no thread yet.
     static PartPool& Instance() {
         static std::atomic<PartPool*> pool{nullptr};
-        static std::mutex making;
         PartPool* current = pool.load(std::memory_order_acquire);
-        if (current != nullptr && current->generation_ == toolkit::ForkGeneration())
-            return *current;
-        std::lock_guard<std::mutex> lock(making);
-        current = pool.load(std::memory_order_relaxed);
-        if (current == nullptr || current->generation_ != toolkit::ForkGeneration()) {
-            current = new PartPool;  // never deleted: helpers may outlive main
-            pool.store(current, std::memory_order_release);
+        while (current == nullptr || current->generation_ != toolkit::ForkGeneration()) {
+            auto* fresh = new PartPool;  // the one kept is never deleted: helpers outlive main
+            if (pool.compare_exchange_strong(current, fresh, std::memory_order_acq_rel)) {
+                current = fresh;  // a parent's pool is left as it is
+            } else {
+                delete fresh;
+            }
         }
         return *current;
     }
@@ -264,9 +265,10 @@ class PartPool {
         std::condition_variable finished;
     };
 
-    // Starts helpers up to `count` (fewer when the system has no thread to give).
+    // Starts helpers up to `count` (fewer when the system has no thread to
+    // give; never more than kMaxHelpers, which calls asking more share).
     void Grow(unsigned count) {
-        for (; threads_ < count; ++threads_) {
+        for (count = std::min(count, kMaxHelpers); threads_ < count; ++threads_) {
             try {
                 std::thread([this] { Serve(); }).detach();
             } catch (const std::system_error&) {
@@ -291,6 +293,7 @@ class PartPool {
         }
     }
 
+    static constexpr unsigned kMaxHelpers = 256;
     const unsigned generation_ = toolkit::ForkGeneration();
     std::mutex mutex_;
     std::condition_variable wake_;

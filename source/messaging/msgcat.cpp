@@ -233,18 +233,22 @@ std::string DecodeBytes(const char* pData, std::size_t alSize) {
 }
 
 std::size_t StuffedDecoder::Decode(char* pData, std::size_t alSize) {
+    // The state in a local: a member could be changed by the stores through
+    // pData, as far as the compiler knows, and be reloaded for every byte.
+    bool escaped = amEscaped;
     std::size_t out = 0;
     for (std::size_t i = 0; i < alSize; ++i) {
         const char c = pData[i];
-        if (amEscaped) {
-            amEscaped = false;
+        if (escaped) {
+            escaped = false;
             pData[out++] = c == '\x0A' ? '\x00' : '\x01';
         } else if (c == '\x01') {
-            amEscaped = true;
+            escaped = true;
         } else {
             pData[out++] = c;
         }
     }
+    amEscaped = escaped;
     return out;
 }
 
