@@ -164,6 +164,10 @@ FineGridTristimulus::FineGridTristimulus(const MeasuringCondition& axCondition,
     const double ySum =
         step > 0.0 ? AddRegularWeights(amWavelengths, step, *illuminant, *observer, amWeights)
                    : AddUnevenWeights(amWavelengths, *illuminant, *observer, amWeights);
+    // Zeros after the last weight, up to a whole step of the sum's lanes.
+    constexpr std::size_t kStep = finegrid::kLanes;
+    for (auto& channel : amWeights)
+        channel.resize((channel.size() + kStep - 1) / kStep * kStep, 0.0);
     const double scale = ySum > 0.0 ? 100.0 / ySum : 0.0;
     for (int c = 0; c < 3; ++c) {
         double white = 0.0;
