@@ -44,3 +44,20 @@ function(nxbase_add_family family)
     set_property(GLOBAL PROPERTY NXBASE_FAMILY_DEPENDS_${family} ${F_DEPENDS})
     set_property(GLOBAL PROPERTY NXBASE_FAMILY_HEADERS_${family} ${headers})
 endfunction()
+
+# Kernels built once per x86-64 instruction set, with GCC: AVX2 with
+# x86-64-v3, AVX512 with AVX-512 F, DQ and VL besides (and AVX512_OPTIONS),
+# both without fused multiply-adds, so that every set rounds alike; the
+# DISPATCHER source is compiled with DEFINE set and picks among them at run
+# time. Elsewhere nothing is added and the dispatcher uses its own code.
+function(nxbase_add_x86_kernels target)
+    cmake_parse_arguments(K "" "AVX2;AVX512;DISPATCHER;DEFINE" "AVX512_OPTIONS" ${ARGN})
+    if(NOT (CMAKE_SYSTEM_PROCESSOR MATCHES "x86_64|AMD64" AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU"))
+        return()
+    endif()
+    target_sources(${target} PRIVATE ${K_AVX2} ${K_AVX512})
+    set_source_files_properties(${K_AVX2} PROPERTIES COMPILE_OPTIONS "-ffp-contract=off;-march=x86-64-v3")
+    set_source_files_properties(${K_AVX512} PROPERTIES COMPILE_OPTIONS
+        "-ffp-contract=off;-march=x86-64-v3;-mavx512f;-mavx512dq;-mavx512vl;${K_AVX512_OPTIONS}")
+    set_source_files_properties(${K_DISPATCHER} PROPERTIES COMPILE_DEFINITIONS ${K_DEFINE})
+endfunction()
