@@ -13,10 +13,14 @@
 //                          (1 set, 0 clear)
 //   std::iostream          the byte count as 4-byte int, then the bytes
 //
+// Storage: one malloc'd array, grown with realloc (a large block's pages move
+// instead of being copied), so that pointers into it (GetDatenZeiger and the
+// like) are stale after any write that grows it.
+//
 // Error model: allocation failure is reported by Check::POINTER (which throws
-// the int 1). Readers never read outside the written data and never throw: a
-// read that finds fewer bytes than it needs stops at the end of the data,
-// leaves what it could not fill unchanged and sets ReadPastEnd().
+// the int 1); a growth that fails leaves the block as it was. Readers never read outside the
+// written data and never throw: a read that finds fewer bytes than it needs stops at the end of the
+// data, leaves what it could not fill unchanged and sets ReadPastEnd().
 #ifndef NXBASE_MYMEMBLO_H_
 #define NXBASE_MYMEMBLO_H_
 
@@ -171,7 +175,8 @@ class NXBASE_EXPORT MyMemoryBlock {
   private:
     // Makes room for `alCount` more bytes, doubling the capacity.
     void CheckSize(long alCount);
-    // Moves the content into a new array of `alCapacity` bytes (>= length).
+    // Resizes the storage to `alCapacity` bytes (>= length), in place or
+    // moved, keeping the content; the positions follow it.
     void Reallocate(std::int32_t alCapacity);
     // Fixed-size helpers for the scalar operators (defined in the .cpp only).
     template <int N>

@@ -255,7 +255,8 @@ class PartPool {
             Grow(helpers);
             Push(&job);
         }
-        wake_.notify_all();
+        // One sleeping helper per place, not the whole pool.
+        for (unsigned i = 0; i < helpers; ++i) wake_.notify_one();
         take();
         std::unique_lock<std::mutex> lock(mutex_);
         auto at = std::find(jobs_.begin(), jobs_.end(), &job);
