@@ -276,11 +276,15 @@ void PipeRoundTrip(benchmark::State& state, Placement placement) {
     nxbase::EncodeBlock(data);
     Application& app = Application::Get();
     gReceived = 0;
-    pipe->Send(kPeerName, "IS_READY", data);
-    while (gReceived < 1) app.RunOneFor(std::chrono::milliseconds(10));
+    if (!pipe->Send(kPeerName, "IS_READY", data))
+        state.SkipWithError(("the peer is unreachable: " + pipe->GetLastError()).c_str());
+    while (!state.error_occurred() && gReceived < 1) app.RunOneFor(std::chrono::milliseconds(10));
     for (auto _ : state) {
         int before = gReceived;
-        pipe->Send(kPeerName, "GET_DEVICE_NAME", data);
+        if (!pipe->Send(kPeerName, "GET_DEVICE_NAME", data)) {
+            state.SkipWithError(("a send failed: " + pipe->GetLastError()).c_str());
+            break;
+        }
         while (gReceived == before) app.RunOneFor(std::chrono::milliseconds(100));
     }
     Pipe::DeletePipe();

@@ -420,6 +420,26 @@ TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {
     ::chmod(runtime.c_str(), 0700);
 }
 
+// A peer that finds the socket file must be able to connect at once: a
+// listener that showed its name before it listened refused such a peer.
+TEST_F(PipeTest, AListenerAcceptsTheMomentItsSocketAppears) {
+    for (int round = 0; round < 20; ++round) {
+        const std::string name = "Racer" + std::to_string(round);
+        const std::string path = nxbase::RequestSocketPath(name);
+        pid_t peer = ::fork();
+        if (peer == 0) {
+            ::execl(NXBASE_PIPE_PEER, NXBASE_PIPE_PEER, name.c_str(), nullptr);
+            ::_exit(127);
+        }
+        auto deadline = std::chrono::steady_clock::now() + 10s;
+        while (!std::filesystem::exists(path) && std::chrono::steady_clock::now() < deadline) {
+        }
+        EXPECT_TRUE(nxtest::Accepts(path)) << "round " << round;
+        ::kill(peer, SIGKILL);
+        ::waitpid(peer, nullptr, 0);
+    }
+}
+
 TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     if (::geteuid() != 0) GTEST_SKIP() << "needs root to act as another user";
     // Let user 65534 reach the socket, so that only the credential check stands.

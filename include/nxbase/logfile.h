@@ -171,9 +171,20 @@ namespace nxbase {
 class NXBASE_EXPORT CachedLogOption {
   public:
     explicit CachedLogOption(std::string key) : amKey(std::move(key)) {}
-    bool Enabled();
+    // Inline: the hot paths ask several times per message.
+    bool Enabled() {
+        const std::uint64_t state = amState.load(std::memory_order_relaxed);
+        if ((state >> 1) == smVersion.load(std::memory_order_acquire)) return (state & 1) != 0;
+        return LookUp();
+    }
+
+    // Counts changes of any log's options; starts at 1, so that a state of 0
+    // always means "not looked up".
+    static std::atomic<std::uint64_t> smVersion;
 
   private:
+    bool LookUp();
+
     const String amKey;
     // (options version << 1) | enabled; 0 before the first look-up.
     std::atomic<std::uint64_t> amState{0};

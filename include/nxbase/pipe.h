@@ -171,6 +171,13 @@ class NXBASE_EXPORT Pipe {
     // The connection the last successful Send went out on (its
     // VELTRAEvent::GetChannel() id); 0 when it went by DDE.
     std::uint64_t GetLastSendChannel() const { return amLastSendChannel; }
+    // Takes what has already arrived on connection `alChannel`, without
+    // waiting, and delivers its frames as the loop would; false when nothing
+    // was there. A caller about to wait for an answer tries this first: a
+    // peer on the same CPU has often answered by the time its send returns,
+    // and the loop's readiness wait and re-armed read would find it later.
+    // The receive function may delete the transport meanwhile.
+    bool ReadArrived(std::uint64_t alChannel);
     // The id of the open channel to `asApp`, 0 when there is none.
     std::uint64_t ChannelId(const std::string& asApp) const;
     // Whether connection `alChannel` (VELTRAEvent::GetChannel()) is open.
@@ -210,8 +217,8 @@ class NXBASE_EXPORT Pipe {
     bool KeepWaiting() const;
     void AddChannel(const ChannelPtr& axChannel);
     void ArmRead(const ChannelPtr& axChannel);
-    void OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError,
-                std::size_t alRead);
+    void OnReadable(const ChannelPtr& axChannel);
+    bool ReadOnce(const ChannelPtr& axChannel);
     void LimitPartialFrames();
     void LimitQueuedBytes();
     void Deliver(const ChannelPtr& axChannel);

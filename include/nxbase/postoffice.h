@@ -206,8 +206,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
 
     static void TransportReceive(VELTRAEvent& axEvent);
     unsigned char CheckLock(const String& asSender);
-    bool TryOnce(const std::string& asApp, const std::string& asCommand,
-                 std::string_view asEncoded);
+    bool TryOnce(const std::string& asApp, const std::string& asCommand, std::string_view asEncoded,
+                 const std::weak_ptr<bool>& alive);
+    bool AnswerBytes(VELTRAEvent* pCommand, std::string_view asData);
     unsigned char SendCommand(const std::string& asApp, const std::string& asCommand,
                               const MyMemoryBlock& axData,
                               const boost::function<bool()>& fKeepTrying, PeerStart axStart);
@@ -230,6 +231,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
                     int alPid, std::chrono::milliseconds pause);
     void SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend, PeerStart axStart);
     void ArmAsync(const RequestPtr& pRequest);
+    RequestPtr NewBlockingRequest();
     void Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlock axData,
                 std::string asError);
     void CloseWhenUnused();
@@ -243,6 +245,7 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // An emptied queue stays until its peer's channel is lost.
     std::map<std::pair<std::string, int>, std::deque<RequestPtr>> amOutstanding;
     std::vector<RequestPtr> amAsync;  // asynchronous requests whose call-back is to come
+    RequestPtr amSpareRequest;        // the last blocking request's record, reused when free
     std::map<int, PeerLostFunction> amPeerLostFunctions;
     int amNextPeerLostId = 1;
     AutoTimer amTimer;

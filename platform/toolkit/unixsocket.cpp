@@ -114,6 +114,10 @@ void SocketCalls::MakeOwnerOnly(const std::string& path) {
     ::chmod(path.c_str(), 0600);
 }
 
+bool SocketCalls::RenameSocketFile(const std::string& from, const std::string& to) {
+    return ::rename(from.c_str(), to.c_str()) == 0;
+}
+
 void SocketCalls::KeepFromChildren(int fd) {
     ::fcntl(fd, F_SETFD, FD_CLOEXEC);
 }

@@ -73,10 +73,6 @@ const std::string& TimeStamp() {
     return cached;
 }
 
-// Counts changes of any log's options; CachedLogOption compares against it.
-// Starts at 1 so that a cached state of 0 always means "not looked up".
-std::atomic<std::uint64_t> gOptionsVersion{1};
-
 // ---- where options come from ----
 
 std::map<std::string, std::string> OptionsFromEnvironment() {
@@ -203,7 +199,7 @@ LogFile::LogFile(const std::string& name) {
     } catch (const std::exception& e) {
         std::fprintf(stderr, "Error creating LogFile instance: %s\n", e.what());
     }
-    gOptionsVersion.fetch_add(1, std::memory_order_acq_rel);
+    nxbase::CachedLogOption::smVersion.fetch_add(1, std::memory_order_acq_rel);
     fileName = ResolveLogPath(name, pathOption);
     WriteLog(String("Starting log"), String());
     if (loggedLines == 0) std::fprintf(stderr, "Error writing LogFile: %s\n", fileName.c_str());
@@ -266,7 +262,7 @@ std::uint8_t LogFile::ChangeKeyState(const std::string& key, std::uint8_t set, s
 
 void LogFile::SetLogOption(const std::string& key, bool enable) {
     ChangeKeyState(key, enable ? kEnabled : 0, enable ? 0 : kEnabled);
-    gOptionsVersion.fetch_add(1, std::memory_order_acq_rel);
+    nxbase::CachedLogOption::smVersion.fetch_add(1, std::memory_order_acq_rel);
     if (key == kUnlimited) {
         CriticalSection section(kLogWrite);
         unlimited = enable;
@@ -439,12 +435,12 @@ std::uint32_t AutoLog::GetAutoLogCounter() {
     return smAutoLogCounter.load();
 }
 
-bool nxbase::CachedLogOption::Enabled() {
-    const std::uint64_t version = gOptionsVersion.load(std::memory_order_acquire);
-    const std::uint64_t state = amState.load(std::memory_order_relaxed);
-    if ((state >> 1) == version) return (state & 1) != 0;
+std::atomic<std::uint64_t> nxbase::CachedLogOption::smVersion{1};
+
+bool nxbase::CachedLogOption::LookUp() {
     // Read the version before the options: a change in between leaves a stale
     // version behind, and the next call looks again.
+    const std::uint64_t version = smVersion.load(std::memory_order_acquire);
     const bool enabled = LogFile::Instance()->IsLogOptionEnabled(amKey);
     amState.store((version << 1) | (enabled ? 1 : 0), std::memory_order_relaxed);
     return enabled;

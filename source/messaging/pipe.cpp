@@ -64,6 +64,8 @@ using Stage = detail::Channel::Stage;
 constexpr const char* kLogKey = "Communication";
 constexpr int kReadsPerTurn = 16;
 constexpr int kListenBacklog = 64;
+// Up to this capacity a frame's body is kept as its command text.
+constexpr std::size_t kBodyKeptAsCommand = 1024;
 constexpr auto kFirstAcceptPause = std::chrono::milliseconds(100);
 constexpr auto kLongestAcceptPause = std::chrono::milliseconds(1000);
 const std::string kDisconnect = "DISCONNECT";
@@ -279,18 +281,24 @@ void Pipe::Listen() {
             "Pipe: " + amOwnName + " " +
             (why == "running already" ? why + " (" + amSocketPath + ")" : why));
     }
-    toolkit::Sockets().RemoveSocketFile(amSocketPath);
+    // Bound, listening and made private under a name of its own first, then
+    // renamed into place: a peer that finds the socket can connect at once.
+    const std::string bound = directory + "/.bind-" + amProcessId;
+    toolkit::Sockets().RemoveSocketFile(bound);
     auto& context = Application::Get().GetContext();
     pmListener = std::make_unique<Listener>(context);
     boost::system::error_code error;
-    boost::asio::local::stream_protocol::endpoint endpoint(amSocketPath);
+    boost::asio::local::stream_protocol::endpoint endpoint(bound);
     pmListener->acceptor.open(endpoint.protocol(), error);
     if (!error) pmListener->acceptor.bind(endpoint, error);
     if (!error) pmListener->acceptor.listen(nxbase::kListenBacklog, error);
+    if (!error) toolkit::Sockets().MakeOwnerOnly(bound);
+    if (!error && !toolkit::Sockets().RenameSocketFile(bound, amSocketPath))
+        error.assign(errno, boost::system::system_category());
     if (error) {
+        toolkit::Sockets().RemoveSocketFile(bound);
         throw std::runtime_error("Pipe: cannot listen on " + amSocketPath + ": " + error.message());
     }
-    toolkit::Sockets().MakeOwnerOnly(amSocketPath);
     // Started peers must not inherit the listener (they would keep the name alive).
     toolkit::Sockets().KeepFromChildren(pmListener->acceptor.native_handle());
     Accept();
@@ -358,67 +366,81 @@ void Pipe::AddChannel(const ChannelPtr& axChannel) {
 
 // ---- reading ----
 
-// A read, not a readiness wait: the reactor reads as soon as the socket is
-// readable, and re-arming needs no change of the descriptor's registration.
+// A readiness wait, not a read: every read is made here, when it is handled,
+// so that a read outside the loop (ReadArrived) can never overtake bytes the
+// reactor took but whose handler has not run yet.
 void Pipe::ArmRead(const ChannelPtr& axChannel) {
-    axChannel->socket.async_read_some(
-        boost::asio::buffer(axChannel->input),
-        [this, axChannel](const boost::system::error_code& error, std::size_t alRead) {
-            if (axChannel->closed) return;
-            OnRead(axChannel, error, alRead);
-        });
+    axChannel->socket.async_wait(nxbase::Socket::wait_read,
+                                 [this, axChannel](const boost::system::error_code& error) {
+                                     if (axChannel->closed) return;
+                                     if (error) {
+                                         Close(axChannel, error.message());
+                                         return;
+                                     }
+                                     OnReadable(axChannel);
+                                 });
 }
 
-void Pipe::OnRead(const ChannelPtr& axChannel, const boost::system::error_code& axError,
-                  std::size_t alRead) {
-    std::size_t before = axChannel->reader.Buffered();
-    if (!axError) axChannel->reader.Append(axChannel->input.data(), alRead);
-    bool ended = axError == boost::asio::error::eof;
-    if (axError && !ended) {
-        Close(axChannel, axError.message());
-        return;
-    }
-    // A full buffer: take the rest that is there now, a bounded amount per turn.
-    int fd = axChannel->socket.native_handle();
-    for (int round = 0;
-         !ended && alRead == axChannel->input.size() && round < nxbase::kReadsPerTurn; ++round) {
+void Pipe::OnReadable(const ChannelPtr& axChannel) {
+    // Nothing to read when ReadArrived took it first.
+    const bool read = ReadOnce(axChannel);
+    if (axChannel->closed) return;
+    // Wait on before delivering: a handler that waits for an answer on this
+    // channel must be able to receive it.
+    ArmRead(axChannel);
+    if (read) Deliver(axChannel);
+}
+
+bool Pipe::ReadArrived(std::uint64_t alChannel) {
+    auto at = amAllChannels.find(alChannel);
+    if (at == amAllChannels.end() || at->second->closed) return false;
+    ChannelPtr channel = at->second;  // a handler may close it or delete this transport
+    // The loop's wait stays armed: it finds nothing, or what comes later.
+    if (!ReadOnce(channel) && !channel->closed) return false;
+    Deliver(channel);
+    return true;
+}
+
+// Reads what is there (after a full buffer on, a bounded amount per turn)
+// and splits it into frames; false when nothing was there (the channel
+// stays open) or the channel was closed.
+bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
+    const int fd = axChannel->socket.native_handle();
+    const std::size_t before = axChannel->reader.Buffered();
+    bool read = false;
+    for (int round = 0; round <= nxbase::kReadsPerTurn; ++round) {
         ssize_t n =
             toolkit::Sockets().Receive(fd, axChannel->input.data(), axChannel->input.size());
         if (n > 0) {
             axChannel->reader.Append(axChannel->input.data(), static_cast<std::size_t>(n));
-            alRead = static_cast<std::size_t>(n);
+            read = true;
+            if (static_cast<std::size_t>(n) < axChannel->input.size()) break;
             continue;
         }
         if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
         if (n < 0) {
             Close(axChannel, std::strerror(errno));
-            return;
+        } else {
+            Close(axChannel, axChannel->reader.Buffered() > 0
+                                 ? "malformed frame (end of file inside a frame)"
+                                 : "end of file");
         }
-        ended = true;
+        return false;
     }
-    if (ended) {
-        Close(axChannel, axChannel->reader.Buffered() > 0
-                             ? "malformed frame (end of file inside a frame)"
-                             : "end of file");
-        return;
-    }
+    if (!read) return false;
     std::string body;
     while (true) {
         FrameReader::Result result = axChannel->reader.Next(body);
         if (result == FrameReader::Result::kNeedMore) break;
         if (result == FrameReader::Result::kMalformed) {
             Close(axChannel, "malformed frame (length above the limit)");
-            return;
+            return false;
         }
         axChannel->pending.push_back(std::move(body));
     }
     amPartialBytes = amPartialBytes + axChannel->reader.Buffered() - before;
     LimitPartialFrames();
-    if (axChannel->closed) return;
-    // Read on before delivering: a handler that waits for an answer on this
-    // channel must be able to receive it.
-    ArmRead(axChannel);
-    Deliver(axChannel);
+    return !axChannel->closed;
 }
 
 // Many peers each holding most of a large frame would add up without bound.
@@ -512,7 +534,6 @@ void Pipe::HandleBody(const ChannelPtr& axChannel, std::string&& asBody) {
         return;
     }
     std::string sender = asBody.substr(0, first);
-    std::string command = asBody.substr(first + 1, second - first - 1);
     if (sender != axChannel->peer) {
         // Answers go back on the channel, so a false name could only be used
         // to make us call (or answer) somebody else.
@@ -520,13 +541,22 @@ void Pipe::HandleBody(const ChannelPtr& axChannel, std::string&& asBody) {
                           "; dropped");
         return;
     }
-    // The data is decoded in place and copied once into its block; the body
-    // is freed before the event is handled, so a frame is never held twice.
+    // The data is decoded in place and copied once into its block. The body
+    // of a small frame then becomes the command text; a larger one is freed
+    // before the event is handled, so a frame is never held twice.
     char* data = asBody.data() + second + 1;
     std::size_t size = nxbase::DecodeInPlace(data, asBody.size() - second - 1);
     MyMemoryBlock block(static_cast<long>(size));
     block.Put(data, static_cast<long>(size));
-    std::string().swap(asBody);
+    std::string command;
+    if (asBody.capacity() <= nxbase::kBodyKeptAsCommand) {
+        asBody.resize(second);
+        asBody.erase(0, first + 1);
+        command.swap(asBody);
+    } else {
+        command.assign(asBody, first + 1, second - first - 1);
+        std::string().swap(asBody);
+    }
     if (nxbase::detail::CommunicationLogged()) {
         nxbase::Log("Pipe::PollForData <- " + sender + " " + command);
     }

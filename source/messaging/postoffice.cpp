@@ -48,13 +48,15 @@ String Number(long alValue) {
 // office's: a send survives the office's destruction by a handler it ran.
 class StuffedData {
   public:
-    explicit StuffedData(const MyMemoryBlock& axData)
+    explicit StuffedData(std::string_view asData)
         : amOuter(!tlInUse), amBytes(amOuter ? tlKept : amNested) {
         tlInUse = true;
         amBytes.clear();
-        nxbase::AppendEncoded(amBytes, axData.GetDatenZeiger(),
-                              static_cast<std::size_t>(axData.Len()));
+        nxbase::AppendEncoded(amBytes, asData.data(), asData.size());
     }
+    explicit StuffedData(const MyMemoryBlock& axData)
+        : StuffedData(
+              std::string_view(axData.GetDatenZeiger(), static_cast<std::size_t>(axData.Len()))) {}
     ~StuffedData() {
         if (!amOuter) return;
         tlInUse = false;
@@ -117,7 +119,7 @@ PostOffice::PostOffice(const String& asAppName)
     pipe->SetApplications(&amApplications);
     std::weak_ptr<bool> alive = amAlive;
     pipe->SetChannelLostFunction([this, alive](const std::string& asApp) {
-        if (alive.lock()) PeerLost(asApp);
+        if (!alive.expired()) PeerLost(asApp);
     });
     amTimer.SetTimeout(kTickMs);
     amTimer.SetTimeoutHdl(LINK(PostOffice, this, TimerCallback));
@@ -395,12 +397,12 @@ void PostOffice::PeerLost(const std::string& asApp) {
     // the call-backs of the requests the loss fails.
     std::weak_ptr<bool> alive = amAlive;
     Application::Get().Post([this, alive, asApp] {
-        if (!alive.lock()) return;
+        if (alive.expired()) return;
         for (auto at = amPeerLostFunctions.begin(); at != amPeerLostFunctions.end();) {
             int id = at->first;
             PeerLostFunction function = at->second;
             function(asApp);
-            if (!alive.lock()) return;
+            if (alive.expired()) return;
             at = amPeerLostFunctions.upper_bound(id);
         }
     });
@@ -462,7 +464,7 @@ void PostOffice::ScheduleHandler() {
     amHandlerScheduled = true;
     std::weak_ptr<bool> alive = amAlive;
     Application::Get().Post([this, alive] {
-        if (!alive.lock()) return;
+        if (alive.expired()) return;
         amHandlerScheduled = false;
         BotschaftenHandler();
     });
@@ -529,9 +531,7 @@ long PostOffice::DefaultHdl(void* pEvent) {
         NX_COMM_LOG(String("Default Hdl - Message Nr: ") + Number(number) + " not supported");
         status = nxbase::kNotSupported;
     }
-    MyMemoryBlock answer(1);
-    answer << status;
-    if (Answer(event, answer)) return 0;
+    if (AnswerBytes(event, std::string_view(reinterpret_cast<const char*>(&status), 1))) return 0;
     // A peer that has gone (its DISCONNECT, then its channel's end) needs no
     // answer, and the user no box.
     Pipe* pipe = Pipe::Instance();
@@ -546,14 +546,17 @@ long PostOffice::DefaultHdl(void* pEvent) {
 }
 
 void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
-    MyMemoryBlock answer(1);
-    answer << axStatus;
-    Answer(&axEvent, answer);
+    AnswerBytes(&axEvent, std::string_view(reinterpret_cast<const char*>(&axStatus), 1));
 }
 
 // ---- sending ----
 
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
+    return AnswerBytes(pCommand, std::string_view(axData.GetDatenZeiger(),
+                                                  static_cast<std::size_t>(axData.Len())));
+}
+
+bool PostOffice::AnswerBytes(VELTRAEvent* pCommand, std::string_view asData) {
     NX_COMM_LOG(String("PostOffice - Answering message") + " " + String(pCommand->GetCommand()));
     std::string unlisted;
     const int number = pCommand->GetNumber();
@@ -566,7 +569,7 @@ unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
     // Back on the transport and connection the command came by: the
     // requester takes its answer only there.
     if (pipe != nullptr) {
-        StuffedData encoded(axData);
+        StuffedData encoded(asData);
         sent = pCommand->GetChannel() == 0
                    ? pipe->AnswerByDde(pCommand->GetSender(), command, encoded.Bytes())
                    : pipe->SendOnChannel(pCommand->GetChannel(), command, encoded.Bytes());
@@ -600,11 +603,10 @@ unsigned char PostOffice::Send(const std::string& asApp, PO_Botschaften axMessag
 // One attempt. False also when the post office was destroyed meanwhile (by a
 // handler the transport's wait ran): then nothing of it may be touched.
 bool PostOffice::TryOnce(const std::string& asApp, const std::string& asCommand,
-                         std::string_view asEncoded) {
-    std::weak_ptr<bool> alive = amAlive;
+                         std::string_view asEncoded, const std::weak_ptr<bool>& alive) {
     Pipe* pipe = Pipe::Instance();
     bool sent = pipe != nullptr && pipe->Send(asApp, asCommand, asEncoded);
-    if (!alive.lock()) return false;
+    if (alive.expired()) return false;
     if (sent) return true;
     pipe = Pipe::Instance();
     amLastError = pipe ? pipe->GetLastError() : std::string("no transport");
@@ -634,15 +636,15 @@ unsigned char PostOffice::SendCommand(const std::string& asApp, const std::strin
     if (fKeepTrying) keepTrying = [&fKeepTrying] { return fKeepTrying(); };
     Pipe::SendScope scope(Pipe::Instance(), std::move(keepTrying), axStart == PeerStart::kIfNeeded);
     for (int retries = 0;;) {
-        if (TryOnce(asApp, command, encoded.Bytes())) {
+        if (TryOnce(asApp, command, encoded.Bytes(), alive)) {
             NX_COMM_LOG(String("Sent: ") + String(command));
             return true;
         }
         ++retries;
         // The loop runs between tries; a handler it runs may close this office.
-        for (int i = 0; i < 10 && alive.lock(); ++i) Application::Get().Reschedule();
-        if (alive.lock()) Application::Get().RunOneFor(std::chrono::milliseconds(1));
-        if (!alive.lock()) return false;
+        for (int i = 0; i < 10 && !alive.expired(); ++i) Application::Get().Reschedule();
+        if (!alive.expired()) Application::Get().RunOneFor(std::chrono::milliseconds(1));
+        if (alive.expired()) return false;
         NX_COMM_LOG("*** Send failed ***");
         NX_COMM_LOG(String("Retry ") + Number(retries));
         if (LogFile::Instance()->IsLogOptionEnabled(String("Acoustic"))) {
@@ -673,6 +675,17 @@ bool PostOffice::SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& ax
     return true;
 }
 
+// The record of the last blocking request is taken again once nobody holds
+// it (its answer came): a round trip allocates none.
+PostOffice::RequestPtr PostOffice::NewBlockingRequest() {
+    if (amSpareRequest && amSpareRequest.use_count() == 1) {
+        *amSpareRequest = Request();
+        return amSpareRequest;
+    }
+    amSpareRequest = std::make_shared<Request>();
+    return amSpareRequest;
+}
+
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
                                          boost::function<bool()> fKeepWaiting, DisEnable axMode,
@@ -681,8 +694,9 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     if (nxbase::detail::CommunicationLogged()) {
         scope.emplace(String("SendAndReceive (") + Number(alMessage), String(kLogKey));
     }
-    auto ui = UserInterface::Current();
-    bool touchWindow = axMode != DisEnableNone && ui->HasTopWindow();
+    // The user interface is looked up (under its lock) only when asked for.
+    auto ui = axMode != DisEnableNone ? UserInterface::Current() : nullptr;
+    bool touchWindow = ui && ui->HasTopWindow();
     bool wasEnabled = touchWindow && ui->IsTopWindowEnabled();
     if (touchWindow) ui->EnableTopWindow(false);
     struct RestoreWindow {
@@ -696,12 +710,12 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     // Everything the wait needs lives in the request: a handler run by the
     // wait may destroy the post office.
     std::weak_ptr<bool> alive = amAlive;
-    auto request = std::make_shared<Request>();
+    RequestPtr request = NewBlockingRequest();
     request->key = {asApp, kAnswerOffset + alMessage};
     // The caller's wish to stop waiting also ends the sending, which may
     // wait for a peer that was just started.
     if (!SendRequest(request, axSend, fKeepWaiting, axStart)) {
-        if (alive.lock()) NX_COMM_LOG("SendAndReceive, Send failed");
+        if (!alive.expired()) NX_COMM_LOG("SendAndReceive, Send failed");
         return false;
     }
     {
@@ -711,6 +725,9 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         }
         std::function<bool()> keepWaiting;
         if (fKeepWaiting) keepWaiting = [&fKeepWaiting] { return fKeepWaiting(); };
+        // A peer on this CPU has often answered before the send returned.
+        if (Pipe* pipe = Pipe::Instance(); pipe != nullptr && request->channel != 0)
+            pipe->ReadArrived(request->channel);
         auto end =
             Application::Get().RunUntil([&request] { return request->finished; }, keepWaiting);
         if (end != Application::WaitEnd::kReady) {
@@ -720,7 +737,7 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
                                                                  : "; the wait was given up");
         }
     }
-    if (!alive.lock()) return false;
+    if (alive.expired()) return false;
     if (!request->answered) {
         amLastError = request->error;
         NX_COMM_LOG("SendAndReceive, Abort");
@@ -773,7 +790,7 @@ void PostOffice::SendAndReceiveAsync(const std::string& asApp, int alMessage,
                                      const MyMemoryBlock& axSend, AnswerCallback fDone,
                                      std::chrono::milliseconds timeout,
                                      boost::function<bool()> fKeepWaiting, PeerStart axStart) {
-    auto request = std::make_shared<Request>();
+    RequestPtr request = NewBlockingRequest();
     request->key = {asApp, kAnswerOffset + alMessage};
     request->async = true;
     request->done = std::move(fDone);
@@ -790,7 +807,7 @@ void PostOffice::SendAndReceiveAsync(const std::string& asApp, int alMessage,
     // peer has to be started first.
     std::weak_ptr<bool> alive = amAlive;
     Application::Get().Post([this, alive, request, axSend, axStart] {
-        if (alive.lock() && !request->finished) StartAsync(request, axSend, axStart);
+        if (!alive.expired() && !request->finished) StartAsync(request, axSend, axStart);
     });
 }
 
@@ -823,7 +840,7 @@ void PostOffice::AwaitStart(const RequestPtr& pRequest, std::shared_ptr<const My
         std::min(std::chrono::steady_clock::now() + pause, pRequest->deadline));
     std::weak_ptr<bool> alive = amAlive;
     pRequest->timer->async_wait([=, this](const boost::system::error_code& error) {
-        if (error || !alive.lock() || pRequest->finished) return;
+        if (error || alive.expired() || pRequest->finished) return;
         const std::string& app = pRequest->key.first;
         Pipe* pipe = Pipe::Instance();
         std::string how;
@@ -861,7 +878,7 @@ void PostOffice::SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSe
                (!pRequest->keepWaiting || pRequest->keepWaiting());
     };
     if (!SendRequest(pRequest, axSend, keepTrying, axStart)) {
-        if (!alive.lock()) return;
+        if (alive.expired()) return;
         std::string why = std::chrono::steady_clock::now() >= pRequest->deadline
                               ? "no answer from " + pRequest->key.first + " within " +
                                     std::to_string(pRequest->timeout.count()) + " ms (" +
@@ -881,7 +898,7 @@ void PostOffice::ArmAsync(const RequestPtr& pRequest) {
     pRequest->timer->expires_at(next);
     std::weak_ptr<bool> alive = amAlive;
     pRequest->timer->async_wait([this, alive, pRequest](const boost::system::error_code& error) {
-        if (error || !alive.lock() || pRequest->finished) return;
+        if (error || alive.expired() || pRequest->finished) return;
         const std::string& app = pRequest->key.first;
         if (std::chrono::steady_clock::now() >= pRequest->deadline) {
             Finish(pRequest, false, MyMemoryBlock(),

@@ -41,6 +41,9 @@ class NXBASE_EXPORT SocketCalls {
     virtual void RemoveSocketFile(const std::string& path);
     // Lets only this user connect to the socket file at `path` (mode 0600).
     virtual void MakeOwnerOnly(const std::string& path);
+    // Renames the socket file `from` to `to` (replacing what is there): false,
+    // errno set, when it failed.
+    virtual bool RenameSocketFile(const std::string& from, const std::string& to);
     // Keeps `fd` from programs this process starts (close-on-exec).
     virtual void KeepFromChildren(int fd);
     // Closes a descriptor these calls gave.
