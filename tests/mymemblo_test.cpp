@@ -3,7 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <climits>
+#include <cstdint>
 #include <cstring>
+#include <random>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -331,6 +333,54 @@ TEST(FlagSet, TwoIntsAreARangeThatSerialisesByIndexAndReadsBackFromZero) {
     EXPECT_EQ(back.Low(), 0);
     EXPECT_EQ(back.Count(), 137);
     for (int i = 0; i < 137; ++i) EXPECT_EQ(back.GetFlag(i), messages.GetFlag(i - 2)) << i;
+}
+
+// Random runs of writes into blocks of random first sizes (so that growth
+// falls anywhere, also inside a text) against bytes laid out by hand.
+TEST(MyMemoryBlock, WritesAgreeWithAHandMadeImageOverRandomRuns) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    auto put = [](Bytes& model, std::uint32_t value, int size) {
+        for (int i = 0; i < size; ++i)
+            model.push_back(static_cast<unsigned char>(value >> (8 * i)));
+    };
+    for (int run = 0; run < 300; ++run) {
+        MyMemoryBlock block(static_cast<long>(random() % 40));
+        Bytes model;
+        for (int step = random() % 60; step > 0; --step) {
+            const std::uint32_t value = random();
+            switch (random() % 6) {
+                case 0:
+                    block << static_cast<char>(value);
+                    put(model, value, 1);
+                    break;
+                case 1:
+                    block << static_cast<unsigned char>(value);
+                    put(model, value, 1);
+                    break;
+                case 2:
+                    block << static_cast<short>(value);
+                    put(model, value, 2);
+                    break;
+                case 3:
+                    block << static_cast<int>(value);
+                    put(model, value, 4);
+                    break;
+                case 4:
+                    block << static_cast<long>(static_cast<std::int32_t>(value));
+                    put(model, value, 4);
+                    break;
+                default: {
+                    const std::string text(random() % 40, static_cast<char>('a' + value % 26));
+                    block << String(text);
+                    model.insert(model.end(), text.begin(), text.end());
+                    model.push_back(0);
+                }
+            }
+        }
+        ASSERT_EQ(Image(block), model) << "run " << run;
+    }
 }
 
 }  // namespace

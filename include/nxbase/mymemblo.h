@@ -25,6 +25,7 @@
 #define NXBASE_MYMEMBLO_H_
 
 #include <cstdint>
+#include <cstring>
 #include <iosfwd>
 #include <vector>
 
@@ -138,14 +139,30 @@ class NXBASE_EXPORT MyMemoryBlock {
     bool ReadPastEnd() const { return readPastEnd; }
     void ClearReadError() { readPastEnd = false; }
 
-    MyMemoryBlock& operator<<(char axValue);
-    MyMemoryBlock& operator<<(unsigned char axValue);
-    MyMemoryBlock& operator<<(signed char axValue);  // one byte, as char
-    MyMemoryBlock& operator<<(short axValue);
-    MyMemoryBlock& operator<<(unsigned short axValue);
-    MyMemoryBlock& operator<<(int axValue);
-    MyMemoryBlock& operator<<(long axValue);
-    MyMemoryBlock& operator<<(const String& asValue);
+    // The writers of numbers and texts are inline: while the room is there,
+    // a value costs a store, as writing its bytes by hand would.
+    MyMemoryBlock& operator<<(char axValue) { return PutLittleEndian<1>(std::uint8_t(axValue)); }
+    MyMemoryBlock& operator<<(unsigned char axValue) { return PutLittleEndian<1>(axValue); }
+    // One byte, as char.
+    MyMemoryBlock& operator<<(signed char axValue) {
+        return PutLittleEndian<1>(std::uint8_t(axValue));
+    }
+    MyMemoryBlock& operator<<(short axValue) { return PutLittleEndian<2>(std::uint16_t(axValue)); }
+    MyMemoryBlock& operator<<(unsigned short axValue) { return PutLittleEndian<2>(axValue); }
+    MyMemoryBlock& operator<<(int axValue) { return PutLittleEndian<4>(std::uint32_t(axValue)); }
+    // The low 32 bits, as a 32-bit long would carry them.
+    MyMemoryBlock& operator<<(long axValue) { return PutLittleEndian<4>(std::uint32_t(axValue)); }
+    // The characters and the terminating zero.
+    MyMemoryBlock& operator<<(const String& asValue) {
+        const long count = static_cast<long>(asValue.Len()) + 1;
+        if (capacity - length >= count) {
+            CopyBytes(putPointer, asValue.GetBuffer(), static_cast<std::size_t>(count));
+            Advance(count);
+        } else {
+            Put(asValue.GetBuffer(), count);
+        }
+        return *this;
+    }
     // The characters without a terminating zero: read them back with Get and
     // a known length, not with the String reader.
     MyMemoryBlock& operator<<(const char* asValue);
@@ -178,9 +195,44 @@ class NXBASE_EXPORT MyMemoryBlock {
     // Resizes the storage to `alCapacity` bytes (>= length), in place or
     // moved, keeping the content; the positions follow it.
     void Reallocate(std::int32_t alCapacity);
-    // Fixed-size helpers for the scalar operators (defined in the .cpp only).
     template <int N>
-    void PutBytes(const unsigned char* p);
+    MyMemoryBlock& PutLittleEndian(std::uint32_t axValue) {
+        // On a little-endian host the value's first N bytes are the image
+        // already; bytes assembled one by one would stall the store that
+        // follows them.
+        unsigned char bytes[4];
+#if defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+        std::memcpy(bytes, &axValue, 4);
+#else
+        for (int i = 0; i < N; ++i) bytes[i] = static_cast<unsigned char>(axValue >> (8 * i));
+#endif
+        if (capacity - length >= N) {
+            std::memcpy(putPointer, bytes, N);
+            Advance(N);
+        } else {
+            Put(bytes, N);
+        }
+        return *this;
+    }
+    // A copy of the short texts most values are, without a call.
+    static void CopyBytes(char* to, const char* from, std::size_t count) {
+        if (count > 16) {
+            std::memcpy(to, from, count);
+        } else if (count >= 8) {  // two overlapping words
+            std::memcpy(to, from, 8);
+            std::memcpy(to + count - 8, from + count - 8, 8);
+        } else if (count >= 4) {
+            std::memcpy(to, from, 4);
+            std::memcpy(to + count - 4, from + count - 4, 4);
+        } else {
+            for (std::size_t i = 0; i < count; ++i) to[i] = from[i];
+        }
+    }
+    void Advance(long alCount) {
+        putPointer += alCount;
+        length += static_cast<std::int32_t>(alCount);
+    }
+    // The fixed-size helper of the number readers (defined in the .cpp only).
     template <int N>
     void GetBytes(unsigned char* p);
 

@@ -283,19 +283,6 @@ void MyMemoryBlock::RestoreWritePointer() {
 }
 
 template <int N>
-void MyMemoryBlock::PutBytes(const unsigned char* p) {
-    // Fast path for the scalar writers: when the room is there, a fixed-size
-    // copy without the growth check.
-    if (capacity - length >= N) {
-        std::memcpy(putPointer, p, N);
-        putPointer += N;
-        length += N;
-        return;
-    }
-    Put(p, N);
-}
-
-template <int N>
 void MyMemoryBlock::GetBytes(unsigned char* p) {
     if (Remaining() >= N) {
         std::memcpy(p, getPointer, N);
@@ -307,54 +294,10 @@ void MyMemoryBlock::GetBytes(unsigned char* p) {
 
 // ------------------------------------------------------------- writers
 
-MyMemoryBlock& MyMemoryBlock::operator<<(signed char axValue) {
-    return *this << static_cast<char>(axValue);
-}
-
 MyMemoryBlock& MyMemoryBlock::operator>>(signed char& axValue) {
     char value = static_cast<char>(axValue);
     *this >> value;
     axValue = static_cast<signed char>(value);
-    return *this;
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(char axValue) {
-    unsigned char byte = static_cast<unsigned char>(axValue);
-    PutBytes<1>(&byte);
-    return *this;
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(unsigned char axValue) {
-    PutBytes<1>(&axValue);
-    return *this;
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(short axValue) {
-    return *this << static_cast<unsigned short>(axValue);
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(unsigned short axValue) {
-    unsigned char bytes[2];
-    Encode<2>(axValue, bytes);
-    PutBytes<2>(bytes);
-    return *this;
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(int axValue) {
-    unsigned char bytes[4];
-    Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
-    PutBytes<4>(bytes);
-    return *this;
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(long axValue) {
-    // The low 32 bits, as a 32-bit long would carry them.
-    return *this << static_cast<int>(static_cast<std::uint32_t>(axValue));
-}
-
-MyMemoryBlock& MyMemoryBlock::operator<<(const String& asValue) {
-    // GetBuffer() carries the terminating zero.
-    Put(asValue.GetBuffer(), static_cast<long>(asValue.Len()) + 1);
     return *this;
 }
 
@@ -368,8 +311,7 @@ MyMemoryBlock& MyMemoryBlock::operator<<(const FlagSet& axValue) {
     *this << count;
     CheckSize(count);
     for (int i = 0; i < count; ++i) {
-        unsigned char byte = axValue.GetFlag(axValue.Low() + i);
-        PutBytes<1>(&byte);
+        *this << static_cast<unsigned char>(axValue.GetFlag(axValue.Low() + i));
     }
     return *this;
 }
