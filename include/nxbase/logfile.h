@@ -177,13 +177,15 @@ class NXBASE_EXPORT CachedLogOption {
         if ((state >> 1) == smVersion.load(std::memory_order_acquire)) return (state & 1) != 0;
         return LookUp();
     }
+    // Makes every cached option look again: the log's options changed.
+    static void OptionsChanged() { smVersion.fetch_add(1, std::memory_order_acq_rel); }
+
+  private:
+    bool LookUp();
 
     // Counts changes of any log's options; starts at 1, so that a state of 0
     // always means "not looked up".
     static std::atomic<std::uint64_t> smVersion;
-
-  private:
-    bool LookUp();
 
     const String amKey;
     // (options version << 1) | enabled; 0 before the first look-up.

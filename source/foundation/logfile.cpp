@@ -199,7 +199,7 @@ LogFile::LogFile(const std::string& name) {
     } catch (const std::exception& e) {
         std::fprintf(stderr, "Error creating LogFile instance: %s\n", e.what());
     }
-    nxbase::CachedLogOption::smVersion.fetch_add(1, std::memory_order_acq_rel);
+    nxbase::CachedLogOption::OptionsChanged();
     fileName = ResolveLogPath(name, pathOption);
     WriteLog(String("Starting log"), String());
     if (loggedLines == 0) std::fprintf(stderr, "Error writing LogFile: %s\n", fileName.c_str());
@@ -262,7 +262,7 @@ std::uint8_t LogFile::ChangeKeyState(const std::string& key, std::uint8_t set, s
 
 void LogFile::SetLogOption(const std::string& key, bool enable) {
     ChangeKeyState(key, enable ? kEnabled : 0, enable ? 0 : kEnabled);
-    nxbase::CachedLogOption::smVersion.fetch_add(1, std::memory_order_acq_rel);
+    nxbase::CachedLogOption::OptionsChanged();
     if (key == kUnlimited) {
         CriticalSection section(kLogWrite);
         unlimited = enable;

@@ -676,7 +676,7 @@ bool PostOffice::SendRequest(const RequestPtr& pRequest, const MyMemoryBlock& ax
 }
 
 // The record of the last blocking request is taken again once nobody holds
-// it (its answer came): a round trip allocates none.
+// it (its answer came): a request in turn allocates no record of its own.
 PostOffice::RequestPtr PostOffice::NewBlockingRequest() {
     if (amSpareRequest && amSpareRequest.use_count() == 1) {
         *amSpareRequest = Request();
