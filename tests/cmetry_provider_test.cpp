@@ -206,15 +206,19 @@ TEST_F(CMetryProviderInDataDir, InstalledDensityTableMakesAStandardExist) {
     // A made-up narrow-band table: it exercises loading, it is no real curve.
     nxtest::WriteFile(Density("din_nb"),
                       "wavelength,red,green,blue\n"
+                      "380,-10,3.0,-10\n"  // the grid's first and last rows count too
                       "440,-10,-10,5.0\n450,-10,-10,4.0\n"
                       "540,-10,5.0,-10\n550,-10,4.7,-10\n"
-                      "620,5.0,-10,-10\n630,4.0,-10,-10\n");
+                      "620,5.0,-10,-10\n630,4.0,-10,-10\n"
+                      "730,2.0,-10,-10\n");
     ASSERT_TRUE(cm::DensityStandardRepository::Exists("DIN NB"));
     const auto standard = cm::DensityStandardRepository::Get("DIN NB");
     EXPECT_EQ(standard->GetChannelName(2), "blue");
     EXPECT_DOUBLE_EQ(standard->GetProducts(2)[(440 - 380) / 10], 1.0);
     EXPECT_DOUBLE_EQ(standard->GetProducts(2)[(450 - 380) / 10], 0.1);
     EXPECT_DOUBLE_EQ(standard->GetProducts(1)[(550 - 380) / 10], std::pow(10.0, -0.3));
+    EXPECT_DOUBLE_EQ(standard->GetProducts(1)[0], 0.01);
+    EXPECT_DOUBLE_EQ(standard->GetProducts(0)[(730 - 380) / 10], 0.001);
     EXPECT_FALSE(cm::DensityStandardRepository::Exists("DIN"));
 
     nxtest::WriteFile(Density("spi"), "wavelength,red\n445,5\n455,5\n");
