@@ -172,11 +172,12 @@ class NXBASE_EXPORT Pipe {
     // VELTRAEvent::GetChannel() id); 0 when it went by DDE.
     std::uint64_t GetLastSendChannel() const { return amLastSendChannel; }
     // Takes what has already arrived on connection `alChannel`, without
-    // waiting, and delivers its frames as the loop would; false when nothing
-    // was there. A caller about to wait for an answer tries this first: a
-    // peer on the same CPU has often answered by the time its send returns,
-    // and the loop's readiness wait and re-armed read would find it later.
-    // The receive function may delete the transport meanwhile.
+    // waiting, and delivers its frames as the loop would (an ended connection
+    // is closed); false when nothing was there. A caller about to wait for an
+    // answer tries this first: a peer on the same CPU has often answered by
+    // the time its send returns, and the loop would spend a readiness wait
+    // and a re-arming to find it. The receive function may delete the
+    // transport meanwhile.
     bool ReadArrived(std::uint64_t alChannel);
     // The id of the open channel to `asApp`, 0 when there is none.
     std::uint64_t ChannelId(const std::string& asApp) const;
