@@ -114,7 +114,7 @@ class NXBASE_EXPORT MyMemoryBlock {
     // data and leaves the rest of `p` unchanged (sets ReadPastEnd()).
     long Get(void* p, long alCount);
 
-    long Len() const { return length; }
+    long Len() const { return static_cast<long>(putPointer - data); }
     long Capacity() const { return capacity; }
     // Bytes between the read and the write position.
     long Remaining() const { return static_cast<long>(putPointer - getPointer); }
@@ -155,7 +155,7 @@ class NXBASE_EXPORT MyMemoryBlock {
     // The characters and the terminating zero.
     MyMemoryBlock& operator<<(const String& asValue) {
         const long count = static_cast<long>(asValue.Len()) + 1;
-        if (capacity - length >= count) {
+        if (capacity - Len() >= count) {
             CopyBytes(putPointer, asValue.GetBuffer(), static_cast<std::size_t>(count));
             Advance(count);
         } else {
@@ -192,7 +192,7 @@ class NXBASE_EXPORT MyMemoryBlock {
   private:
     // Makes room for `alCount` more bytes, doubling the capacity.
     void CheckSize(long alCount);
-    // Resizes the storage to `alCapacity` bytes (>= length), in place or
+    // Resizes the storage to `alCapacity` bytes (>= Len()), in place or
     // moved, keeping the content; the positions follow it.
     void Reallocate(std::int32_t alCapacity);
     template <int N>
@@ -206,7 +206,7 @@ class NXBASE_EXPORT MyMemoryBlock {
 #else
         for (int i = 0; i < N; ++i) bytes[i] = static_cast<unsigned char>(axValue >> (8 * i));
 #endif
-        if (capacity - length >= N) {
+        if (capacity - Len() >= N) {
             std::memcpy(putPointer, bytes, N);
             Advance(N);
         } else {
@@ -230,7 +230,6 @@ class NXBASE_EXPORT MyMemoryBlock {
     }
     void Advance(long alCount) {
         putPointer += alCount;
-        length += static_cast<std::int32_t>(alCount);
     }
     // The fixed-size helper of the number readers (defined in the .cpp only).
     template <int N>
@@ -241,7 +240,6 @@ class NXBASE_EXPORT MyMemoryBlock {
     char* putPointer = nullptr;
     char* rememberedRead = nullptr;
     char* rememberedWrite = nullptr;
-    std::int32_t length = 0;
     std::int32_t capacity = 0;
     bool readPastEnd = false;
 };

@@ -180,7 +180,7 @@ MyMemoryBlock::MyMemoryBlock(long alCapacity) {
 }
 
 MyMemoryBlock::MyMemoryBlock(const MyMemoryBlock& axOther) : MyMemoryBlock(axOther.capacity) {
-    Put(axOther.data, axOther.length);
+    Put(axOther.data, axOther.Len());
 }
 
 MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
@@ -190,10 +190,9 @@ MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     std::free(data);
     data = fresh;
     capacity = axOther.capacity;
-    length = 0;
     readPastEnd = false;
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
-    Put(axOther.data, axOther.length);
+    Put(axOther.data, axOther.Len());
     return *this;
 }
 
@@ -209,7 +208,6 @@ MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
     putPointer = std::exchange(axOther.putPointer, nullptr);
     rememberedRead = std::exchange(axOther.rememberedRead, nullptr);
     rememberedWrite = std::exchange(axOther.rememberedWrite, nullptr);
-    length = std::exchange(axOther.length, 0);
     capacity = std::exchange(axOther.capacity, 0);
     readPastEnd = std::exchange(axOther.readPastEnd, false);
     return *this;
@@ -232,7 +230,7 @@ void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
 }
 
 void MyMemoryBlock::CheckSize(long alCount) {
-    long needed = static_cast<long>(length) + alCount;
+    long needed = Len() + alCount;
     if (capacity >= needed) return;
     if (needed > kMaxCapacity) needed = kMaxCapacity;
     long grown = std::max<long>(capacity, 1);
@@ -252,11 +250,10 @@ long MyMemoryBlock::Put(const void* p, long alCount) {
     } else {
         CheckSize(alCount);
     }
-    long copied = std::min<long>(alCount, static_cast<long>(capacity) - length);
+    long copied = std::min<long>(alCount, static_cast<long>(capacity) - Len());
     if (copied <= 0) return 0;
     std::memmove(putPointer, source, static_cast<std::size_t>(copied));
     putPointer += copied;
-    length += static_cast<std::int32_t>(copied);
     return copied;
 }
 
@@ -272,12 +269,11 @@ long MyMemoryBlock::Get(void* p, long alCount) {
 }
 
 void MyMemoryBlock::Minimize() {
-    if (capacity != length) Reallocate(length);
+    if (capacity != Len()) Reallocate(static_cast<std::int32_t>(Len()));
 }
 
 void MyMemoryBlock::RestoreWritePointer() {
     putPointer = rememberedWrite;
-    length = static_cast<std::int32_t>(putPointer - data);
     if (getPointer > putPointer) getPointer = putPointer;
     if (rememberedRead > putPointer) rememberedRead = putPointer;
 }
