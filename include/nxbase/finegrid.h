@@ -65,7 +65,8 @@ class NXBASE_EXPORT FineGridTristimulus {
     // CIE 1976 L*a*b* relative to White(): CielabOf(ToXYZ(...), White()).
     std::array<double, 3> ToLab(const float* pValues) const;
     // alCount spectra, spectrum i at pSpectra + i * Wavelengths().size(), into
-    // pOut[3i..3i+2] as float: the one-spectrum values, narrowed.
+    // pOut[3i..3i+2] as float: the one-spectrum values, narrowed (a value
+    // beyond float's range becomes infinite, NaN stays NaN).
     void ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const;
     void ToLab(const float* pSpectra, std::size_t alCount, float* pOut) const;
     // The same with the spectra split over alThreads threads (0: one per

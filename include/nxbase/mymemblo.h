@@ -27,6 +27,7 @@
 #include <cstdint>
 #include <cstring>
 #include <iosfwd>
+#include <string_view>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -115,6 +116,10 @@ class NXBASE_EXPORT MyMemoryBlock {
     long Get(void* p, long alCount);
 
     long Len() const { return static_cast<long>(putPointer - data); }
+    // The written bytes, valid until the block changes.
+    std::string_view Bytes() const {
+        return std::string_view(data, static_cast<std::size_t>(Len()));
+    }
     long Capacity() const { return capacity; }
     // Bytes between the read and the write position.
     long Remaining() const { return static_cast<long>(putPointer - getPointer); }

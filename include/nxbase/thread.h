@@ -109,7 +109,8 @@ namespace nxbase {
 // thread one of them. The range is cut into parts whose starts are multiples
 // of alGranule, eight or so per thread, taken by whichever thread is free;
 // the call returns when all are done. The other threads are kept between
-// calls (asleep when idle; a forked child starts its own); a call from one
+// calls (they look for work for 50 µs, then sleep; a forked child starts its
+// own); a call from one
 // of them, or from several threads at once, is served as helpers come free,
 // the calling thread always working too. With one thread, or when no thread
 // can be started, the work is done on the calling thread. fPart must not

@@ -907,22 +907,14 @@ toolkit::StartWait Pipe::WaitForStart(const std::string& asApp, const std::funct
     return result;
 }
 
-namespace {
-
-std::string_view BytesOf(const MyMemoryBlock& axBlock) {
-    return std::string_view(axBlock.GetDatenZeiger(), static_cast<std::size_t>(axBlock.Len()));
-}
-
-}  // namespace
-
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 const MyMemoryBlock& axEncodedData) {
-    return Send(asApp, asCommand, BytesOf(axEncodedData));
+    return Send(asApp, asCommand, axEncodedData.Bytes());
 }
 
 bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
                          const MyMemoryBlock& axEncodedData) {
-    return SendOnChannel(alChannel, asCommand, BytesOf(axEncodedData));
+    return SendOnChannel(alChannel, asCommand, axEncodedData.Bytes());
 }
 
 // What every send checks first: not a forked copy, on the loop's thread.
@@ -979,7 +971,7 @@ bool Pipe::SendByDde(const std::string& asApp, const std::string& asCommand, boo
 
 bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,
                        const MyMemoryBlock& axEncodedData) {
-    return AnswerByDde(asApp, asCommand, BytesOf(axEncodedData));
+    return AnswerByDde(asApp, asCommand, axEncodedData.Bytes());
 }
 
 bool Pipe::AnswerByDde(const std::string& asApp, const std::string& asCommand,

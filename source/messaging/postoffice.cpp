@@ -54,9 +54,7 @@ class StuffedData {
         amBytes.clear();
         nxbase::AppendEncoded(amBytes, asData.data(), asData.size());
     }
-    explicit StuffedData(const MyMemoryBlock& axData)
-        : StuffedData(
-              std::string_view(axData.GetDatenZeiger(), static_cast<std::size_t>(axData.Len()))) {}
+    explicit StuffedData(const MyMemoryBlock& axData) : StuffedData(axData.Bytes()) {}
     ~StuffedData() {
         if (!amOuter) return;
         tlInUse = false;
@@ -552,8 +550,7 @@ void PostOffice::AnswerStatus(VELTRAEvent& axEvent, signed char axStatus) {
 // ---- sending ----
 
 unsigned char PostOffice::Answer(VELTRAEvent* pCommand, MyMemoryBlock& axData) {
-    return AnswerBytes(pCommand, std::string_view(axData.GetDatenZeiger(),
-                                                  static_cast<std::size_t>(axData.Len())));
+    return AnswerBytes(pCommand, axData.Bytes());
 }
 
 bool PostOffice::AnswerBytes(VELTRAEvent* pCommand, std::string_view asData) {
