@@ -183,6 +183,9 @@ class NXBASE_EXPORT Pipe {
     std::uint64_t ChannelId(const std::string& asApp) const;
     // Whether connection `alChannel` (VELTRAEvent::GetChannel()) is open.
     bool IsChannelOpen(std::uint64_t alChannel) const;
+    // The socket of open connection `alChannel`, -1 when it is not open: a
+    // wait for an answer on it may watch it beside the loop.
+    int ChannelDescriptor(std::uint64_t alChannel) const;
     std::size_t ChannelCount() const { return amAllChannels.size(); }
     // Bytes of partly read frames over all channels.
     std::size_t PartialBytes() const { return amPartialBytes; }

@@ -994,6 +994,12 @@ bool Pipe::IsChannelOpen(std::uint64_t alChannel) const {
     return at != amAllChannels.end() && !at->second->closed;
 }
 
+int Pipe::ChannelDescriptor(std::uint64_t alChannel) const {
+    auto at = amAllChannels.find(alChannel);
+    return at == amAllChannels.end() || at->second->closed ? -1
+                                                           : at->second->socket.native_handle();
+}
+
 bool Pipe::HasChannel(const std::string& asApp) const {
     auto at = amChannels.find(asApp);
     return at != amChannels.end() && !at->second->closed && at->second->stage == Stage::kOpen;
