@@ -3,14 +3,9 @@
 
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
-#include <boost/asio/posix/stream_descriptor.hpp>
 #include <boost/asio/post.hpp>
-#include <boost/asio/steady_timer.hpp>
 #include <memory>
-#include <random>
 #include <thread>
 
 #include "toolkit/userinterface.h"
@@ -158,78 +153,6 @@ TEST(EventLoop, TheLoopDescriptorIsReadableExactlyWhileAHandlerIsDue) {
     app.RunOneFor(15ms);
     app.SetNestedWait({});
     EXPECT_EQ(turns, std::vector<long>{15});
-}
-
-// A wait that watches a socket beside the loop, at the top or inside a
-// handler: whatever the loop holds (handlers an earlier turn left queued, a
-// timer, a post from another thread) still runs, and the socket's bytes are
-// read by the wait, in order. A handler left unrun ends the wait at its
-// deadline.
-TEST(EventLoop, AWaitOnASocketStillRunsEveryHandlerTheLoopHolds) {
-    const unsigned seed = std::random_device{}();
-    std::mt19937 random(seed);
-    Application& app = Application::Get();
-    int sockets[2];
-    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK, 0, sockets), 0);
-    std::string received, sent;
-    Application::Awaited awaited{sockets[0], [&] {
-                                     char buffer[64];
-                                     for (ssize_t n; (n = ::recv(sockets[0], buffer, 64, 0)) > 0;)
-                                         received.append(buffer, static_cast<std::size_t>(n));
-                                     return sockets[0];
-                                 }};
-    // The loop watches the socket too, as it does a channel's: a wait inside
-    // a handler reads it only so.
-    boost::asio::posix::stream_descriptor watch(app.GetContext(), ::dup(sockets[0]));
-    std::function<void()> arm = [&] {
-        watch.async_wait(boost::asio::posix::stream_descriptor::wait_read,
-                         [&](const boost::system::error_code& error) {
-                             if (error) return;
-                             awaited.read();
-                             arm();
-                         });
-    };
-    arm();
-    for (int round = 0; round < 300; ++round) {
-        int ran = 0, expected = 0;
-        auto count = [&ran] { ++ran; };
-        boost::asio::steady_timer timer(app.GetContext());
-        if (random() % 2 == 0) {
-            ++expected;
-            timer.expires_after(std::chrono::microseconds(random() % 3000));
-            timer.async_wait([&](const boost::system::error_code&) { ++ran; });
-        }
-        const auto delay = std::chrono::microseconds(random() % 2000);
-        std::string word = random() % 2 == 0 ? std::to_string(round) + ";" : "";
-        const bool post = random() % 2 == 0;
-        expected += post ? 1 : 0;
-        std::thread other([&, delay, word, post] {
-            std::this_thread::sleep_for(delay);
-            if (post) app.Post(count);
-            if (!word.empty()) (void)::send(sockets[1], word.data(), word.size(), 0);
-        });
-        sent += word;
-        auto wait = [&] {
-            auto end = app.RunUntil([&] { return ran == expected && received == sent; }, {},
-                                    std::chrono::steady_clock::now() + 5s, awaited);
-            EXPECT_EQ(end, Application::WaitEnd::kReady)
-                << "seed " << seed << " round " << round << ": " << ran << " of " << expected
-                << " handlers ran, read \"" << received << "\" of \"" << sent << "\"";
-        };
-        // Handlers queued behind the one the turn runs, which waits or not.
-        const bool inHandler = random() % 2 == 0;
-        const int behind = static_cast<int>(random() % 3);
-        expected += behind + (inHandler ? 0 : 1);
-        boost::asio::post(app.GetContext(), inHandler ? std::function<void()>(wait) : count);
-        for (int i = 0; i < behind; ++i) boost::asio::post(app.GetContext(), count);
-        ASSERT_TRUE(app.RunOneFor(1s));
-        if (!inHandler) wait();
-        other.join();
-        if (HasFailure()) break;
-    }
-    watch.close();
-    ::close(sockets[0]);
-    ::close(sockets[1]);
 }
 
 TEST(EventLoop, WaitingStateAndTopWindowGoThroughTheUserInterface) {

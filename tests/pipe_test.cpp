@@ -267,6 +267,15 @@ TEST_F(PipeTest, ALostPeerIsReportedAndTheNextSendStartsItAgain) {
     // An application nobody registered is not started and the send fails.
     EXPECT_FALSE(pipe->Send("Nobody", "IS_READY", none));
     pipe->SetChannelLostFunction(nullptr);
+    // A connection's id is never used again, not even by a new transport:
+    // a request that names one of the old transport matches nothing new.
+    const std::uint64_t last = pipe->ChannelId("EchoPeer");
+    Pipe::DeletePipe();
+    pipe = Pipe::CreatePipe("PipeTestClient");
+    pipe->SetReceiveFunction(Record);
+    pipe->SetApplications(applications.get());
+    EXPECT_EQ(RoundTrip("three"), "three");
+    EXPECT_GT(pipe->ChannelId("EchoPeer"), last);
 }
 
 TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {

@@ -183,9 +183,6 @@ class NXBASE_EXPORT Pipe {
     std::uint64_t ChannelId(const std::string& asApp) const;
     // Whether connection `alChannel` (VELTRAEvent::GetChannel()) is open.
     bool IsChannelOpen(std::uint64_t alChannel) const;
-    // The socket of open connection `alChannel`, -1 when it is not open: a
-    // wait for an answer on it may watch it beside the loop.
-    int ChannelDescriptor(std::uint64_t alChannel) const;
     std::size_t ChannelCount() const { return amAllChannels.size(); }
     // Bytes of partly read frames over all channels.
     std::size_t PartialBytes() const { return amPartialBytes; }
@@ -265,7 +262,6 @@ class NXBASE_EXPORT Pipe {
     std::map<std::string, ChannelPtr> amChannels;       // by peer name
     std::map<std::string, int> amStarting;              // peers being started, their pids
     std::map<std::uint64_t, ChannelPtr> amAllChannels;  // every open connection, by id
-    std::uint64_t amNextChannelId = 1;
     std::uint64_t amLastSendChannel = 0;
     std::size_t amPartialBytes = 0;
     std::size_t amQueuedBytes = 0;  // the sum of every channel's outgoing bytes

@@ -232,7 +232,6 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     void SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend, PeerStart axStart);
     void ArmAsync(const RequestPtr& pRequest);
     RequestPtr NewBlockingRequest();
-    static Application::Awaited AwaitAnswerOn(std::uint64_t alChannel);
     void Finish(const RequestPtr& pRequest, bool abAnswered, MyMemoryBlock axData,
                 std::string asError);
     void CloseWhenUnused();

@@ -1,6 +1,5 @@
 #include "toolkit/application.h"
 
-#include <poll.h>
 #include <pthread.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
@@ -94,7 +93,6 @@ void Application::AfterFork() {
     // are made on demand. The old ones stay open (closing the wake-up eventfd
     // changes nothing for the parent, but a reused number would confuse).
     loopDescriptor_ = -1;
-    handlersMayBeQueued_ = true;
     wakeDescriptor_ = -1;
     wakePending_ = false;
     foreignWork_.reset();
@@ -114,8 +112,6 @@ void Application::Execute() {
     auto work = boost::asio::make_work_guard(context_);
     while (!quitting_) {
         if (context_.stopped()) context_.restart();
-        handlersMayBeQueued_ = true;
-        ScopedValue<int> running(running_, running_ + 1);
         context_.run_one();
     }
     --executing_;
@@ -143,21 +139,13 @@ bool Application::RunOneFor(std::chrono::milliseconds timeout) {
         return true;
     }
     if (context_.stopped()) context_.restart();
-    handlersMayBeQueued_ = true;
-    ScopedValue<int> running(running_, running_ + 1);
-    return context_.run_one_for(timeout) > 0;
+    bool ran = context_.run_one_for(timeout) > 0;
+    return ran;
 }
 
 Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
                                            const std::function<bool()>& keepWaiting,
                                            std::chrono::steady_clock::time_point deadline) {
-    return RunUntil(ready, keepWaiting, deadline, Awaited());
-}
-
-Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
-                                           const std::function<bool()>& keepWaiting,
-                                           std::chrono::steady_clock::time_point deadline,
-                                           Awaited awaited) {
     using namespace std::chrono;
     constexpr milliseconds kLongestTurn(50);
     const unsigned long quits = quitCount_.load();
@@ -171,48 +159,8 @@ Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
         // Rounded up, so that a turn ending just before the deadline is not
         // followed by turns of 0 ms.
         auto left = deadline - now;
-        auto turn = left < kLongestTurn ? duration_cast<milliseconds>(left) + milliseconds(1)
-                                        : kLongestTurn;
-        // A GUI's loop must turn: it is the one that dispatches this one. A
-        // wait inside a handler turns the loop too: asio may hold handlers
-        // ready behind the running one where its epoll set no longer shows
-        // them.
-        if (awaited.descriptor >= 0 && !nestedWait_ && running_ == 0) {
-            TurnOrRead(awaited, turn);
-        } else {
-            RunOneFor(turn);
-        }
-    }
-}
-
-// Sleeps until the awaited socket or the loop descriptor is readable, then
-// reads the one or dispatches the other. The socket is in the context's
-// epoll set too: its answer makes both readable, and that readiness stays for
-// a later turn (asio drops it unread if it was the socket's alone).
-void Application::TurnOrRead(Awaited& axAwaited, std::chrono::milliseconds timeout) {
-    MarkUserInterfaceThread();
-    int loop;
-    try {
-        loop = GetLoopDescriptor();
-    } catch (const std::system_error&) {
-        RunOneFor(timeout);  // out of descriptors: the plain turn still works
-        return;
-    }
-    if (handlersMayBeQueued_) {
-        Dispatch();
-        handlersMayBeQueued_ = false;
-        return;
-    }
-    pollfd watched[2] = {{axAwaited.descriptor, POLLIN, 0}, {loop, POLLIN, 0}};
-    if (::poll(watched, 2, static_cast<int>(timeout.count())) <= 0) return;
-    if (watched[0].revents != 0) {
-        axAwaited.descriptor = axAwaited.read();
-        // What the read delivered may have made handlers ready without a
-        // sign on the descriptor (a closed channel's cancelled waits).
-        handlersMayBeQueued_ = true;
-    } else {
-        Dispatch();
-        handlersMayBeQueued_ = false;
+        RunOneFor(left < kLongestTurn ? duration_cast<milliseconds>(left) + milliseconds(1)
+                                      : kLongestTurn);
     }
 }
 
@@ -247,8 +195,6 @@ std::size_t Application::Dispatch() {
     }
     if (context_.stopped()) context_.restart();
     ScopedValue<int> depth(dispatching_, dispatching_ + 1);
-    ScopedValue<int> running(running_, running_ + 1);
-    handlersMayBeQueued_ = true;
     return context_.poll();
 }
 

@@ -1,6 +1,7 @@
 #include "nxbase/pipe.h"
 
 #include <array>
+#include <atomic>
 #include <boost/asio/local/stream_protocol.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <cerrno>
@@ -72,6 +73,13 @@ const std::string kDisconnect = "DISCONNECT";
 
 Pipe* gPipe = nullptr;
 bool gListen = true;
+
+// Unique in the process, not per transport: a request or a wait that names
+// a connection of a transport since deleted must never match a new one.
+std::uint64_t NextChannelId() {
+    static std::atomic<std::uint64_t> next{1};
+    return next.fetch_add(1, std::memory_order_relaxed);
+}
 
 void Log(const std::string& asText) {
     LogFile::WriteToLog(String(asText), String(kLogKey));
@@ -307,7 +315,8 @@ void Pipe::Listen() {
 // ---- accepting ----
 
 void Pipe::Accept() {
-    auto channel = std::make_shared<Channel>(Application::Get().GetContext(), amNextChannelId++);
+    auto channel =
+        std::make_shared<Channel>(Application::Get().GetContext(), nxbase::NextChannelId());
     pmListener->acceptor.async_accept(
         channel->socket, [this, channel](const boost::system::error_code& error) {
             if (error == boost::asio::error::operation_aborted) return;
@@ -730,7 +739,8 @@ Pipe::ChannelPtr Pipe::Connect(const std::string& asApp) {
         Fail("refused to talk to " + asApp + ": " + why);
         return nullptr;
     }
-    auto channel = std::make_shared<Channel>(Application::Get().GetContext(), amNextChannelId++);
+    auto channel =
+        std::make_shared<Channel>(Application::Get().GetContext(), nxbase::NextChannelId());
     boost::system::error_code error;
     channel->socket.assign(boost::asio::local::stream_protocol(), fd, error);
     if (error) {
@@ -992,12 +1002,6 @@ std::uint64_t Pipe::ChannelId(const std::string& asApp) const {
 bool Pipe::IsChannelOpen(std::uint64_t alChannel) const {
     auto at = amAllChannels.find(alChannel);
     return at != amAllChannels.end() && !at->second->closed;
-}
-
-int Pipe::ChannelDescriptor(std::uint64_t alChannel) const {
-    auto at = amAllChannels.find(alChannel);
-    return at == amAllChannels.end() || at->second->closed ? -1
-                                                           : at->second->socket.native_handle();
 }
 
 bool Pipe::HasChannel(const std::string& asApp) const {

@@ -722,9 +722,11 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
         }
         std::function<bool()> keepWaiting;
         if (fKeepWaiting) keepWaiting = [&fKeepWaiting] { return fKeepWaiting(); };
-        auto end = Application::Get().RunUntil(
-            [&request] { return request->finished; }, keepWaiting,
-            std::chrono::steady_clock::time_point::max(), AwaitAnswerOn(request->channel));
+        // A peer on this CPU has often answered before the send returned.
+        if (Pipe* pipe = Pipe::Instance(); pipe != nullptr && request->channel != 0)
+            pipe->ReadArrived(request->channel);
+        auto end =
+            Application::Get().RunUntil([&request] { return request->finished; }, keepWaiting);
         if (end != Application::WaitEnd::kReady) {
             request->finished = true;
             request->error = "no answer from " + asApp +
@@ -743,24 +745,6 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
     NX_COMM_LOG("MessageQueue - Erased message");
     NX_COMM_LOG(String("Answer received: ") + Number(alMessage));
     return true;
-}
-
-// The answer to a request sent on a socket is read from it the moment it
-// arrives. A peer on this CPU has often answered before the send returned:
-// what is there already is read first.
-Application::Awaited PostOffice::AwaitAnswerOn(std::uint64_t alChannel) {
-    Pipe* pipe = Pipe::Instance();
-    if (pipe == nullptr || alChannel == 0) return {};
-    pipe->ReadArrived(alChannel);
-    // The receive function may have deleted the transport, now or later.
-    auto descriptor = [alChannel] {
-        Pipe* now = Pipe::Instance();
-        return now != nullptr ? now->ChannelDescriptor(alChannel) : -1;
-    };
-    return {descriptor(), [alChannel, descriptor] {
-                if (Pipe* now = Pipe::Instance()) now->ReadArrived(alChannel);
-                return descriptor();
-            }};
 }
 
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,

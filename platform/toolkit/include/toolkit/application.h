@@ -102,25 +102,10 @@ class NXBASE_EXPORT Application {
     // of precedence. Both functions are asked before the first turn, after
     // every turn and at least every 50 ms; a handler a turn ran may destroy
     // whatever they look at, so they must hold what they need.
-    //
-    // `awaited` names a socket an answer is expected on, one the loop
-    // watches too. A wait on the library's own loop, outside any handler,
-    // then sleeps on the socket and the loop descriptor at once and calls
-    // `read` when the socket is readable, where a turn of the loop would
-    // spend a readiness wait, a dispatch and a re-arming to reach the same
-    // read. Inside a handler or under a nested wait the loop turns as usual.
-    struct Awaited {
-        int descriptor = -1;
-        // Reads what is there; answers the descriptor to watch from then on
-        // (-1: none, the socket is gone).
-        std::function<int()> read;
-    };
     WaitEnd RunUntil(const std::function<bool()>& ready,
                      const std::function<bool()>& keepWaiting = {},
                      std::chrono::steady_clock::time_point deadline =
                          std::chrono::steady_clock::time_point::max());
-    WaitEnd RunUntil(const std::function<bool()>& ready, const std::function<bool()>& keepWaiting,
-                     std::chrono::steady_clock::time_point deadline, Awaited awaited);
 
     // For a foreign main loop: a descriptor that becomes readable whenever a
     // handler is ready (a socket ready, a timer due, an event posted from
@@ -170,7 +155,6 @@ class NXBASE_EXPORT Application {
     Application() = default;
     void AfterFork();
     void MarkUserInterfaceThread() { uiThread_.store(std::this_thread::get_id()); }
-    void TurnOrRead(Awaited& axAwaited, std::chrono::milliseconds timeout);
     void Wake();
 
     boost::asio::io_context context_;
@@ -183,11 +167,6 @@ class NXBASE_EXPORT Application {
     int dispatching_ = 0;         // Dispatch() calls running, nested ones included
     bool nestingBarred_ = false;  // inside DispatchWithoutNesting()
     int loopDescriptor_ = -1;     // an epoll set of the context's epoll set and wakeDescriptor_
-    // False only right after every ready handler ran: asio queues handlers it
-    // found ready but has not run yet where its epoll set no longer shows
-    // them, so a wait on the loop descriptor alone must first run them.
-    bool handlersMayBeQueued_ = true;
-    int running_ = 0;  // calls into the context in progress: a handler is running
     std::atomic<int> wakeDescriptor_{-1};   // an eventfd written by posts from other threads
     std::atomic<bool> wakePending_{false};  // set after each write to it
     std::function<void(unsigned long, void*)> userEventHandler_;
