@@ -372,7 +372,10 @@ TEST(MyMemoryBlock, WritesAgreeWithAHandMadeImageOverRandomRuns) {
                     put(model, value, 4);
                     break;
                 default: {
-                    const std::string text(random() % 40, static_cast<char>('a' + value % 26));
+                    // Distinct characters: a piece copied to the wrong place shows.
+                    std::string text(random() % 40, ' ');
+                    for (std::size_t i = 0; i < text.size(); ++i)
+                        text[i] = static_cast<char>('a' + (value + i) % 26);
                     block << String(text);
                     model.insert(model.end(), text.begin(), text.end());
                     model.push_back(0);

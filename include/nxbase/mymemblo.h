@@ -24,6 +24,11 @@
 #ifndef NXBASE_MYMEMBLO_H_
 #define NXBASE_MYMEMBLO_H_
 
+// The inline writers store whole little-endian words (GCC and Clang).
+#if defined(__GNUC__) && defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+#define NXBASE_WORD_STORES 1
+#endif
+
 #include <cstdint>
 #include <cstring>
 #include <iosfwd>
@@ -120,7 +125,7 @@ class NXBASE_EXPORT MyMemoryBlock {
     std::string_view Bytes() const {
         return std::string_view(data, static_cast<std::size_t>(Len()));
     }
-    long Capacity() const { return capacity; }
+    long Capacity() const { return static_cast<long>(end - data); }
     // Bytes between the read and the write position.
     long Remaining() const { return static_cast<long>(putPointer - getPointer); }
     char* GetDatenZeiger() { return data; }
@@ -160,12 +165,13 @@ class NXBASE_EXPORT MyMemoryBlock {
     // The characters and the terminating zero.
     MyMemoryBlock& operator<<(const String& asValue) {
         const long count = static_cast<long>(asValue.Len()) + 1;
-        if (capacity - Len() >= count) {
-            CopyBytes(putPointer, asValue.GetBuffer(), static_cast<std::size_t>(count));
-            Advance(count);
-        } else {
-            Put(asValue.GetBuffer(), count);
+#ifdef NXBASE_WORD_STORES
+        if (__builtin_expect(count <= 16 && end - putPointer >= 16, 1)) {
+            PutShort(asValue.GetBuffer(), static_cast<int>(count));
+            return *this;
         }
+#endif
+        putPointer = PutAndTell(asValue.GetBuffer(), count);
         return *this;
     }
     // The characters without a terminating zero: read them back with Get and
@@ -202,40 +208,61 @@ class NXBASE_EXPORT MyMemoryBlock {
     void Reallocate(std::int32_t alCapacity);
     template <int N>
     MyMemoryBlock& PutLittleEndian(std::uint32_t axValue) {
-        // On a little-endian host the value's first N bytes are the image
-        // already; bytes assembled one by one would stall the store that
-        // follows them.
-        unsigned char bytes[4];
-#if defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
-        std::memcpy(bytes, &axValue, 4);
-#else
-        for (int i = 0; i < N; ++i) bytes[i] = static_cast<unsigned char>(axValue >> (8 * i));
-#endif
-        if (capacity - Len() >= N) {
-            std::memcpy(putPointer, bytes, N);
-            Advance(N);
-        } else {
-            Put(bytes, N);
+#ifdef NXBASE_WORD_STORES
+        // The whole word is stored and the position moves by N: the bytes
+        // past it are the value's own and the next write covers them.
+        if (__builtin_expect(end - putPointer >= 4, 1)) {
+            StoreWord<Word32>(putPointer, axValue);
+            putPointer += N;
+            return *this;
         }
+#endif
+        unsigned char bytes[N];
+        for (int i = 0; i < N; ++i) bytes[i] = static_cast<unsigned char>(axValue >> (8 * i));
+        putPointer = PutAndTell(bytes, N);
         return *this;
     }
-    // A copy of the short texts most values are, without a call.
-    static void CopyBytes(char* to, const char* from, std::size_t count) {
-        if (count > 16) {
-            std::memcpy(to, from, count);
-        } else if (count >= 8) {  // two overlapping words
-            std::memcpy(to, from, 8);
-            std::memcpy(to + count - 8, from + count - 8, 8);
+    // Put() answering the new write position: the inline writers take it
+    // from the register, where reading the member again after the call
+    // would make every later write wait for that load.
+    char* PutAndTell(const void* p, long alCount);
+#ifdef NXBASE_WORD_STORES
+    // Words stored at any address. A store of a char could change any
+    // object, the block's own positions included, so that after it every
+    // position would be read again from memory; a store of one of these
+    // cannot, and a run of writes keeps its position in a register.
+    typedef std::uint32_t Word32 __attribute__((aligned(1)));
+    typedef std::uint64_t Word64 __attribute__((aligned(1)));
+    template <class W, class V>
+    static void StoreWord(char* to, V axValue) {
+        *reinterpret_cast<W*>(to) = axValue;
+    }
+    // 1 to 16 bytes, with room for 16: two overlapping words of the text, or
+    // for 1 to 3 bytes one word of which the rest is overwritten later.
+    void PutShort(const char* from, int count) {
+        if (count >= 8) {
+            std::uint64_t head, tail;
+            std::memcpy(&head, from, 8);
+            std::memcpy(&tail, from + count - 8, 8);
+            StoreWord<Word64>(putPointer, head);
+            StoreWord<Word64>(putPointer + count - 8, tail);
         } else if (count >= 4) {
-            std::memcpy(to, from, 4);
-            std::memcpy(to + count - 4, from + count - 4, 4);
+            std::uint32_t head, tail;
+            std::memcpy(&head, from, 4);
+            std::memcpy(&tail, from + count - 4, 4);
+            StoreWord<Word32>(putPointer, head);
+            StoreWord<Word32>(putPointer + count - 4, tail);
         } else {
-            for (std::size_t i = 0; i < count; ++i) to[i] = from[i];
+            std::uint32_t word = static_cast<unsigned char>(from[0]);
+            if (count > 1)
+                word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[1])) << 8;
+            if (count > 2)
+                word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[2])) << 16;
+            StoreWord<Word32>(putPointer, word);
         }
+        putPointer += count;
     }
-    void Advance(long alCount) {
-        putPointer += alCount;
-    }
+#endif
     // The fixed-size helper of the number readers (defined in the .cpp only).
     template <int N>
     void GetBytes(unsigned char* p);
@@ -245,7 +272,7 @@ class NXBASE_EXPORT MyMemoryBlock {
     char* putPointer = nullptr;
     char* rememberedRead = nullptr;
     char* rememberedWrite = nullptr;
-    std::int32_t capacity = 0;
+    char* end = nullptr;  // of the storage: Capacity() bytes after data
     bool readPastEnd = false;
 };
 

@@ -174,22 +174,24 @@ FlagSet operator^(FlagSet a, const FlagSet& b) {
 MyMemoryBlock::MyMemoryBlock() : MyMemoryBlock(kDefaultCapacity) {}
 
 MyMemoryBlock::MyMemoryBlock(long alCapacity) {
-    capacity = ClampCapacity(alCapacity);
-    data = AllocateBytes(capacity);
+    const std::int32_t size = ClampCapacity(alCapacity);
+    data = AllocateBytes(size);
+    end = data + size;
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
 }
 
-MyMemoryBlock::MyMemoryBlock(const MyMemoryBlock& axOther) : MyMemoryBlock(axOther.capacity) {
+MyMemoryBlock::MyMemoryBlock(const MyMemoryBlock& axOther) : MyMemoryBlock(axOther.Capacity()) {
     Put(axOther.data, axOther.Len());
 }
 
 MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     if (this == &axOther) return *this;
     // Allocate before freeing, so that a failed allocation leaves this block intact.
-    char* fresh = AllocateBytes(axOther.capacity);
+    const auto size = static_cast<std::int32_t>(axOther.Capacity());
+    char* fresh = AllocateBytes(size);
     std::free(data);
     data = fresh;
-    capacity = axOther.capacity;
+    end = fresh + size;
     readPastEnd = false;
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
     Put(axOther.data, axOther.Len());
@@ -208,7 +210,7 @@ MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
     putPointer = std::exchange(axOther.putPointer, nullptr);
     rememberedRead = std::exchange(axOther.rememberedRead, nullptr);
     rememberedWrite = std::exchange(axOther.rememberedWrite, nullptr);
-    capacity = std::exchange(axOther.capacity, 0);
+    end = std::exchange(axOther.end, nullptr);
     readPastEnd = std::exchange(axOther.readPastEnd, false);
     return *this;
 }
@@ -226,14 +228,14 @@ void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
     putPointer = data + put;
     rememberedRead = data + readMark;
     rememberedWrite = data + writeMark;
-    capacity = alCapacity;
+    end = data + alCapacity;
 }
 
 void MyMemoryBlock::CheckSize(long alCount) {
     long needed = Len() + alCount;
-    if (capacity >= needed) return;
+    if (Capacity() >= needed) return;
     if (needed > kMaxCapacity) needed = kMaxCapacity;
-    long grown = std::max<long>(capacity, 1);
+    long grown = std::max<long>(Capacity(), 1);
     while (grown < needed) grown *= 2;
     Reallocate(ClampCapacity(grown));
 }
@@ -241,8 +243,7 @@ void MyMemoryBlock::CheckSize(long alCount) {
 long MyMemoryBlock::Put(const void* p, long alCount) {
     if (alCount <= 0) return 0;
     const char* source = static_cast<const char*>(p);
-    if (!std::less<const char*>()(source, data) &&
-        std::less<const char*>()(source, data + capacity)) {
+    if (!std::less<const char*>()(source, data) && std::less<const char*>()(source, end)) {
         // Copying from inside this block: keep the source valid across growth.
         long offset = static_cast<long>(source - data);
         CheckSize(alCount);
@@ -250,11 +251,16 @@ long MyMemoryBlock::Put(const void* p, long alCount) {
     } else {
         CheckSize(alCount);
     }
-    long copied = std::min<long>(alCount, static_cast<long>(capacity) - Len());
+    long copied = std::min<long>(alCount, static_cast<long>(end - putPointer));
     if (copied <= 0) return 0;
     std::memmove(putPointer, source, static_cast<std::size_t>(copied));
     putPointer += copied;
     return copied;
+}
+
+char* MyMemoryBlock::PutAndTell(const void* p, long alCount) {
+    Put(p, alCount);
+    return putPointer;
 }
 
 long MyMemoryBlock::Get(void* p, long alCount) {
@@ -269,7 +275,7 @@ long MyMemoryBlock::Get(void* p, long alCount) {
 }
 
 void MyMemoryBlock::Minimize() {
-    if (capacity != Len()) Reallocate(static_cast<std::int32_t>(Len()));
+    if (Capacity() != Len()) Reallocate(static_cast<std::int32_t>(Len()));
 }
 
 void MyMemoryBlock::RestoreWritePointer() {
