@@ -40,6 +40,10 @@ namespace nxbase {
 // finite, gives NaN.
 NXBASE_EXPORT std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
                                              const std::array<double, 3>& axWhite);
+// CielabOf of alCount colours, three doubles each, in place: the same values,
+// several times faster than a call per colour.
+NXBASE_EXPORT void CielabInPlace(double* pXYZ, std::size_t alCount,
+                                 const std::array<double, 3>& axWhite);
 NXBASE_EXPORT std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
                                                 const std::array<double, 3>& axWhite);
 

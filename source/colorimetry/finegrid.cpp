@@ -47,15 +47,53 @@ bool Usable(const std::array<double, 3>& axColour, const std::array<double, 3>& 
     return true;
 }
 constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
+
+// The kernels of the instruction set the machine has, chosen once.
+const finegrid::Kernels& TheKernels() {
+    static const finegrid::Kernels kernels = [] {
+#ifdef NXBASE_FINEGRID_X86_KERNELS
+        if (__builtin_cpu_supports("x86-64-v3") && __builtin_cpu_supports("avx512f") &&
+            __builtin_cpu_supports("avx512dq") && __builtin_cpu_supports("avx512vl"))
+            return finegrid::Avx512Kernels();
+        if (__builtin_cpu_supports("x86-64-v3")) return finegrid::Avx2Kernels();
+#endif
+        return finegrid::BaselineKernels();
+    }();
+    return kernels;
+}
 }  // namespace
 
 std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
                                const std::array<double, 3>& axWhite) {
-    if (!Usable(axXYZ, axWhite)) return {kNaN, kNaN, kNaN};
-    const double fx = cielab::F(axXYZ[0] / axWhite[0]);
-    const double fy = cielab::F(axXYZ[1] / axWhite[1]);
-    const double fz = cielab::F(axXYZ[2] / axWhite[2]);
-    return {116.0 * fy - 16.0, 500.0 * (fx - fy), 200.0 * (fy - fz)};
+    std::array<double, 3> lab = axXYZ;
+    CielabInPlace(lab.data(), 1, axWhite);
+    return lab;
+}
+
+// A chunk's ratios to the white first, then f of all of them by the
+// kernel, eight at a time, then L*, a* and b*.
+void CielabInPlace(double* pXYZ, std::size_t alCount, const std::array<double, 3>& axWhite) {
+    constexpr std::size_t kChunk = 64;
+    for (std::size_t first = 0; first < alCount; first += kChunk) {
+        double* xyz = pXYZ + 3 * first;
+        const std::size_t count = std::min(kChunk, alCount - first);
+        double f[3 * kChunk];
+        for (std::size_t i = 0; i < count; ++i) {
+            for (int c = 0; c < 3; ++c) f[3 * i + c] = xyz[3 * i + c] / axWhite[c];
+        }
+        TheKernels().f(f, 3 * count);
+        for (std::size_t i = 0; i < count; ++i, xyz += 3) {
+            const std::array<double, 3> colour{xyz[0], xyz[1], xyz[2]};
+            const double fx = f[3 * i], fy = f[3 * i + 1], fz = f[3 * i + 2];
+            if (!Usable(colour, axWhite)) {
+                xyz[0] = xyz[1] = xyz[2] = kNaN;
+                continue;
+            }
+            xyz[0] = 116.0 * fy - 16.0;
+            xyz[1] = 500.0 * (fx - fy);
+            xyz[2] = 200.0 * (fy - fz);
+        }
+    }
 }
 
 std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
@@ -185,28 +223,15 @@ namespace {
 // for spectra of 36 values; longer spectra need proportionally fewer.
 constexpr std::size_t kMinValuesPerThread = 16384 * 36;
 
-// The instruction set's sum, chosen once.
-finegrid::SumFunction ChosenSum() {
-#ifdef NXBASE_FINEGRID_X86_KERNELS
-    if (__builtin_cpu_supports("x86-64-v3") && __builtin_cpu_supports("avx512f") &&
-        __builtin_cpu_supports("avx512dq") && __builtin_cpu_supports("avx512vl"))
-        return &finegrid::SumAvx512;
-    if (__builtin_cpu_supports("x86-64-v3")) return &finegrid::SumAvx2;
-#endif
-    return &finegrid::SumBaseline;
-}
-
 }  // namespace
 
-void finegrid::SumBaseline(const double* w0, const double* w1, const double* w2, std::size_t n,
-                           const float* spectra, std::size_t count, double* xyz) {
-    finegrid::SumSpectra(w0, w1, w2, n, spectra, count, xyz);
+finegrid::Kernels finegrid::BaselineKernels() {
+    return finegrid::TheseKernels();
 }
 
 void FineGridTristimulus::Sum(const float* pSpectra, std::size_t alCount, double* pXYZ) const {
-    static const finegrid::SumFunction sum = ChosenSum();
-    sum(amWeights[0].data(), amWeights[1].data(), amWeights[2].data(), amWavelengths.size(),
-        pSpectra, alCount, pXYZ);
+    TheKernels().sum(amWeights[0].data(), amWeights[1].data(), amWeights[2].data(),
+                     amWavelengths.size(), pSpectra, alCount, pXYZ);
 }
 
 std::array<double, 3> FineGridTristimulus::ToXYZ(const float* pValues) const {
@@ -228,11 +253,9 @@ void FineGridTristimulus::Convert(const float* pSpectra, std::size_t alCount, fl
     for (std::size_t first = 0; first < alCount; first += kBlock) {
         const std::size_t count = std::min(kBlock, alCount - first);
         Sum(pSpectra + first * n, count, xyz.data());
-        for (std::size_t i = 0; i < count; ++i) {
-            std::array<double, 3> v{xyz[3 * i], xyz[3 * i + 1], xyz[3 * i + 2]};
-            if constexpr (kLab) v = CielabOf(v, amWhite);
-            for (int c = 0; c < 3; ++c) pOut[3 * (first + i) + c] = static_cast<float>(v[c]);
-        }
+        if constexpr (kLab) CielabInPlace(xyz.data(), count, amWhite);
+        for (std::size_t i = 0; i < 3 * count; ++i)
+            pOut[3 * first + i] = static_cast<float>(xyz[i]);
     }
 }
 

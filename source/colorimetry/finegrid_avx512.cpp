@@ -1,11 +1,10 @@
-// The fine-grid sum built for AVX-512 F, DQ and VL.
+// The fine-grid kernels built for AVX-512 F, DQ and VL.
 #include "finegrid_sum.h"
 
 namespace nxbase::finegrid {
 
-void SumAvx512(const double* w0, const double* w1, const double* w2, std::size_t n,
-               const float* spectra, std::size_t count, double* xyz) {
-    SumSpectra(w0, w1, w2, n, spectra, count, xyz);
+Kernels Avx512Kernels() {
+    return TheseKernels();
 }
 
 }  // namespace nxbase::finegrid
