@@ -28,15 +28,16 @@ constexpr float kInverseEpsilonF = 0.206893034423f;
 constexpr float kExponentF = 0.33333334f;
 
 // t^(1/3) of a positive normal t, within an ulp of the exact root, without a
-// call: a first guess of t^(-1/3) from t's bits (within 4 %), four Newton
+// call: a first guess of t^(-1/3) from t's bits (within 3.5 %), four Newton
 // steps for it without a division (each squares the error), its square times
-// t, and a last Newton step for the root itself. About twice as fast as
-// std::cbrt, which splits and scales its argument by calls. Real is double,
-// or a vector of doubles (GCC's vector extension) with Bits the vector of
-// 64-bit integers of its size: every lane then gets the scalar's bits. In
-// place, as a vector passed by value would change the ABI with the
-// instruction set. Code built for another instruction set passes as Tag a
-// type of its own unnamed namespace, which makes the instantiation its own.
+// t, and a last Newton step for the root itself. Faster than std::cbrt, which
+// splits and scales its argument by calls, and computable in the lanes of a
+// vector. Real is double, or a vector of doubles (GCC's vector extension)
+// with Bits the vector of 64-bit integers of its size: every lane then gets
+// the scalar's bits. In place, as a vector passed by value would change the
+// ABI with the instruction set. Code built for another instruction set passes
+// as Tag a type of its own unnamed namespace, which makes the instantiation
+// its own.
 template <class Real, class Bits, class Tag = void>
 inline void TakeCubeRoot(Real& t) {
     Bits bits;

@@ -89,7 +89,9 @@ inline double Reduced(const Eight (&lane)[2]) {
 
 // The last n % kLanes values of a spectrum of n >= kLanes values are summed
 // as the last kLanes of it, whose first ones weigh nothing here: the step
-// reads no byte beyond the spectrum and copies nothing.
+// reads no byte beyond the spectrum and copies nothing. (An infinite value
+// among those first ones makes the sums NaN instead of infinite: either way
+// not a colour.)
 struct Tail {
     Tail(const double* w0, const double* w1, const double* w2, std::size_t n) {
         const std::size_t from = n / kLanes * kLanes, start = n - kLanes;
