@@ -212,7 +212,7 @@ class NXBASE_EXPORT MyMemoryBlock {
         // The whole word is stored and the position moves by N: the bytes
         // past it are the value's own and the next write covers them.
         if (__builtin_expect(end - putPointer >= 4, 1)) {
-            StoreWord<Word32>(putPointer, axValue);
+            StoreWord(putPointer, axValue);
             putPointer += N;
             return *this;
         }
@@ -231,11 +231,14 @@ class NXBASE_EXPORT MyMemoryBlock {
     // object, the block's own positions included, so that after it every
     // position would be read again from memory; a store of one of these
     // cannot, and a run of writes keeps its position in a register.
+    // (Not through a template: a typedef's alignment is lost in its argument.)
     typedef std::uint32_t Word32 __attribute__((aligned(1)));
     typedef std::uint64_t Word64 __attribute__((aligned(1)));
-    template <class W, class V>
-    static void StoreWord(char* to, V axValue) {
-        *reinterpret_cast<W*>(to) = axValue;
+    static void StoreWord(char* to, std::uint32_t axValue) {
+        *reinterpret_cast<Word32*>(to) = axValue;
+    }
+    static void StoreWord(char* to, std::uint64_t axValue) {
+        *reinterpret_cast<Word64*>(to) = axValue;
     }
     // 1 to 16 bytes, with room for 16: two overlapping words of the text, or
     // for 1 to 3 bytes one word of which the rest is overwritten later.
@@ -244,21 +247,21 @@ class NXBASE_EXPORT MyMemoryBlock {
             std::uint64_t head, tail;
             std::memcpy(&head, from, 8);
             std::memcpy(&tail, from + count - 8, 8);
-            StoreWord<Word64>(putPointer, head);
-            StoreWord<Word64>(putPointer + count - 8, tail);
+            StoreWord(putPointer, head);
+            StoreWord(putPointer + count - 8, tail);
         } else if (count >= 4) {
             std::uint32_t head, tail;
             std::memcpy(&head, from, 4);
             std::memcpy(&tail, from + count - 4, 4);
-            StoreWord<Word32>(putPointer, head);
-            StoreWord<Word32>(putPointer + count - 4, tail);
+            StoreWord(putPointer, head);
+            StoreWord(putPointer + count - 4, tail);
         } else {
             std::uint32_t word = static_cast<unsigned char>(from[0]);
             if (count > 1)
                 word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[1])) << 8;
             if (count > 2)
                 word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[2])) << 16;
-            StoreWord<Word32>(putPointer, word);
+            StoreWord(putPointer, word);
         }
         putPointer += count;
     }
