@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <clocale>
 #include <locale>
+#include <random>
+#include <string>
 
 namespace {
 
@@ -62,6 +64,50 @@ TEST(String, EditingKeepsBoundsSafe) {
     EXPECT_TRUE(upper.EqualsIgnoreCaseAscii("MIXED"));
     EXPECT_EQ(upper.ToUpper(), "MIXED");
     EXPECT_EQ(text.GetChar(100), '\0');
+}
+
+}  // namespace
+
+namespace {
+
+// Well-formedness by decoding first, then checking the code point's range for
+// its length: another route than the lead and second byte tables.
+bool DecodesAsUtf8(const std::string& text) {
+    for (std::size_t at = 0; at < text.size();) {
+        const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[at + i]); };
+        int length = 0;
+        for (unsigned char lead = byte(0); lead & 0x80;
+             lead = static_cast<unsigned char>(lead << 1))
+            ++length;
+        if (length == 0) length = 1;
+        if (length == 1 ? byte(0) >= 0x80 : length > 4 || at + length > text.size()) return false;
+        unsigned long code = byte(0) & (0x7F >> length);
+        for (int i = 1; i < length; ++i) {
+            if ((byte(i) & 0xC0) != 0x80) return false;
+            code = code << 6 | (byte(i) & 0x3F);
+        }
+        const unsigned long least[] = {0, 0, 0x80, 0x800, 0x10000};
+        if ((length > 1 && code < least[length]) || code > 0x10FFFF ||
+            (code >= 0xD800 && code <= 0xDFFF))
+            return false;
+        at += static_cast<std::size_t>(length);
+    }
+    return true;
+}
+
+TEST(String, Utf8ValidityAgreesWithDecodingOverRandomBytes) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    const unsigned char edges[] = {0x00, 0x7F, 0x80, 0x8F, 0x90, 0x9F, 0xA0, 0xBF, 0xC0, 0xC1,
+                                   0xC2, 0xDF, 0xE0, 0xED, 0xEF, 0xF0, 0xF4, 0xF5, 0xF8, 0xFF};
+    for (int i = 0; i < 200000; ++i) {
+        std::string text(random() % 7, ' ');
+        for (char& c : text)
+            c = static_cast<char>(random() % 2 ? edges[random() % sizeof edges] : random() % 256);
+        ASSERT_EQ(toolkit::IsValidUtf8(text), DecodesAsUtf8(text))
+            << ::testing::PrintToString(text);
+    }
 }
 
 }  // namespace
