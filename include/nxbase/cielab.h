@@ -12,6 +12,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <limits>
 
 namespace nxbase::cielab {
 
@@ -27,17 +28,15 @@ constexpr float kInverseEpsilonF = 0.206893034423f;
 // The single-precision path takes the cube root as pow(t, 1/3 in float).
 constexpr float kExponentF = 0.33333334f;
 
-// t^(1/3) of a positive normal t, within an ulp of the exact root, without a
-// call: a first guess of t^(-1/3) from t's bits (within 3.5 %), four Newton
-// steps for it without a division (each squares the error), its square times
-// t, and a last Newton step for the root itself. Faster than std::cbrt, which
-// splits and scales its argument by calls, and computable in the lanes of a
-// vector. Real is double, or a vector of doubles (GCC's vector extension)
-// with Bits the vector of 64-bit integers of its size: every lane then gets
-// the scalar's bits. In place, as a vector passed by value would change the
-// ABI with the instruction set. Code built for another instruction set passes
-// as Tag a type of its own unnamed namespace, which makes the instantiation
-// its own.
+// t^(1/3) of a positive normal t (and of +infinity, which it keeps), within
+// an ulp of the exact root, without a call: a first guess of t^(-1/3) from t's bits (within 3.5 %),
+// four Newton steps for it without a division (each squares the error), its square times t, and a
+// last Newton step for the root itself. Faster than std::cbrt, which splits and scales its argument
+// by calls, and computable in the lanes of a vector. Real is double, or a vector of doubles (GCC's
+// vector extension) with Bits the vector of 64-bit integers of its size: every lane then gets the
+// scalar's bits. In place, as a vector passed by value would change the ABI with the instruction
+// set. Code built for another instruction set passes as Tag a type of its own unnamed namespace,
+// which makes the instantiation its own.
 template <class Real, class Bits, class Tag = void>
 inline void TakeCubeRoot(Real& t) {
     Bits bits;
@@ -53,10 +52,14 @@ inline void TakeCubeRoot(Real& t) {
     r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
     r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
     const Real y = t * (r * r);
-    t = y - (y - t / (y * y)) * (1.0 / 3.0);
+    const Real root = y - (y - t / (y * y)) * (1.0 / 3.0);
+    t = t <= std::numeric_limits<double>::max() ? root : t;
 }
 
+// t^(1/3) of any t: zero, subnormal, negative and NaN arguments, outside the
+// steps' range, go to std::cbrt.
 inline double CubeRoot(double t) {
+    if (!(t >= std::numeric_limits<double>::min())) return std::cbrt(t);
     TakeCubeRoot<double, std::uint64_t>(t);
     return t;
 }

@@ -206,6 +206,11 @@ class NXBASE_EXPORT MyMemoryBlock {
     // Resizes the storage to `alCapacity` bytes (>= Len()), in place or
     // moved, keeping the content; the positions follow it.
     void Reallocate(std::int32_t alCapacity);
+    // The little-endian image of the low N bytes of a value.
+    template <int N>
+    static void LittleEndian(std::uint32_t axValue, unsigned char* p) {
+        for (int i = 0; i < N; ++i) p[i] = static_cast<unsigned char>(axValue >> (8 * i));
+    }
     template <int N>
     MyMemoryBlock& PutLittleEndian(std::uint32_t axValue) {
 #ifdef NXBASE_WORD_STORES
@@ -218,7 +223,7 @@ class NXBASE_EXPORT MyMemoryBlock {
         }
 #endif
         unsigned char bytes[N];
-        for (int i = 0; i < N; ++i) bytes[i] = static_cast<unsigned char>(axValue >> (8 * i));
+        LittleEndian<N>(axValue, bytes);
         putPointer = PutAndTell(bytes, N);
         return *this;
     }

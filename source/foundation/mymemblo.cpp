@@ -40,12 +40,6 @@ std::int32_t ClampCapacity(long alCapacity) {
     return static_cast<std::int32_t>(alCapacity);
 }
 
-// Little-endian encoding of the low `N` bytes of an unsigned value.
-template <int N>
-void Encode(std::uint32_t axValue, unsigned char* p) {
-    for (int i = 0; i < N; ++i) p[i] = static_cast<unsigned char>(axValue >> (8 * i));
-}
-
 template <int N>
 std::uint32_t Decode(const unsigned char* p) {
     std::uint32_t value = 0;
@@ -367,7 +361,7 @@ MyMemoryBlock& MyMemoryBlock::operator>>(short& axValue) {
 
 MyMemoryBlock& MyMemoryBlock::operator>>(unsigned short& axValue) {
     unsigned char bytes[2];
-    Encode<2>(axValue, bytes);
+    LittleEndian<2>(axValue, bytes);
     GetBytes<2>(bytes);
     axValue = static_cast<unsigned short>(Decode<2>(bytes));
     return *this;
@@ -375,7 +369,7 @@ MyMemoryBlock& MyMemoryBlock::operator>>(unsigned short& axValue) {
 
 MyMemoryBlock& MyMemoryBlock::operator>>(long& axValue) {
     unsigned char bytes[4];
-    Encode<4>(static_cast<std::uint32_t>(axValue), bytes);
+    LittleEndian<4>(static_cast<std::uint32_t>(axValue), bytes);
     GetBytes<4>(bytes);
     axValue = static_cast<long>(static_cast<std::int32_t>(Decode<4>(bytes)));
     return *this;
