@@ -50,17 +50,6 @@ bool HavePython() {
     return std::system("python3 -c 'import configparser' >/dev/null 2>&1") == 0;
 }
 
-std::string RunCapture(const std::string& command) {
-    std::string out;
-    FILE* pipe = ::popen(command.c_str(), "r");
-    if (pipe == nullptr) return out;
-    char buffer[4096];
-    std::size_t n;
-    while ((n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0) out.append(buffer, n);
-    ::pclose(pipe);
-    return out;
-}
-
 TEST(IniFile, AMissingFileReadsAsEmptyAndIsNotCreatedByReading) {
     TempDir dir;
     Config config(dir.File("absent.ini"));
@@ -426,7 +415,7 @@ TEST(IniFile, PythonConfigparserReadsOurFilesAndWeReadItsFiles) {
         "  for k,v in c.items(s): print(s+'|'+k+'|'+v)\n";
     WriteFile(dir.File("dump.py"), dump);
     std::string out =
-        RunCapture("PYTHONIOENCODING=utf-8 python3 " + dir.File("dump.py") + " " + ours);
+        nxtest::ShellOutput("PYTHONIOENCODING=utf-8 python3 " + dir.File("dump.py") + " " + ours);
     EXPECT_EQ(out,
               "LPM-Server|Path|/opt/k-lume/bin/lumaserver\n"
               "LPM-Server|Version|2.10\n"

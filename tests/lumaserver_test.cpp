@@ -7,7 +7,6 @@
 #include <signal.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -260,16 +259,11 @@ TEST_F(LumaServerTest, ASubscriberThatCannotBeReachedHoldsNobodyUp) {
     Connect();
     // Deaf listens under its name but never accepts; it subscribed on a
     // channel that it then closed.
-    int deaf = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::string path = nxbase::RequestSocketPath("Deaf");
-    std::strcpy(address.sun_path, path.c_str());
-    ASSERT_EQ(::bind(deaf, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    const std::string path = nxbase::RequestSocketPath("Deaf");
+    const int deaf = nxtest::ConnectUnix(path, true);
     ASSERT_EQ(::listen(deaf, 4), 0);
-    int channel = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
-    ASSERT_EQ(::connect(channel, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    const int channel = nxtest::ConnectUnix(nxbase::RequestSocketPath("LumaServer"));
+    ASSERT_GE(channel, 0);
     std::string frames = nxbase::EncodeFrame("Deaf_1") +
                          nxbase::EncodeFrame(nxbase::MessageBody("Deaf", "NOTIFY_MESSUNG", ""));
     ASSERT_EQ(::send(channel, frames.data(), frames.size(), MSG_NOSIGNAL),
@@ -363,15 +357,10 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
 
 TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     auto run = [&](const std::string& arguments, int& status) {
-        std::string output;
-        FILE* pipe =
-            ::popen((NXBASE_BINARY_DIR "/tools/nxmsg " + arguments + " 2>&1").c_str(), "r");
-        char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            output.append(buffer, n);
-        int result = ::pclose(pipe);
-        status = WIFEXITED(result) ? WEXITSTATUS(result) : -1;
-        return output;
+        const nxtest::ShellResult result =
+            nxtest::Shell(NXBASE_BINARY_DIR "/tools/nxmsg " + arguments);
+        status = result.status;
+        return result.out;
     };
     int status = -1;
     EXPECT_EQ(run("--expect str LumaServer GET_DEVICE_NAME", status),
@@ -436,14 +425,9 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
 TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
     // nxcolor starts the registered server on demand, measures three patches
     // and prints their colours; the server then ends by itself.
-    std::string output;
-    FILE* pipe = ::popen(NXBASE_BINARY_DIR "/tools/nxcolor --measure 3 -f csv -p 2 2>&1", "r");
-    char buffer[4096];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        output.append(buffer, n);
-    const int result = ::pclose(pipe);
-    ASSERT_TRUE(WIFEXITED(result)) << output;
-    EXPECT_EQ(WEXITSTATUS(result), 0) << output;
+    const auto [status, output] =
+        nxtest::Shell(NXBASE_BINARY_DIR "/tools/nxcolor --measure 3 -f csv -p 2");
+    EXPECT_EQ(status, 0) << output;
     EXPECT_EQ(std::count(output.begin(), output.end(), '\n'), 4) << output;
     EXPECT_NE(output.find("id,name,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
     // The emulator measures the built-in chart: dark skin's values, to the
@@ -469,11 +453,8 @@ struct Reaper {
 
 // A blocking client on the server's socket, handshake done.
 int RawClient(const std::string& name) {
-    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
-    if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return -1;
+    const int fd = nxtest::ConnectUnix(nxbase::RequestSocketPath("LumaServer"));
+    if (fd < 0) return -1;
     std::string request = nxbase::EncodeFrame(name + "_1");
     if (::send(fd, request.data(), request.size(), MSG_NOSIGNAL) < 0) return -1;
     char reply[256];
@@ -595,12 +576,8 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
     ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     std::vector<int> idle;
     for (int i = 0; i < 40; ++i) {
-        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, nxbase::RequestSocketPath("LumaServer").c_str());
-        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0)
-            idle.push_back(fd);
+        const int fd = nxtest::ConnectUnix(nxbase::RequestSocketPath("LumaServer"));
+        if (fd >= 0) idle.push_back(fd);
     }
     RunUntil([] { return false; }, 300ms);
     double before = CpuSeconds(server);

@@ -47,17 +47,29 @@ inline void LoopOfItsOwn() {
     Application::Get().GetContext().notify_fork(boost::asio::execution_context::fork_child);
 }
 
+// A blocking stream socket connected to `path` (bound there instead when
+// `bind`), or -1.
+inline int ConnectUnix(const std::string& path, bool bind = false) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) return -1;
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    auto* where = reinterpret_cast<sockaddr*>(&address);
+    if (fd >= 0 &&
+        (bind ? ::bind(fd, where, sizeof address) : ::connect(fd, where, sizeof address))) {
+        ::close(fd);
+        return -1;
+    }
+    return fd;
+}
+
 // Whether something listens on the socket at `path` (it holds its name's
 // lock a moment before it listens).
 inline bool Accepts(const std::string& path) {
-    int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path) return false;
-    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
-    bool accepted = ::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
-    ::close(fd);
-    return accepted;
+    const int fd = ConnectUnix(path);
+    if (fd >= 0) ::close(fd);
+    return fd >= 0;
 }
 
 // A number field of a /proc status file ("VmRSS", "voluntary_ctxt_switches"

@@ -13,31 +13,15 @@
 
 namespace {
 
-struct Result {
-    int status = -1;
-    std::string out;  // standard output and error
-};
+using Result = nxtest::ShellResult;
 
 class NxregTest : public ::testing::Test {
   protected:
     // Runs nxreg; `input`, when given, is a shell command piped into it.
     Result Run(const std::string& arguments, const std::string& input = "") {
-        return Shell((input.empty() ? "" : input + " | ") + Nxreg() + " " + arguments + " 2>&1");
+        return nxtest::Shell((input.empty() ? "" : input + " | ") + Nxreg() + " " + arguments);
     }
     static std::string Nxreg() { return std::string(NXBASE_BINARY_DIR) + "/tools/nxreg"; }
-    Result Shell(const std::string& command) {
-        Result result;
-        FILE* pipe = ::popen(command.c_str(), "r");
-        if (pipe == nullptr) return result;
-        char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-            result.out.append(buffer, n);
-        }
-        int status = ::pclose(pipe);
-        result.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-        return result;
-    }
-
     nxtest::TempDir dir;
     nxtest::ScopedEnv user{"NXBASE_USER_REGISTRY", dir.File("user.sqlite")};
     nxtest::ScopedEnv machine{"NXBASE_MACHINE_REGISTRY", dir.File("machine.sqlite")};
@@ -185,9 +169,9 @@ TEST_F(NxregTest, HivesOnAReadOnlyMountAreRead) {
     ASSERT_EQ(Run("set 'HKLM\\Software\\K-Lume\\Ro' m machine").status, 0);
     const std::string mount =
         "mount --bind -o ro '" + dir.path().string() + "' '" + dir.path().string() + "'";
-    Result readOnly = Shell("unshare -rm sh -c \"" + mount + " && " + Nxreg() +
-                            " get 'HKCU\\Software\\K-Lume\\Ro' u && " + Nxreg() +
-                            " get 'HKLM\\Software\\K-Lume\\Ro' m\" 2>&1");
+    Result readOnly = nxtest::Shell("unshare -rm sh -c \"" + mount + " && " + Nxreg() +
+                                    " get 'HKCU\\Software\\K-Lume\\Ro' u && " + Nxreg() +
+                                    " get 'HKLM\\Software\\K-Lume\\Ro' m\"");
     EXPECT_EQ(readOnly.status, 0) << readOnly.out;
     EXPECT_EQ(readOnly.out, "user\nmachine\n");
 }

@@ -6,7 +6,6 @@
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -154,11 +153,8 @@ class PipeTest : public ::testing::Test {
 
     // A raw connection to our own request socket, handshake done.
     int RawClient(const std::string& name) {
-        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
-        EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        const int fd = nxtest::ConnectUnix(pipe->GetSocketPath());
+        EXPECT_GE(fd, 0);
         std::string request = nxbase::EncodeFrame(name + "_1");
         EXPECT_EQ(::write(fd, request.data(), request.size()),
                   static_cast<ssize_t>(request.size()));
@@ -282,11 +278,8 @@ TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
     // Silent, or a request without a process id: closed, the silent one after 5 s.
     std::size_t channels = pipe->ChannelCount();
     auto connect = [&] {
-        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
-        EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        const int fd = nxtest::ConnectUnix(pipe->GetSocketPath());
+        EXPECT_GE(fd, 0);
         return fd;
     };
     int silent = connect();
@@ -419,13 +412,9 @@ TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {
         << pipe->GetLastError();
     // The server says so and ends instead of running without a socket.
     if (::access(NXBASE_BINARY_DIR "/tools/lumaserver", X_OK) != 0) return;  // tools not built
-    std::string server = NXBASE_BINARY_DIR "/tools/lumaserver 2>&1";
-    FILE* output = ::popen(server.c_str(), "r");
-    char buffer[512] = {};
-    std::size_t n = std::fread(buffer, 1, sizeof buffer - 1, output);
-    int status = ::pclose(output);
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) != 0);
-    EXPECT_NE(std::string(buffer, n).find("open to other users"), std::string::npos) << buffer;
+    const nxtest::ShellResult server = nxtest::Shell(NXBASE_BINARY_DIR "/tools/lumaserver");
+    EXPECT_GT(server.status, 0);
+    EXPECT_NE(server.out.find("open to other users"), std::string::npos) << server.out;
     ::chmod(runtime.c_str(), 0700);
 }
 
@@ -459,11 +448,8 @@ TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     pid_t child = ::fork();
     if (child == 0) {
         if (::setgid(65534) != 0 || ::setuid(65534) != 0) ::_exit(3);
-        int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, pipe->GetSocketPath().c_str());
-        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(4);
+        const int fd = nxtest::ConnectUnix(pipe->GetSocketPath());
+        if (fd < 0) ::_exit(4);
         std::string request = nxbase::EncodeFrame("Intruder_1");
         (void)!::send(fd, request.data(), request.size(), MSG_NOSIGNAL);
         char reply[64];

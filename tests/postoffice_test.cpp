@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -35,11 +34,8 @@ using nxtest::RunUntil;
 class RawPeer {
   public:
     RawPeer(const std::string& name, const std::string& socketPath) : name_(name) {
-        fd_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, socketPath.c_str());
-        EXPECT_EQ(::connect(fd_, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+        fd_ = nxtest::ConnectUnix(socketPath);
+        EXPECT_GE(fd_, 0);
         Write(nxbase::EncodeFrame(name + "_7"));
         Next();  // the "DirectPipe-..." reply
     }
@@ -374,11 +370,8 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
     if (flooder == 0) {
         // Blocking calls only: the child must not run the parent's event loop,
         // whose epoll instance it shares.
-        int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, path.c_str());
-        if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(1);
+        const int fd = nxtest::ConnectUnix(path);
+        if (fd < 0) ::_exit(1);
         std::string bytes = nxbase::EncodeFrame("Flooder_1");
         char reply[256];
         if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0 ||

@@ -3,6 +3,8 @@
 #ifndef NXBASE_TESTS_TEST_UTIL_H_
 #define NXBASE_TESTS_TEST_UTIL_H_
 
+#include <sys/wait.h>
+
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -90,16 +92,27 @@ inline std::string ReadFile(const std::string& path) {
     return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
 }
 
-// What a shell command prints, standard error included.
-inline std::string ShellOutput(const std::string& command) {
-    std::string output;
+// What a shell command printed, standard error included, and its exit status
+// (-1 when it did not exit).
+struct ShellResult {
+    int status = -1;
+    std::string out;
+};
+
+inline ShellResult Shell(const std::string& command) {
+    ShellResult result;
     FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
-    if (pipe == nullptr) return output;
+    if (pipe == nullptr) return result;
     char buffer[4096];
     for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        output.append(buffer, n);
-    ::pclose(pipe);
-    return output;
+        result.out.append(buffer, n);
+    const int status = ::pclose(pipe);
+    result.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    return result;
+}
+
+inline std::string ShellOutput(const std::string& command) {
+    return Shell(command).out;
 }
 
 inline std::vector<std::string> ReadLines(const std::string& path) {
