@@ -82,6 +82,18 @@ unsigned int OnlineProcessorCount() {
     return count > 0 ? static_cast<unsigned int>(count) : 1u;
 }
 
+VectorIsa MachineVectorIsa() {
+#if defined(__x86_64__) && defined(__GNUC__)
+    if (!__builtin_cpu_supports("x86-64-v3")) return VectorIsa::kBaseline;
+    if (__builtin_cpu_supports("avx512f") && __builtin_cpu_supports("avx512dq") &&
+        __builtin_cpu_supports("avx512vl"))
+        return VectorIsa::kAvx512;
+    return VectorIsa::kAvx2;
+#else
+    return VectorIsa::kBaseline;
+#endif
+}
+
 int ProcessNiceValue() {
     errno = 0;
     const int nice = ::getpriority(PRIO_PROCESS, static_cast<id_t>(::getpid()));

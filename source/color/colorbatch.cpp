@@ -20,6 +20,7 @@
 #include "nxbase/cmetry.h"
 #include "nxbase/spectrafile.h"
 #include "nxbase/thread.h"
+#include "toolkit/system.h"
 
 namespace nxbase {
 namespace {
@@ -36,19 +37,12 @@ struct Chosen {
 };
 
 bool MachineHas(detail::BatchIsa isa) {
-    switch (isa) {
-        case detail::BatchIsa::kBaseline:
-            return true;
 #ifdef NXBASE_BATCH_X86_KERNELS
-        case detail::BatchIsa::kAvx2:
-            return __builtin_cpu_supports("x86-64-v3");
-        case detail::BatchIsa::kAvx512:
-            return __builtin_cpu_supports("x86-64-v3") && __builtin_cpu_supports("avx512f") &&
-                   __builtin_cpu_supports("avx512dq") && __builtin_cpu_supports("avx512vl");
+    const toolkit::VectorIsa machine = toolkit::MachineVectorIsa();
+    if (isa == detail::BatchIsa::kAvx2) return machine >= toolkit::VectorIsa::kAvx2;
+    if (isa == detail::BatchIsa::kAvx512) return machine == toolkit::VectorIsa::kAvx512;
 #endif
-        default:
-            return false;
-    }
+    return isa == detail::BatchIsa::kBaseline;
 }
 
 Chosen Choose(detail::BatchIsa isa) {

@@ -11,6 +11,7 @@
 #include "nxbase/cielab.h"
 #include "nxbase/meascond.h"
 #include "nxbase/thread.h"
+#include "toolkit/system.h"
 
 namespace nxbase {
 namespace {
@@ -52,10 +53,14 @@ constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
 const finegrid::Kernels& TheKernels() {
     static const finegrid::Kernels kernels = [] {
 #ifdef NXBASE_FINEGRID_X86_KERNELS
-        if (__builtin_cpu_supports("x86-64-v3") && __builtin_cpu_supports("avx512f") &&
-            __builtin_cpu_supports("avx512dq") && __builtin_cpu_supports("avx512vl"))
-            return finegrid::Avx512Kernels();
-        if (__builtin_cpu_supports("x86-64-v3")) return finegrid::Avx2Kernels();
+        switch (toolkit::MachineVectorIsa()) {
+            case toolkit::VectorIsa::kAvx512:
+                return finegrid::Avx512Kernels();
+            case toolkit::VectorIsa::kAvx2:
+                return finegrid::Avx2Kernels();
+            case toolkit::VectorIsa::kBaseline:
+                break;
+        }
 #endif
         return finegrid::BaselineKernels();
     }();

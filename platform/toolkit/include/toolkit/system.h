@@ -51,6 +51,11 @@ NXBASE_EXPORT std::string HostName();
 NXBASE_EXPORT std::string LoginName();
 // Processors online, at least 1.
 NXBASE_EXPORT unsigned int OnlineProcessorCount();
+// The widest vector instruction set the processor offers of those the
+// colour kernels are built for: AVX-512 (F, DQ and VL) with x86-64-v3, AVX2
+// with the rest of x86-64-v3, or neither (any other processor).
+enum class VectorIsa { kBaseline, kAvx2, kAvx512 };
+NXBASE_EXPORT VectorIsa MachineVectorIsa();
 // How many fork() calls lie between the original process and this one (0
 // there): an object that remembers the value it was made under sees by a
 // change that its threads and locks are its parent's.
