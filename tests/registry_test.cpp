@@ -393,14 +393,22 @@ TEST_F(RegistryTest, Regedit4ErrorsNameSourceAndLineAndApplyNothing) {
         {"REGEDIT4\n[HKCU\\x]\n\"a\"\n", "trip.reg:3: missing ="},
         {"REGEDIT4\n[-HKCU\\]\n", "trip.reg:2: a whole hive cannot be deleted"},
     };
-    for (const Case& c : cases) {
+    auto refusal = [](const std::string& text) {
         try {
-            nxbase::ParseRegedit4(c.text, "trip.reg");
-            ADD_FAILURE() << "accepted: " << c.text;
+            nxbase::ParseRegedit4(text, "trip.reg");
         } catch (const std::runtime_error& error) {
-            EXPECT_EQ(std::string(error.what()).rfind(c.expected, 0), 0u) << error.what();
+            return std::string(error.what());
         }
+        return "accepted: " + text;
+    };
+    for (const Case& c : cases) {
+        const std::string why = refusal(c.text);
+        EXPECT_EQ(why.rfind(c.expected, 0), 0u) << why;
     }
+    // The offending text is quoted up to 60 characters; "..." only if cut.
+    const std::string line(60, 'x'), first = "trip.reg:1: the first line must be REGEDIT4: ";
+    EXPECT_EQ(refusal(line + "\n"), first + line);
+    EXPECT_EQ(refusal(line + "y\n"), first + line + "...");
     EXPECT_FALSE(std::filesystem::exists(dir.File("user/registry.sqlite")));
 }
 

@@ -342,6 +342,9 @@ TEST(SpectraFile, ReadsCgatsSpellingsAndReportsBadSets) {
         // LittleCMS's limit, said in words instead of "AllocateDataSet: too much data".
         {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format + "NUMBER_OF_SETS 40000\n" + rows,
          "c:6: more than 32766 sets, which the CGATS parser (LittleCMS) does not take"},
+        {"CGATS.17\nNUMBER_OF_FIELDS 5\n" + format +
+             "NUMBER_OF_SETS 32766\nBEGIN_DATA\n1 a 0.1 0.2 0.3\nEND_DATA\n",
+         "c:6: NUMBER_OF_SETS says 32766, the data holds 1 sets"},
     };
     // A header grid the fields contradict is refused, as ArgyllCMS does.
     std::string contradicted = argyll;
