@@ -46,11 +46,15 @@ constexpr std::size_t kLanes = 16;
 constexpr std::size_t kPrefetchBytes = 9 * 1024;
 
 // kLanes partial sums per channel, as two vectors of eight (GCC's generic
-// vectors: two AVX-512 registers, four AVX2 ones or eight SSE2 ones).
+// vectors: two AVX-512 registers, four AVX2 ones or eight SSE2 ones). Named
+// members, not an array: the compiler keeps them in registers for a whole
+// spectrum instead of clearing and reducing them through memory.
 typedef double Eight __attribute__((vector_size(64)));
 typedef std::uint64_t EightBits __attribute__((vector_size(64)));
 typedef float EightFloats __attribute__((vector_size(32)));
-using Lanes = Eight[3][2];
+struct Lanes {
+    Eight x0{}, x1{}, y0{}, y1{}, z0{}, z1{};
+};
 
 // Vectors go by reference: passed by value, their ABI would depend on the
 // instruction set of the file.
@@ -69,22 +73,23 @@ inline void AddProducts(Eight& lane, const double* weights, const Eight& values)
 // One step: kLanes values of a spectrum into the lanes of the three sums.
 inline void AddLanes(Lanes& lane, const double* w0, const double* w1, const double* w2,
                      const float* values) {
-    for (int half = 0; half < 2; ++half) {
-        Eight r;
-        Widen(values + 8 * half, r);
-        AddProducts(lane[0][half], w0 + 8 * half, r);
-        AddProducts(lane[1][half], w1 + 8 * half, r);
-        AddProducts(lane[2][half], w2 + 8 * half, r);
-    }
+    Eight low, high;
+    Widen(values, low);
+    Widen(values + 8, high);
+    AddProducts(lane.x0, w0, low);
+    AddProducts(lane.y0, w1, low);
+    AddProducts(lane.z0, w2, low);
+    AddProducts(lane.x1, w0 + 8, high);
+    AddProducts(lane.y1, w1 + 8, high);
+    AddProducts(lane.z1, w2 + 8, high);
 }
 
 // The lanes' sum, halving them pairwise in a fixed order.
-inline double Reduced(const Eight (&lane)[2]) {
-    const Eight half = lane[0] + lane[1];
-    double quarter[4], eighth[2];
-    for (int l = 0; l < 4; ++l) quarter[l] = half[l] + half[l + 4];
-    for (int l = 0; l < 2; ++l) eighth[l] = quarter[l] + quarter[l + 2];
-    return eighth[0] + eighth[1];
+inline double Reduced(const Eight& low, const Eight& high) {
+    const Eight half = low + high;
+    const double q0 = half[0] + half[4], q1 = half[1] + half[5];
+    const double q2 = half[2] + half[6], q3 = half[3] + half[7];
+    return (q0 + q2) + (q1 + q3);
 }
 
 // The last n % kLanes values of a spectrum of n >= kLanes values are summed
@@ -127,12 +132,17 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
     const bool overlap = n >= kLanes && whole < n;
     const Tail tail(w0, w1, w2, overlap ? n : kLanes);
     for (std::size_t i = 0; i < count; ++i, spectra += n, xyz += 3) {
+        // A line fetched per step (a step reads kLanes floats, one line's
+        // worth), and the lines of the tail: fetched in a burst instead, the
+        // lines of a long spectrum wait for each other.
         const char* ahead = reinterpret_cast<const char*>(spectra) + kPrefetchBytes;
-        for (std::size_t line = 0; line < n * sizeof(float); line += 64)
-            __builtin_prefetch(ahead + line, 0, 3);
-        Lanes lane = {};
-        for (std::size_t k = 0; k < whole; k += kLanes)
+        Lanes lane;
+        for (std::size_t k = 0; k < whole; k += kLanes) {
+            __builtin_prefetch(ahead + k * sizeof(float), 0, 3);
             AddLanes(lane, w0 + k, w1 + k, w2 + k, spectra + k);
+        }
+        __builtin_prefetch(ahead + whole * sizeof(float), 0, 3);
+        __builtin_prefetch(ahead + n * sizeof(float) - 1, 0, 3);
         if (overlap) {
             AddLanes(lane, tail.row[0], tail.row[1], tail.row[2], spectra + n - kLanes);
         } else if (whole < n) {
@@ -140,7 +150,9 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
             for (std::size_t l = 0; whole + l < n; ++l) rest[l] = spectra[whole + l];
             AddLanes(lane, w0 + whole, w1 + whole, w2 + whole, rest);
         }
-        for (int c = 0; c < 3; ++c) xyz[c] = Reduced(lane[c]);
+        xyz[0] = Reduced(lane.x0, lane.x1);
+        xyz[1] = Reduced(lane.y0, lane.y1);
+        xyz[2] = Reduced(lane.z0, lane.z1);
     }
 }
 
