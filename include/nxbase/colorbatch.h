@@ -21,6 +21,7 @@
 
 #include "nxbase/export.h"
 #include "nxbase/spectralgrid.h"
+#include "toolkit/system.h"
 
 class CMetryFilter;
 class MeasuringCondition;
@@ -119,10 +120,11 @@ namespace detail {
 // The batch cube root: pOut[i] = t^(1/3) for positive normal pIn[i], to a few
 // units in the last place. Exposed for the tests.
 NXBASE_EXPORT void BatchCbrt(const float* pIn, std::size_t alCount, float* pOut);
-// The instruction sets the kernels are built for. The fastest the machine
-// has is used; UseBatchIsa switches (false when the machine lacks it), for
-// the tests only: never while a conversion runs.
-enum class BatchIsa { kBaseline, kAvx2, kAvx512 };
+// The instruction sets the kernels are built for (the toolkit's, widest
+// last). The widest the machine has is used; UseBatchIsa switches (false
+// when the machine lacks it or the kernel is not built), for the tests only:
+// never while a conversion runs.
+using BatchIsa = toolkit::VectorIsa;
 NXBASE_EXPORT bool UseBatchIsa(BatchIsa isa);
 NXBASE_EXPORT BatchIsa BatchIsaInUse();
 }  // namespace detail

@@ -20,7 +20,6 @@
 #include "nxbase/cmetry.h"
 #include "nxbase/spectrafile.h"
 #include "nxbase/thread.h"
-#include "toolkit/system.h"
 
 namespace nxbase {
 namespace {
@@ -36,13 +35,13 @@ struct Chosen {
     batch::WideKernels wide{};
 };
 
-bool MachineHas(detail::BatchIsa isa) {
+// The widest set the machine has of those built here.
+detail::BatchIsa Widest() {
 #ifdef NXBASE_BATCH_X86_KERNELS
-    const toolkit::VectorIsa machine = toolkit::MachineVectorIsa();
-    if (isa == detail::BatchIsa::kAvx2) return machine >= toolkit::VectorIsa::kAvx2;
-    if (isa == detail::BatchIsa::kAvx512) return machine == toolkit::VectorIsa::kAvx512;
+    return toolkit::MachineVectorIsa();
+#else
+    return detail::BatchIsa::kBaseline;
 #endif
-    return isa == detail::BatchIsa::kBaseline;
 }
 
 Chosen Choose(detail::BatchIsa isa) {
@@ -56,10 +55,7 @@ Chosen Choose(detail::BatchIsa isa) {
 }
 
 Chosen& InUse() {
-    static Chosen chosen =
-        Choose(MachineHas(detail::BatchIsa::kAvx512) ? detail::BatchIsa::kAvx512
-               : MachineHas(detail::BatchIsa::kAvx2) ? detail::BatchIsa::kAvx2
-                                                     : detail::BatchIsa::kBaseline);
+    static Chosen chosen = Choose(Widest());
     return chosen;
 }
 
@@ -257,7 +253,7 @@ void BatchCbrt(const float* pIn, std::size_t alCount, float* pOut) {
 }
 
 bool UseBatchIsa(BatchIsa isa) {
-    if (!MachineHas(isa)) return false;
+    if (isa > Widest()) return false;
     InUse() = Choose(isa);
     return true;
 }

@@ -53,7 +53,8 @@ NXBASE_EXPORT std::string LoginName();
 NXBASE_EXPORT unsigned int OnlineProcessorCount();
 // The widest vector instruction set the processor offers of those the
 // colour kernels are built for: AVX-512 (F, DQ and VL) with x86-64-v3, AVX2
-// with the rest of x86-64-v3, or neither (any other processor).
+// with the rest of x86-64-v3, or neither (any other processor); in order of
+// width, so that a set the machine has compares <= its answer.
 enum class VectorIsa { kBaseline, kAvx2, kAvx512 };
 NXBASE_EXPORT VectorIsa MachineVectorIsa();
 // How many fork() calls lie between the original process and this one (0
