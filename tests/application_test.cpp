@@ -6,6 +6,8 @@
 
 #include <boost/asio/post.hpp>
 #include <memory>
+#include <random>
+#include <string>
 #include <thread>
 
 #include "toolkit/userinterface.h"
@@ -153,6 +155,52 @@ TEST(EventLoop, TheLoopDescriptorIsReadableExactlyWhileAHandlerIsDue) {
     app.RunOneFor(15ms);
     app.SetNestedWait({});
     EXPECT_EQ(turns, std::vector<long>{15});
+}
+
+// Random waits against a model: a timer that makes the wait ready at T and a
+// deadline D (or none) give kReady near T when T comes first, else kTimedOut
+// near D; the keep-waiting function is asked at least every 50 ms however
+// long the wait; after the waits the loop falls asleep (no tick left armed).
+TEST(EventLoop, RandomWaitsEndAsTheirModelSaysAndLeaveTheLoopAsleep) {
+    using Clock = std::chrono::steady_clock;
+    Application& app = Application::Get();
+    app.ResetQuit();
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    for (int round = 0; round < 12; ++round) {
+        const auto readyAt = std::chrono::milliseconds(random() % 260);
+        const bool bounded = random() % 2 == 0;
+        const auto deadlineIn = std::chrono::milliseconds(random() % 260);
+        // Too close to call on a loaded machine.
+        if (bounded && (readyAt > deadlineIn ? readyAt - deadlineIn : deadlineIn - readyAt) < 40ms)
+            continue;
+        SCOPED_TRACE("round " + std::to_string(round));
+        bool ready = false;
+        boost::asio::steady_timer trigger(app.GetContext(), readyAt);
+        trigger.async_wait([&](const boost::system::error_code& error) { ready = !error; });
+        std::vector<Clock::time_point> asked;
+        const auto start = Clock::now();
+        auto end =
+            app.RunUntil([&] { return ready; }, [&] { return asked.push_back(Clock::now()), true; },
+                         bounded ? start + deadlineIn : Clock::time_point::max());
+        const auto took = Clock::now() - start;
+        const bool readyFirst = !bounded || readyAt < deadlineIn;
+        EXPECT_EQ(end, readyFirst ? Application::WaitEnd::kReady : Application::WaitEnd::kTimedOut);
+        EXPECT_GE(took, readyFirst ? readyAt : deadlineIn);
+        EXPECT_LT(took, (readyFirst ? readyAt : deadlineIn) + 250ms);
+        asked.push_back(Clock::now());
+        for (std::size_t i = 1; i < asked.size(); ++i)
+            EXPECT_LT((asked[i] - asked[i - 1]) / 1ms, 150);
+        trigger.cancel();
+        app.GetContext().poll();
+    }
+    // At most two ticks after the last wait (one finds that wait, the next none).
+    std::size_t ran = 0;
+    for (auto until = Clock::now() + 300ms; Clock::now() < until;)
+        ran += app.GetContext().run_one_until(until);
+    EXPECT_LE(ran, 2u);
+    EXPECT_EQ(app.GetContext().run_one_for(200ms), 0u);
 }
 
 TEST(EventLoop, WaitingStateAndTopWindowGoThroughTheUserInterface) {

@@ -9,6 +9,7 @@
 #include <boost/asio/post.hpp>
 #include <cerrno>
 #include <system_error>
+#include <utility>
 
 #include "toolkit/userinterface.h"
 
@@ -17,6 +18,9 @@
 #endif
 
 namespace {
+
+// The longest turn of a wait: how often its functions are asked.
+constexpr std::chrono::milliseconds kLongestTurn(50);
 
 // asio keeps its epoll descriptor private. Its timers are a timerfd and its
 // cross-thread wake-up an eventfd in that same epoll set, so the set becomes
@@ -147,7 +151,6 @@ Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
                                            const std::function<bool()>& keepWaiting,
                                            std::chrono::steady_clock::time_point deadline) {
     using namespace std::chrono;
-    constexpr milliseconds kLongestTurn(50);
     const unsigned long quits = quitCount_.load();
     while (true) {
         if (ready()) return WaitEnd::kReady;
@@ -159,9 +162,34 @@ Application::WaitEnd Application::RunUntil(const std::function<bool()>& ready,
         // Rounded up, so that a turn ending just before the deadline is not
         // followed by turns of 0 ms.
         auto left = deadline - now;
-        RunOneFor(left < kLongestTurn ? duration_cast<milliseconds>(left) + milliseconds(1)
-                                      : kLongestTurn);
+        if (left < kLongestTurn) {
+            RunOneFor(duration_cast<milliseconds>(left) + milliseconds(1));
+        } else if (nestedWait_ && !nestingBarred_) {
+            RunOneFor(kLongestTurn);
+        } else {
+            RunOneTicked();
+        }
     }
+}
+
+// One turn of a wait with no deadline within the tick: blocks until a
+// handler ran, the tick's included.
+void Application::RunOneTicked() {
+    MarkUserInterfaceThread();
+    if (!waitTickArmed_) ArmWaitTick();
+    waitedSinceTick_ = true;
+    if (context_.stopped()) context_.restart();
+    context_.run_one();
+}
+
+void Application::ArmWaitTick() {
+    waitTickArmed_ = true;
+    waitTick_.expires_after(kLongestTurn);
+    waitTick_.async_wait([this](const boost::system::error_code& error) {
+        waitTickArmed_ = false;
+        const bool waited = std::exchange(waitedSinceTick_, false);
+        if (!error && waited) ArmWaitTick();
+    });
 }
 
 int Application::GetLoopDescriptor() {

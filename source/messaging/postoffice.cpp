@@ -750,34 +750,45 @@ unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage
 unsigned char PostOffice::SendAndReceive(const std::string& asApp, int alMessage,
                                          MyMemoryBlock& axSend, MyMemoryBlock& axReceive,
                                          DisEnable axMode, PeerStart axStart) {
-    auto start = std::chrono::steady_clock::now();
-    const int limitSeconds = nxbase::WaitTimeoutSeconds();
-    auto limit = std::chrono::seconds(limitSeconds);
-    bool toServer = PostOfficeApplications::IsServerName(asApp);
-    if (!toServer) NX_COMM_LOG("Set callback function");
-    bool dialogOpen = false;
-    boost::function<bool()> keepWaiting = [&]() {
-        auto ui = UserInterface::Current();
-        auto elapsed = std::chrono::steady_clock::now() - start;
-        if (limitSeconds > 0 && !ui->IsInteractive() && elapsed > limit) {
-            // Always written: a wait given up for want of a person must show.
-            LogFile::WriteToLog(String("SendAndReceive: no answer from ") + String(asApp) +
-                                    " within " + Number(static_cast<long>(limitSeconds)) +
-                                    " s (NXBASE_WAIT_TIMEOUT), aborted",
-                                String());
-            return false;
+    // Asked every turn of the wait, that is for every message that arrives:
+    // the time-out's setting and the user interface are looked up only once
+    // a second has passed (no time-out is shorter), the state is one pointer
+    // so that the function is not allocated.
+    struct Waiting {
+        std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+        const std::string& app;
+        bool toServer;
+        std::optional<int> limitSeconds{};
+        bool dialogOpen = false;
+        bool KeepWaiting() {
+            auto elapsed = std::chrono::steady_clock::now() - start;
+            if (elapsed < std::chrono::seconds(1)) return true;
+            if (!limitSeconds) limitSeconds = nxbase::WaitTimeoutSeconds();
+            auto ui = UserInterface::Current();
+            if (*limitSeconds > 0 && !ui->IsInteractive() &&
+                elapsed > std::chrono::seconds(*limitSeconds)) {
+                // Always written: a wait given up for want of a person must show.
+                LogFile::WriteToLog(String("SendAndReceive: no answer from ") + String(app) +
+                                        " within " + Number(static_cast<long>(*limitSeconds)) +
+                                        " s (NXBASE_WAIT_TIMEOUT), aborted",
+                                    String());
+                return false;
+            }
+            if (toServer || elapsed < kAbortDialogAfter) return true;
+            if (!dialogOpen) {
+                dialogOpen = true;
+                ui->OpenAbortDialog(
+                    TextOr("ObjectIdApplikation", 0, "Waiting").str(),
+                    TextOr("ObjectIdApplikation", 1, "Waiting for an answer").str());
+            }
+            return !ui->IsAbortDialogAborted();
         }
-        if (toServer || elapsed < kAbortDialogAfter) return true;
-        if (!dialogOpen) {
-            dialogOpen = true;
-            ui->OpenAbortDialog(TextOr("ObjectIdApplikation", 0, "Waiting").str(),
-                                TextOr("ObjectIdApplikation", 1, "Waiting for an answer").str());
-        }
-        return !ui->IsAbortDialogAborted();
-    };
+    } waiting{.app = asApp, .toServer = PostOfficeApplications::IsServerName(asApp)};
+    if (!waiting.toServer) NX_COMM_LOG("Set callback function");
+    boost::function<bool()> keepWaiting = [state = &waiting] { return state->KeepWaiting(); };
     unsigned char result =
         SendAndReceive(asApp, alMessage, axSend, axReceive, keepWaiting, axMode, axStart);
-    if (dialogOpen) UserInterface::Current()->CloseAbortDialog();
+    if (waiting.dialogOpen) UserInterface::Current()->CloseAbortDialog();
     return result;
 }
 

@@ -156,6 +156,8 @@ class NXBASE_EXPORT Application {
     void AfterFork();
     void MarkUserInterfaceThread() { uiThread_.store(std::this_thread::get_id()); }
     void Wake();
+    void RunOneTicked();
+    void ArmWaitTick();
 
     boost::asio::io_context context_;
     NestedWait nestedWait_;
@@ -176,6 +178,13 @@ class NXBASE_EXPORT Application {
     bool waiting_ = false;
     int executing_ = 0;
     std::atomic<std::thread::id> uiThread_{std::this_thread::get_id()};
+    // Ends a long wait's turn every 50 ms. A timer armed for every turn costs
+    // a round trip more than the rest of the loop: this one is armed by the
+    // first wait, rearms itself while waits go on and stops at a tick that
+    // finds none since the one before.
+    boost::asio::steady_timer waitTick_{context_};
+    bool waitTickArmed_ = false;
+    bool waitedSinceTick_ = false;
 };
 
 // A one-shot timer on the application's loop: after Start() it calls its
