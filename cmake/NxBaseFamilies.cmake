@@ -47,17 +47,22 @@ endfunction()
 
 # Kernels built once per x86-64 instruction set, with GCC: AVX2 with
 # x86-64-v3, AVX512 with AVX-512 F, DQ and VL besides (and AVX512_OPTIONS),
-# both without fused multiply-adds, so that every set rounds alike; the
+# both without fused multiply-adds, so that every set rounds alike, unless
+# FUSED_MULTIPLY_ADD is given (faster, the last bits differ by set); the
 # DISPATCHER source is compiled with DEFINE set and picks among them at run
 # time. Elsewhere nothing is added and the dispatcher uses its own code.
 function(nxbase_add_x86_kernels target)
-    cmake_parse_arguments(K "" "AVX2;AVX512;DISPATCHER;DEFINE" "AVX512_OPTIONS" ${ARGN})
+    cmake_parse_arguments(K "FUSED_MULTIPLY_ADD" "AVX2;AVX512;DISPATCHER;DEFINE" "AVX512_OPTIONS" ${ARGN})
     if(NOT (CMAKE_SYSTEM_PROCESSOR MATCHES "x86_64|AMD64" AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU"))
         return()
     endif()
     target_sources(${target} PRIVATE ${K_AVX2} ${K_AVX512})
-    set_source_files_properties(${K_AVX2} PROPERTIES COMPILE_OPTIONS "-ffp-contract=off;-march=x86-64-v3")
+    set(contract "-ffp-contract=off")
+    if(K_FUSED_MULTIPLY_ADD)
+        set(contract "-ffp-contract=fast")
+    endif()
+    set_source_files_properties(${K_AVX2} PROPERTIES COMPILE_OPTIONS "${contract};-march=x86-64-v3")
     set_source_files_properties(${K_AVX512} PROPERTIES COMPILE_OPTIONS
-        "-ffp-contract=off;-march=x86-64-v3;-mavx512f;-mavx512dq;-mavx512vl;${K_AVX512_OPTIONS}")
+        "${contract};-march=x86-64-v3;-mavx512f;-mavx512dq;-mavx512vl;${K_AVX512_OPTIONS}")
     set_source_files_properties(${K_DISPATCHER} PROPERTIES COMPILE_DEFINITIONS ${K_DEFINE})
 endfunction()

@@ -544,10 +544,26 @@ TEST(FineGridTristimulus, TheCubeRootIsWithinAnUlpAndManyColoursGiveEachOnesLab)
         xyz[j] = j % 29 == 0 ? odd[j / 29 % 6] : white[j % 3] * unit(random);
     std::vector<double> lab = xyz;
     nxbase::CielabInPlace(lab.data(), 203, white);
+    // The model: CIE's formula with the standard library's cube root; NaN
+    // exactly when a ratio to the white is not finite.
+    auto f = [](double t) { return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0; };
     for (std::size_t i = 0; i < 203; ++i) {
         const auto one = nxbase::CielabOf({xyz[3 * i], xyz[3 * i + 1], xyz[3 * i + 2]}, white);
         ASSERT_EQ(std::memcmp(one.data(), &lab[3 * i], sizeof one), 0) << "colour " << i;
+        double r[3];
+        for (int c = 0; c < 3; ++c) r[c] = xyz[3 * i + c] / white[c];
+        if (!std::isfinite(r[0]) || !std::isfinite(r[1]) || !std::isfinite(r[2])) {
+            for (int c = 0; c < 3; ++c) ASSERT_TRUE(std::isnan(one[c])) << "colour " << i;
+            continue;
+        }
+        const double model[3] = {116.0 * f(r[1]) - 16.0, 500.0 * (f(r[0]) - f(r[1])),
+                                 200.0 * (f(r[1]) - f(r[2]))};
+        for (int c = 0; c < 3; ++c)
+            ASSERT_NEAR(one[c], model[c], 1e-9 * (1.0 + std::fabs(model[c]))) << "colour " << i;
     }
+    // Finite values whose ratio to a white below 1 overflows have no colour.
+    for (double v : nxbase::CielabOf({1e308, 1.0, 1.0}, {0.5, 1.0, 1.0}))
+        EXPECT_TRUE(std::isnan(v));
 }
 
 TEST(FineGridTristimulus, SumsAtTheirOwnIntervalAndAgreeWithTheTenNanometrePathForSmoothSpectra) {

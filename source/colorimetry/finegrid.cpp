@@ -38,12 +38,11 @@ double CmfAt(const klume::cmetry::IObserver& observer, int channel, double nm) {
 }  // namespace
 
 namespace {
-// A white every component of which is positive and finite (CIELAB divides
-// by it), and a colour of finite components: anything else has no colour.
-bool Usable(const std::array<double, 3>& axColour, const std::array<double, 3>& axWhite) {
-    for (int c = 0; c < 3; ++c) {
-        if (!(axWhite[c] > 0.0 && std::isfinite(axWhite[c]) && std::isfinite(axColour[c])))
-            return false;
+// CIELAB divides by the white: each of its components must be positive and
+// finite.
+bool UsableWhite(const std::array<double, 3>& axWhite) {
+    for (double component : axWhite) {
+        if (!(component > 0.0 && std::isfinite(component))) return false;
     }
     return true;
 }
@@ -75,35 +74,19 @@ std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
     return lab;
 }
 
-// A chunk's ratios to the white first, then f of all of them by the
-// kernel, eight at a time, then L*, a* and b*.
 void CielabInPlace(double* pXYZ, std::size_t alCount, const std::array<double, 3>& axWhite) {
-    constexpr std::size_t kChunk = 64;
-    for (std::size_t first = 0; first < alCount; first += kChunk) {
-        double* xyz = pXYZ + 3 * first;
-        const std::size_t count = std::min(kChunk, alCount - first);
-        double f[3 * kChunk];
-        for (std::size_t i = 0; i < count; ++i) {
-            for (int c = 0; c < 3; ++c) f[3 * i + c] = xyz[3 * i + c] / axWhite[c];
-        }
-        TheKernels().f(f, 3 * count);
-        for (std::size_t i = 0; i < count; ++i, xyz += 3) {
-            const std::array<double, 3> colour{xyz[0], xyz[1], xyz[2]};
-            const double fx = f[3 * i], fy = f[3 * i + 1], fz = f[3 * i + 2];
-            if (!Usable(colour, axWhite)) {
-                xyz[0] = xyz[1] = xyz[2] = kNaN;
-                continue;
-            }
-            xyz[0] = 116.0 * fy - 16.0;
-            xyz[1] = 500.0 * (fx - fy);
-            xyz[2] = 200.0 * (fy - fz);
-        }
+    if (!UsableWhite(axWhite)) {
+        std::fill(pXYZ, pXYZ + 3 * alCount, kNaN);
+        return;
     }
+    TheKernels().lab(pXYZ, alCount, axWhite.data());
 }
 
 std::array<double, 3> XyzOfCielab(const std::array<double, 3>& axLab,
                                   const std::array<double, 3>& axWhite) {
-    if (!Usable(axLab, axWhite)) return {kNaN, kNaN, kNaN};
+    if (!UsableWhite(axWhite) ||
+        !std::all_of(axLab.begin(), axLab.end(), [](double v) { return std::isfinite(v); }))
+        return {kNaN, kNaN, kNaN};
     const double fy = (axLab[0] + 16.0) / 116.0;
     return {cielab::FInverse(axLab[1] / 500.0 + fy) * axWhite[0], cielab::FInverse(fy) * axWhite[1],
             cielab::FInverse(fy - axLab[2] / 200.0) * axWhite[2]};

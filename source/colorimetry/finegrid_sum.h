@@ -17,13 +17,15 @@ namespace nxbase::finegrid {
 // weights run on with zeros to a multiple of kLanes values.
 using SumFunction = void (*)(const double* w0, const double* w1, const double* w2, std::size_t n,
                              const float* spectra, std::size_t count, double* xyz);
-// CIELAB's f of `count` values in place, eight at a time; the same bits as
-// cielab::F of each.
-using FFunction = void (*)(double* values, std::size_t count);
+// CIELAB of `count` XYZ triples in place, relative to a white of positive
+// finite components (three doubles); a triple whose ratio to the white is
+// not finite in some component (a value not finite, or too large) becomes
+// NaN. The same bits for a colour alone as among many.
+using LabFunction = void (*)(double* xyz, std::size_t count, const double* white);
 
 struct Kernels {
     SumFunction sum;
-    FFunction f;
+    LabFunction lab;
 };
 
 Kernels BaselineKernels();
@@ -37,8 +39,10 @@ namespace {
 // Partial sums per channel kept apart: independent chains that the compiler
 // holds in vector registers (two AVX-512 registers, or four AVX2 ones, per
 // channel), enough of them that the multiplies and adds, not their latency,
-// set the pace. Their order of additions is fixed and the files are built
-// without fused multiply-adds, so every instruction set gives the same bits.
+// set the pace. Their order of additions is fixed; the AVX2 and AVX-512
+// files fuse each multiply with its add (a quarter faster), so their last
+// bits differ from the baseline's (relative 1e-16, hardly ever a float's);
+// on one machine one spectrum and many give the same bits.
 constexpr std::size_t kLanes = 16;
 // How far ahead of the spectrum being summed the following ones are fetched,
 // as the batch kernels fetch: the hardware's stream prefetcher alone leaves
@@ -113,6 +117,8 @@ struct Tail {
 // copy built for one instruction set must never be the one the others call.
 struct ThisFile {};
 
+// CIELAB's f of `count` values in place, eight at a time; each value gets
+// the same bits in a vector as alone.
 inline void FOfValues(double* values, std::size_t count) {
     std::size_t i = 0;
     for (; i + 8 <= count; i += 8) {
@@ -156,8 +162,38 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
     }
 }
 
+// The ratios to the white of kLabBlock triples, as kLabBlock * 3 doubles:
+// whole vectors, divided lane by lane (the same bits as one by one).
+constexpr std::size_t kLabBlock = 8;
+
+inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
+    double whites[3 * kLabBlock];
+    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = white[j % 3];
+    for (std::size_t first = 0; first < count; first += kLabBlock, xyz += 3 * kLabBlock) {
+        const std::size_t n = count - first < kLabBlock ? count - first : kLabBlock;
+        double f[3 * kLabBlock];
+        if (n == kLabBlock) {
+            for (std::size_t j = 0; j < 3 * kLabBlock; ++j) f[j] = xyz[j] / whites[j];
+        } else {
+            for (std::size_t j = 0; j < 3 * n; ++j) f[j] = xyz[j] / whites[j];
+        }
+        // 0 when the three ratios are finite, NaN otherwise (inf * 0): added
+        // to L*, a* and b*, it leaves them or makes them NaN without a branch.
+        double unusable[kLabBlock];
+        for (std::size_t i = 0; i < n; ++i)
+            unusable[i] = f[3 * i] * 0.0 + f[3 * i + 1] * 0.0 + f[3 * i + 2] * 0.0;
+        FOfValues(f, 3 * n);
+        for (std::size_t i = 0; i < n; ++i) {
+            const double fx = f[3 * i], fy = f[3 * i + 1], fz = f[3 * i + 2];
+            xyz[3 * i] = (116.0 * fy - 16.0) + unusable[i];
+            xyz[3 * i + 1] = 500.0 * (fx - fy) + unusable[i];
+            xyz[3 * i + 2] = 200.0 * (fy - fz) + unusable[i];
+        }
+    }
+}
+
 inline Kernels TheseKernels() {
-    return {&SumSpectra, &FOfValues};
+    return {&SumSpectra, &LabOfTriples};
 }
 
 }  // namespace
