@@ -8,6 +8,9 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#ifdef __AVX512F__
+#include <immintrin.h>
+#endif
 
 #include "nxbase/cielab.h"
 
@@ -63,9 +66,15 @@ struct Lanes {
 // Vectors go by reference: passed by value, their ABI would depend on the
 // instruction set of the file.
 inline void Widen(const float* values, Eight& wide) {
+#ifdef __AVX512F__
+    // One conversion: GCC splits the generic one into halves and inserts.
+    // (The masked form: the unmasked one warns of an undefined operand.)
+    wide = reinterpret_cast<Eight>(_mm512_maskz_cvtps_pd(0xFF, _mm256_loadu_ps(values)));
+#else
     EightFloats narrow;
     std::memcpy(&narrow, values, sizeof narrow);
     wide = __builtin_convertvector(narrow, Eight);
+#endif
 }
 
 inline void AddProducts(Eight& lane, const double* weights, const Eight& values) {
@@ -88,12 +97,17 @@ inline void AddLanes(Lanes& lane, const double* w0, const double* w1, const doub
     AddProducts(lane.z1, w2 + 8, high);
 }
 
-// The lanes' sum, halving them pairwise in a fixed order.
+// The lanes' sum, halving them pairwise in a fixed order: whole halves of
+// vectors added (lane i with lane i + 4, then i with i + 2), not lane by lane.
+typedef double Four __attribute__((vector_size(32)));
+typedef double Two __attribute__((vector_size(16)));
 inline double Reduced(const Eight& low, const Eight& high) {
     const Eight half = low + high;
-    const double q0 = half[0] + half[4], q1 = half[1] + half[5];
-    const double q2 = half[2] + half[6], q3 = half[3] + half[7];
-    return (q0 + q2) + (q1 + q3);
+    const Four quarter = __builtin_shufflevector(half, half, 0, 1, 2, 3) +
+                         __builtin_shufflevector(half, half, 4, 5, 6, 7);
+    const Two pair = __builtin_shufflevector(quarter, quarter, 0, 1) +
+                     __builtin_shufflevector(quarter, quarter, 2, 3);
+    return pair[0] + pair[1];
 }
 
 // The last n % kLanes values of a spectrum of n >= kLanes values are summed
@@ -163,19 +177,21 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
 }
 
 // The ratios to the white of kLabBlock triples, as kLabBlock * 3 doubles:
-// whole vectors, divided lane by lane (the same bits as one by one).
+// whole vectors, multiplied lane by lane by the white's reciprocals (a
+// division costs as much as the rest of the step; the ratios differ from
+// the quotients by at most an ulp).
 constexpr std::size_t kLabBlock = 8;
 
 inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
     double whites[3 * kLabBlock];
-    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = white[j % 3];
+    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = 1.0 / white[j % 3];
     for (std::size_t first = 0; first < count; first += kLabBlock, xyz += 3 * kLabBlock) {
         const std::size_t n = count - first < kLabBlock ? count - first : kLabBlock;
         double f[3 * kLabBlock];
         if (n == kLabBlock) {
-            for (std::size_t j = 0; j < 3 * kLabBlock; ++j) f[j] = xyz[j] / whites[j];
+            for (std::size_t j = 0; j < 3 * kLabBlock; ++j) f[j] = xyz[j] * whites[j];
         } else {
-            for (std::size_t j = 0; j < 3 * n; ++j) f[j] = xyz[j] / whites[j];
+            for (std::size_t j = 0; j < 3 * n; ++j) f[j] = xyz[j] * whites[j];
         }
         // 0 when the three ratios are finite, NaN otherwise (inf * 0): added
         // to L*, a* and b*, it leaves them or makes them NaN without a branch.
