@@ -21,6 +21,10 @@ constexpr double kKappa = 7.787;
 constexpr double kOffset = 16.0 / 116.0;
 constexpr double kInverseEpsilon = 0.206893034423;  // f at or below: linear branch
 
+// A constant, not a call: the kernels built for other instruction sets must
+// not define (and so offer the linker) their own copy of a library function.
+constexpr double kLargestFinite = std::numeric_limits<double>::max();
+
 constexpr float kEpsilonF = 0.008856f;
 constexpr float kKappaF = 7.787f;
 constexpr float kOffsetF = 16.0f / 116.0f;
@@ -53,7 +57,7 @@ inline void TakeCubeRoot(Real& t) {
     r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
     const Real y = t * (r * r);
     const Real root = y - (y - t / (y * y)) * (1.0 / 3.0);
-    t = t <= std::numeric_limits<double>::max() ? root : t;
+    t = t <= kLargestFinite ? root : t;
 }
 
 // t^(1/3) of any t: zero, subnormal, negative and NaN arguments, outside the
