@@ -561,8 +561,11 @@ TEST(FineGridTristimulus, TheCubeRootIsWithinAnUlpAndManyColoursGiveEachOnesLab)
         for (int c = 0; c < 3; ++c)
             ASSERT_NEAR(one[c], model[c], 1e-9 * (1.0 + std::fabs(model[c]))) << "colour " << i;
     }
-    // Finite values whose ratio to a white below 1 overflows have no colour.
+    // Finite values whose ratio to a white below 1 overflows have no colour,
+    // nor has any colour under a white with a subnormal component.
     for (double v : nxbase::CielabOf({1e308, 1.0, 1.0}, {0.5, 1.0, 1.0}))
+        EXPECT_TRUE(std::isnan(v));
+    for (double v : nxbase::CielabOf({1.0, 1.0, 1.0}, {1.0, 4e-320, 1.0}))
         EXPECT_TRUE(std::isnan(v));
 }
 

@@ -37,7 +37,7 @@ namespace nxbase {
 // CIELAB constants (t > 0.008856: cube root, else 7.787 t + 16/116), and
 // its inverse (f > 0.206893034423: cube, else linear). A colour with a
 // component that is not finite or whose ratio to the white overflows, or a
-// white with a component that is not positive and finite, gives NaN.
+// white with a component that is not positive, normal and finite, gives NaN.
 NXBASE_EXPORT std::array<double, 3> CielabOf(const std::array<double, 3>& axXYZ,
                                              const std::array<double, 3>& axWhite);
 // CielabOf of alCount colours, three doubles each, in place: the same values,

@@ -39,10 +39,11 @@ double CmfAt(const klume::cmetry::IObserver& observer, int channel, double nm) {
 
 namespace {
 // CIELAB divides by the white: each of its components must be positive and
-// finite.
+// finite, and normal, so that its reciprocal is finite too.
 bool UsableWhite(const std::array<double, 3>& axWhite) {
     for (double component : axWhite) {
-        if (!(component > 0.0 && std::isfinite(component))) return false;
+        if (!(component >= std::numeric_limits<double>::min() && std::isfinite(component)))
+            return false;
     }
     return true;
 }
