@@ -115,6 +115,7 @@ def test_conversions_adaptation_and_progress(chart):
     xyz = nxbase.spectra_to_XYZ(chart, illuminant="D65").astype(np.float64)
     lab = nxbase.XYZ_to_Lab(xyz, "D65")
     np.testing.assert_allclose(lab, nxbase.spectra_to_Lab(chart, illuminant="D65"), atol=2e-3)
+    np.testing.assert_array_equal(nxbase.XYZ_to_Lab(xyz[5], "D65"), lab[5])  # one as among many
     np.testing.assert_allclose(nxbase.Lab_to_XYZ(lab, "D65"), xyz, rtol=1e-12, atol=1e-12)
     white = nxbase.Lab_to_XYZ([100, 0, 0], "D65")  # the white point itself
     np.testing.assert_allclose(white, nxbase.spectra_to_XYZ(np.ones(36), illuminant="D65"), rtol=1e-6)

@@ -183,8 +183,9 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
 constexpr std::size_t kLabBlock = 8;
 
 inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
+    const double reciprocal[3] = {1.0 / white[0], 1.0 / white[1], 1.0 / white[2]};
     double whites[3 * kLabBlock];
-    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = 1.0 / white[j % 3];
+    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = reciprocal[j % 3];
     for (std::size_t first = 0; first < count; first += kLabBlock, xyz += 3 * kLabBlock) {
         const std::size_t n = count - first < kLabBlock ? count - first : kLabBlock;
         double f[3 * kLabBlock];
