@@ -166,7 +166,7 @@ class NXBASE_EXPORT MyMemoryBlock {
     MyMemoryBlock& operator<<(const String& asValue) {
         const long count = static_cast<long>(asValue.Len()) + 1;
 #ifdef NXBASE_WORD_STORES
-        if (__builtin_expect(count <= 16 && end - putPointer >= 16, 1)) {
+        if (__builtin_expect(count <= 16 && putPointer < wordLimit, 1)) {
             PutShort(asValue.GetBuffer(), static_cast<int>(count));
             return *this;
         }
@@ -203,6 +203,8 @@ class NXBASE_EXPORT MyMemoryBlock {
   private:
     // Makes room for `alCount` more bytes, doubling the capacity.
     void CheckSize(long alCount);
+    // Takes `fresh` of `alCapacity` bytes as the storage (end and wordLimit).
+    void SetStorage(char* fresh, std::int32_t alCapacity);
     // Resizes the storage to `alCapacity` bytes (>= Len()), in place or
     // moved, keeping the content; the positions follow it.
     void Reallocate(std::int32_t alCapacity);
@@ -216,7 +218,7 @@ class NXBASE_EXPORT MyMemoryBlock {
 #ifdef NXBASE_WORD_STORES
         // The whole word is stored and the position moves by N: the bytes
         // past it are the value's own and the next write covers them.
-        if (__builtin_expect(end - putPointer >= 4, 1)) {
+        if (__builtin_expect(putPointer < wordLimit, 1)) {
             StoreWord(putPointer, axValue);
             putPointer += N;
             return *this;
@@ -281,6 +283,9 @@ class NXBASE_EXPORT MyMemoryBlock {
     char* rememberedRead = nullptr;
     char* rememberedWrite = nullptr;
     char* end = nullptr;  // of the storage: Capacity() bytes after data
+    // While putPointer < wordLimit, 16 bytes are free: the inline writers'
+    // test of room is one comparison of two registers.
+    char* wordLimit = nullptr;
     bool readPastEnd = false;
 };
 

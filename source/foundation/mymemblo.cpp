@@ -169,8 +169,7 @@ MyMemoryBlock::MyMemoryBlock() : MyMemoryBlock(kDefaultCapacity) {}
 
 MyMemoryBlock::MyMemoryBlock(long alCapacity) {
     const std::int32_t size = ClampCapacity(alCapacity);
-    data = AllocateBytes(size);
-    end = data + size;
+    SetStorage(AllocateBytes(size), size);
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
 }
 
@@ -184,8 +183,7 @@ MyMemoryBlock& MyMemoryBlock::operator=(const MyMemoryBlock& axOther) {
     const auto size = static_cast<std::int32_t>(axOther.Capacity());
     char* fresh = AllocateBytes(size);
     std::free(data);
-    data = fresh;
-    end = fresh + size;
+    SetStorage(fresh, size);
     readPastEnd = false;
     getPointer = putPointer = rememberedRead = rememberedWrite = data;
     Put(axOther.data, axOther.Len());
@@ -205,6 +203,7 @@ MyMemoryBlock& MyMemoryBlock::operator=(MyMemoryBlock&& axOther) noexcept {
     rememberedRead = std::exchange(axOther.rememberedRead, nullptr);
     rememberedWrite = std::exchange(axOther.rememberedWrite, nullptr);
     end = std::exchange(axOther.end, nullptr);
+    wordLimit = std::exchange(axOther.wordLimit, nullptr);
     readPastEnd = std::exchange(axOther.readPastEnd, false);
     return *this;
 }
@@ -217,12 +216,17 @@ void MyMemoryBlock::Reallocate(std::int32_t alCapacity) {
     // Positions as offsets: the old pointers are not to be used once moved.
     const auto get = getPointer - data, put = putPointer - data;
     const auto readMark = rememberedRead - data, writeMark = rememberedWrite - data;
-    data = ResizeBytes(data, alCapacity);
+    SetStorage(ResizeBytes(data, alCapacity), alCapacity);
     getPointer = data + get;
     putPointer = data + put;
     rememberedRead = data + readMark;
     rememberedWrite = data + writeMark;
-    end = data + alCapacity;
+}
+
+void MyMemoryBlock::SetStorage(char* fresh, std::int32_t alCapacity) {
+    data = fresh;
+    end = fresh + alCapacity;
+    wordLimit = alCapacity >= 16 ? end - 15 : fresh;
 }
 
 void MyMemoryBlock::CheckSize(long alCount) {
