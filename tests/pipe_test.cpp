@@ -2,6 +2,7 @@
 // peer started on demand, bad input from raw sockets, foreign users refused.
 #include "nxbase/pipe.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
@@ -12,6 +13,7 @@
 #include <cstring>
 #include <filesystem>
 #include <functional>
+#include <random>
 #include <thread>
 
 #include "messaging_test_util.h"
@@ -246,6 +248,65 @@ TEST_F(PipeTest, BackToBackFramesAllArriveAndBadInputClosesOnlyItsChannel) {
         EXPECT_FALSE(pipe->HasChannel("Bad")) << what;
         EXPECT_EQ(RoundTrip(what), what) << "after " << what;
         ::close(raw);
+    }
+}
+
+// Random streams from raw clients: frames of every size cut into random
+// writes, the loop turning between them or not, and the stream ended by a
+// shutdown, a close or not at all right behind its last bytes. Every frame
+// must arrive whole and in order, and the channel must end exactly when its
+// stream did, however the end shared a wake-up with the last bytes.
+TEST_F(PipeTest, RandomStreamsArriveWholeAndEveryEndIsSeen) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    auto draw = [&](std::size_t low, std::size_t high) {
+        return std::uniform_int_distribution<std::size_t>(low, high)(random);
+    };
+    for (int round = 0; round < 30; ++round) {
+        const std::string name = "Rnd" + std::to_string(round);
+        const int fd = RawClient(name);
+        ASSERT_EQ(::fcntl(fd, F_SETFL, ::fcntl(fd, F_GETFL) | O_NONBLOCK), 0);
+        // Room for more than one turn's reads, so that some are cut off.
+        const int room = 1 << 20;
+        ::setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &room, sizeof room);
+        std::vector<std::string> sent;
+        std::string stream;
+        for (std::size_t frames = draw(1, 6); frames > 0; --frames) {
+            const std::size_t sizes[] = {draw(0, 64), draw(16000, 16800), draw(20000, 300000)};
+            std::string payload(sizes[draw(0, 9) / 4], '\0');
+            for (char& c : payload) c = static_cast<char>(draw(0, 255));
+            sent.push_back(payload);
+            stream += nxbase::EncodeFrame(nxbase::MessageBody(
+                name, "IS_READY", nxbase::EncodeBytes(payload.data(), payload.size())));
+        }
+        for (std::size_t at = 0; at < stream.size();) {
+            const ssize_t n =
+                ::write(fd, stream.data() + at, std::min(draw(1, 70000), stream.size() - at));
+            if (n > 0) at += static_cast<std::size_t>(n);
+            ASSERT_TRUE(n > 0 || errno == EAGAIN) << std::strerror(errno);
+            for (std::size_t turns = n > 0 ? draw(0, 1) : 1; turns > 0; --turns)
+                Application::Get().RunOneFor(std::chrono::milliseconds(draw(0, 2)));
+        }
+        const std::size_t ending = draw(0, 2);  // open, shut down, closed
+        if (ending == 1) ::shutdown(fd, SHUT_WR);
+        if (ending == 2) ::close(fd);
+        auto count = [&] {
+            return static_cast<std::size_t>(
+                std::count_if(gReceived.begin(), gReceived.end(),
+                              [&](const VELTRAEvent& e) { return e.GetSender() == name; }));
+        };
+        EXPECT_TRUE(RunUntil(
+            [&] { return count() == sent.size() && (ending == 0) == pipe->HasChannel(name); }, 10s))
+            << "round " << round << ", ending " << ending << ": " << count() << " of "
+            << sent.size() << " frames, channel " << (pipe->HasChannel(name) ? "open" : "closed");
+        std::vector<std::string> got;
+        for (const VELTRAEvent& e : gReceived)
+            if (e.GetSender() == name) got.push_back(BytesOf(e.GetData()));
+        EXPECT_TRUE(got == sent) << "round " << round;
+        if (ending != 2) ::close(fd);
+        ASSERT_TRUE(RunUntil([&] { return !pipe->HasChannel(name); })) << "round " << round;
+        gReceived.clear();
     }
 }
 

@@ -5,12 +5,12 @@
 #include <sys/eventfd.h>
 #include <unistd.h>
 
-#include <boost/asio/detail/epoll_reactor.hpp>
 #include <boost/asio/post.hpp>
 #include <cerrno>
 #include <system_error>
 #include <utility>
 
+#include "toolkit/arrival.h"
 #include "toolkit/userinterface.h"
 
 #if !defined(BOOST_ASIO_HAS_EPOLL) || !defined(BOOST_ASIO_HAS_TIMERFD)
@@ -21,28 +21,6 @@ namespace {
 
 // The longest turn of a wait: how often its functions are asked.
 constexpr std::chrono::milliseconds kLongestTurn(50);
-
-// asio keeps its epoll descriptor private. Its timers are a timerfd and its
-// cross-thread wake-up an eventfd in that same epoll set, so the set becomes
-// readable whenever a handler is due: exactly what a foreign loop must
-// watch. An explicit instantiation may name a private member; a boost that
-// renames it fails to compile here instead of misbehaving.
-using ReactorDescriptor = int boost::asio::detail::epoll_reactor::*;
-ReactorDescriptor EpollDescriptorMember();
-template <ReactorDescriptor Member>
-struct EpollDescriptorAccess {
-    friend ReactorDescriptor EpollDescriptorMember() { return Member; }
-};
-template struct EpollDescriptorAccess<&boost::asio::detail::epoll_reactor::epoll_fd_>;
-
-int ContextEpollDescriptor(boost::asio::io_context& axContext) {
-    auto& reactor = boost::asio::use_service<boost::asio::detail::epoll_reactor>(axContext);
-    // The reactor runs in a poll only once it is the scheduler's task, which
-    // the first timer or socket would make it; until then its first wake-up
-    // would stay unread and keep the descriptor readable.
-    reactor.init_task();
-    return reactor.*EpollDescriptorMember();
-}
 
 [[noreturn]] void ThrowErrno(const char* asWhat) {
     throw std::system_error(errno, std::generic_category(), asWhat);
@@ -199,7 +177,7 @@ int Application::GetLoopDescriptor() {
     int wake = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
     try {
         if (wake < 0) ThrowErrno("eventfd");
-        Watch(loop, ContextEpollDescriptor(context_));
+        Watch(loop, toolkit::ReactorDescriptor(context_));
         Watch(loop, wake);
     } catch (...) {
         ::close(loop);

@@ -20,6 +20,7 @@
 #include "nxbase/mymemblo.h"
 #include "nxbase/poapps.h"
 #include "toolkit/application.h"
+#include "toolkit/arrival.h"
 #include "toolkit/fileio.h"
 #include "toolkit/process.h"
 #include "toolkit/system.h"
@@ -32,7 +33,7 @@ namespace detail {
 // The loop's own executor type rather than the polymorphic default: every
 // read and write would otherwise go through a type-erased executor.
 using Executor = boost::asio::io_context::executor_type;
-using Socket = boost::asio::basic_stream_socket<boost::asio::local::stream_protocol, Executor>;
+using Socket = toolkit::LocalSocket;
 using Acceptor = boost::asio::basic_socket_acceptor<boost::asio::local::stream_protocol, Executor>;
 using Timer = boost::asio::basic_waitable_timer<
     std::chrono::steady_clock, boost::asio::wait_traits<std::chrono::steady_clock>, Executor>;
@@ -54,6 +55,14 @@ struct Channel {
     std::deque<std::string> pending;    // bodies read, not yet delivered
     std::string outgoing;               // bytes not yet taken by the socket
     bool writeArmed = false;
+    bool readWaiting = false;     // a wait for bytes is queued in the loop
+    bool readContinuing = false;  // a turn that reads on is posted
+    bool waitedOnce = false;
+    bool arrivalWaits = false;        // its waits may be waits for an arrival
+    bool peerStoppedWriting = false;  // a short read may leave the end of the stream
+    bool readBlind = false;           // the wait told nothing of the stream's end
+    bool drained = true;              // the last read left the socket empty
+    std::string endWhy;               // why the stream ended, once it did
 };
 
 }  // namespace detail
@@ -359,6 +368,7 @@ void Pipe::AcceptFailed(const std::string& asReason) {
 void Pipe::AddChannel(const ChannelPtr& axChannel) {
     boost::system::error_code ignored;
     axChannel->socket.non_blocking(true, ignored);
+    axChannel->arrivalWaits = toolkit::WatchPeerShutdown(axChannel->socket);
     amAllChannels[axChannel->id] = axChannel;
     if (axChannel->stage == Stage::kAwaitingRequest) {
         // A connection that never says who it is must not hold a descriptor for ever.
@@ -377,26 +387,64 @@ void Pipe::AddChannel(const ChannelPtr& axChannel) {
 
 // A readiness wait, not a read: every read is made here, when it is handled,
 // so that a read outside the loop (ReadArrived) can never overtake bytes the
-// reactor took but whose handler has not run yet.
+// reactor took but whose handler has not run yet. After a read that emptied
+// the socket the wait is for an arrival, which costs no system call to start.
 void Pipe::ArmRead(const ChannelPtr& axChannel) {
-    axChannel->socket.async_wait(nxbase::Socket::wait_read,
-                                 [this, axChannel](const boost::system::error_code& error) {
-                                     if (axChannel->closed) return;
-                                     if (error) {
-                                         Close(axChannel, error.message());
-                                         return;
-                                     }
-                                     OnReadable(axChannel);
-                                 });
+    if (axChannel->readWaiting) return;
+    axChannel->readWaiting = true;
+    auto woken = [this, axChannel](const boost::system::error_code& error, bool abStopped) {
+        axChannel->readWaiting = false;
+        if (axChannel->closed) return;
+        if (error) {
+            Close(axChannel, error.message());
+            return;
+        }
+        axChannel->peerStoppedWriting = axChannel->peerStoppedWriting || abStopped;
+        OnReadable(axChannel);
+    };
+    if (axChannel->waitedOnce && axChannel->arrivalWaits) {
+        toolkit::AwaitArrival(axChannel->socket, std::move(woken));
+    } else {
+        // The first wait also sees bytes that came before it; a short read
+        // after it is followed by one more, which finds an end of stream.
+        axChannel->waitedOnce = true;
+        axChannel->socket.async_wait(nxbase::Socket::wait_read,
+                                     [woken, axChannel](const boost::system::error_code& error) {
+                                         axChannel->readBlind = true;
+                                         woken(error, false);
+                                     });
+    }
+}
+
+// Reads on in a later turn, after the other channels had theirs: the socket
+// still holds bytes, so no arrival would end a wait.
+void Pipe::ContinueReading(const ChannelPtr& axChannel) {
+    if (axChannel->readContinuing) return;
+    axChannel->readContinuing = true;
+    Application::Get().Post([this, axChannel] {
+        axChannel->readContinuing = false;
+        // The loop may have taken a readiness event meanwhile, with none of
+        // this channel's waits queued.
+        axChannel->readBlind = true;
+        if (!axChannel->closed) OnReadable(axChannel);
+    });
 }
 
 void Pipe::OnReadable(const ChannelPtr& axChannel) {
     // Nothing to read when ReadArrived took it first.
     const bool read = ReadOnce(axChannel);
     if (axChannel->closed) return;
+    if (!axChannel->endWhy.empty()) {
+        DeliverAndEnd(axChannel);
+        return;
+    }
     // Wait on before delivering: a handler that waits for an answer on this
     // channel must be able to receive it.
-    ArmRead(axChannel);
+    if (axChannel->drained) {
+        ArmRead(axChannel);
+    } else {
+        ContinueReading(axChannel);
+    }
     if (read) Deliver(axChannel);
 }
 
@@ -404,41 +452,48 @@ bool Pipe::ReadArrived(std::uint64_t alChannel) {
     auto at = amAllChannels.find(alChannel);
     if (at == amAllChannels.end() || at->second->closed) return false;
     ChannelPtr channel = at->second;  // a handler may close it or delete this transport
-    // The loop's wait stays armed: it finds nothing, or what comes later.
-    if (!ReadOnce(channel) && !channel->closed) return false;
-    Deliver(channel);
-    return true;
+    // The loop's wait stays queued: it finds nothing, or what comes later.
+    const bool read = ReadOnce(channel);
+    if (channel->closed) return true;
+    if (!channel->endWhy.empty()) {
+        DeliverAndEnd(channel);
+        return true;
+    }
+    if (!channel->drained) ContinueReading(channel);
+    if (read) Deliver(channel);
+    return read;
 }
 
 // Reads what is there (after a full buffer on, a bounded amount per turn)
-// and splits it into frames; false when nothing was there (the channel
-// stays open) or the channel was closed.
+// and splits it into frames; false when nothing was there or the channel was
+// closed. A stream that ended is closed by DeliverAndEnd once the frames
+// before its end were delivered.
 bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
     const int fd = axChannel->socket.native_handle();
     const std::size_t before = axChannel->reader.Buffered();
     bool read = false;
-    for (int round = 0; round <= nxbase::kReadsPerTurn; ++round) {
+    int failure = 0;  // errno of a failed read, -1 at the end of the stream
+    axChannel->drained = false;
+    for (int round = 0; round <= nxbase::kReadsPerTurn && !axChannel->drained; ++round) {
         ssize_t n =
             toolkit::Sockets().Receive(fd, axChannel->input.data(), axChannel->input.size());
         if (n > 0) {
             axChannel->reader.Append(axChannel->input.data(), static_cast<std::size_t>(n));
             read = true;
-            if (static_cast<std::size_t>(n) < axChannel->input.size()) break;
-            continue;
-        }
-        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) break;
-        if (n < 0) {
-            Close(axChannel, std::strerror(errno));
+            // A short read of a stream socket leaves it empty, but for an
+            // end of the stream that may have come with the bytes.
+            axChannel->drained = !axChannel->peerStoppedWriting && !axChannel->readBlind &&
+                                 static_cast<std::size_t>(n) < axChannel->input.size();
+        } else if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+            axChannel->drained = true;
+            axChannel->readBlind = false;
         } else {
-            Close(axChannel, axChannel->reader.Buffered() > 0
-                                 ? "malformed frame (end of file inside a frame)"
-                                 : "end of file");
+            failure = n < 0 ? errno : -1;
+            break;
         }
-        return false;
     }
-    if (!read) return false;
     std::string body;
-    while (true) {
+    while (read) {
         FrameReader::Result result = axChannel->reader.Next(body);
         if (result == FrameReader::Result::kNeedMore) break;
         if (result == FrameReader::Result::kMalformed) {
@@ -448,8 +503,21 @@ bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
         axChannel->pending.push_back(std::move(body));
     }
     amPartialBytes = amPartialBytes + axChannel->reader.Buffered() - before;
+    if (failure != 0) {
+        axChannel->endWhy = failure > 0 ? std::strerror(failure)
+                            : axChannel->reader.Buffered() > 0
+                                ? "malformed frame (end of file inside a frame)"
+                                : "end of file";
+    }
     LimitPartialFrames();
-    return !axChannel->closed;
+    return read && !axChannel->closed;
+}
+
+// Delivers what was read and closes a channel whose stream ended: the frames
+// a peer sent before it went are its last word.
+void Pipe::DeliverAndEnd(const ChannelPtr& axChannel) {
+    Deliver(axChannel);
+    if (!axChannel->endWhy.empty()) Close(axChannel, axChannel->endWhy);
 }
 
 // Many peers each holding most of a large frame would add up without bound.
