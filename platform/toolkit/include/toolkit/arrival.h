@@ -56,6 +56,26 @@ struct SocketAccess : LocalSocket {
     }
 };
 
+// The reactor of a context, looked up (under the context's lock) only when
+// the context is another than last time.
+inline boost::asio::detail::epoll_reactor& ReactorOf(boost::asio::execution_context& axContext) {
+    thread_local boost::asio::execution_context* context = nullptr;
+    thread_local boost::asio::detail::epoll_reactor* reactor = nullptr;
+    if (context != &axContext) {
+        reactor = &boost::asio::use_service<boost::asio::detail::epoll_reactor>(axContext);
+        context = &axContext;
+    }
+    return *reactor;
+}
+
+// The memory of the last finished wait, which the next takes: a wait per
+// message should not cost an allocation.
+struct SpareBlock {
+    void* block = nullptr;
+    ~SpareBlock() { ::operator delete(block); }
+};
+inline thread_local SpareBlock tSpareArrival;
+
 // A reactor operation that performs nothing: asked when it is queued, it is
 // not done; asked for a readiness event of the socket, it is, and notes
 // whether the event says the peer stopped writing.
@@ -68,7 +88,21 @@ class ArrivalOp : public boost::asio::detail::reactor_op {
           state_(state) {}
     bool queued = false;
 
+    static void* operator new(std::size_t) {
+        static_assert(sizeof(ArrivalOp) <= kBlockSize, "the spare block holds every wait");
+        if (void* spare = std::exchange(tSpareArrival.block, nullptr)) return spare;
+        return ::operator new(kBlockSize);
+    }
+    static void operator delete(void* block) {
+        if (tSpareArrival.block == nullptr) {
+            tSpareArrival.block = block;
+        } else {
+            ::operator delete(block);
+        }
+    }
+
   private:
+    static constexpr std::size_t kBlockSize = 128;
     static status Perform(reactor_op* base) {
         auto* op = static_cast<ArrivalOp*>(base);
         if (!op->queued) return not_done;
@@ -98,8 +132,7 @@ class ArrivalOp : public boost::asio::detail::reactor_op {
 template <class Handler>
 void AwaitArrival(LocalSocket& axSocket, Handler handler) {
     auto& implementation = detail::SocketAccess::Implementation(axSocket);
-    auto& reactor = boost::asio::use_service<boost::asio::detail::epoll_reactor>(
-        axSocket.get_executor().context());
+    auto& reactor = detail::ReactorOf(axSocket.get_executor().context());
     auto* op = new detail::ArrivalOp<Handler>(std::move(handler), implementation.reactor_data_);
     reactor.start_op(boost::asio::detail::epoll_reactor::read_op, implementation.socket_,
                      implementation.reactor_data_, op, true, true);
