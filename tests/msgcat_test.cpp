@@ -119,6 +119,8 @@ TEST(MessageCatalogue, StuffedDataDecodesAlikeInAnyPiecesAndAPokeSplitsAsAWhole)
         ASSERT_EQ(nxbase::DecodeBytes(data.data(), data.size()), decoded);
         std::string plain = data.substr(0, random() % (data.size() + 1));
         ASSERT_EQ(ModelDecode(nxbase::EncodeBytes(plain.data(), plain.size())), plain);
+        plain.erase(std::remove(plain.begin(), plain.end(), '\0'), plain.end());  // one kind left
+        ASSERT_EQ(ModelDecode(nxbase::EncodeBytes(plain.data(), plain.size())), plain);
 
         std::string sender;
         MyMemoryBlock block;

@@ -1,6 +1,7 @@
 #include "nxbase/frame.h"
 
 #include <algorithm>
+#include <cstring>
 
 namespace nxbase {
 
@@ -54,14 +55,20 @@ std::string MessageFrame(const std::string& asSender, const std::string& asComma
 void BuildMessageFrame(std::string& asFrame, std::string_view asSender, std::string_view asCommand,
                        std::string_view asEncodedData) {
     std::size_t length = asSender.size() + asCommand.size() + 2 + asEncodedData.size();
-    asFrame.clear();
-    asFrame.reserve(kFrameHeaderSize + length);
-    AppendLength(asFrame, static_cast<std::uint32_t>(length));
-    asFrame += asSender;
-    asFrame += '\0';
-    asFrame += asCommand;
-    asFrame += '\0';
-    asFrame += asEncodedData;
+    // Sized once and filled by copies: every message passes here.
+    asFrame.resize(kFrameHeaderSize + length);
+    char* out = asFrame.data();
+    for (std::size_t i = 0; i < kFrameHeaderSize; ++i)
+        *out++ = static_cast<char>((static_cast<std::uint32_t>(length) >> (8 * i)) & 0xFF);
+    auto put = [&out](std::string_view field) {
+        std::memcpy(out, field.data(), field.size());
+        out += field.size();
+    };
+    put(asSender);
+    *out++ = '\0';
+    put(asCommand);
+    *out++ = '\0';
+    put(asEncodedData);
 }
 
 bool FindMessageFields(const std::string& asBody, std::size_t& alFirst, std::size_t& alSecond) {

@@ -1,5 +1,6 @@
 #include "nxbase/msgcat.h"
 
+#include <cstring>
 #include <iterator>
 #include <unordered_map>
 
@@ -204,6 +205,12 @@ std::string CommandTextOfNumber(int alNumber) {
 }
 
 void AppendEncoded(std::string& asOut, const char* pData, std::size_t alSize) {
+    // Most data holds neither byte: one copy.
+    if (std::memchr(pData, '\x00', alSize) == nullptr &&
+        std::memchr(pData, '\x01', alSize) == nullptr) {
+        asOut.append(pData, alSize);
+        return;
+    }
     std::size_t specials = 0;
     for (std::size_t i = 0; i < alSize; ++i) specials += static_cast<unsigned char>(pData[i]) <= 1;
     std::size_t at = asOut.size();
