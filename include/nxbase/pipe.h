@@ -220,11 +220,11 @@ class NXBASE_EXPORT Pipe {
     void ArmRead(const ChannelPtr& axChannel);
     void OnReadable(const ChannelPtr& axChannel);
     void ContinueReading(const ChannelPtr& axChannel);
+    void AfterRead(const ChannelPtr& axChannel, bool abRead);
     bool ReadOnce(const ChannelPtr& axChannel);
     void LimitPartialFrames();
     void LimitQueuedBytes();
     void Deliver(const ChannelPtr& axChannel);
-    void DeliverAndEnd(const ChannelPtr& axChannel);
     void HandleBody(const ChannelPtr& axChannel, std::string&& asBody);
     void HandleHandshake(const ChannelPtr& axChannel, const std::string& asBody);
     bool Write(const ChannelPtr& axChannel, const std::string& asFrame);

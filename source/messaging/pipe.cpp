@@ -432,20 +432,26 @@ void Pipe::ContinueReading(const ChannelPtr& axChannel) {
 
 void Pipe::OnReadable(const ChannelPtr& axChannel) {
     // Nothing to read when ReadArrived took it first.
-    const bool read = ReadOnce(axChannel);
+    AfterRead(axChannel, ReadOnce(axChannel));
+}
+
+// A stream that ended has its last frames delivered and is closed. Else the
+// next read is prepared before delivering, so that a handler that waits for
+// an answer on this channel can receive it: a wait when the socket is empty
+// (none when one is queued), a later turn when it is not.
+void Pipe::AfterRead(const ChannelPtr& axChannel, bool abRead) {
     if (axChannel->closed) return;
     if (!axChannel->endWhy.empty()) {
-        DeliverAndEnd(axChannel);
+        Deliver(axChannel);
+        if (!axChannel->closed) Close(axChannel, axChannel->endWhy);
         return;
     }
-    // Wait on before delivering: a handler that waits for an answer on this
-    // channel must be able to receive it.
     if (axChannel->drained) {
         ArmRead(axChannel);
     } else {
         ContinueReading(axChannel);
     }
-    if (read) Deliver(axChannel);
+    if (abRead) Deliver(axChannel);
 }
 
 bool Pipe::ReadArrived(std::uint64_t alChannel) {
@@ -454,20 +460,14 @@ bool Pipe::ReadArrived(std::uint64_t alChannel) {
     ChannelPtr channel = at->second;  // a handler may close it or delete this transport
     // The loop's wait stays queued: it finds nothing, or what comes later.
     const bool read = ReadOnce(channel);
-    if (channel->closed) return true;
-    if (!channel->endWhy.empty()) {
-        DeliverAndEnd(channel);
-        return true;
-    }
-    if (!channel->drained) ContinueReading(channel);
-    if (read) Deliver(channel);
+    AfterRead(channel, read);
     return read;
 }
 
 // Reads what is there (after a full buffer on, a bounded amount per turn)
 // and splits it into frames; false when nothing was there or the channel was
-// closed. A stream that ended is closed by DeliverAndEnd once the frames
-// before its end were delivered.
+// closed. A stream that ended is closed by AfterRead once the frames before
+// its end were delivered: they are the peer's last word.
 bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
     const int fd = axChannel->socket.native_handle();
     const std::size_t before = axChannel->reader.Buffered();
@@ -511,13 +511,6 @@ bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
     }
     LimitPartialFrames();
     return read && !axChannel->closed;
-}
-
-// Delivers what was read and closes a channel whose stream ended: the frames
-// a peer sent before it went are its last word.
-void Pipe::DeliverAndEnd(const ChannelPtr& axChannel) {
-    Deliver(axChannel);
-    if (!axChannel->endWhy.empty()) Close(axChannel, axChannel->endWhy);
 }
 
 // Many peers each holding most of a large frame would add up without bound.
