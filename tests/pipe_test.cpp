@@ -263,7 +263,7 @@ TEST_F(PipeTest, RandomStreamsArriveWholeAndEveryEndIsSeen) {
     auto draw = [&](std::size_t low, std::size_t high) {
         return std::uniform_int_distribution<std::size_t>(low, high)(random);
     };
-    for (int round = 0; round < 30; ++round) {
+    for (int round = 0; round < 200; ++round) {
         const std::string name = "Rnd" + std::to_string(round);
         const int fd = RawClient(name);
         ASSERT_EQ(::fcntl(fd, F_SETFL, ::fcntl(fd, F_GETFL) | O_NONBLOCK), 0);
