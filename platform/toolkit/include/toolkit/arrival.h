@@ -10,11 +10,12 @@
 //
 // The rules for its user: call WatchPeerShutdown once for the socket; start
 // the wait only right after a read that left the socket empty, before the
-// loop runs again (an edge the loop saw while no wait was queued is gone);
-// once a wait reported that the peer stopped writing, a short read no longer
-// means empty (the end of the stream may wait behind it): read on until a
-// read returns 0 or EAGAIN. A first wait, or one after a read that stopped
-// early, is asio's async_wait.
+// loop runs again (an edge the loop saw while no wait was queued is gone).
+// A short read means empty only after an AwaitArrival that did not report
+// the peer stopping: after asio's async_wait (the first wait, which also
+// sees bytes that came before it), after a turn that read on without a
+// wait, and once the peer stopped writing, the end of the stream may wait
+// behind the bytes, so read until a read returns 0 or EAGAIN.
 #ifndef TOOLKIT_ARRIVAL_H_
 #define TOOLKIT_ARRIVAL_H_
 
