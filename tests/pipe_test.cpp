@@ -253,7 +253,8 @@ TEST_F(PipeTest, BackToBackFramesAllArriveAndBadInputClosesOnlyItsChannel) {
 
 // Random streams from raw clients: frames of every size cut into random
 // writes, the loop turning between them or not, and the stream ended by a
-// shutdown, a close or not at all right behind its last bytes. Every frame
+// shutdown, a close or not at all right behind its last bytes or after a
+// turn that read part of them. Every frame
 // must arrive whole and in order, and the channel must end exactly when its
 // stream did, however the end shared a wake-up with the last bytes.
 TEST_F(PipeTest, RandomStreamsArriveWholeAndEveryEndIsSeen) {
@@ -288,6 +289,9 @@ TEST_F(PipeTest, RandomStreamsArriveWholeAndEveryEndIsSeen) {
             for (std::size_t turns = n > 0 ? draw(0, 1) : 1; turns > 0; --turns)
                 Application::Get().RunOneFor(std::chrono::milliseconds(draw(0, 2)));
         }
+        // Now and then one turn before the end: it reads part of what is
+        // there, and the end comes between that turn and the next.
+        if (draw(0, 3) == 0) Application::Get().RunOneFor(std::chrono::milliseconds(0));
         const std::size_t ending = draw(0, 2);  // open, shut down, closed
         if (ending == 1) ::shutdown(fd, SHUT_WR);
         if (ending == 2) ::close(fd);
