@@ -191,6 +191,13 @@ TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
     ASSERT_EQ(gReceived.size(), 6u);
     EXPECT_EQ(gReceived[0].GetSender(), "EchoPeer");
     EXPECT_EQ(gReceived[0].GetCommand(), "ANSWER!GET_DEVICE_NAME");
+    // A frame one byte longer than a reader takes is refused here, and the
+    // channel stays ("PipeTestClient", "IS_READY" and two zero bytes).
+    const std::string over(nxbase::kMaxFrameLength - 14 - 8 - 2 + 1, 'x');
+    EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", over));
+    EXPECT_EQ(pipe->GetLastError(), "a message of " + std::to_string(nxbase::kMaxFrameLength + 1) +
+                                        " bytes is above the frame limit of 64 MiB");
+    EXPECT_TRUE(pipe->HasChannel("EchoPeer"));
 
     // It was started with the start line, in its own directory.
     std::vector<std::string> started = nxtest::ReadLines(runtime + "/EchoPeer.started");

@@ -22,7 +22,8 @@ constexpr std::size_t kFrameHeaderSize = 4;
 inline constexpr const char* kPipeRequestPrefix = "PipeRequest-";
 inline constexpr const char* kDirectPipePrefix = "DirectPipe-";
 
-// The 4-byte little-endian length of `asBody`, then the body.
+// The 4-byte little-endian length of `asBody`, then the body. Lengths above
+// kMaxFrameLength are the caller's to refuse: a reader refuses such frames.
 NXBASE_EXPORT std::string EncodeFrame(const std::string& asBody);
 // The body of a message frame; `asEncodedData` is already byte-stuffed.
 NXBASE_EXPORT std::string MessageBody(const std::string& asSender, const std::string& asCommand,
@@ -31,7 +32,8 @@ NXBASE_EXPORT std::string MessageBody(const std::string& asSender, const std::st
 // command, 0x00, the byte-stuffed data.
 NXBASE_EXPORT std::string MessageFrame(const std::string& asSender, const std::string& asCommand,
                                        const char* pEncodedData, std::size_t alSize);
-// The same written over `asFrame`, whose storage is reused.
+// The same written over `asFrame`, whose storage is reused (sized once and
+// filled by copies).
 NXBASE_EXPORT void BuildMessageFrame(std::string& asFrame, std::string_view asSender,
                                      std::string_view asCommand, std::string_view asEncodedData);
 // The positions of a message body's first two zero bytes (after the sender

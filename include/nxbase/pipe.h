@@ -131,7 +131,8 @@ class NXBASE_EXPORT Pipe {
 
     // Frames and writes one message to `asApp`, opening the channel first and
     // starting the application when it is registered but not running (never
-    // for DISCONNECT). False on failure; GetLastError() then says why.
+    // for DISCONNECT). False on failure; GetLastError() then says why (a
+    // message whose frame would pass nxbase::kMaxFrameLength is refused).
     bool Send(const std::string& asApp, const std::string& asCommand,
               const MyMemoryBlock& axEncodedData);
     bool Send(const std::string& asApp, const std::string& asCommand,
@@ -236,6 +237,7 @@ class NXBASE_EXPORT Pipe {
     void Close(ChannelPtr axChannel, const std::string& asReason);
     void Trace(const char* asWhat);
     bool MaySend(const std::string& asTo, const std::string& asCommand);
+    bool FitsOneFrame(const std::string& asCommand, std::string_view asEncodedData);
     bool SendByDde(const std::string& asApp, const std::string& asCommand, bool abMayStart,
                    std::string_view asEncodedData);
     bool OnDdeBus(const std::string& asApp);

@@ -50,17 +50,22 @@ int ReactorDescriptor(boost::asio::io_context& axContext) {
     return reactor.*MemberOf(EpollDescriptor{});
 }
 
-bool WatchPeerShutdown(LocalSocket& axSocket) {
+ArrivalWatch WatchPeerShutdown(LocalSocket& axSocket) {
     auto& implementation = detail::SocketAccess::Implementation(axSocket);
     State* state = implementation.reactor_data_;
-    if (state == nullptr) return false;
+    if (state == nullptr) return {};
     std::uint32_t& events = state->*MemberOf(RegisteredEvents{});
     events |= EPOLLRDHUP;  // kept by asio's own later re-arming, which passes these
     epoll_event event{};
     event.events = events;
     event.data.ptr = state;
-    const int reactor = Reactor(axSocket.get_executor().context()).*MemberOf(EpollDescriptor{});
-    return ::epoll_ctl(reactor, EPOLL_CTL_MOD, implementation.socket_, &event) == 0;
+    epoll_reactor& reactor = Reactor(axSocket.get_executor().context());
+    if (::epoll_ctl(reactor.*MemberOf(EpollDescriptor{}), EPOLL_CTL_MOD, implementation.socket_,
+                    &event) != 0)
+        return {};
+    ArrivalWatch watch;
+    watch.reactor = &reactor;
+    return watch;
 }
 
 namespace detail {

@@ -10,9 +10,9 @@ namespace {
 // Frames at least this long are collected in a buffer of their own.
 constexpr std::size_t kLargeFrame = 64 * 1024;
 
-void AppendLength(std::string& asOut, std::uint32_t alLength) {
+void StoreLength(char* pHeader, std::uint32_t alLength) {
     for (std::size_t i = 0; i < kFrameHeaderSize; ++i) {
-        asOut += static_cast<char>((alLength >> (8 * i)) & 0xFF);
+        pHeader[i] = static_cast<char>((alLength >> (8 * i)) & 0xFF);
     }
 }
 
@@ -26,10 +26,9 @@ std::uint32_t ReadLength(const char* pHeader) {
 }  // namespace
 
 std::string EncodeFrame(const std::string& asBody) {
-    std::string frame;
-    frame.reserve(kFrameHeaderSize + asBody.size());
-    AppendLength(frame, static_cast<std::uint32_t>(asBody.size()));
-    frame += asBody;
+    std::string frame(kFrameHeaderSize + asBody.size(), '\0');
+    StoreLength(frame.data(), static_cast<std::uint32_t>(asBody.size()));
+    std::memcpy(frame.data() + kFrameHeaderSize, asBody.data(), asBody.size());
     return frame;
 }
 
@@ -57,11 +56,10 @@ void BuildMessageFrame(std::string& asFrame, std::string_view asSender, std::str
     std::size_t length = asSender.size() + asCommand.size() + 2 + asEncodedData.size();
     // Sized once and filled by copies: every message passes here.
     asFrame.resize(kFrameHeaderSize + length);
-    char* out = asFrame.data();
-    for (std::size_t i = 0; i < kFrameHeaderSize; ++i)
-        *out++ = static_cast<char>((static_cast<std::uint32_t>(length) >> (8 * i)) & 0xFF);
+    StoreLength(asFrame.data(), static_cast<std::uint32_t>(length));
+    char* out = asFrame.data() + kFrameHeaderSize;
     auto put = [&out](std::string_view field) {
-        std::memcpy(out, field.data(), field.size());
+        if (!field.empty()) std::memcpy(out, field.data(), field.size());
         out += field.size();
     };
     put(asSender);

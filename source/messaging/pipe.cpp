@@ -58,11 +58,12 @@ struct Channel {
     bool readWaiting = false;     // a wait for bytes is queued in the loop
     bool readContinuing = false;  // a turn that reads on is posted
     bool waitedOnce = false;
-    bool arrivalWaits = false;        // its waits may be waits for an arrival
-    bool peerStoppedWriting = false;  // a short read may leave the end of the stream
-    bool readBlind = false;           // the wait told nothing of the stream's end
-    bool drained = true;              // the last read left the socket empty
-    std::string endWhy;               // why the stream ended, once it did
+    toolkit::ArrivalWatch arrival;  // true: its waits may be waits for an arrival
+    // A short read may leave the end of the stream behind it: the last wait
+    // told nothing of it (or said the peer stopped writing).
+    bool readBlind = false;
+    bool drained = true;  // the last read left the socket empty
+    std::string endWhy;   // why the stream ended, once it did
 };
 
 }  // namespace detail
@@ -368,7 +369,7 @@ void Pipe::AcceptFailed(const std::string& asReason) {
 void Pipe::AddChannel(const ChannelPtr& axChannel) {
     boost::system::error_code ignored;
     axChannel->socket.non_blocking(true, ignored);
-    axChannel->arrivalWaits = toolkit::WatchPeerShutdown(axChannel->socket);
+    axChannel->arrival = toolkit::WatchPeerShutdown(axChannel->socket);
     amAllChannels[axChannel->id] = axChannel;
     if (axChannel->stage == Stage::kAwaitingRequest) {
         // A connection that never says who it is must not hold a descriptor for ever.
@@ -399,11 +400,11 @@ void Pipe::ArmRead(const ChannelPtr& axChannel) {
             Close(axChannel, error.message());
             return;
         }
-        axChannel->peerStoppedWriting = axChannel->peerStoppedWriting || abStopped;
+        axChannel->readBlind = axChannel->readBlind || abStopped;
         OnReadable(axChannel);
     };
-    if (axChannel->waitedOnce && axChannel->arrivalWaits) {
-        toolkit::AwaitArrival(axChannel->socket, std::move(woken));
+    if (axChannel->waitedOnce && axChannel->arrival) {
+        toolkit::AwaitArrival(axChannel->arrival, axChannel->socket, std::move(woken));
     } else {
         // The first wait also sees bytes that came before it; a short read
         // after it is followed by one more, which finds an end of stream.
@@ -482,8 +483,8 @@ bool Pipe::ReadOnce(const ChannelPtr& axChannel) {
             read = true;
             // A short read of a stream socket leaves it empty, but for an
             // end of the stream that may have come with the bytes.
-            axChannel->drained = !axChannel->peerStoppedWriting && !axChannel->readBlind &&
-                                 static_cast<std::size_t>(n) < axChannel->input.size();
+            axChannel->drained =
+                !axChannel->readBlind && static_cast<std::size_t>(n) < axChannel->input.size();
         } else if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
             axChannel->drained = true;
             axChannel->readBlind = false;
@@ -999,9 +1000,18 @@ bool Pipe::MaySend(const std::string& asTo, const std::string& asCommand) {
     return true;
 }
 
+// A frame longer than a reader takes would close the channel at the peer
+// (and its length might not even fit the header): refused before any start.
+bool Pipe::FitsOneFrame(const std::string& asCommand, std::string_view asEncodedData) {
+    const std::size_t length = amOwnName.size() + asCommand.size() + 2 + asEncodedData.size();
+    return length <= nxbase::kMaxFrameLength ||
+           Fail("a message of " + std::to_string(length) + " bytes is above the frame limit of " +
+                std::to_string(nxbase::kMaxFrameLength >> 20) + " MiB");
+}
+
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 std::string_view asEncodedData) {
-    if (!MaySend(asApp, asCommand)) return false;
+    if (!MaySend(asApp, asCommand) || !FitsOneFrame(asCommand, asEncodedData)) return false;
     std::optional<SendScope> own;
     if (pmScope == nullptr) own.emplace(this, nullptr);
     // A process reached by DDE only also sends by DDE.
@@ -1029,6 +1039,7 @@ bool Pipe::SendOnChannel(std::uint64_t alChannel, const std::string& asCommand,
         at != amAllChannels.end() && !at->second->closed && at->second->stage == Stage::kOpen;
     if (!MaySend(open ? at->second->peer : "(closed channel)", asCommand)) return false;
     if (!open) return Fail("the channel the command came in on is closed");
+    if (!FitsOneFrame(asCommand, asEncodedData)) return false;
     ChannelPtr channel = at->second;
     return WriteMessage(channel, asCommand, asEncodedData) ||
            Fail("writing to " + channel->peer + " failed: " + channel->closedWhy);

@@ -8,7 +8,7 @@
 // AwaitArrival queues a wait that only such an edge (or an error, a hang-up,
 // a close) ends: a message costs one system call fewer.
 //
-// The rules for its user: call WatchPeerShutdown once for the socket; start
+// The rules for its user: take the socket's ArrivalWatch once; start
 // the wait only right after a read that left the socket empty, before the
 // loop runs again (an edge the loop saw while no wait was queued is gone).
 // A short read means empty only after an AwaitArrival that did not report
@@ -39,9 +39,17 @@ using LocalSocket = boost::asio::basic_stream_socket<boost::asio::local::stream_
 // are in that set too).
 int ReactorDescriptor(boost::asio::io_context& axContext);
 
-// Lets the waits of `socket` see a peer that shut down its writing side
-// (EPOLLRDHUP): one epoll_ctl, false when it failed.
-bool WatchPeerShutdown(LocalSocket& axSocket);
+// What the arrival waits of one socket need, taken once: the socket's
+// registration also reports a peer that shut down its writing side
+// (EPOLLRDHUP, one epoll_ctl), and the reactor is looked up (under the
+// context's lock) here rather than per wait. False when that failed: the
+// socket's waits are then asio's async_wait.
+class ArrivalWatch {
+  public:
+    explicit operator bool() const { return reactor != nullptr; }
+    boost::asio::detail::epoll_reactor* reactor = nullptr;
+};
+ArrivalWatch WatchPeerShutdown(LocalSocket& axSocket);
 
 namespace detail {
 
@@ -56,18 +64,6 @@ struct SocketAccess : LocalSocket {
         return (axSocket.*(&SocketAccess::impl_)).get_implementation();
     }
 };
-
-// The reactor of a context, looked up (under the context's lock) only when
-// the context is another than last time.
-inline boost::asio::detail::epoll_reactor& ReactorOf(boost::asio::execution_context& axContext) {
-    thread_local boost::asio::execution_context* context = nullptr;
-    thread_local boost::asio::detail::epoll_reactor* reactor = nullptr;
-    if (context != &axContext) {
-        reactor = &boost::asio::use_service<boost::asio::detail::epoll_reactor>(axContext);
-        context = &axContext;
-    }
-    return *reactor;
-}
 
 // The memory of the last finished wait, which the next takes: a wait per
 // message should not cost an allocation.
@@ -129,14 +125,13 @@ class ArrivalOp : public boost::asio::detail::reactor_op {
 
 // Calls handler(error, peerStoppedWriting) from the loop once bytes arrive
 // on `socket` after this call (error set when the socket failed or was
-// closed).
+// closed). `watch` is the socket's, and true.
 template <class Handler>
-void AwaitArrival(LocalSocket& axSocket, Handler handler) {
+void AwaitArrival(const ArrivalWatch& axWatch, LocalSocket& axSocket, Handler handler) {
     auto& implementation = detail::SocketAccess::Implementation(axSocket);
-    auto& reactor = detail::ReactorOf(axSocket.get_executor().context());
     auto* op = new detail::ArrivalOp<Handler>(std::move(handler), implementation.reactor_data_);
-    reactor.start_op(boost::asio::detail::epoll_reactor::read_op, implementation.socket_,
-                     implementation.reactor_data_, op, true, true);
+    axWatch.reactor->start_op(boost::asio::detail::epoll_reactor::read_op, implementation.socket_,
+                              implementation.reactor_data_, op, true, true);
     op->queued = true;  // still ours: a queued or posted operation runs only from the loop
 }
 
