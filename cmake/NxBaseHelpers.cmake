@@ -18,6 +18,14 @@ function(nxbase_add_test name)
     if(ARG_LABELS)
         list(APPEND properties LABELS "${ARG_LABELS}")
     endif()
+    if(TARGET nxtest_launcher)
+        # CMake before 3.29 runs tests through the emulator, later ones
+        # through the launcher.
+        add_dependencies(${name} nxtest_launcher)
+        set_target_properties(${name} PROPERTIES
+            CROSSCOMPILING_EMULATOR ${NXBASE_TEST_LAUNCHER}
+            TEST_LAUNCHER ${NXBASE_TEST_LAUNCHER})
+    endif()
     gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES ${properties})
 endfunction()
 

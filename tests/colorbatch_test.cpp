@@ -167,8 +167,10 @@ TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBits) {
         for (BatchIsa isa : {BatchIsa::kAvx2, BatchIsa::kAvx512}) {
             if (!nxbase::detail::UseBatchIsa(isa)) continue;
             const std::vector<float> wider = results();
-            // Compared as bits: NaN from a negative cube root is NaN in both.
-            ASSERT_EQ(std::memcmp(wider.data(), baseline.data(), sizeof(float) * wider.size()), 0)
+            // Compared as bits: NaN from a negative cube root is NaN in both
+            // (no memcmp of the empty vectors of zero spectra: their data may be null).
+            ASSERT_TRUE(wider.empty() || std::memcmp(wider.data(), baseline.data(),
+                                                     sizeof(float) * wider.size()) == 0)
                 << "instruction set " << static_cast<int>(isa) << ", " << count << " spectra";
         }
     }
