@@ -24,11 +24,6 @@
 #ifndef NXBASE_MYMEMBLO_H_
 #define NXBASE_MYMEMBLO_H_
 
-// The inline writers store whole little-endian words (GCC and Clang).
-#if defined(__GNUC__) && defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
-#define NXBASE_WORD_STORES 1
-#endif
-
 #include <cstdint>
 #include <cstring>
 #include <iosfwd>
@@ -37,6 +32,16 @@
 
 #include "nxbase/export.h"
 #include "toolkit/string.h"
+
+// The inline writers store whole little-endian words (GCC and Clang), and
+// short texts as 16 bytes where a String's storage is known to hold them
+// (libstdc++'s std::string of the C++11 ABI).
+#if defined(__GNUC__) && defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+#define NXBASE_WORD_STORES 1
+#if defined(_GLIBCXX_USE_CXX11_ABI) && _GLIBCXX_USE_CXX11_ABI
+#define NXBASE_TEXT_WORDS 1
+#endif
+#endif
 
 // A set of flags numbered Low() to High()-1, all clear unless set. The
 // serialised form holds only the count and the flags in order, so a set read
@@ -165,9 +170,10 @@ class NXBASE_EXPORT MyMemoryBlock {
     // The characters and the terminating zero.
     MyMemoryBlock& operator<<(const String& asValue) {
         const long count = static_cast<long>(asValue.Len()) + 1;
-#ifdef NXBASE_WORD_STORES
+#ifdef NXBASE_TEXT_WORDS
         if (__builtin_expect(count <= 16 && putPointer < wordLimit, 1)) {
-            PutShort(asValue.GetBuffer(), static_cast<int>(count));
+            PutSixteen(asValue.GetBuffer());
+            putPointer += count;
             return *this;
         }
 #endif
@@ -247,30 +253,20 @@ class NXBASE_EXPORT MyMemoryBlock {
     static void StoreWord(char* to, std::uint64_t axValue) {
         *reinterpret_cast<Word64*>(to) = axValue;
     }
-    // 1 to 16 bytes, with room for 16: two overlapping words of the text, or
-    // for 1 to 3 bytes one word of which the rest is overwritten later.
-    void PutShort(const char* from, int count) {
-        if (count >= 8) {
-            std::uint64_t head, tail;
-            std::memcpy(&head, from, 8);
-            std::memcpy(&tail, from + count - 8, 8);
-            StoreWord(putPointer, head);
-            StoreWord(putPointer + count - 8, tail);
-        } else if (count >= 4) {
-            std::uint32_t head, tail;
-            std::memcpy(&head, from, 4);
-            std::memcpy(&tail, from + count - 4, 4);
-            StoreWord(putPointer, head);
-            StoreWord(putPointer + count - 4, tail);
-        } else {
-            std::uint32_t word = static_cast<unsigned char>(from[0]);
-            if (count > 1)
-                word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[1])) << 8;
-            if (count > 2)
-                word |= static_cast<std::uint32_t>(static_cast<unsigned char>(from[2])) << 16;
-            StoreWord(putPointer, word);
-        }
-        putPointer += count;
+#endif
+#ifdef NXBASE_TEXT_WORDS
+    // 16 bytes from a String's storage, with room for 16: a text of up to 15
+    // characters and its zero in one copy, without a branch on its length.
+    // The storage of a std::string holds at least 16 bytes (its own buffer
+    // of 15 characters and the zero, or a heap buffer that held more); the
+    // bytes past the zero are copied as they are and the next write covers
+    // them, as it covers the rest of a word.
+    void PutSixteen(const char* from) {
+        std::uint64_t head, tail;
+        std::memcpy(&head, from, 8);
+        std::memcpy(&tail, from + 8, 8);
+        StoreWord(putPointer, head);
+        StoreWord(putPointer + 8, tail);
     }
 #endif
     // The fixed-size helper of the number readers (defined in the .cpp only).
