@@ -177,10 +177,11 @@ TEST(EventLoop, RandomWaitsEndAsTheirModelSaysAndLeaveTheLoopAsleep) {
             continue;
         SCOPED_TRACE("round " + std::to_string(round));
         bool ready = false;
+        // Before the timer: it expires readyAt after its making, not after a later now.
+        const auto start = Clock::now();
         boost::asio::steady_timer trigger(app.GetContext(), readyAt);
         trigger.async_wait([&](const boost::system::error_code& error) { ready = !error; });
         std::vector<Clock::time_point> asked;
-        const auto start = Clock::now();
         auto end =
             app.RunUntil([&] { return ready; }, [&] { return asked.push_back(Clock::now()), true; },
                          bounded ? start + deadlineIn : Clock::time_point::max());
