@@ -84,7 +84,15 @@ unsigned int OnlineProcessorCount() {
 
 VectorIsa MachineVectorIsa() {
 #if defined(__x86_64__) && defined(__GNUC__)
-    if (!__builtin_cpu_supports("x86-64-v3")) return VectorIsa::kBaseline;
+#ifdef __clang__
+    // Clang 14 knows no level names; these are the parts of x86-64-v3 it can ask for.
+    const bool level3 = __builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma") &&
+                        __builtin_cpu_supports("bmi") && __builtin_cpu_supports("bmi2") &&
+                        __builtin_cpu_supports("popcnt");
+#else
+    const bool level3 = __builtin_cpu_supports("x86-64-v3");
+#endif
+    if (!level3) return VectorIsa::kBaseline;
     if (__builtin_cpu_supports("avx512f") && __builtin_cpu_supports("avx512dq") &&
         __builtin_cpu_supports("avx512vl"))
         return VectorIsa::kAvx512;

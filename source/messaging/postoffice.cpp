@@ -847,35 +847,36 @@ void PostOffice::AwaitStart(const RequestPtr& pRequest, std::shared_ptr<const My
     pRequest->timer->expires_at(
         std::min(std::chrono::steady_clock::now() + pause, pRequest->deadline));
     std::weak_ptr<bool> alive = amAlive;
-    pRequest->timer->async_wait([=, this](const boost::system::error_code& error) {
-        if (error || alive.expired() || pRequest->finished) return;
-        const std::string& app = pRequest->key.first;
-        Pipe* pipe = Pipe::Instance();
-        std::string how;
-        int pid = alPid;
-        if (pipe == nullptr) {
-            Finish(pRequest, false, MyMemoryBlock(), "the transport was closed");
-        } else if (pipe->IsReachable(app)) {
-            SendAsync(pRequest, *pSend, PeerStart::kIfNeeded);
-        } else if (pipe->StartEnded(app, pid, how) && !pipe->IsReachable(app)) {
-            Finish(pRequest, false, MyMemoryBlock(), "no answer from " + app + ": it " + how);
-        } else if (std::chrono::steady_clock::now() >= pRequest->deadline) {
-            Finish(pRequest, false, MyMemoryBlock(),
-                   "no answer from " + app + " within " +
-                       std::to_string(pRequest->timeout.count()) +
-                       " ms (it did not become reachable in time)");
-        } else if (pRequest->keepWaiting && !pRequest->keepWaiting()) {
-            Finish(pRequest, false, MyMemoryBlock(),
-                   "no answer from " + app + "; the wait was given up");
-        } else if (pid <= 0 && !nxbase::IsApplicationRunning(app) &&
-                   !pipe->StartForLater(app, pid)) {
-            // The instance it waited for ended before it could be reached.
-            Finish(pRequest, false, MyMemoryBlock(), pipe->GetLastError());
-        } else {
-            AwaitStart(pRequest, pSend, pid,
-                       std::min(pause * 2, std::chrono::milliseconds(kTickMs)));
-        }
-    });
+    pRequest->timer->async_wait(
+        [this, pRequest, pSend, alPid, pause, alive](const boost::system::error_code& error) {
+            if (error || alive.expired() || pRequest->finished) return;
+            const std::string& app = pRequest->key.first;
+            Pipe* pipe = Pipe::Instance();
+            std::string how;
+            int pid = alPid;
+            if (pipe == nullptr) {
+                Finish(pRequest, false, MyMemoryBlock(), "the transport was closed");
+            } else if (pipe->IsReachable(app)) {
+                SendAsync(pRequest, *pSend, PeerStart::kIfNeeded);
+            } else if (pipe->StartEnded(app, pid, how) && !pipe->IsReachable(app)) {
+                Finish(pRequest, false, MyMemoryBlock(), "no answer from " + app + ": it " + how);
+            } else if (std::chrono::steady_clock::now() >= pRequest->deadline) {
+                Finish(pRequest, false, MyMemoryBlock(),
+                       "no answer from " + app + " within " +
+                           std::to_string(pRequest->timeout.count()) +
+                           " ms (it did not become reachable in time)");
+            } else if (pRequest->keepWaiting && !pRequest->keepWaiting()) {
+                Finish(pRequest, false, MyMemoryBlock(),
+                       "no answer from " + app + "; the wait was given up");
+            } else if (pid <= 0 && !nxbase::IsApplicationRunning(app) &&
+                       !pipe->StartForLater(app, pid)) {
+                // The instance it waited for ended before it could be reached.
+                Finish(pRequest, false, MyMemoryBlock(), pipe->GetLastError());
+            } else {
+                AwaitStart(pRequest, pSend, pid,
+                           std::min(pause * 2, std::chrono::milliseconds(kTickMs)));
+            }
+        });
 }
 
 void PostOffice::SendAsync(const RequestPtr& pRequest, const MyMemoryBlock& axSend,
