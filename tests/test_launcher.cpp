@@ -10,6 +10,7 @@
 // process to go does not see a zombie), kills what is left once the test has
 // ended, and ends as the test did.
 #include <dirent.h>
+#include <fcntl.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
@@ -19,7 +20,6 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -33,13 +33,19 @@ void ForwardToTest(int signal) {
 }
 
 // The parent pid in /proc/PID/stat: the field after the command, which is
-// in parentheses and may itself hold spaces and parentheses.
+// in parentheses and may itself hold spaces and parentheses. 0 when the
+// process is gone (it may go between the listing and the read).
 pid_t ParentOf(const std::string& pid) {
-    std::ifstream file("/proc/" + pid + "/stat");
-    std::string stat((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
-    std::size_t close = stat.rfind(')');
-    if (close == std::string::npos || close + 4 >= stat.size()) return 0;
-    return static_cast<pid_t>(std::atol(stat.c_str() + close + 4));
+    const int fd = ::open(("/proc/" + pid + "/stat").c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0) return 0;
+    char buffer[1024];
+    const ssize_t got = ::read(fd, buffer, sizeof buffer - 1);
+    ::close(fd);
+    if (got <= 0) return 0;
+    const std::string stat(buffer, static_cast<std::size_t>(got));
+    const std::size_t end = stat.rfind(')');
+    if (end == std::string::npos || end + 4 >= stat.size()) return 0;
+    return static_cast<pid_t>(std::atol(stat.c_str() + end + 4));
 }
 
 std::vector<pid_t> Children() {
