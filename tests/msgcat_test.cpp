@@ -59,6 +59,7 @@ TEST(MessageCatalogue, ByteStuffingRemovesZeroBytesAndComesBack) {
         EXPECT_EQ(nxbase::EncodeBytes(c.plain.data(), c.plain.size()), c.encoded);
         EXPECT_EQ(nxbase::DecodeBytes(c.encoded.data(), c.encoded.size()), c.plain);
     }
+    EXPECT_EQ(nxbase::EncodeBytes(nullptr, 0), "");  // the data of an emptied block
     EXPECT_EQ(nxbase::DecodeBytes("\x01\x05", 2), "\x01");
     EXPECT_EQ(nxbase::DecodeBytes("a\x01", 2), "a\x01");  // a lone 0x01 at the end
 

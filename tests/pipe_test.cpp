@@ -194,7 +194,9 @@ TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
     // A frame one byte longer than a reader takes is refused here, and the
     // channel stays ("PipeTestClient", "IS_READY" and two zero bytes).
     const std::string over(nxbase::kMaxFrameLength - 14 - 8 - 2 + 1, 'x');
+    Pipe::SendScope overScope(pipe, nullptr);
     EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", over));
+    EXPECT_TRUE(overScope.Hopeless()) << "retrying cannot make it fit";
     EXPECT_EQ(pipe->GetLastError(), "a message of " + std::to_string(nxbase::kMaxFrameLength + 1) +
                                         " bytes is above the frame limit of 64 MiB");
     EXPECT_TRUE(pipe->HasChannel("EchoPeer"));

@@ -109,7 +109,8 @@ class NXBASE_EXPORT Pipe {
         SendScope(const SendScope&) = delete;
         SendScope& operator=(const SendScope&) = delete;
         // Whether trying again is of no use: the start failed, the peer
-        // does not run and must not be started, or the application quits.
+        // does not run and must not be started, the message is above the
+        // frame limit, or the application quits.
         bool Hopeless() const { return amHopeless || Quitting(); }
         // Whether Application::Quit() was called since the scope began.
         bool Quitting() const;

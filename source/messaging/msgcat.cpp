@@ -205,7 +205,9 @@ std::string CommandTextOfNumber(int alNumber) {
 }
 
 void AppendEncoded(std::string& asOut, const char* pData, std::size_t alSize) {
-    // Most data holds neither byte: one copy.
+    // Most data holds neither byte: one copy. (No data may come as a null
+    // pointer, as from an emptied block, which memchr must not be given.)
+    if (alSize == 0) return;
     if (std::memchr(pData, '\x00', alSize) == nullptr &&
         std::memchr(pData, '\x01', alSize) == nullptr) {
         asOut.append(pData, alSize);

@@ -1011,9 +1011,13 @@ bool Pipe::FitsOneFrame(const std::string& asCommand, std::string_view asEncoded
 
 bool Pipe::Send(const std::string& asApp, const std::string& asCommand,
                 std::string_view asEncodedData) {
-    if (!MaySend(asApp, asCommand) || !FitsOneFrame(asCommand, asEncodedData)) return false;
+    if (!MaySend(asApp, asCommand)) return false;
     std::optional<SendScope> own;
     if (pmScope == nullptr) own.emplace(this, nullptr);
+    if (!FitsOneFrame(asCommand, asEncodedData)) {
+        pmScope->amHopeless = true;  // no retry makes the message shorter
+        return false;
+    }
     // A process reached by DDE only also sends by DDE.
     if (!nxbase::gListen && pmDDE && pmDDE->IsActive()) {
         amLastSendChannel = 0;
