@@ -184,7 +184,8 @@ NXBASE_EXPORT void EncodeBlock(MyMemoryBlock& axBlock);
 NXBASE_EXPORT void DecodeBlock(MyMemoryBlock& axBlock);
 // The same on plain bytes.
 NXBASE_EXPORT std::string EncodeBytes(const char* pData, std::size_t alSize);
-// Appends the stuffed form of `alSize` bytes at `pData` to `asOut`.
+// Appends the stuffed form of `alSize` bytes at `pData` to `asOut` (`pData`
+// may be null when `alSize` is 0).
 NXBASE_EXPORT void AppendEncoded(std::string& asOut, const char* pData, std::size_t alSize);
 NXBASE_EXPORT std::string DecodeBytes(const char* pData, std::size_t alSize);
 // Decodes `alSize` bytes at `pData` in place (decoding never grows them);

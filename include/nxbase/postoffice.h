@@ -72,8 +72,9 @@ class NXBASE_EXPORT PostOffice : public NxSingleton {
     // transport started it (one start per Send, all retries included, and
     // at most nxbase::StartWaitLimit(): 10 s, less when $NXBASE_WAIT_TIMEOUT
     // is shorter). A peer that does not run is started only with
-    // PeerStart::kIfNeeded. True on success; GetLastError() says why a send
-    // failed.
+    // PeerStart::kIfNeeded. A message whose frame would pass
+    // nxbase::kMaxFrameLength fails after its first attempt. True on
+    // success; GetLastError() says why a send failed.
     unsigned char Send(const std::string& asApp, PO_Botschaften axMessage, MyMemoryBlock& axData,
                        boost::function<bool()> fKeepTrying = boost::function<bool()>(),
                        PeerStart axStart = PeerStart::kIfNeeded);
