@@ -8,7 +8,6 @@
 #include <functional>
 
 #include "gui_test_util.h"
-#include "nxbase/lumaclient.h"
 
 namespace {
 
@@ -29,12 +28,6 @@ bool IterateUntil(const std::function<bool()>& done, std::chrono::milliseconds l
     return true;
 }
 
-MyMemoryBlock Level(unsigned char level) {
-    MyMemoryBlock block;
-    block << level;
-    return block;
-}
-
 class GlibLoopTest : public ::testing::Test {
   protected:
     void TearDown() override { nxbase::glib::Detach(); }
@@ -50,7 +43,8 @@ TEST_F(GlibLoopTest, AConnectedIdleApplicationSleepsAndABlockingWaitKeepsGLibTur
         [](gpointer count) -> gboolean { return ++*static_cast<int*>(count), G_SOURCE_CONTINUE; },
         &ticks);
     // Starting the server and connecting wait inside SendAndReceive: GLib runs meanwhile.
-    MyMemoryBlock send = Level(2), answer;
+    MyMemoryBlock send, answer;
+    send << static_cast<unsigned char>(2);
     ASSERT_TRUE(office->SendAndReceive("LumaServer", CONNECT, send, answer))
         << office->GetLastError();
     EXPECT_GT(ticks, 0) << "GLib's sources did not run during the wait";
@@ -123,30 +117,6 @@ TEST_F(GlibLoopTest, AsynchronousSendsEndInAnAnswerALostPeerARefusalOrATimeOut) 
     EXPECT_FALSE(results[3].answered);
     EXPECT_NE(results[3].error.find("was lost"), std::string::npos) << results[3].error;
     EXPECT_EQ(office->GetPendingAsyncCount(), 0u);
-}
-
-TEST_F(GlibLoopTest, NoticesReachAGLibSubscriberWhileItStaysConnected) {
-    ASSERT_EQ(std::system((gui.ServerPath() + " --trigger-every 50 &").c_str()), 0);
-    PostOffice* office = PostOffice::CreatePostOffice("GlibTester");
-    nxbase::glib::Attach();
-    ASSERT_TRUE(
-        IterateUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
-    struct Counter {
-        int notices = 0;
-        long Count(void*) { return ++notices, 0; }
-    } counter;
-    Link handler = LINK(Counter, &counter, Count);
-    office->ChangeMessageHdl(MESSUNG_AUSGELOEST, handler);
-    MyMemoryBlock level = Level(2), answer, none;
-    ASSERT_TRUE(office->SendAndReceive("LumaServer", CONNECT, level, answer));
-    ASSERT_TRUE(office->SendAndReceive("LumaServer", NOTIFY_MESSUNG, none, answer));
-    ASSERT_TRUE(IterateUntil([&] { return counter.notices >= 3; }));
-    std::vector<nxbase::MeasuredSpectrum> measured;
-    std::string error;
-    ASSERT_TRUE(nxbase::MeasureWithLumaServer(*office, 2, &measured, &error)) << error;
-    int before = counter.notices;
-    ASSERT_TRUE(IterateUntil([&] { return counter.notices >= before + 5; }));
-    office->Send("LumaServer", DISCONNECT, none);
 }
 
 }  // namespace

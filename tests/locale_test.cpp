@@ -121,7 +121,9 @@ std::string ReadAndWriteEverything(const nxtest::TempDir& dir) {
     IniConfig ini(dir.File("store.ini"));
     ini.WriteKey("Colour", "Tolerance", StringHelpers::Fixed(0.75, 2));
     out += ini.ReadKey("Colour", "Tolerance", "") + "\n" + nxtest::ReadFile(dir.File("store.ini"));
-    out += std::string(GString(2.5, 3)) + "\n";
+    out += std::string(GString(2.5, 3)) + " " + GString(-0.5, 3, 8).str() + "\n";
+    for (const char* text : {"1234.5678", "7,25"})
+        out += StringHelpers::Shortest(static_cast<double>(GString(text))) + "\n";
     return out;
 }
 

@@ -221,23 +221,9 @@ TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
     EXPECT_EQ(RoundTrip("still here"), "still here");
 }
 
-TEST_F(PipeTest, BackToBackFramesAllArriveAndBadInputClosesOnlyItsChannel) {
+// Back-to-back frames in any pieces: see the random streams below.
+TEST_F(PipeTest, BadInputClosesOnlyItsChannel) {
     ASSERT_EQ(RoundTrip("warm"), "warm");
-    int fd = RawClient("Raw");
-    std::string burst;
-    for (int i = 0; i < 50; ++i) {
-        std::string data = nxbase::EncodeBytes(std::string(1, static_cast<char>(i)).data(), 1);
-        burst += nxbase::EncodeFrame(nxbase::MessageBody("Raw", "IS_READY", data));
-        if (i == 10) burst += nxbase::EncodeFrame("");  // consumed, not delivered
-    }
-    std::size_t before = gReceived.size();
-    ASSERT_EQ(::write(fd, burst.data(), burst.size()), static_cast<ssize_t>(burst.size()));
-    ASSERT_TRUE(RunUntil([&] { return gReceived.size() == before + 50; }));
-    for (int i = 0; i < 50; ++i) {
-        EXPECT_EQ(BytesOf(gReceived[before + i].GetData()), std::string(1, static_cast<char>(i)));
-    }
-    ::close(fd);
-
     std::string random(4096, '\0');
     unsigned state = 12345;
     for (char& c : random) c = static_cast<char>((state = state * 1103515245u + 12345u) >> 16);

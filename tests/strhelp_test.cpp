@@ -3,16 +3,12 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
-#include <clocale>
 #include <cmath>
-#include <cstdio>
 #include <cstdlib>
 #include <random>
 #include <regex>
 #include <string>
 #include <vector>
-
-#include "test_util.h"
 
 namespace {
 
@@ -120,44 +116,6 @@ TEST(GString, ReadsNumbersWithPointOrComma) {
     for (double value : {0.1, 1.0 / 3.0, -123456.789, 5e-7}) {
         EXPECT_DOUBLE_EQ(static_cast<double>(GString(value, 17)), value);
     }
-}
-
-// Switches LC_ALL to a locale whose decimal separator is ','. de_DE.UTF-8 is
-// used when installed; otherwise it is compiled into the test's directory
-// with localedef, when the locale sources are there.
-class CommaLocaleTest : public ::testing::Test {
-  protected:
-    void SetUp() override {
-        if (std::setlocale(LC_ALL, "de_DE.UTF-8") == nullptr) {
-            std::string command =
-                "localedef -i de_DE -f UTF-8 '" + dir_.File("de_DE.UTF-8") + "' >/dev/null 2>&1";
-            if (std::system(command.c_str()) == 0) {
-                locpath_.emplace("LOCPATH", dir_.path().string());
-                std::setlocale(LC_ALL, "de_DE.UTF-8");
-            }
-        }
-        const char* active = std::setlocale(LC_ALL, nullptr);
-        if (active == nullptr || std::string(active) != "de_DE.UTF-8" ||
-            *std::localeconv()->decimal_point != ',') {
-            std::setlocale(LC_ALL, "C");
-            GTEST_SKIP() << "no locale with a decimal comma: de_DE.UTF-8 is not installed and "
-                            "could not be built with localedef";
-        }
-    }
-    void TearDown() override { std::setlocale(LC_ALL, "C"); }
-
-    nxtest::TempDir dir_;
-    std::optional<nxtest::ScopedEnv> locpath_;
-};
-
-TEST_F(CommaLocaleTest, GStringWritesAndReadsPointWhateverTheLocale) {
-    char printed[32];
-    std::snprintf(printed, sizeof printed, "%.1f", 2.5);
-    ASSERT_STREQ(printed, "2,5") << "the locale is in force";
-    EXPECT_EQ(GString(1234.5678, 2), "1234.57");
-    EXPECT_EQ(GString(-0.5, 3, 8), "  -0.500");
-    EXPECT_DOUBLE_EQ(static_cast<double>(GString("1234.5678")), 1234.5678);
-    EXPECT_DOUBLE_EQ(static_cast<double>(GString("7,25")), 7.25);
 }
 
 TEST(DynStringArray, SlotsOutsideTheArrayAreNeitherReadNorWritten) {
