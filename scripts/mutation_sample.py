@@ -16,9 +16,11 @@ sources draw the same mutations, so a run before and after a change of the
 tests compares like with like.
 """
 import argparse
+import os
 import pathlib
 import random
 import re
+import signal
 import subprocess
 import sys
 import time
@@ -64,10 +66,16 @@ def candidates(path):
 
 
 def run(command, timeout):
+    """The command's exit status, or -1 when it ran out of time. A command
+    that runs out of time is ended with everything it started: a hung test
+    would otherwise keep its test launcher (and what the test started) alive."""
+    process = subprocess.Popen(command, cwd=ROOT, stdout=subprocess.DEVNULL,
+                               stderr=subprocess.DEVNULL, start_new_session=True)
     try:
-        return subprocess.run(command, cwd=ROOT, stdout=subprocess.PIPE, stderr=subprocess.STDOUT,
-                              timeout=timeout, text=True).returncode
+        return process.wait(timeout=timeout)
     except subprocess.TimeoutExpired:
+        os.killpg(process.pid, signal.SIGKILL)
+        process.wait()
         return -1
 
 
@@ -121,9 +129,12 @@ def main():
                 where = f"{path.relative_to(ROOT)}:{number + 1}"
                 # Which tests caught it: the candidates for keeping when tests are pruned.
                 failed = build / "Testing" / "Temporary" / "LastTestsFailed.log"
-                catchers = ",".join(line.split(":", 1)[-1].strip()
-                                    for line in failed.read_text().splitlines()) \
-                    if killed and failed.exists() else ""
+                if result == -1:
+                    catchers = "time-out"  # the list, if any, is an earlier run's
+                else:
+                    catchers = ",".join(line.split(":", 1)[-1].strip()
+                                        for line in failed.read_text().splitlines()) \
+                        if killed and failed.exists() else ""
                 out.write(f"{where}\t{'caught' if killed else 'missed'}\t"
                           f"{mutated_line.strip()}\t{time.time() - start:.0f}s\t{catchers}\n")
                 out.flush()
