@@ -145,19 +145,6 @@ struct Tail {
 // copy built for one instruction set must never be the one the others call.
 struct ThisFile {};
 
-// CIELAB's f of `count` values in place, eight at a time; each value gets
-// the same bits in a vector as alone.
-inline void FOfValues(double* values, std::size_t count) {
-    std::size_t i = 0;
-    for (; i + 8 <= count; i += 8) {
-        Eight t;
-        std::memcpy(&t, values + i, sizeof t);
-        cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(t);
-        std::memcpy(values + i, &t, sizeof t);
-    }
-    for (; i < count; ++i) cielab::TakeFOfLanes<double, std::uint64_t, ThisFile>(values[i]);
-}
-
 inline void StoreSums(const Lanes& lane, double* xyz) {
     xyz[0] = Reduced(lane.x0, lane.x1);
     xyz[1] = Reduced(lane.y0, lane.y1);
@@ -165,6 +152,34 @@ inline void StoreSums(const Lanes& lane, double* xyz) {
 }
 
 #ifdef __AVX512F__
+// Halves of a and b added lane to lane: lane i of a half gets lanes i and
+// i + h of its vector, a's halves first. Both results are vectors of eight.
+template <int h>
+inline Eight HalvesAdded(const Eight& a, const Eight& b) {
+    if constexpr (h == 4) {
+        return __builtin_shufflevector(a, b, 0, 1, 2, 3, 8, 9, 10, 11) +
+               __builtin_shufflevector(a, b, 4, 5, 6, 7, 12, 13, 14, 15);
+    } else if constexpr (h == 2) {
+        return __builtin_shufflevector(a, b, 0, 1, 4, 5, 8, 9, 12, 13) +
+               __builtin_shufflevector(a, b, 2, 3, 6, 7, 10, 11, 14, 15);
+    } else {
+        return __builtin_shufflevector(a, b, 0, 2, 4, 6, 8, 10, 12, 14) +
+               __builtin_shufflevector(a, b, 1, 3, 5, 7, 9, 11, 13, 15);
+    }
+}
+
+// The six sums of two spectra, each lane added in Reduced's order, but the
+// six vectors halved together: a third of the shuffles and adds.
+inline void StoreSumsOfTwo(const Lanes& a, const Lanes& b, double* xyz) {
+    const Eight quarters0 = HalvesAdded<4>(a.x0 + a.x1, a.y0 + a.y1);
+    const Eight quarters1 = HalvesAdded<4>(a.z0 + a.z1, b.x0 + b.x1);
+    const Eight quarters2 = HalvesAdded<4>(b.y0 + b.y1, b.z0 + b.z1);
+    const Eight pairs0 = HalvesAdded<2>(quarters0, quarters1);
+    const Eight pairs1 = HalvesAdded<2>(quarters2, quarters2);
+    const Eight sums = HalvesAdded<1>(pairs0, pairs1);
+    std::memcpy(xyz, &sums, 6 * sizeof(double));
+}
+
 // Two neighbouring spectra of n >= kLanes values at a time, each step's
 // weights loaded once for both. One spectrum at a time loads a weight vector
 // per multiply-add; a core that loads one 64-byte vector a cycle (AMD Zen 4)
@@ -197,8 +212,7 @@ inline void SumTwo(const double* w0, const double* w1, const double* w2, std::si
         AddLanes(la, w, a + n - kLanes);
         AddLanes(lb, w, b + n - kLanes);
     }
-    StoreSums(la, xyz);
-    StoreSums(lb, xyz + 3);
+    StoreSumsOfTwo(la, lb, xyz);
 }
 #endif
 
@@ -239,37 +253,71 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
     }
 }
 
-// The ratios to the white of kLabBlock triples, as kLabBlock * 3 doubles:
-// whole vectors, multiplied lane by lane by the white's reciprocals (a
-// division costs as much as the rest of the step; the ratios differ from
-// the quotients by at most an ulp).
+// Eight colours as three vectors of interleaved triples (x0 y0 z0 x1 ...),
+// taken apart into a vector per component and put back together: CIELAB is
+// then whole-vector arithmetic, with no lane handled alone.
 constexpr std::size_t kLabBlock = 8;
 
+struct Planes {
+    Eight x, y, z;
+};
+
+inline void Deinterleave(const double* triples, Planes& p) {
+    Eight v0, v1, v2;
+    std::memcpy(&v0, triples, sizeof v0);
+    std::memcpy(&v1, triples + 8, sizeof v1);
+    std::memcpy(&v2, triples + 16, sizeof v2);
+    const Eight x = __builtin_shufflevector(v0, v1, 0, 3, 6, 9, 12, 15, 0, 0);
+    const Eight y = __builtin_shufflevector(v0, v1, 1, 4, 7, 10, 13, 0, 0, 0);
+    const Eight z = __builtin_shufflevector(v0, v1, 2, 5, 8, 11, 14, 0, 0, 0);
+    p.x = __builtin_shufflevector(x, v2, 0, 1, 2, 3, 4, 5, 10, 13);
+    p.y = __builtin_shufflevector(y, v2, 0, 1, 2, 3, 4, 8, 11, 14);
+    p.z = __builtin_shufflevector(z, v2, 0, 1, 2, 3, 4, 9, 12, 15);
+}
+
+inline void Interleave(const Planes& p, double* triples) {
+    const Eight xy0 = __builtin_shufflevector(p.x, p.y, 0, 8, 0, 1, 9, 0, 2, 10);
+    const Eight xy1 = __builtin_shufflevector(p.x, p.y, 0, 3, 11, 0, 4, 12, 0, 5);
+    const Eight xy2 = __builtin_shufflevector(p.x, p.y, 13, 0, 6, 14, 0, 7, 15, 0);
+    const Eight v0 = __builtin_shufflevector(xy0, p.z, 0, 1, 8, 3, 4, 9, 6, 7);
+    const Eight v1 = __builtin_shufflevector(xy1, p.z, 10, 1, 2, 11, 4, 5, 12, 7);
+    const Eight v2 = __builtin_shufflevector(xy2, p.z, 0, 13, 2, 3, 14, 5, 6, 15);
+    std::memcpy(triples, &v0, sizeof v0);
+    std::memcpy(triples + 8, &v1, sizeof v1);
+    std::memcpy(triples + 16, &v2, sizeof v2);
+}
+
+// CIELAB of eight triples in place, from the white's reciprocals: the ratios
+// are multiplied, not divided (a division costs as much as the rest; the
+// ratios differ from the quotients by at most an ulp).
+inline void LabOfEight(double* triples, const double* reciprocal) {
+    Planes p;
+    Deinterleave(triples, p);
+    p.x *= reciprocal[0];
+    p.y *= reciprocal[1];
+    p.z *= reciprocal[2];
+    // 0 when the three ratios are finite, NaN otherwise (inf * 0): added
+    // to L*, a* and b*, it leaves them or makes them NaN without a branch.
+    const Eight unusable = p.x * 0.0 + p.y * 0.0 + p.z * 0.0;
+    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.x);
+    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.y);
+    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.z);
+    const Planes lab = {(116.0 * p.y - 16.0) + unusable, 500.0 * (p.x - p.y) + unusable,
+                        200.0 * (p.y - p.z) + unusable};
+    Interleave(lab, triples);
+}
+
+// The last count % kLabBlock triples go through a copy padded with zeros, so
+// that a colour gets the same bits alone as among many.
 inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
     const double reciprocal[3] = {1.0 / white[0], 1.0 / white[1], 1.0 / white[2]};
-    double whites[3 * kLabBlock];
-    for (std::size_t j = 0; j < 3 * kLabBlock; ++j) whites[j] = reciprocal[j % 3];
-    for (std::size_t first = 0; first < count; first += kLabBlock, xyz += 3 * kLabBlock) {
-        const std::size_t n = count - first < kLabBlock ? count - first : kLabBlock;
-        double f[3 * kLabBlock];
-        if (n == kLabBlock) {
-            for (std::size_t j = 0; j < 3 * kLabBlock; ++j) f[j] = xyz[j] * whites[j];
-        } else {
-            for (std::size_t j = 0; j < 3 * n; ++j) f[j] = xyz[j] * whites[j];
-        }
-        // 0 when the three ratios are finite, NaN otherwise (inf * 0): added
-        // to L*, a* and b*, it leaves them or makes them NaN without a branch.
-        double unusable[kLabBlock];
-        for (std::size_t i = 0; i < n; ++i)
-            unusable[i] = f[3 * i] * 0.0 + f[3 * i + 1] * 0.0 + f[3 * i + 2] * 0.0;
-        FOfValues(f, 3 * n);
-        for (std::size_t i = 0; i < n; ++i) {
-            const double fx = f[3 * i], fy = f[3 * i + 1], fz = f[3 * i + 2];
-            xyz[3 * i] = (116.0 * fy - 16.0) + unusable[i];
-            xyz[3 * i + 1] = 500.0 * (fx - fy) + unusable[i];
-            xyz[3 * i + 2] = 200.0 * (fy - fz) + unusable[i];
-        }
-    }
+    std::size_t i = 0;
+    for (; i + kLabBlock <= count; i += kLabBlock) LabOfEight(xyz + 3 * i, reciprocal);
+    if (i == count) return;
+    double rest[3 * kLabBlock] = {};
+    std::memcpy(rest, xyz + 3 * i, 3 * (count - i) * sizeof(double));
+    LabOfEight(rest, reciprocal);
+    std::memcpy(xyz + 3 * i, rest, 3 * (count - i) * sizeof(double));
 }
 
 inline Kernels TheseKernels() {
