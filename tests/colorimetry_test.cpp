@@ -397,6 +397,20 @@ std::vector<double> Grid(double from, double to, double step) {
     return grid;
 }
 
+// Runs `check` once with the kernels of each instruction set the machine
+// has, the widest again in use afterwards.
+template <class Check>
+void ForEachFineGridIsa(Check check) {
+    using toolkit::VectorIsa;
+    for (VectorIsa isa : {VectorIsa::kBaseline, VectorIsa::kAvx2, VectorIsa::kAvx512}) {
+        if (!nxbase::detail::UseFineGridIsa(isa)) break;
+        SCOPED_TRACE("instruction set " + std::to_string(static_cast<int>(isa)));
+        check();
+        if (::testing::Test::HasFatalFailure()) break;
+    }
+    nxbase::detail::UseFineGridIsa(toolkit::MachineVectorIsa());
+}
+
 }  // namespace
 
 // Random regular and uneven fine grids and spectra: one spectrum against a
@@ -408,46 +422,49 @@ TEST(FineGridTristimulus, BatchesAndThreadsGiveTheOneSpectrumValues) {
     std::mt19937 random(seed);
     std::uniform_real_distribution<double> unit(0.0, 1.0);
     const MeasuringCondition condition;
-    for (int round = 0; round < 12; ++round) {
-        std::vector<double> grid;
-        if (round % 3 == 2) {
-            for (double nm = 350 + 20 * unit(random); nm < 840; nm += 0.5 + 12 * unit(random))
-                grid.push_back(nm);
-        } else {
-            const double from = 340 + 60 * unit(random), step = 0.5 + 9 * unit(random);
-            grid = Grid(from, from + 300 + 200 * unit(random), step);
-        }
-        if (!nxbase::FineGridTristimulus::Applies(grid)) continue;
-        const nxbase::FineGridTristimulus fine(condition, grid);
-        // Every fourth round has enough spectra for the threads to share them
-        // (a thread takes about 600 000 values).
-        const std::size_t n = grid.size();
-        const std::size_t count = round % 4 ? 1 + random() % 200 : 2 * 589824 / n + random() % 999;
-        std::vector<float> spectra(count * n);
-        for (float& v : spectra) v = static_cast<float>(1.2 * unit(random));
-        std::vector<float> xyz(3 * count), lab(3 * count), threaded(3 * count);
-        fine.ToXYZ(spectra.data(), count, xyz.data());
-        fine.ToLab(spectra.data(), count, lab.data());
-        // Every spectrum of the first blocks (batches go two at a time), sparser after.
-        for (std::size_t i = 0; i < count; i += 1 + i / 128) {
-            const float* r = &spectra[i * n];
-            const std::array<double, 3> one = fine.ToXYZ(r), oneLab = fine.ToLab(r);
-            for (int c = 0; c < 3; ++c) {
-                long double model = 0;
-                for (std::size_t k = 0; k < n; ++k) model += fine.Weight(c, k) * r[k];
-                ASSERT_NEAR(one[c], static_cast<double>(model), 1e-12 * (1 + std::fabs(one[c])))
-                    << "grid of " << n << ", spectrum " << i << ", channel " << c;
-                ASSERT_EQ(xyz[3 * i + c], static_cast<float>(one[c]));
-                ASSERT_EQ(lab[3 * i + c], static_cast<float>(oneLab[c]));
+    ForEachFineGridIsa([&] {
+        for (int round = 0; round < 12; ++round) {
+            std::vector<double> grid;
+            if (round % 3 == 2) {
+                for (double nm = 350 + 20 * unit(random); nm < 840; nm += 0.5 + 12 * unit(random))
+                    grid.push_back(nm);
+            } else {
+                const double from = 340 + 60 * unit(random), step = 0.5 + 9 * unit(random);
+                grid = Grid(from, from + 300 + 200 * unit(random), step);
+            }
+            if (!nxbase::FineGridTristimulus::Applies(grid)) continue;
+            const nxbase::FineGridTristimulus fine(condition, grid);
+            // Every fourth round has enough spectra for the threads to share them
+            // (a thread takes about 600 000 values).
+            const std::size_t n = grid.size();
+            const std::size_t count =
+                round % 4 ? 1 + random() % 200 : 2 * 589824 / n + random() % 999;
+            std::vector<float> spectra(count * n);
+            for (float& v : spectra) v = static_cast<float>(1.2 * unit(random));
+            std::vector<float> xyz(3 * count), lab(3 * count), threaded(3 * count);
+            fine.ToXYZ(spectra.data(), count, xyz.data());
+            fine.ToLab(spectra.data(), count, lab.data());
+            // Every spectrum of the first blocks (batches go two at a time), sparser after.
+            for (std::size_t i = 0; i < count; i += 1 + i / 128) {
+                const float* r = &spectra[i * n];
+                const std::array<double, 3> one = fine.ToXYZ(r), oneLab = fine.ToLab(r);
+                for (int c = 0; c < 3; ++c) {
+                    long double model = 0;
+                    for (std::size_t k = 0; k < n; ++k) model += fine.Weight(c, k) * r[k];
+                    ASSERT_NEAR(one[c], static_cast<double>(model), 1e-12 * (1 + std::fabs(one[c])))
+                        << "grid of " << n << ", spectrum " << i << ", channel " << c;
+                    ASSERT_EQ(xyz[3 * i + c], static_cast<float>(one[c]));
+                    ASSERT_EQ(lab[3 * i + c], static_cast<float>(oneLab[c]));
+                }
+            }
+            for (unsigned threads : {2u, 3u, 0u}) {
+                fine.ToLabParallel(spectra.data(), count, threaded.data(), threads);
+                ASSERT_EQ(threaded, lab) << threads << " threads, " << count << " spectra";
+                fine.ToXYZParallel(spectra.data(), count, threaded.data(), threads);
+                ASSERT_EQ(threaded, xyz) << threads << " threads, " << count << " spectra";
             }
         }
-        for (unsigned threads : {2u, 3u, 0u}) {
-            fine.ToLabParallel(spectra.data(), count, threaded.data(), threads);
-            ASSERT_EQ(threaded, lab) << threads << " threads, " << count << " spectra";
-            fine.ToXYZParallel(spectra.data(), count, threaded.data(), threads);
-            ASSERT_EQ(threaded, xyz) << threads << " threads, " << count << " spectra";
-        }
-    }
+    });
 }
 
 // CIELAB's cube root: within an ulp of the exact root over twenty decades;
@@ -469,30 +486,33 @@ TEST(FineGridTristimulus, TheCubeRootIsWithinAnUlpAndManyColoursGiveEachOnesLab)
         EXPECT_EQ(nxbase::cielab::CubeRoot(t), std::cbrt(t)) << t;
     EXPECT_TRUE(std::isnan(nxbase::cielab::CubeRoot(NAN)));
     EXPECT_EQ(nxbase::cielab::F(INFINITY), INFINITY);
-    const std::array<double, 3> white{96.42 * unit(random) + 1, 100.0, 82.52 * unit(random) + 1};
-    const double odd[] = {0.0, -3.0, 1e-3, NAN, INFINITY, 1e12};
-    std::vector<double> xyz(3 * 203);
-    for (std::size_t j = 0; j < xyz.size(); ++j)
-        xyz[j] = j % 29 == 0 ? odd[j / 29 % 6] : white[j % 3] * unit(random);
-    std::vector<double> lab = xyz;
-    nxbase::CielabInPlace(lab.data(), 203, white);
-    // The model: CIE's formula with the standard library's cube root; NaN
-    // exactly when a ratio to the white is not finite.
-    auto f = [](double t) { return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0; };
-    for (std::size_t i = 0; i < 203; ++i) {
-        const auto one = nxbase::CielabOf({xyz[3 * i], xyz[3 * i + 1], xyz[3 * i + 2]}, white);
-        ASSERT_EQ(std::memcmp(one.data(), &lab[3 * i], sizeof one), 0) << "colour " << i;
-        double r[3];
-        for (int c = 0; c < 3; ++c) r[c] = xyz[3 * i + c] / white[c];
-        if (!std::isfinite(r[0]) || !std::isfinite(r[1]) || !std::isfinite(r[2])) {
-            for (int c = 0; c < 3; ++c) ASSERT_TRUE(std::isnan(one[c])) << "colour " << i;
-            continue;
+    ForEachFineGridIsa([&] {
+        const std::array<double, 3> white{96.42 * unit(random) + 1, 100.0,
+                                          82.52 * unit(random) + 1};
+        const double odd[] = {0.0, -3.0, 1e-3, NAN, INFINITY, 1e12};
+        std::vector<double> xyz(3 * 203);
+        for (std::size_t j = 0; j < xyz.size(); ++j)
+            xyz[j] = j % 29 == 0 ? odd[j / 29 % 6] : white[j % 3] * unit(random);
+        std::vector<double> lab = xyz;
+        nxbase::CielabInPlace(lab.data(), 203, white);
+        // The model: CIE's formula with the standard library's cube root; NaN
+        // exactly when a ratio to the white is not finite.
+        auto f = [](double t) { return t > 0.008856 ? std::cbrt(t) : 7.787 * t + 16.0 / 116.0; };
+        for (std::size_t i = 0; i < 203; ++i) {
+            const auto one = nxbase::CielabOf({xyz[3 * i], xyz[3 * i + 1], xyz[3 * i + 2]}, white);
+            ASSERT_EQ(std::memcmp(one.data(), &lab[3 * i], sizeof one), 0) << "colour " << i;
+            double r[3];
+            for (int c = 0; c < 3; ++c) r[c] = xyz[3 * i + c] / white[c];
+            if (!std::isfinite(r[0]) || !std::isfinite(r[1]) || !std::isfinite(r[2])) {
+                for (int c = 0; c < 3; ++c) ASSERT_TRUE(std::isnan(one[c])) << "colour " << i;
+                continue;
+            }
+            const double model[3] = {116.0 * f(r[1]) - 16.0, 500.0 * (f(r[0]) - f(r[1])),
+                                     200.0 * (f(r[1]) - f(r[2]))};
+            for (int c = 0; c < 3; ++c)
+                ASSERT_NEAR(one[c], model[c], 1e-9 * (1.0 + std::fabs(model[c]))) << "colour " << i;
         }
-        const double model[3] = {116.0 * f(r[1]) - 16.0, 500.0 * (f(r[0]) - f(r[1])),
-                                 200.0 * (f(r[1]) - f(r[2]))};
-        for (int c = 0; c < 3; ++c)
-            ASSERT_NEAR(one[c], model[c], 1e-9 * (1.0 + std::fabs(model[c]))) << "colour " << i;
-    }
+    });
     // Finite values whose ratio to a white below 1 overflows have no colour,
     // nor has any colour under a white with a subnormal component.
     for (double v : nxbase::CielabOf({1e308, 1.0, 1.0}, {0.5, 1.0, 1.0}))

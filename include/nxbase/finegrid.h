@@ -28,6 +28,7 @@
 #include <vector>
 
 #include "nxbase/export.h"
+#include "toolkit/system.h"
 
 class MeasuringCondition;
 
@@ -94,6 +95,13 @@ class NXBASE_EXPORT FineGridTristimulus {
     std::array<std::vector<double>, 3> amWeights;
     std::array<double, 3> amWhite{};
 };
+
+namespace detail {
+// Switches the kernels of the fine grid and CIELAB to those of `isa` (false
+// when the machine lacks it or they are not built), as UseBatchIsa does for
+// the batch: for the tests only, never while a conversion runs.
+NXBASE_EXPORT bool UseFineGridIsa(toolkit::VectorIsa isa);
+}  // namespace detail
 
 }  // namespace nxbase
 

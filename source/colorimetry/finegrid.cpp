@@ -49,21 +49,32 @@ bool UsableWhite(const std::array<double, 3>& axWhite) {
 }
 constexpr double kNaN = std::numeric_limits<double>::quiet_NaN();
 
-// The kernels of the instruction set the machine has, chosen once.
-const finegrid::Kernels& TheKernels() {
-    static const finegrid::Kernels kernels = [] {
+// The widest instruction set kernels are built for that the machine has.
+toolkit::VectorIsa Widest() {
 #ifdef NXBASE_FINEGRID_X86_KERNELS
-        switch (toolkit::MachineVectorIsa()) {
-            case toolkit::VectorIsa::kAvx512:
-                return finegrid::Avx512Kernels();
-            case toolkit::VectorIsa::kAvx2:
-                return finegrid::Avx2Kernels();
-            case toolkit::VectorIsa::kBaseline:
-                break;
-        }
+    return toolkit::MachineVectorIsa();
+#else
+    return toolkit::VectorIsa::kBaseline;
 #endif
-        return finegrid::BaselineKernels();
-    }();
+}
+
+finegrid::Kernels KernelsFor(toolkit::VectorIsa isa) {
+#ifdef NXBASE_FINEGRID_X86_KERNELS
+    switch (isa) {
+        case toolkit::VectorIsa::kAvx512:
+            return finegrid::Avx512Kernels();
+        case toolkit::VectorIsa::kAvx2:
+            return finegrid::Avx2Kernels();
+        case toolkit::VectorIsa::kBaseline:
+            break;
+    }
+#endif
+    return finegrid::BaselineKernels();
+}
+
+// The kernels in use: the widest, chosen once; the tests switch them.
+finegrid::Kernels& TheKernels() {
+    static finegrid::Kernels kernels = KernelsFor(Widest());
     return kernels;
 }
 }  // namespace
@@ -276,4 +287,13 @@ void FineGridTristimulus::ToLabParallel(const float* pSpectra, std::size_t alCou
     ConvertParallel<true>(pSpectra, alCount, pOut, alThreads);
 }
 
+namespace detail {
+
+bool UseFineGridIsa(toolkit::VectorIsa isa) {
+    if (isa > Widest()) return false;
+    TheKernels() = KernelsFor(isa);
+    return true;
+}
+
+}  // namespace detail
 }  // namespace nxbase
