@@ -54,9 +54,11 @@ inline void TakeCubeRoot(Real& t) {
     const Bits guess = (0x553EF0FFull - third) << 32;
     Real r;
     std::memcpy(&r, &guess, sizeof r);
-    r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
-    r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
-    r = r * (4.0 - t * (r * r * r)) * (1.0 / 3.0);
+    // r (4 - t r^3) / 3 as r (4/3 - t/3 r^3): a multiplication fewer a step.
+    const Real tThird = t * (1.0 / 3.0);
+    r = r * ((4.0 / 3.0) - tThird * (r * r * r));
+    r = r * ((4.0 / 3.0) - tThird * (r * r * r));
+    r = r * ((4.0 / 3.0) - tThird * (r * r * r));
     const Real y = t * (r * r);
     const Real root = y - (y - t / (y * y)) * (1.0 / 3.0);
     t = t <= kLargestFinite ? root : t;

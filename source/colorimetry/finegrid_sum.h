@@ -296,9 +296,9 @@ inline void LabOfEight(double* triples, const double* reciprocal) {
     p.x *= reciprocal[0];
     p.y *= reciprocal[1];
     p.z *= reciprocal[2];
-    // 0 when the three ratios are finite, NaN otherwise (inf * 0): added
+    // 0 when the three ratios are finite, NaN otherwise (inf - inf): added
     // to L*, a* and b*, it leaves them or makes them NaN without a branch.
-    const Eight unusable = p.x * 0.0 + p.y * 0.0 + p.z * 0.0;
+    const Eight unusable = (p.x - p.x) + (p.y - p.y) + (p.z - p.z);
     cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.x);
     cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.y);
     cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.z);
