@@ -467,6 +467,38 @@ TEST(FineGridTristimulus, BatchesAndThreadsGiveTheOneSpectrumValues) {
     });
 }
 
+// AVX2 and AVX-512 sum each lane and halve the lanes alike: the same bits,
+// one spectrum or many, XYZ and Lab.
+TEST(FineGridTristimulus, Avx2AndAvx512GiveTheSameBits) {
+    using toolkit::VectorIsa;
+    if (toolkit::MachineVectorIsa() != VectorIsa::kAvx512) GTEST_SKIP() << "no AVX-512 here";
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    std::uniform_real_distribution<double> unit(0.0, 1.0);
+    for (int round = 0; round < 20; ++round) {
+        const double from = 340 + 60 * unit(random), step = 0.5 + 9 * unit(random);
+        const nxbase::FineGridTristimulus fine(MeasuringCondition(), Grid(from, from + 400, step));
+        const std::size_t n = fine.Wavelengths().size(), count = 1 + random() % 40;
+        std::vector<float> spectra(count * n);
+        for (float& v : spectra) v = static_cast<float>(1.2 * unit(random));
+        std::vector<float> batch[2];
+        std::vector<std::array<double, 3>> one[2];
+        for (int wide = 0; wide < 2; ++wide) {
+            nxbase::detail::UseFineGridIsa(wide ? VectorIsa::kAvx512 : VectorIsa::kAvx2);
+            batch[wide].resize(3 * count);
+            fine.ToLab(spectra.data(), count, batch[wide].data());
+            for (std::size_t i = 0; i < count; ++i) {
+                one[wide].push_back(fine.ToXYZ(&spectra[i * n]));
+                one[wide].push_back(fine.ToLab(&spectra[i * n]));
+            }
+        }
+        ASSERT_EQ(batch[0], batch[1]) << "grid of " << n;
+        ASSERT_EQ(std::memcmp(one[0].data(), one[1].data(), one[0].size() * sizeof one[0][0]), 0)
+            << "grid of " << n;
+    }
+}
+
 // CIELAB's cube root: within an ulp of the exact root over twenty decades;
 // and the many-colour form, eight lanes at a time, equal bit for bit to
 // CielabOf of each colour, colours of either branch and unusable ones alike.

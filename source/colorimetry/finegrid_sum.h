@@ -8,7 +8,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
-#ifdef __AVX512F__
+#if defined(__AVX__)
 #include <immintrin.h>
 #endif
 
@@ -44,64 +44,73 @@ namespace {
 // channel), enough of them that the multiplies and adds, not their latency,
 // set the pace. Their order of additions is fixed; the AVX2 and AVX-512
 // files fuse each multiply with its add (a quarter faster), so their last
-// bits differ from the baseline's (relative 1e-16, hardly ever a float's);
-// on one machine one spectrum and many give the same bits.
+// bits differ from the baseline's (relative 1e-16, hardly ever a float's),
+// and agree with each other; one spectrum and many give the same bits.
 constexpr std::size_t kLanes = 16;
 // How far ahead of the spectrum being summed the following ones are fetched,
 // as the batch kernels fetch: the hardware's stream prefetcher alone leaves
 // compute and memory taking turns (a third of the read's rate at 1 nm).
 constexpr std::size_t kPrefetchBytes = 9 * 1024;
 
-// kLanes partial sums per channel, as two vectors of eight (GCC's generic
-// vectors: two AVX-512 registers, four AVX2 ones or eight SSE2 ones). Named
-// members, not an array: the compiler keeps them in registers for a whole
-// spectrum instead of clearing and reducing them through memory.
-typedef double Eight __attribute__((vector_size(64)));
-typedef std::uint64_t EightBits __attribute__((vector_size(64)));
-typedef float EightFloats __attribute__((vector_size(32)));
+// Vectors of the registers' own width: two, four or eight doubles. (GCC's
+// generic vectors wider than the registers live in memory: every operation
+// then loads and stores them, slower than scalar code.) Vectors go by
+// reference: passed by value, their ABI would depend on the instruction set
+// of the file.
+#if defined(__AVX512F__)
+constexpr std::size_t kWidth = 8;
+#elif defined(__AVX__)
+constexpr std::size_t kWidth = 4;
+#else
+constexpr std::size_t kWidth = 2;
+#endif
+typedef double Vec __attribute__((vector_size(8 * kWidth)));
+typedef std::uint64_t VecBits __attribute__((vector_size(8 * kWidth)));
+// The vectors a channel's kLanes partial sums take.
+constexpr std::size_t kParts = kLanes / kWidth;
+
+// kLanes partial sums per channel, lane l in element l % kWidth of part
+// l / kWidth. Arrays indexed only by constants after unrolling: the compiler
+// keeps them in registers.
 struct Lanes {
-    Eight x0{}, x1{}, y0{}, y1{}, z0{}, z1{};
+    Vec x[kParts]{}, y[kParts]{}, z[kParts]{};
 };
 
-// Vectors go by reference: passed by value, their ABI would depend on the
-// instruction set of the file.
-inline void Widen(const float* values, Eight& wide) {
-#ifdef __AVX512F__
-    // One conversion: GCC splits the generic one into halves and inserts.
+inline void Widen(const float* values, Vec& wide) {
+#if defined(__AVX512F__)
     // (The masked form: the unmasked one warns of an undefined operand.)
-    wide = reinterpret_cast<Eight>(_mm512_maskz_cvtps_pd(0xFF, _mm256_loadu_ps(values)));
+    wide = reinterpret_cast<Vec>(_mm512_maskz_cvtps_pd(0xFF, _mm256_loadu_ps(values)));
+#elif defined(__AVX__)
+    wide = reinterpret_cast<Vec>(_mm256_cvtps_pd(_mm_loadu_ps(values)));
 #else
-    EightFloats narrow;
-    std::memcpy(&narrow, values, sizeof narrow);
-    wide = __builtin_convertvector(narrow, Eight);
+    for (std::size_t e = 0; e < kWidth; ++e) wide[e] = values[e];
 #endif
 }
 
 // The weights of one step, kLanes per channel.
 struct Weights {
-    Eight x0, x1, y0, y1, z0, z1;
+    Vec x[kParts], y[kParts], z[kParts];
 };
 
 inline void LoadWeights(Weights& w, const double* w0, const double* w1, const double* w2) {
-    std::memcpy(&w.x0, w0, sizeof w.x0);
-    std::memcpy(&w.x1, w0 + 8, sizeof w.x1);
-    std::memcpy(&w.y0, w1, sizeof w.y0);
-    std::memcpy(&w.y1, w1 + 8, sizeof w.y1);
-    std::memcpy(&w.z0, w2, sizeof w.z0);
-    std::memcpy(&w.z1, w2 + 8, sizeof w.z1);
+#pragma GCC unroll 8
+    for (std::size_t p = 0; p < kParts; ++p) {
+        std::memcpy(&w.x[p], w0 + p * kWidth, sizeof(Vec));
+        std::memcpy(&w.y[p], w1 + p * kWidth, sizeof(Vec));
+        std::memcpy(&w.z[p], w2 + p * kWidth, sizeof(Vec));
+    }
 }
 
 // One step: kLanes values of a spectrum into the lanes of the three sums.
 inline void AddLanes(Lanes& lane, const Weights& w, const float* values) {
-    Eight low, high;
-    Widen(values, low);
-    Widen(values + 8, high);
-    lane.x0 += w.x0 * low;
-    lane.y0 += w.y0 * low;
-    lane.z0 += w.z0 * low;
-    lane.x1 += w.x1 * high;
-    lane.y1 += w.y1 * high;
-    lane.z1 += w.z1 * high;
+#pragma GCC unroll 8
+    for (std::size_t p = 0; p < kParts; ++p) {
+        Vec v;
+        Widen(values + p * kWidth, v);
+        lane.x[p] += w.x[p] * v;
+        lane.y[p] += w.y[p] * v;
+        lane.z[p] += w.z[p] * v;
+    }
 }
 
 inline void AddLanes(Lanes& lane, const double* w0, const double* w1, const double* w2,
@@ -111,16 +120,32 @@ inline void AddLanes(Lanes& lane, const double* w0, const double* w1, const doub
     AddLanes(lane, w, values);
 }
 
-// The lanes' sum, halving them pairwise in a fixed order: whole halves of
-// vectors added (lane i with lane i + 4, then i with i + 2), not lane by lane.
+// The lanes' sum, halving them pairwise in a fixed order: lane i with lane
+// i + 8, then i with i + 4, i + 2 and i + 1, whatever the width (so that
+// AVX2 and AVX-512 give the same bits): whole parts first, then the halves
+// of the last vector.
 typedef double Four __attribute__((vector_size(32)));
 typedef double Two __attribute__((vector_size(16)));
-inline double Reduced(const Eight& low, const Eight& high) {
-    const Eight half = low + high;
-    const Four quarter = __builtin_shufflevector(half, half, 0, 1, 2, 3) +
-                         __builtin_shufflevector(half, half, 4, 5, 6, 7);
+inline double Reduced(const Vec (&lanes)[kParts]) {
+    Vec parts[kParts];
+#pragma GCC unroll 8
+    for (std::size_t p = 0; p < kParts; ++p) parts[p] = lanes[p];
+#pragma GCC unroll 8
+    for (std::size_t half = kParts / 2; half >= 1; half /= 2) {
+#pragma GCC unroll 8
+        for (std::size_t p = 0; p < half; ++p) parts[p] += parts[p + half];
+    }
+    const Vec& v = parts[0];
+#if defined(__AVX512F__)
+    const Four quarter =
+        __builtin_shufflevector(v, v, 0, 1, 2, 3) + __builtin_shufflevector(v, v, 4, 5, 6, 7);
     const Two pair = __builtin_shufflevector(quarter, quarter, 0, 1) +
                      __builtin_shufflevector(quarter, quarter, 2, 3);
+#elif defined(__AVX__)
+    const Two pair = __builtin_shufflevector(v, v, 0, 1) + __builtin_shufflevector(v, v, 2, 3);
+#else
+    const Two& pair = v;
+#endif
     return pair[0] + pair[1];
 }
 
@@ -146,16 +171,16 @@ struct Tail {
 struct ThisFile {};
 
 inline void StoreSums(const Lanes& lane, double* xyz) {
-    xyz[0] = Reduced(lane.x0, lane.x1);
-    xyz[1] = Reduced(lane.y0, lane.y1);
-    xyz[2] = Reduced(lane.z0, lane.z1);
+    xyz[0] = Reduced(lane.x);
+    xyz[1] = Reduced(lane.y);
+    xyz[2] = Reduced(lane.z);
 }
 
 #ifdef __AVX512F__
 // Halves of a and b added lane to lane: lane i of a half gets lanes i and
 // i + h of its vector, a's halves first. Both results are vectors of eight.
 template <int h>
-inline Eight HalvesAdded(const Eight& a, const Eight& b) {
+inline Vec HalvesAdded(const Vec& a, const Vec& b) {
     if constexpr (h == 4) {
         return __builtin_shufflevector(a, b, 0, 1, 2, 3, 8, 9, 10, 11) +
                __builtin_shufflevector(a, b, 4, 5, 6, 7, 12, 13, 14, 15);
@@ -171,12 +196,12 @@ inline Eight HalvesAdded(const Eight& a, const Eight& b) {
 // The six sums of two spectra, each lane added in Reduced's order, but the
 // six vectors halved together: a third of the shuffles and adds.
 inline void StoreSumsOfTwo(const Lanes& a, const Lanes& b, double* xyz) {
-    const Eight quarters0 = HalvesAdded<4>(a.x0 + a.x1, a.y0 + a.y1);
-    const Eight quarters1 = HalvesAdded<4>(a.z0 + a.z1, b.x0 + b.x1);
-    const Eight quarters2 = HalvesAdded<4>(b.y0 + b.y1, b.z0 + b.z1);
-    const Eight pairs0 = HalvesAdded<2>(quarters0, quarters1);
-    const Eight pairs1 = HalvesAdded<2>(quarters2, quarters2);
-    const Eight sums = HalvesAdded<1>(pairs0, pairs1);
+    const Vec quarters0 = HalvesAdded<4>(a.x[0] + a.x[1], a.y[0] + a.y[1]);
+    const Vec quarters1 = HalvesAdded<4>(a.z[0] + a.z[1], b.x[0] + b.x[1]);
+    const Vec quarters2 = HalvesAdded<4>(b.y[0] + b.y[1], b.z[0] + b.z[1]);
+    const Vec pairs0 = HalvesAdded<2>(quarters0, quarters1);
+    const Vec pairs1 = HalvesAdded<2>(quarters2, quarters2);
+    const Vec sums = HalvesAdded<1>(pairs0, pairs1);
     std::memcpy(xyz, &sums, 6 * sizeof(double));
 }
 
@@ -200,7 +225,8 @@ inline void SumTwo(const double* w0, const double* w1, const double* w2, std::si
         LoadWeights(w, w0 + k, w1 + k, w2 + k);
         // In registers, once: left to itself GCC folds each load into both
         // spectra's multiply-adds, loading every vector twice.
-        asm("" : "+v"(w.x0), "+v"(w.x1), "+v"(w.y0), "+v"(w.y1), "+v"(w.z0), "+v"(w.z1));
+        asm(""
+            : "+v"(w.x[0]), "+v"(w.x[1]), "+v"(w.y[0]), "+v"(w.y[1]), "+v"(w.z[0]), "+v"(w.z[1]));
         AddLanes(la, w, a + k);
         AddLanes(lb, w, b + k);
     }
@@ -253,44 +279,70 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
     }
 }
 
-// Eight colours as three vectors of interleaved triples (x0 y0 z0 x1 ...),
+// kWidth colours as three vectors of interleaved triples (x0 y0 z0 x1 ...),
 // taken apart into a vector per component and put back together: CIELAB is
 // then whole-vector arithmetic, with no lane handled alone.
-constexpr std::size_t kLabBlock = 8;
+constexpr std::size_t kLabBlock = kWidth;
 
 struct Planes {
-    Eight x, y, z;
+    Vec x, y, z;
 };
 
 inline void Deinterleave(const double* triples, Planes& p) {
-    Eight v0, v1, v2;
+    Vec v0, v1, v2;
     std::memcpy(&v0, triples, sizeof v0);
-    std::memcpy(&v1, triples + 8, sizeof v1);
-    std::memcpy(&v2, triples + 16, sizeof v2);
-    const Eight x = __builtin_shufflevector(v0, v1, 0, 3, 6, 9, 12, 15, 0, 0);
-    const Eight y = __builtin_shufflevector(v0, v1, 1, 4, 7, 10, 13, 0, 0, 0);
-    const Eight z = __builtin_shufflevector(v0, v1, 2, 5, 8, 11, 14, 0, 0, 0);
+    std::memcpy(&v1, triples + kWidth, sizeof v1);
+    std::memcpy(&v2, triples + 2 * kWidth, sizeof v2);
+#if defined(__AVX512F__)
+    const Vec x = __builtin_shufflevector(v0, v1, 0, 3, 6, 9, 12, 15, 0, 0);
+    const Vec y = __builtin_shufflevector(v0, v1, 1, 4, 7, 10, 13, 0, 0, 0);
+    const Vec z = __builtin_shufflevector(v0, v1, 2, 5, 8, 11, 14, 0, 0, 0);
     p.x = __builtin_shufflevector(x, v2, 0, 1, 2, 3, 4, 5, 10, 13);
     p.y = __builtin_shufflevector(y, v2, 0, 1, 2, 3, 4, 8, 11, 14);
     p.z = __builtin_shufflevector(z, v2, 0, 1, 2, 3, 4, 9, 12, 15);
+#elif defined(__AVX__)
+    const Vec x = __builtin_shufflevector(v0, v1, 0, 3, 6, 0);
+    const Vec y = __builtin_shufflevector(v0, v1, 1, 4, 7, 0);
+    const Vec z = __builtin_shufflevector(v0, v1, 2, 5, 0, 0);
+    p.x = __builtin_shufflevector(x, v2, 0, 1, 2, 5);
+    p.y = __builtin_shufflevector(y, v2, 0, 1, 2, 6);
+    p.z = __builtin_shufflevector(z, v2, 0, 1, 4, 7);
+#else
+    p.x = __builtin_shufflevector(v0, v1, 0, 3);
+    p.y = __builtin_shufflevector(v0, v2, 1, 2);
+    p.z = __builtin_shufflevector(v1, v2, 0, 3);
+#endif
 }
 
 inline void Interleave(const Planes& p, double* triples) {
-    const Eight xy0 = __builtin_shufflevector(p.x, p.y, 0, 8, 0, 1, 9, 0, 2, 10);
-    const Eight xy1 = __builtin_shufflevector(p.x, p.y, 0, 3, 11, 0, 4, 12, 0, 5);
-    const Eight xy2 = __builtin_shufflevector(p.x, p.y, 13, 0, 6, 14, 0, 7, 15, 0);
-    const Eight v0 = __builtin_shufflevector(xy0, p.z, 0, 1, 8, 3, 4, 9, 6, 7);
-    const Eight v1 = __builtin_shufflevector(xy1, p.z, 10, 1, 2, 11, 4, 5, 12, 7);
-    const Eight v2 = __builtin_shufflevector(xy2, p.z, 0, 13, 2, 3, 14, 5, 6, 15);
+#if defined(__AVX512F__)
+    const Vec xy0 = __builtin_shufflevector(p.x, p.y, 0, 8, 0, 1, 9, 0, 2, 10);
+    const Vec xy1 = __builtin_shufflevector(p.x, p.y, 0, 3, 11, 0, 4, 12, 0, 5);
+    const Vec xy2 = __builtin_shufflevector(p.x, p.y, 13, 0, 6, 14, 0, 7, 15, 0);
+    const Vec v0 = __builtin_shufflevector(xy0, p.z, 0, 1, 8, 3, 4, 9, 6, 7);
+    const Vec v1 = __builtin_shufflevector(xy1, p.z, 10, 1, 2, 11, 4, 5, 12, 7);
+    const Vec v2 = __builtin_shufflevector(xy2, p.z, 0, 13, 2, 3, 14, 5, 6, 15);
+#elif defined(__AVX__)
+    const Vec xy0 = __builtin_shufflevector(p.x, p.y, 0, 4, 0, 1);
+    const Vec xy1 = __builtin_shufflevector(p.x, p.y, 5, 0, 2, 6);
+    const Vec xy2 = __builtin_shufflevector(p.x, p.y, 0, 3, 7, 0);
+    const Vec v0 = __builtin_shufflevector(xy0, p.z, 0, 1, 4, 3);
+    const Vec v1 = __builtin_shufflevector(xy1, p.z, 0, 5, 2, 3);
+    const Vec v2 = __builtin_shufflevector(xy2, p.z, 6, 1, 2, 7);
+#else
+    const Vec v0 = __builtin_shufflevector(p.x, p.y, 0, 2);
+    const Vec v1 = __builtin_shufflevector(p.z, p.x, 0, 3);
+    const Vec v2 = __builtin_shufflevector(p.y, p.z, 1, 3);
+#endif
     std::memcpy(triples, &v0, sizeof v0);
-    std::memcpy(triples + 8, &v1, sizeof v1);
-    std::memcpy(triples + 16, &v2, sizeof v2);
+    std::memcpy(triples + kWidth, &v1, sizeof v1);
+    std::memcpy(triples + 2 * kWidth, &v2, sizeof v2);
 }
 
-// CIELAB of eight triples in place, from the white's reciprocals: the ratios
-// are multiplied, not divided (a division costs as much as the rest; the
-// ratios differ from the quotients by at most an ulp).
-inline void LabOfEight(double* triples, const double* reciprocal) {
+// CIELAB of kLabBlock triples in place, from the white's reciprocals: the
+// ratios are multiplied, not divided (a division costs as much as the rest;
+// the ratios differ from the quotients by at most an ulp).
+inline void LabOfBlock(double* triples, const double* reciprocal) {
     Planes p;
     Deinterleave(triples, p);
     p.x *= reciprocal[0];
@@ -298,10 +350,10 @@ inline void LabOfEight(double* triples, const double* reciprocal) {
     p.z *= reciprocal[2];
     // 0 when the three ratios are finite, NaN otherwise (inf - inf): added
     // to L*, a* and b*, it leaves them or makes them NaN without a branch.
-    const Eight unusable = (p.x - p.x) + (p.y - p.y) + (p.z - p.z);
-    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.x);
-    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.y);
-    cielab::TakeFOfLanes<Eight, EightBits, ThisFile>(p.z);
+    const Vec unusable = (p.x - p.x) + (p.y - p.y) + (p.z - p.z);
+    cielab::TakeFOfLanes<Vec, VecBits, ThisFile>(p.x);
+    cielab::TakeFOfLanes<Vec, VecBits, ThisFile>(p.y);
+    cielab::TakeFOfLanes<Vec, VecBits, ThisFile>(p.z);
     const Planes lab = {(116.0 * p.y - 16.0) + unusable, 500.0 * (p.x - p.y) + unusable,
                         200.0 * (p.y - p.z) + unusable};
     Interleave(lab, triples);
@@ -312,11 +364,11 @@ inline void LabOfEight(double* triples, const double* reciprocal) {
 inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
     const double reciprocal[3] = {1.0 / white[0], 1.0 / white[1], 1.0 / white[2]};
     std::size_t i = 0;
-    for (; i + kLabBlock <= count; i += kLabBlock) LabOfEight(xyz + 3 * i, reciprocal);
+    for (; i + kLabBlock <= count; i += kLabBlock) LabOfBlock(xyz + 3 * i, reciprocal);
     if (i == count) return;
     double rest[3 * kLabBlock] = {};
     std::memcpy(rest, xyz + 3 * i, 3 * (count - i) * sizeof(double));
-    LabOfEight(rest, reciprocal);
+    LabOfBlock(rest, reciprocal);
     std::memcpy(xyz + 3 * i, rest, 3 * (count - i) * sizeof(double));
 }
 
