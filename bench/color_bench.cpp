@@ -11,7 +11,8 @@
 //   one thread and on two;
 // - fine grids (FineGridTristimulus at 1 nm, 471 values, and 5 nm, 95
 //   values, 360..830 nm): the same float bytes read as spectra of that
-//   length, against the same read, on one thread and on two;
+//   length, against the same read, on one thread and on two; on a machine
+//   with AVX-512, also the AVX2 kernels (most desktops' widest) on one;
 // - two threads against one on calls of 32 768, 65 536 and 262 144 spectra
 //   (the helper threads are kept between calls).
 // One-thread cases run pinned to CPU 0, two-thread cases on CPUs 0 and 1.
@@ -211,8 +212,10 @@ nxbench::Pair DramPair(const char* type, std::size_t count, unsigned threads) {
             [=](benchmark::State& s) { BatchLab<T>(s, count, threads); }};
 }
 
-// Lab of the DRAM-resident float bytes read as spectra of a fine grid.
-void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigned threads) {
+// Lab of the DRAM-resident float bytes read as spectra of a fine grid, with
+// the kernels of `isa` (the machine's widest by default).
+void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigned threads,
+                 toolkit::VectorIsa isa) {
     std::vector<double> grid;
     for (double nm = 360.0; nm <= 830.0 + 1e-9; nm += step) grid.push_back(nm);
     static std::map<double, nxbase::FineGridTristimulus> made;
@@ -222,20 +225,24 @@ void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigne
     const std::size_t count = dram * kSamples / grid.size();
     const float* spectra = Spectra<float>(dram).data();
     float* lab = Results(count);
+    nxbase::detail::UseFineGridIsa(isa);
     // Counted in the read's items (36 values' worth of bytes): the ratio is
     // one of bytes per second.
     Timed(state, dram, threads, [&] {
         threads == 1 ? fine.ToLab(spectra, count, lab)
                      : fine.ToLabParallel(spectra, count, lab, threads);
     });
+    nxbase::detail::UseFineGridIsa(toolkit::MachineVectorIsa());
 }
 
-nxbench::Pair FinePair(double step, std::size_t dram, unsigned threads) {
-    const std::string name = std::string("FineGridLab_vs_ReadOnce_DramResident_") +
-                             (step == 1.0 ? "1nm_" : "5nm_") +
+nxbench::Pair FinePair(double step, std::size_t dram, unsigned threads,
+                       toolkit::VectorIsa isa = toolkit::MachineVectorIsa()) {
+    const bool avx2 = isa == toolkit::VectorIsa::kAvx2 && isa != toolkit::MachineVectorIsa();
+    const std::string name = std::string(avx2 ? "FineGridLabAvx2Kernels" : "FineGridLab") +
+                             "_vs_ReadOnce_DramResident_" + (step == 1.0 ? "1nm_" : "5nm_") +
                              (threads == 1 ? "OneThread" : "TwoThreads");
     return {name, [=](benchmark::State& s) { ReadOnce<float>(s, dram, threads); },
-            [=](benchmark::State& s) { FineGridLab(s, step, dram, threads); }};
+            [=](benchmark::State& s) { FineGridLab(s, step, dram, threads, isa); }};
 }
 
 // A second thread on a call of `count` spectra, against one thread: what
@@ -253,7 +260,7 @@ int main(int argc, char** argv) {
     if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
     const std::size_t dram = DramSpectra();
     auto batchInCache = [](benchmark::State& s) { BatchLab<float>(s, kCacheSpectra, 1); };
-    const std::vector<nxbench::Pair> pairs = {
+    std::vector<nxbench::Pair> pairs = {
         {"LabBatch_vs_VectorisedLoop_CacheResident", VectorisedLoop, batchInCache},
         {"LabVectorisedLoop_vs_ScalarLoop_CacheResident", ScalarLoop, VectorisedLoop},
         {"LabObjectPath_vs_ScalarLoop_CacheResident", ScalarLoop, ObjectPath},
@@ -269,6 +276,12 @@ int main(int argc, char** argv) {
         ThreadGainPair(65536),
         ThreadGainPair(262144),
     };
+    // On a machine with AVX-512, what the AVX2 kernels (the widest of most
+    // desktops) reach on the same core.
+    if (toolkit::MachineVectorIsa() == toolkit::VectorIsa::kAvx512) {
+        for (double step : {1.0, 5.0})
+            pairs.push_back(FinePair(step, dram, 1, toolkit::VectorIsa::kAvx2));
+    }
     std::printf(
         "DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "
         "MiB)\n",
