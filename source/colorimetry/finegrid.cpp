@@ -58,7 +58,7 @@ toolkit::VectorIsa Widest() {
 #endif
 }
 
-finegrid::Kernels KernelsFor(toolkit::VectorIsa isa) {
+finegrid::Kernels KernelsFor([[maybe_unused]] toolkit::VectorIsa isa) {
 #ifdef NXBASE_FINEGRID_X86_KERNELS
     switch (isa) {
         case toolkit::VectorIsa::kAvx512:
