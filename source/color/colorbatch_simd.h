@@ -35,6 +35,18 @@ template <>
 struct IntOf<V16> {
     using type = I16;
 };
+#ifndef __AVX__
+// Without AVX the registers hold four floats: eight-float vectors live in
+// memory, and their shuffles come out a float at a time. The baseline kernel
+// therefore works on four-float vectors wherever it can, with the same
+// operations on every lane (so the same bits).
+typedef float V4 __attribute__((vector_size(4 * sizeof(float))));
+typedef std::int32_t I4 __attribute__((vector_size(4 * sizeof(std::int32_t))));
+template <>
+struct IntOf<V4> {
+    using type = I4;
+};
+#endif
 
 using detail::kLabEpsilon;
 using detail::kLabKappa;
@@ -97,6 +109,35 @@ template <class V>
     return out;
 }
 
+#ifndef __AVX__
+[[gnu::always_inline]] inline V4 Load4(const float* p) {
+    V4 v;
+    std::memcpy(&v, p, sizeof v);
+    return v;
+}
+
+// Neighbouring lanes of a and b added: (a0+a1, a2+a3, b0+b1, b2+b3).
+[[gnu::always_inline]] inline V4 AddNeighbours4(V4 a, V4 b) {
+    return __builtin_shufflevector(a, b, 0, 2, 4, 6) + __builtin_shufflevector(a, b, 1, 3, 5, 7);
+}
+
+// Lane j: ((p[j][k]+p[j][k+1]) + (p[j][k+2]+p[j][k+3])) for rows p[0..3].
+[[gnu::always_inline]] inline V4 SumQuarter(const float (*p)[kLanes], int k) {
+    return AddNeighbours4(AddNeighbours4(Load4(p[0] + k), Load4(p[1] + k)),
+                          AddNeighbours4(Load4(p[2] + k), Load4(p[3] + k)));
+}
+
+// Lane s of the result is the sum of the eight lanes of p[s], in SumLanes'
+// order: ((0+1) + (2+3)) + ((4+5) + (6+7)).
+[[gnu::always_inline]] inline V8 SumLanes(const float (*p)[kLanes]) {
+    const V4 low = SumQuarter(p, 0) + SumQuarter(p, 4);
+    const V4 high = SumQuarter(p + 4, 0) + SumQuarter(p + 4, 4);
+    float sums[kLanes];
+    std::memcpy(sums, &low, sizeof low);
+    std::memcpy(sums + 4, &high, sizeof high);
+    return Load(sums);
+}
+#else
 // Lane s of the result is the sum of the eight lanes of p[s]: a pairwise
 // tree of shuffles and adds (14 shuffles, 7 adds for 64 numbers).
 [[gnu::always_inline]] inline V8 SumLanes(const float (*p)[kLanes]) {
@@ -117,6 +158,7 @@ template <class V>
     return __builtin_shufflevector(h[0], h[1], 0, 1, 2, 3, 8, 9, 10, 11) +
            __builtin_shufflevector(h[0], h[1], 4, 5, 6, 7, 12, 13, 14, 15);
 }
+#endif
 
 // Weighted sums of eight spectra (src holds 8 x 36 floats). Each spectrum is
 // read as five 8-float chunks (the last at offset 28, overlapping the fourth,
@@ -126,6 +168,22 @@ template <class V>
 // operations is the one detail::LaneSums spells out for a single spectrum.
 [[gnu::always_inline]] inline void SumBlock(const PaddedWeights& w, const float* src, V8 sums[3]) {
     alignas(32) float part[3][kLanes][kLanes];
+#ifndef __AVX__
+    // Four lanes at a time: the same products and sums, in registers.
+    for (int s = 0; s < kLanes; ++s) {
+        const float* r = src + s * kSamples;
+        for (int h = 0; h < kLanes; h += 4) {
+            const V4 r0 = Load4(r + h), r1 = Load4(r + 8 + h), r2 = Load4(r + 16 + h),
+                     r3 = Load4(r + 24 + h), r4 = Load4(r + 28 + h);
+            for (int c = 0; c < 3; ++c) {
+                const V4 acc = (r0 * Load4(w.chunks[c][0] + h) + r1 * Load4(w.chunks[c][1] + h)) +
+                               (r2 * Load4(w.chunks[c][2] + h) + r3 * Load4(w.chunks[c][3] + h)) +
+                               r4 * Load4(w.chunks[c][4] + h);
+                std::memcpy(part[c][s] + h, &acc, sizeof acc);
+            }
+        }
+    }
+#else
     for (int s = 0; s < kLanes; ++s) {
         const float* r = src + s * kSamples;
         const V8 r0 = Load(r);
@@ -140,6 +198,7 @@ template <class V>
             Store(part[c][s], acc);
         }
     }
+#endif
     for (int c = 0; c < 3; ++c) sums[c] = SumLanes(part[c]);
 }
 
@@ -162,14 +221,35 @@ template <class V>
     v[2] = Splat<V>(200.0f) * (f[1] - f[2]);
 }
 
+// f on the eight lanes of v, in four-lane halves where the registers are
+// that wide.
+template <class F>
+[[gnu::always_inline]] inline void OnSums(V8 v[3], F f) {
+#ifndef __AVX__
+    V4 quarter[6];  // lanes 0..3 of v[c] in quarter[2c], lanes 4..7 in quarter[2c + 1]
+    std::memcpy(quarter, v, sizeof quarter);
+    V4 low[3] = {quarter[0], quarter[2], quarter[4]};
+    V4 high[3] = {quarter[1], quarter[3], quarter[5]};
+    f(low);
+    f(high);
+    for (int c = 0; c < 3; ++c) {
+        quarter[2 * c] = low[c];
+        quarter[2 * c + 1] = high[c];
+    }
+    std::memcpy(v, quarter, sizeof quarter);
+#else
+    f(v);
+#endif
+}
+
 [[gnu::always_inline]] inline void XyzBlock(const PaddedWeights& w, const float* src, V8 xyz[3]) {
     SumBlock(w, src, xyz);
-    XyzOfSums(w, xyz);
+    OnSums(xyz, [&w](auto* v) { XyzOfSums(w, v); });
 }
 
 [[gnu::always_inline]] inline void LabBlock(const PaddedWeights& w, const float* src, V8 lab[3]) {
     SumBlock(w, src, lab);
-    LabOfSums(w, lab);
+    OnSums(lab, [&w](auto* v) { LabOfSums(w, v); });
 }
 
 // Eight (x, y, z) triples from three channel vectors into 24 floats in
@@ -189,9 +269,27 @@ template <class V>
 }
 
 [[gnu::always_inline]] inline void InterleaveFull(const V8 v[3], float* out) {
+#ifndef __AVX__
+    // Four triples at a time, from four-float vectors.
+    alignas(32) float channel[3][kLanes];
+    for (int c = 0; c < 3; ++c) Store(channel[c], v[c]);
+    for (int h = 0; h < kLanes; h += 4, out += 12) {
+        const V4 x = Load4(channel[0] + h), y = Load4(channel[1] + h), z = Load4(channel[2] + h);
+        const V4 xy01 = __builtin_shufflevector(x, y, 0, 4, 1, 5);  // x0 y0 x1 y1
+        const V4 xy23 = __builtin_shufflevector(x, y, 2, 6, 3, 7);  // x2 y2 x3 y3
+        const V4 o0 = __builtin_shufflevector(xy01, z, 0, 1, 4, 2);
+        const V4 yz1 = __builtin_shufflevector(xy01, z, 3, 5, 3, 5);  // y1 z1 . .
+        const V4 o1 = __builtin_shufflevector(yz1, xy23, 0, 1, 4, 5);
+        const V4 o2 = __builtin_shufflevector(z, xy23, 2, 6, 7, 3);
+        std::memcpy(out, &o0, sizeof o0);
+        std::memcpy(out + 4, &o1, sizeof o1);
+        std::memcpy(out + 8, &o2, sizeof o2);
+    }
+#else
     V8 o[3];
     InterleaveVectors(v, o);
     for (int k = 0; k < 3; ++k) Store(out + 8 * k, o[k]);
+#endif
 }
 
 [[gnu::always_inline]] inline void Interleave(const V8 v[3], float* out, int lanes) {
