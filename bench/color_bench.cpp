@@ -13,6 +13,8 @@
 //   values, 360..830 nm): the same float bytes read as spectra of that
 //   length, against the same read, on one thread and on two; on a machine
 //   with AVX-512, also the AVX2 kernels (most desktops' widest) on one;
+// - the batch with the kernels of narrower instruction sets than the
+//   machine's (AVX2, baseline), DRAM-resident, on one thread;
 // - two threads against one on calls of 32 768, 65 536 and 262 144 spectra
 //   (the helper threads are kept between calls).
 // One-thread cases run pinned to CPU 0, two-thread cases on CPUs 0 and 1.
@@ -204,6 +206,21 @@ void ReadOnce(benchmark::State& state, std::size_t count, unsigned threads) {
     });
 }
 
+// The batch with the kernels of a narrower instruction set than the
+// machine's, on one thread: what machines without AVX-512 (AVX2) or without
+// AVX2 (the baseline) run.
+nxbench::Pair NarrowerBatchPair(toolkit::VectorIsa isa, std::size_t count) {
+    const std::string name = std::string("LabBatch") +
+                             (isa == toolkit::VectorIsa::kAvx2 ? "Avx2" : "Baseline") +
+                             "Kernels_vs_ReadOnce_DramResident_float_OneThread";
+    return {name, [=](benchmark::State& s) { ReadOnce<float>(s, count, 1); },
+            [=](benchmark::State& s) {
+                nxbase::detail::UseBatchIsa(isa);
+                BatchLab<float>(s, count, 1);
+                nxbase::detail::UseBatchIsa(toolkit::MachineVectorIsa());
+            }};
+}
+
 template <class T>
 nxbench::Pair DramPair(const char* type, std::size_t count, unsigned threads) {
     const std::string name = std::string("LabBatch_vs_ReadOnce_DramResident_") + type + "_" +
@@ -281,7 +298,10 @@ int main(int argc, char** argv) {
     if (toolkit::MachineVectorIsa() == toolkit::VectorIsa::kAvx512) {
         for (double step : {1.0, 5.0})
             pairs.push_back(FinePair(step, dram, 1, toolkit::VectorIsa::kAvx2));
+        pairs.push_back(NarrowerBatchPair(toolkit::VectorIsa::kAvx2, dram));
     }
+    if (toolkit::MachineVectorIsa() != toolkit::VectorIsa::kBaseline)
+        pairs.push_back(NarrowerBatchPair(toolkit::VectorIsa::kBaseline, dram));
     std::printf(
         "DRAM-resident: %zu spectra (%.0f MiB as float, %.0f MiB as double; last-level cache %zu "
         "MiB)\n",
