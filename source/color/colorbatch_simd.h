@@ -59,8 +59,9 @@ template <class V = V8>
     return V{} + v;
 }
 
-[[gnu::always_inline]] inline V8 Load(const float* p) {
-    V8 v;
+template <class V = V8>
+[[gnu::always_inline]] inline V Load(const float* p) {
+    V v;
     std::memcpy(&v, p, sizeof v);
     return v;
 }
@@ -110,12 +111,6 @@ template <class V>
 }
 
 #ifndef __AVX__
-[[gnu::always_inline]] inline V4 Load4(const float* p) {
-    V4 v;
-    std::memcpy(&v, p, sizeof v);
-    return v;
-}
-
 // Neighbouring lanes of a and b added: (a0+a1, a2+a3, b0+b1, b2+b3).
 [[gnu::always_inline]] inline V4 AddNeighbours4(V4 a, V4 b) {
     return __builtin_shufflevector(a, b, 0, 2, 4, 6) + __builtin_shufflevector(a, b, 1, 3, 5, 7);
@@ -123,8 +118,8 @@ template <class V>
 
 // Lane j: ((p[j][k]+p[j][k+1]) + (p[j][k+2]+p[j][k+3])) for rows p[0..3].
 [[gnu::always_inline]] inline V4 SumQuarter(const float (*p)[kLanes], int k) {
-    return AddNeighbours4(AddNeighbours4(Load4(p[0] + k), Load4(p[1] + k)),
-                          AddNeighbours4(Load4(p[2] + k), Load4(p[3] + k)));
+    return AddNeighbours4(AddNeighbours4(Load<V4>(p[0] + k), Load<V4>(p[1] + k)),
+                          AddNeighbours4(Load<V4>(p[2] + k), Load<V4>(p[3] + k)));
 }
 
 // Lane s of the result is the sum of the eight lanes of p[s], in SumLanes'
@@ -173,12 +168,13 @@ template <class V>
     for (int s = 0; s < kLanes; ++s) {
         const float* r = src + s * kSamples;
         for (int h = 0; h < kLanes; h += 4) {
-            const V4 r0 = Load4(r + h), r1 = Load4(r + 8 + h), r2 = Load4(r + 16 + h),
-                     r3 = Load4(r + 24 + h), r4 = Load4(r + 28 + h);
+            const V4 r0 = Load<V4>(r + h), r1 = Load<V4>(r + 8 + h), r2 = Load<V4>(r + 16 + h),
+                     r3 = Load<V4>(r + 24 + h), r4 = Load<V4>(r + 28 + h);
             for (int c = 0; c < 3; ++c) {
-                const V4 acc = (r0 * Load4(w.chunks[c][0] + h) + r1 * Load4(w.chunks[c][1] + h)) +
-                               (r2 * Load4(w.chunks[c][2] + h) + r3 * Load4(w.chunks[c][3] + h)) +
-                               r4 * Load4(w.chunks[c][4] + h);
+                const V4 acc =
+                    (r0 * Load<V4>(w.chunks[c][0] + h) + r1 * Load<V4>(w.chunks[c][1] + h)) +
+                    (r2 * Load<V4>(w.chunks[c][2] + h) + r3 * Load<V4>(w.chunks[c][3] + h)) +
+                    r4 * Load<V4>(w.chunks[c][4] + h);
                 std::memcpy(part[c][s] + h, &acc, sizeof acc);
             }
         }
@@ -274,7 +270,8 @@ template <class F>
     alignas(32) float channel[3][kLanes];
     for (int c = 0; c < 3; ++c) Store(channel[c], v[c]);
     for (int h = 0; h < kLanes; h += 4, out += 12) {
-        const V4 x = Load4(channel[0] + h), y = Load4(channel[1] + h), z = Load4(channel[2] + h);
+        const V4 x = Load<V4>(channel[0] + h), y = Load<V4>(channel[1] + h),
+                 z = Load<V4>(channel[2] + h);
         const V4 xy01 = __builtin_shufflevector(x, y, 0, 4, 1, 5);  // x0 y0 x1 y1
         const V4 xy23 = __builtin_shufflevector(x, y, 2, 6, 3, 7);  // x2 y2 x3 y3
         const V4 o0 = __builtin_shufflevector(xy01, z, 0, 1, 4, 2);

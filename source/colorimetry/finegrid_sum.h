@@ -194,7 +194,8 @@ inline Vec HalvesAdded(const Vec& a, const Vec& b) {
 }
 
 // The six sums of two spectra, each lane added in Reduced's order, but the
-// six vectors halved together: a third of the shuffles and adds.
+// six vectors halved together: a third of the shuffles and adds (3 % off a
+// 5 nm spectrum).
 inline void StoreSumsOfTwo(const Lanes& a, const Lanes& b, double* xyz) {
     const Vec quarters0 = HalvesAdded<4>(a.x[0] + a.x[1], a.y[0] + a.y[1]);
     const Vec quarters1 = HalvesAdded<4>(a.z[0] + a.z[1], b.x[0] + b.x[1]);
