@@ -11,8 +11,10 @@
 //   one thread and on two;
 // - fine grids (FineGridTristimulus at 1 nm, 471 values, and 5 nm, 95
 //   values, 360..830 nm): the same float bytes read as spectra of that
-//   length, against the same read, on one thread and on two; on a machine
-//   with AVX-512, also the AVX2 kernels (most desktops' widest) on one;
+//   length, against the same read, on one thread and on two; the same
+//   conversion of cache-resident spectra against that read (the arithmetic
+//   alone against the bound); on a machine with AVX-512, also the AVX2
+//   kernels (most desktops' widest) on one;
 // - the batch with the kernels of narrower instruction sets than the
 //   machine's (AVX2, baseline), DRAM-resident, on one thread;
 // - two threads against one on calls of 32 768, 65 536 and 262 144 spectra
@@ -229,8 +231,9 @@ nxbench::Pair DramPair(const char* type, std::size_t count, unsigned threads) {
             [=](benchmark::State& s) { BatchLab<T>(s, count, threads); }};
 }
 
-// Lab of the DRAM-resident float bytes read as spectra of a fine grid, with
-// the kernels of `isa` (the machine's widest by default).
+// Lab of the float bytes of `dram` 36-value spectra (DRAM-resident, or
+// cache-resident for kCacheSpectra) read as spectra of a fine grid, with the
+// kernels of `isa` (the machine's widest by default).
 void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigned threads,
                  toolkit::VectorIsa isa) {
     std::vector<double> grid;
@@ -250,6 +253,16 @@ void FineGridLab(benchmark::State& state, double step, std::size_t dram, unsigne
                      : fine.ToLabParallel(spectra, count, lab, threads);
     });
     nxbase::detail::UseFineGridIsa(toolkit::MachineVectorIsa());
+}
+
+// The conversion of cache-resident spectra against the DRAM read: the
+// arithmetic alone against the bound, the most the DRAM case could reach.
+nxbench::Pair FineInCachePair(double step, std::size_t dram) {
+    const std::string name = std::string("FineGridLabCacheResident_vs_ReadOnce_DramResident_") +
+                             (step == 1.0 ? "1nm" : "5nm") + "_OneThread";
+    const toolkit::VectorIsa isa = toolkit::MachineVectorIsa();
+    return {name, [=](benchmark::State& s) { ReadOnce<float>(s, dram, 1); },
+            [=](benchmark::State& s) { FineGridLab(s, step, kCacheSpectra, 1, isa); }};
 }
 
 nxbench::Pair FinePair(double step, std::size_t dram, unsigned threads,
@@ -289,6 +302,8 @@ int main(int argc, char** argv) {
         FinePair(1.0, dram, 2),
         FinePair(5.0, dram, 1),
         FinePair(5.0, dram, 2),
+        FineInCachePair(1.0, dram),
+        FineInCachePair(5.0, dram),
         ThreadGainPair(32768),
         ThreadGainPair(65536),
         ThreadGainPair(262144),
