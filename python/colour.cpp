@@ -174,24 +174,29 @@ constexpr float kMaxPlausibleL = 130.2f;
 typedef float Float4 __attribute__((vector_size(16)));
 typedef std::int32_t Int4 __attribute__((vector_size(16)));
 
+float LimitOf(Quantity quantity) {
+    return quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
+}
+
 // True for a result that no reflectance factors give: a lightness beyond
-// the limit (percentages, most likely), or NaN or an infinity from one in
-// the spectrum.
+// the limit (percentages, most likely), or a component that is NaN or
+// infinite. The batch's BatchRange tells the same of many results at once.
 inline bool Implausible(const float* v, int axis, float limit) {
-    return !(v[axis] <= limit) || !std::isfinite(v[0] + v[1] + v[2]);
+    return !(v[axis] <= limit) || !std::isfinite(v[0]) || !std::isfinite(v[1]) ||
+           !std::isfinite(v[2]);
 }
 
 // The index of the first implausible result; -1 when all are plausible.
 // Each stretch is first tested as a whole, four results (twelve floats, three
 // vectors) at a time against the limit where the tested component lies and
-// infinity elsewhere, and against the lowest float (a NaN fails both); only a
-// stretch that fails is searched.
+// the largest float elsewhere, and against the lowest float (a NaN fails
+// both, an infinity one); only a stretch that fails is searched.
 long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
     const int axis = quantity == Quantity::kXYZ ? 1 : 0;
-    const float limit = quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
+    const float limit = LimitOf(quantity);
     float limitOf[12];
     for (int k = 0; k < 12; ++k)
-        limitOf[k] = k % 3 == axis ? limit : std::numeric_limits<float>::infinity();
+        limitOf[k] = k % 3 == axis ? limit : std::numeric_limits<float>::max();
     Float4 limits[3];
     std::memcpy(limits, limitOf, sizeof limits);
     const float lowest = std::numeric_limits<float>::lowest();
@@ -238,15 +243,20 @@ std::string ImplausibleReason(long index, const T* spectrum, std::size_t bands, 
                (std::isnan(spectrum[at]) ? "NaN" : "an infinity") + " (value " +
                std::to_string(at) + "): it has no colour";
     }
-    return "spectrum " + std::to_string(index) + " gives " +
-           (quantity == Quantity::kXYZ ? "Y " + StringHelpers::Fixed(v[1], 6)
-                                       : "L* " + StringHelpers::Fixed(v[0], 6)) +
+    const int axis = quantity == Quantity::kXYZ ? 1 : 0;
+    const std::string name = quantity == Quantity::kXYZ ? "Y " : "L* ";
+    if (!std::isfinite(v[axis]) || v[axis] <= LimitOf(quantity)) {
+        return "spectrum " + std::to_string(index) +
+               " gives a colour beyond the float range: not reflectance factors (white = 1)";
+    }
+    return "spectrum " + std::to_string(index) + " gives " + name +
+           StringHelpers::Fixed(v[axis], 6) +
            ": not reflectance factors (white = 1); divide percentages by 100 first";
 }
 
-// Spectra converted and then checked at a time, so that the check reads
-// results the core has just written and a part with a bad spectrum stops
-// early; a multiple of the batch kernel's sixteen.
+// Spectra converted and then checked at a time, so that a part with a bad
+// spectrum stops early and a search reads results the core has just
+// written; a multiple of the batch kernel's sixteen.
 constexpr std::size_t kCheckedPiece = 2048;
 
 // Spectra per call of a progress call-back: large enough that the call costs
@@ -368,9 +378,14 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
             const std::size_t piece = std::min(kCheckedPiece, n - done);
             float* to = out + 3 * (first + done);
             const auto* from = in + (first + done) * kBands;
-            quantity == Quantity::kXYZ ? batch->ToXYZ(from, piece, to)
-                                       : batch->ToLab(from, piece, to);
-            bad = FirstImplausible(to, piece, quantity);
+            const nxbase::BatchRange range = quantity == Quantity::kXYZ
+                                                 ? batch->ToXYZ(from, piece, to)
+                                                 : batch->ToLab(from, piece, to);
+            // What the kernels saw in passing clears most pieces; only a
+            // piece with a result beyond the limit or not finite is searched.
+            bad = range.allFinite && range.brightest <= LimitOf(quantity)
+                      ? -1
+                      : FirstImplausible(to, piece, quantity);
             if (bad >= 0) bad += static_cast<long>(first + done);
         }
         long seen = implausible.load();

@@ -133,33 +133,75 @@ TEST(ColorBatch, HandlesEveryTailLengthAndWritesNothingBeyond) {
     }
 }
 
+// The model of BatchRange: what the results themselves show.
+nxbase::BatchRange RangeOfResults(const float* results, std::size_t count, int light) {
+    nxbase::BatchRange range;
+    for (std::size_t i = 0; i < 3 * count; ++i) {
+        range.allFinite = range.allFinite && std::isfinite(results[i]);
+        if (i % 3 == static_cast<std::size_t>(light) && results[i] > range.brightest)
+            range.brightest = results[i];
+    }
+    return range;
+}
+
 // Every instruction set the machine has against the baseline kernels, bit
 // for bit, on random spectra and counts (float and double input, XYZ, Lab
-// and the cube root).
-TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBits) {
+// and the cube root); and each conversion's BatchRange against its results.
+// Some spectra are percentages, negative, huge, or hold a NaN or an infinity.
+TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBitsAndTheRangeOfItsResults) {
     using nxbase::detail::BatchIsa;
     const unsigned seed = std::random_device{}();
     SCOPED_TRACE("seed " + std::to_string(seed));
     std::mt19937 random(seed);
     std::uniform_real_distribution<float> value(-0.1f, 1.5f);
+    // Whole spectra scaled, or one value replaced: a huge one overflows
+    // some channels and not others, depending on where it lies.
+    const double odd[] = {100.0, -1.0, 0.0, NAN, INFINITY, -INFINITY};
     const BatchIsa chosen = nxbase::detail::BatchIsaInUse();
     const ColorBatch batch;
     for (int round = 0; round < 40; ++round) {
         const std::size_t count = random() % 300;
         std::vector<double> doubles(36 * count);
-        for (double& v : doubles) v = value(random) * (random() % 9 == 0 ? 0.003 : 1.0);
+        // Every fourth round all negative: the brightest result is below zero.
+        const double sign = round % 4 == 0 ? -1.0 : 1.0;
+        for (double& v : doubles) v = sign * value(random) * (random() % 9 == 0 ? 0.003 : 1.0);
+        // Odd spectra in every other even round; odd rounds hold only the one below.
+        for (std::size_t s = 0; s < count && round % 4 == 2; ++s) {
+            if (random() % 10 != 0) continue;
+            const double kind = odd[random() % 6];
+            double* spectrum = &doubles[36 * s];
+            if (kind == 0.0) {
+                spectrum[random() % 36] = std::pow(10.0, 30.0 + 8.5 * value(random) / 1.5);
+            } else if (std::isfinite(kind)) {
+                for (int k = 0; k < 36; ++k) spectrum[k] *= kind;
+            } else {
+                spectrum[random() % 36] = kind;
+            }
+        }
+        // In odd rounds one spectrum whose Z alone overflows (5e37 at 440
+        // nm) or X alone (2e38 at 650 nm), anywhere or last (in the tail).
+        if (count > 0 && round % 2 == 1) {
+            const bool z = round % 4 == 1, last = round % 8 >= 5;
+            double* spectrum = &doubles[36 * (last ? count - 1 : random() % count)];
+            std::fill(spectrum, spectrum + 36, 0.5);
+            spectrum[z ? 6 : 27] = z ? 5e37 : 2e38;
+        }
         const std::vector<float> floats(doubles.begin(), doubles.end());
         auto results = [&] {
             std::vector<float> all(15 * count), part(3 * count);
-            batch.ToXYZ(floats.data(), count, part.data());
-            std::copy(part.begin(), part.end(), all.begin());
-            batch.ToLab(floats.data(), count, part.data());
-            std::copy(part.begin(), part.end(), all.begin() + 3 * count);
-            batch.ToXYZ(doubles.data(), count, part.data());
-            std::copy(part.begin(), part.end(), all.begin() + 6 * count);
-            batch.ToLab(doubles.data(), count, part.data());
-            std::copy(part.begin(), part.end(), all.begin() + 9 * count);
+            auto keep = [&](nxbase::BatchRange range, int light, std::size_t at) {
+                const nxbase::BatchRange model = RangeOfResults(part.data(), count, light);
+                EXPECT_EQ(range.allFinite, model.allFinite) << at;
+                EXPECT_EQ(range.brightest, model.brightest) << at;
+                std::copy(part.begin(), part.end(), all.begin() + at);
+            };
+            keep(batch.ToXYZ(floats.data(), count, part.data()), 1, 0);
+            keep(batch.ToLab(floats.data(), count, part.data()), 0, 3 * count);
+            keep(batch.ToXYZ(doubles.data(), count, part.data()), 1, 6 * count);
+            keep(batch.ToLab(doubles.data(), count, part.data()), 0, 9 * count);
             nxbase::detail::BatchCbrt(floats.data(), 3 * count, all.data() + 12 * count);
+            // NaN as one pattern: how a NaN is spelt may differ between instruction sets.
+            for (float& v : all) v = std::isnan(v) ? NAN : v;
             return all;
         };
         ASSERT_TRUE(nxbase::detail::UseBatchIsa(BatchIsa::kBaseline));
@@ -167,12 +209,13 @@ TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBits) {
         for (BatchIsa isa : {BatchIsa::kAvx2, BatchIsa::kAvx512}) {
             if (!nxbase::detail::UseBatchIsa(isa)) continue;
             const std::vector<float> wider = results();
-            // Compared as bits: NaN from a negative cube root is NaN in both
-            // (no memcmp of the empty vectors of zero spectra: their data may be null).
+            // Compared as bits (no memcmp of the empty vectors of zero
+            // spectra: their data may be null).
             ASSERT_TRUE(wider.empty() || std::memcmp(wider.data(), baseline.data(),
                                                      sizeof(float) * wider.size()) == 0)
                 << "instruction set " << static_cast<int>(isa) << ", " << count << " spectra";
         }
+        if (HasFailure()) break;
     }
     nxbase::detail::UseBatchIsa(chosen);
 }
@@ -203,6 +246,20 @@ TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
     std::vector<float> labFromDoubles(3 * count);
     batch.ToLabParallel(doubles.data(), count, labFromDoubles.data(), 2);
     EXPECT_TRUE(std::equal(serial.begin(), serial.end(), labFromDoubles.begin()));
+
+    // The parts' ranges come together: the brightest result lies in the
+    // first part, a NaN in the last.
+    spectra[36 * 5 + 3] = 100.0f;
+    spectra[36 * (count - 9) + 30] = NAN;
+    const nxbase::BatchRange range = batch.ToLab(spectra.data(), count, serial.data());
+    for (unsigned threads : {2u, 3u}) {
+        const nxbase::BatchRange split =
+            batch.ToLabParallel(spectra.data(), count, labFromDoubles.data(), threads);
+        EXPECT_EQ(split.brightest, range.brightest) << threads;
+        EXPECT_FALSE(split.allFinite) << threads;
+    }
+    EXPECT_EQ(range.brightest, RangeOfResults(serial.data(), count, 0).brightest);
+    EXPECT_GT(range.brightest, 100.0f);
 }
 
 TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {

@@ -17,6 +17,7 @@
 #define NXBASE_COLORBATCH_H_
 
 #include <cstddef>
+#include <limits>
 #include <vector>
 
 #include "nxbase/export.h"
@@ -52,6 +53,18 @@ struct NXBASE_EXPORT BatchWeights {
     float sums[kChannels] = {};  // sum of each table; sums[1] scales Y of white to 100
 };
 
+// What a conversion saw of its results as it wrote them: the brightest
+// result's Y (ToXYZ, white = 100) or L* (ToLab), results that are NaN
+// skipped, -infinity when there are none; and whether every component of
+// every result is finite. Reflectance factors give Y up to about 100 (more
+// for fluorescent samples); percentages give up to 10 000. Gathering it
+// costs a few per cent of the arithmetic, far less than a second pass over
+// the results.
+struct BatchRange {
+    float brightest = -std::numeric_limits<float>::infinity();
+    bool allFinite = true;
+};
+
 class NXBASE_EXPORT ColorBatch {
   public:
     // The weights of the current colorimetric filter of the CMetry facade.
@@ -65,33 +78,34 @@ class NXBASE_EXPORT ColorBatch {
 
     // XYZ (white Y = 100) of alCount spectra: pXYZ[3i + c] = 100 * S_c / sum_1,
     // S_c the weighted sum of spectrum i against table c. pSpectra and pXYZ
-    // must not overlap.
-    void ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const;
+    // must not overlap. Every array form returns the BatchRange of its
+    // results.
+    BatchRange ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const;
 
     // CIE 1976 L*a*b* (CIE 15:2004, formulas as in LABVector) of alCount
     // spectra relative to the white point of the weights; pLab[3i..3i+2] =
     // L, a, b. Always CIE 1976: the process-wide DIN99 setting of LABVector
     // does not apply here. pSpectra and pLab must not overlap.
-    void ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const;
+    BatchRange ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const;
 
     // As above for spectra held as doubles: each value is rounded to float
     // as it is read, so the results equal those of a float copy of the array
     // without making one.
-    void ToXYZ(const double* pSpectra, std::size_t alCount, float* pXYZ) const;
-    void ToLab(const double* pSpectra, std::size_t alCount, float* pLab) const;
+    BatchRange ToXYZ(const double* pSpectra, std::size_t alCount, float* pXYZ) const;
+    BatchRange ToLab(const double* pSpectra, std::size_t alCount, float* pLab) const;
 
     // As ToXYZ and ToLab, with the array split over alThreads threads (0: one
     // per core); the calling thread takes one part. Results are identical to
     // the one-thread forms. Small counts, or threads that cannot be started,
     // are done on the calling thread.
-    void ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
-                       unsigned alThreads = 0) const;
-    void ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
-                       unsigned alThreads = 0) const;
-    void ToXYZParallel(const double* pSpectra, std::size_t alCount, float* pXYZ,
-                       unsigned alThreads = 0) const;
-    void ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
-                       unsigned alThreads = 0) const;
+    BatchRange ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
+                             unsigned alThreads = 0) const;
+    BatchRange ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
+                             unsigned alThreads = 0) const;
+    BatchRange ToXYZParallel(const double* pSpectra, std::size_t alCount, float* pXYZ,
+                             unsigned alThreads = 0) const;
+    BatchRange ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
+                             unsigned alThreads = 0) const;
 
     // XYZ or Lab of every row of a table read from a file (its values on the
     // 36-point grid), three floats per row in row order: the same numbers

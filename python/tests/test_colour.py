@@ -241,6 +241,43 @@ def test_bad_input_raises_with_the_librarys_words(tmp_path):
         nxbase.spectra_to_XYZ(np.full(36, 50.0))
 
 
+def test_the_first_spectrum_without_a_reflectance_colour_is_named_wherever_it_lies():
+    """Thousands of spectra (several pieces of the check) up to Y 199.9, a
+    few of them percentages, beyond the limits (Y 200, L* 130.2) by a hair,
+    huge, or holding NaN or an infinity: the error names the first, on one
+    thread and two."""
+    seed = int.from_bytes(os.urandom(4), "little")
+    rng = np.random.default_rng(seed)
+
+    def named(convert, spectra, threads):
+        try:
+            convert(spectra, threads=threads)
+            return None
+        except ValueError as error:
+            return int(str(error).split()[1])
+
+    for _ in range(10):
+        n = int(rng.integers(1, 3 * 2048 + 40))
+        spectra = rng.uniform(0.0, 1.99, (n, 36)).astype(np.float32)
+        spectra[rng.integers(0, n)] = 1.999  # Y 199.9, L* 130.13: still reflectance factors
+        bad = sorted(set(rng.integers(0, n, int(rng.integers(0, 3))).tolist()))
+        for i in bad:
+            kind = int(rng.integers(0, 5))
+            if kind == 0:
+                spectra[i] *= 100
+            elif kind == 1:
+                spectra[i] = 2.003  # Y 200.3, L* 130.22
+            elif kind == 2:
+                spectra[i, 27] = 2e38  # X beyond the float range
+            else:
+                spectra[i, rng.integers(0, 36)] = [np.nan, np.inf][kind - 3]
+        for convert in (nxbase.spectra_to_XYZ, nxbase.spectra_to_Lab):
+            for threads in (1, 2):
+                assert named(convert, spectra, threads) == (bad[0] if bad else None), (seed, n, bad)
+    with pytest.raises(ValueError, match="spectrum 0 gives a colour beyond the float range"):
+        nxbase.spectra_to_Lab(np.full(36, 1e37, dtype=np.float32))
+
+
 def test_every_function_answers_nan_or_refuses_and_keeps_its_properties():
     """NaN or infinity in gives NaN out or a ValueError naming the item;
     dE(x, x) = 0 and symmetry where the formula is; Lab round-trips; whites

@@ -15,6 +15,8 @@
 
 #include <algorithm>
 #include <cstring>
+#include <limits>
+#include <mutex>
 
 #include "colorbatch_kernels.h"
 #include "nxbase/cmetry.h"
@@ -60,62 +62,72 @@ Chosen& InUse() {
 }
 
 template <bool kLab, class T>
-void Run(const PaddedWeights& w, const T* src, std::size_t count, float* out);
+batch::Seen Run(const PaddedWeights& w, const T* src, std::size_t count, float* out);
+
+// What a run of no spectra saw.
+constexpr batch::Seen kNothingSeen{-std::numeric_limits<float>::infinity(), true};
+
+// What two runs saw together.
+batch::Seen Merged(batch::Seen a, batch::Seen b) {
+    return {std::max(a.brightest, b.brightest), a.finite && b.finite};
+}
+
+BatchRange RangeOf(batch::Seen seen) {
+    return {seen.brightest, seen.finite};
+}
 
 // Spectra that are not contiguous floats (doubles, a table's rows): copied a
 // piece at a time into a buffer that stays in the cache, fill(first, n,
 // piece) writing spectra first..first+n-1, and each piece converted as an
 // array.
 template <bool kLab, class Fill>
-void RunCopied(const PaddedWeights& w, std::size_t count, float* out, Fill fill) {
+batch::Seen RunCopied(const PaddedWeights& w, std::size_t count, float* out, Fill fill) {
     constexpr std::size_t kPiece = 64;
     alignas(64) float piece[kPiece * kSamples];
+    batch::Seen seen = kNothingSeen;
     for (std::size_t first = 0; first < count; first += kPiece) {
         const std::size_t n = std::min(kPiece, count - first);
         fill(first, n, piece);
-        Run<kLab>(w, static_cast<const float*>(piece), n, out + 3 * first);
+        seen = Merged(seen, Run<kLab>(w, static_cast<const float*>(piece), n, out + 3 * first));
     }
+    return seen;
 }
 
 template <bool kLab>
-void RunNarrow(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+batch::Seen RunNarrow(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
     const batch::NarrowKernels& kernels = InUse().narrow;
-    (kLab ? kernels.lab : kernels.xyz)(w, src, count, out);
+    return (kLab ? kernels.lab : kernels.xyz)(w, src, count, out);
 }
 
 // Doubles on the eight-lane path: rounded to float first, as the float path
 // would see a float copy of them.
 template <bool kLab>
-void RunNarrow(const PaddedWeights& w, const double* src, std::size_t count, float* out) {
-    RunCopied<kLab>(w, count, out, [src](std::size_t first, std::size_t n, float* piece) {
+batch::Seen RunNarrow(const PaddedWeights& w, const double* src, std::size_t count, float* out) {
+    return RunCopied<kLab>(w, count, out, [src](std::size_t first, std::size_t n, float* piece) {
         std::copy(src + first * kSamples, src + (first + n) * kSamples, piece);
     });
 }
 
 template <bool kLab>
-void RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const float* src,
-             std::size_t count, float* out) {
-    (kLab ? wide.lab : wide.xyz)(w, src, count, out);
+batch::Seen RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const float* src,
+                    std::size_t count, float* out) {
+    return (kLab ? wide.lab : wide.xyz)(w, src, count, out);
 }
 
 template <bool kLab>
-void RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const double* src,
-             std::size_t count, float* out) {
-    (kLab ? wide.labDouble : wide.xyzDouble)(w, src, count, out);
+batch::Seen RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const double* src,
+                    std::size_t count, float* out) {
+    return (kLab ? wide.labDouble : wide.xyzDouble)(w, src, count, out);
 }
 
 // Sixteen spectra at a time where the machine can, the rest eight at a time.
 template <bool kLab, class T>
-void Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
+batch::Seen Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
     const Chosen& chosen = InUse();
-    if (chosen.wide.xyz != nullptr) {
-        const std::size_t wide = count / (2 * kLanes) * (2 * kLanes);
-        RunWide<kLab>(chosen.wide, w, src, wide, out);
-        src += wide * kSamples;
-        out += 3 * wide;
-        count -= wide;
-    }
-    RunNarrow<kLab>(w, src, count, out);
+    if (chosen.wide.xyz == nullptr) return RunNarrow<kLab>(w, src, count, out);
+    const std::size_t wide = count / (2 * kLanes) * (2 * kLanes);
+    const batch::Seen seen = RunWide<kLab>(chosen.wide, w, src, wide, out);
+    return Merged(seen, RunNarrow<kLab>(w, src + wide * kSamples, count - wide, out + 3 * wide));
 }
 
 }  // namespace
@@ -154,20 +166,20 @@ ColorBatch::ColorBatch(const BatchWeights& axWeights) : amWeights(axWeights) {
     amTables.sumY = amWeights.sums[1];
 }
 
-void ColorBatch::ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const {
-    Run<false>(amTables, pSpectra, alCount, pXYZ);
+BatchRange ColorBatch::ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const {
+    return RangeOf(Run<false>(amTables, pSpectra, alCount, pXYZ));
 }
 
-void ColorBatch::ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const {
-    Run<true>(amTables, pSpectra, alCount, pLab);
+BatchRange ColorBatch::ToLab(const float* pSpectra, std::size_t alCount, float* pLab) const {
+    return RangeOf(Run<true>(amTables, pSpectra, alCount, pLab));
 }
 
-void ColorBatch::ToXYZ(const double* pSpectra, std::size_t alCount, float* pXYZ) const {
-    Run<false>(amTables, pSpectra, alCount, pXYZ);
+BatchRange ColorBatch::ToXYZ(const double* pSpectra, std::size_t alCount, float* pXYZ) const {
+    return RangeOf(Run<false>(amTables, pSpectra, alCount, pXYZ));
 }
 
-void ColorBatch::ToLab(const double* pSpectra, std::size_t alCount, float* pLab) const {
-    Run<true>(amTables, pSpectra, alCount, pLab);
+BatchRange ColorBatch::ToLab(const double* pSpectra, std::size_t alCount, float* pLab) const {
+    return RangeOf(Run<true>(amTables, pSpectra, alCount, pLab));
 }
 
 namespace {
@@ -176,35 +188,40 @@ namespace {
 constexpr std::size_t kMinPerThread = 16384;
 
 template <bool kLab, class T>
-void RunParallel(const PaddedWeights& w, const T* src, std::size_t count, float* out,
-                 unsigned threads) {
+batch::Seen RunParallel(const PaddedWeights& w, const T* src, std::size_t count, float* out,
+                        unsigned threads) {
+    std::mutex mutex;
+    batch::Seen seen = kNothingSeen;
     // Parts start at multiples of sixteen: every part but the last runs on
     // the wide kernel only.
     RunInParts(count, threads, kMinPerThread, 2 * kLanes, [&](std::size_t first, std::size_t n) {
-        Run<kLab>(w, src + first * kSamples, n, out + 3 * first);
+        const batch::Seen part = Run<kLab>(w, src + first * kSamples, n, out + 3 * first);
+        std::lock_guard<std::mutex> lock(mutex);
+        seen = Merged(seen, part);
     });
+    return seen;
 }
 
 }  // namespace
 
-void ColorBatch::ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
-                               unsigned alThreads) const {
-    RunParallel<false>(amTables, pSpectra, alCount, pXYZ, alThreads);
+BatchRange ColorBatch::ToXYZParallel(const float* pSpectra, std::size_t alCount, float* pXYZ,
+                                     unsigned alThreads) const {
+    return RangeOf(RunParallel<false>(amTables, pSpectra, alCount, pXYZ, alThreads));
 }
 
-void ColorBatch::ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
-                               unsigned alThreads) const {
-    RunParallel<true>(amTables, pSpectra, alCount, pLab, alThreads);
+BatchRange ColorBatch::ToLabParallel(const float* pSpectra, std::size_t alCount, float* pLab,
+                                     unsigned alThreads) const {
+    return RangeOf(RunParallel<true>(amTables, pSpectra, alCount, pLab, alThreads));
 }
 
-void ColorBatch::ToXYZParallel(const double* pSpectra, std::size_t alCount, float* pXYZ,
-                               unsigned alThreads) const {
-    RunParallel<false>(amTables, pSpectra, alCount, pXYZ, alThreads);
+BatchRange ColorBatch::ToXYZParallel(const double* pSpectra, std::size_t alCount, float* pXYZ,
+                                     unsigned alThreads) const {
+    return RangeOf(RunParallel<false>(amTables, pSpectra, alCount, pXYZ, alThreads));
 }
 
-void ColorBatch::ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
-                               unsigned alThreads) const {
-    RunParallel<true>(amTables, pSpectra, alCount, pLab, alThreads);
+BatchRange ColorBatch::ToLabParallel(const double* pSpectra, std::size_t alCount, float* pLab,
+                                     unsigned alThreads) const {
+    return RangeOf(RunParallel<true>(amTables, pSpectra, alCount, pLab, alThreads));
 }
 
 namespace {

@@ -130,7 +130,7 @@ constexpr WideInterleave kWideInterleave;
 constexpr std::size_t kPrefetchSpectra = 64;
 
 template <bool kLab, class T>
-void RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
+Seen RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
     WideWeights weights;
     for (int c = 0; c < 3; ++c) {
         for (int k = 0; k < detail::BatchTables::kChunks; ++k) {
@@ -138,6 +138,7 @@ void RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out
         }
     }
     constexpr std::size_t kBlockBytes = 2 * kLanes * kSamples * sizeof(T);
+    Watch<V16> watch;
     for (std::size_t i = 0; i + 2 * kLanes <= count; i += 2 * kLanes) {
         // Every line of a block some way ahead: the hardware's stream
         // prefetcher alone leaves compute and memory taking turns.
@@ -153,14 +154,16 @@ void RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out
         } else {
             XyzOfSums(w, v);
         }
+        watch.template Add<kLab>(v);
         std::memcpy(sums, v, sizeof v);
         InterleaveSixteen(sums, out + 3 * i);
     }
+    return watch.Result();
 }
 
 template <bool kLab, class T>
-void Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
-    RunWide<kLab>(w, src, count, out);
+Seen Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
+    return RunWide<kLab>(w, src, count, out);
 }
 
 }  // namespace

@@ -12,8 +12,18 @@
 namespace nxbase::batch {
 
 using PaddedWeights = detail::BatchTables;
-using Kernel = void (*)(const PaddedWeights& w, const float* src, std::size_t count, float* out);
-using DoubleKernel = void (*)(const PaddedWeights& w, const double* src, std::size_t count,
+
+// What a kernel saw of the results it wrote: the largest Y (XYZ) or L*
+// (Lab), NaN skipped, -infinity for none; and whether every component was
+// finite. A plain aggregate: the kernel files, each built for its own
+// instruction set, must not define functions the linker could share.
+struct Seen {
+    float brightest;
+    bool finite;
+};
+
+using Kernel = Seen (*)(const PaddedWeights& w, const float* src, std::size_t count, float* out);
+using DoubleKernel = Seen (*)(const PaddedWeights& w, const double* src, std::size_t count,
                               float* out);
 
 // Eight spectra per step, any count.

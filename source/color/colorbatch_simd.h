@@ -301,10 +301,68 @@ template <class F>
     }
 }
 
+// Watches the results as they are written, for Seen: the brightest so far
+// per lane (Y or L*; a NaN never compares greater, so it is skipped) and a
+// sum that stays zero while every component is finite (x * 0 is NaN for an
+// infinite or NaN x). For Lab, L + a + b = 500 fx - 184 fy - 200 fz - 16
+// cannot overflow while the cube roots are finite and is not finite when one
+// is not: one product per result instead of three.
+template <class V>
+struct Watch {
+    V brightest = Splat<V>(-__builtin_inff());
+    V poison = V{};
+
+    template <bool kLab>
+    [[gnu::always_inline]] inline void Add(V x, V y, V z) {
+        const V light = kLab ? x : y;
+        brightest = light > brightest ? light : brightest;
+        poison += kLab ? (x + y + z) * 0.0f : x * 0.0f + y * 0.0f + z * 0.0f;
+    }
+
+    // Eight results; without AVX, in the four-float halves the registers hold.
+    template <bool kLab, class W>
+    [[gnu::always_inline]] inline void Add(const W v[3]) {
+        if constexpr (sizeof(W) == sizeof(V)) {
+            Add<kLab>(v[0], v[1], v[2]);
+        } else {
+            V part[3][2];
+            for (int c = 0; c < 3; ++c) std::memcpy(part[c], &v[c], sizeof part[c]);
+            for (int h = 0; h < 2; ++h) Add<kLab>(part[0][h], part[1][h], part[2][h]);
+        }
+    }
+
+    // As Add for the first `lanes` (at least one): the padding lanes repeat
+    // lane 0, which changes neither the brightest nor the finiteness.
+    template <bool kLab>
+    [[gnu::always_inline]] inline void AddFirst(const V8 v[3], int lanes) {
+        V8 used[3];
+        for (int c = 0; c < 3; ++c) {
+            for (int l = 0; l < kLanes; ++l) used[c][l] = v[c][l < lanes ? l : 0];
+        }
+        Add<kLab>(used);
+    }
+
+    [[gnu::always_inline]] inline Seen Result() const {
+        Seen seen{-__builtin_inff(), true};
+        for (int l = 0; l < static_cast<int>(sizeof(V) / sizeof(float)); ++l) {
+            if (brightest[l] > seen.brightest) seen.brightest = brightest[l];
+            seen.finite = seen.finite && poison[l] == 0.0f;
+        }
+        return seen;
+    }
+};
+
+#ifdef __AVX__
+using NarrowWatch = Watch<V8>;
+#else
+using NarrowWatch = Watch<V4>;
+#endif
+
 template <bool kLab>
-[[gnu::always_inline]] inline void RunBlocks(const PaddedWeights& w, const float* src,
+[[gnu::always_inline]] inline Seen RunBlocks(const PaddedWeights& w, const float* src,
                                              std::size_t count, float* out) {
     V8 v[3];
+    NarrowWatch watch;
     std::size_t i = 0;
     for (; i + kLanes <= count; i += kLanes) {
         if (kLab) {
@@ -312,6 +370,7 @@ template <bool kLab>
         } else {
             XyzBlock(w, src + i * kSamples, v);
         }
+        watch.template Add<kLab>(v);
         Interleave(v, out + 3 * i, kLanes);
     }
     if (i < count) {
@@ -324,16 +383,18 @@ template <bool kLab>
         } else {
             XyzBlock(w, block, v);
         }
+        watch.template AddFirst<kLab>(v, rest);
         Interleave(v, out + 3 * i, rest);
     }
+    return watch.Result();
 }
 
-void RunXyz(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
-    RunBlocks<false>(w, src, count, out);
+Seen RunXyz(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+    return RunBlocks<false>(w, src, count, out);
 }
 
-void RunLab(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
-    RunBlocks<true>(w, src, count, out);
+Seen RunLab(const PaddedWeights& w, const float* src, std::size_t count, float* out) {
+    return RunBlocks<true>(w, src, count, out);
 }
 
 inline void RunCbrt(const float* in, std::size_t count, float* out) {
