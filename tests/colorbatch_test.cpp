@@ -154,8 +154,9 @@ TEST(ColorBatch, EveryInstructionSetGivesTheBaselinesBitsAndTheRangeOfItsResults
     SCOPED_TRACE("seed " + std::to_string(seed));
     std::mt19937 random(seed);
     std::uniform_real_distribution<float> value(-0.1f, 1.5f);
-    // Whole spectra scaled, or one value replaced: a huge one overflows
-    // some channels and not others, depending on where it lies.
+    // 100 and -1 scale a whole spectrum; 0 stands for one huge value (it
+    // overflows some channels and not others, depending on where it lies);
+    // NaN and the infinities replace one value.
     const double odd[] = {100.0, -1.0, 0.0, NAN, INFINITY, -INFINITY};
     const BatchIsa chosen = nxbase::detail::BatchIsaInUse();
     const ColorBatch batch;
