@@ -124,6 +124,21 @@ TEST(Spectrum, BinaryOperatorsOfBothTypesMatchElementWiseFloatArithmetic) {
         }
         ASSERT_NE(a, a + Spectrum(1e-7f));
         ASSERT_EQ(Spectrum(0.5f).Summe(), 18.0f);
+        // The compound operators stay within the 36 values: the float after
+        // each operand shows a read or write beyond them.
+        struct Guarded {
+            Spectrum s;
+            float guard;
+        } target{a, 7.0f}, operand{b, 2.0f};
+        ASSERT_EQ(static_cast<const void*>(target.s.GetData() + Spectrum::kSize),
+                  static_cast<const void*>(&target.guard));
+        for (int op = 0; op < 4; ++op) {
+            op == 0   ? target.s += operand.s
+            : op == 1 ? target.s -= operand.s
+            : op == 2 ? target.s *= operand.s
+                      : target.s /= operand.s;
+            ASSERT_EQ(target.guard, 7.0f) << op;
+        }
         for (const ReflectanceSpectrum& result : reflectances) {
             EXPECT_EQ(result.GetPhysicalConditions(), physical);
             EXPECT_EQ(result.GetAdditionalInfo(kFirstKey), r.GetAdditionalInfo(kFirstKey));
