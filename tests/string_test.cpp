@@ -110,4 +110,16 @@ TEST(String, Utf8ValidityAgreesWithDecodingOverRandomBytes) {
     }
 }
 
+// One "?" stands for a malformed sequence: its lead byte and the continuation
+// bytes its class allows; every boundary of the lead classes.
+TEST(String, AMalformedSequenceBecomesOneQuestionMarkUpToItsLeadsLength) {
+    const std::pair<const char*, const char*> cases[] = {
+        {"\xC1\x80", "??"},        {"\xC2\x41", "?A"},     {"\xDF\x80\x80", "??"},
+        {"\xE0\x80\x80", "?"},     {"\xEF\x80\x41", "?A"}, {"\xF0\x80\x80\x80", "?"},
+        {"\xF4\x90\x80\x80", "?"}, {"\xF5\x80", "??"},
+    };
+    for (const auto& [utf8, ansi] : cases)
+        EXPECT_EQ(toolkit::Utf8ToWindows1252(utf8), ansi) << ::testing::PrintToString(utf8);
+}
+
 }  // namespace
