@@ -96,7 +96,17 @@ TEST(ColorDifference, NamesAndVectorsAndBatch) {
     EXPECT_NEAR(nxbase::DeltaEab(a, b), std::sqrt(4.0 + 1.0 + 9.0), nxtest::kFloatNearTen);
     EXPECT_DOUBLE_EQ(nxbase::DeltaE2000(a, b),
                      nxbase::DeltaE2000(nxbase::ToLabValue(a), nxbase::ToLabValue(b)));
-    EXPECT_GT(nxbase::DeltaE94(a, b, nxbase::Cie94Application::kTextiles), 0.0);
+    EXPECT_DOUBLE_EQ(nxbase::DeltaE94(a, b, nxbase::Cie94Application::kTextiles),
+                     nxbase::DeltaE94(nxbase::ToLabValue(a), nxbase::ToLabValue(b),
+                                      nxbase::Cie94Application::kTextiles));
+    // CIE 116's two applications: kL 1 or 2 for a lightness difference, and
+    // SC = 1 + K1 C*ab of the reference, K1 0.045 or 0.048, for a chroma one.
+    using nxbase::Cie94Application;
+    EXPECT_DOUBLE_EQ(nxbase::DeltaE94({50, 0, 0}, {52, 0, 0}), 2.0);
+    EXPECT_DOUBLE_EQ(nxbase::DeltaE94({50, 0, 0}, {52, 0, 0}, Cie94Application::kTextiles), 1.0);
+    EXPECT_NEAR(nxbase::DeltaE94({50, 50, 0}, {50, 52, 0}), 2.0 / 3.25, 1e-12);
+    EXPECT_NEAR(nxbase::DeltaE94({50, 50, 0}, {50, 52, 0}, Cie94Application::kTextiles), 2.0 / 3.4,
+                1e-12);
 
     const float reference[6] = {50, 2.6772f, -79.7751f, 60, 0, 0};
     const float sample[6] = {50, 0, -82.7485f, 60, 0, 0};
