@@ -3,10 +3,12 @@
 #include <charconv>
 #include <cmath>
 #include <string>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
 #include "nxbase/appconfig.h"
+#include "nxbase/strhelp.h"
 
 namespace {
 
@@ -17,17 +19,12 @@ const char* const kDirectLightPart = "DirectLightPart";
 const char* const kDisplay = "MeasurementDisplay";
 constexpr double kDefaultDirectLightPart = 0.5;
 
-// A finite decimal number without locale; `fallback` when the text is not one.
-double ParseDouble(const std::string& text, double fallback) {
-    std::size_t begin = text.find_first_not_of(" \t");
-    if (begin == std::string::npos) return fallback;
-    const char* first = text.data() + begin;
-    const char* last = text.data() + text.size();
-    if (*first == '+') ++first;
-    double value = 0.0;
-    auto [end, error] = std::from_chars(first, last, value);
-    if (error != std::errc() || end == first || !std::isfinite(value)) return fallback;
-    return value;
+// The whole text as a decimal number without locale, an optional "+" first
+// (a hand-edited file may carry one); `fallback` when it is not one.
+double ParseDouble(std::string_view text, double fallback) {
+    if (!text.empty() && text.front() == '+') text.remove_prefix(1);
+    double value = fallback;
+    return StringHelpers::ParseDecimal(text, value) ? value : fallback;
 }
 
 std::string FormatFixed2(double value) {
