@@ -178,6 +178,11 @@ float LimitOf(Quantity quantity) {
     return quantity == Quantity::kXYZ ? kMaxPlausibleY : kMaxPlausibleL;
 }
 
+// The component the limit applies to: Y of XYZ, L* of Lab.
+int LightOf(Quantity quantity) {
+    return quantity == Quantity::kXYZ ? 1 : 0;
+}
+
 // True for a result that no reflectance factors give: a lightness beyond
 // the limit (percentages, most likely), or a component that is NaN or
 // infinite. The batch's BatchRange tells the same of many results at once.
@@ -192,7 +197,7 @@ inline bool Implausible(const float* v, int axis, float limit) {
 // the largest float elsewhere, and against the lowest float (a NaN fails
 // both, an infinity one); only a stretch that fails is searched.
 long FirstImplausible(const float* out, std::size_t count, Quantity quantity) {
-    const int axis = quantity == Quantity::kXYZ ? 1 : 0;
+    const int axis = LightOf(quantity);
     const float limit = LimitOf(quantity);
     float limitOf[12];
     for (int k = 0; k < 12; ++k)
@@ -243,7 +248,7 @@ std::string ImplausibleReason(long index, const T* spectrum, std::size_t bands, 
                (std::isnan(spectrum[at]) ? "NaN" : "an infinity") + " (value " +
                std::to_string(at) + "): it has no colour";
     }
-    const int axis = quantity == Quantity::kXYZ ? 1 : 0;
+    const int axis = LightOf(quantity);
     const std::string name = quantity == Quantity::kXYZ ? "Y " : "L* ";
     if (!std::isfinite(v[axis]) || v[axis] <= LimitOf(quantity)) {
         return "spectrum " + std::to_string(index) +

@@ -21,8 +21,10 @@ class NXBASE_EXPORT NxSetting : public NxSingleton {
     static NxSetting* Instance();
 
     // Reads the four keys from the user configuration; does nothing unless
-    // UserConfig::IsInitialized(). A "DirectLightPart" that is not a number
-    // (or not finite) reads as 0.5; the display is EYE exactly when the text is "Eye".
+    // UserConfig::IsInitialized(). A "DirectLightPart" that is not wholly a
+    // finite decimal number without locale (a leading "+" allowed; "0.5x" or
+    // "1,25" is not) reads as 0.5; the display is EYE exactly when the text
+    // is "Eye".
     void LoadProperties();
     // Writes the four keys to the user configuration (the direct-light part
     // with 2 decimals); does nothing unless UserConfig::IsInitialized().

@@ -74,6 +74,8 @@ class NXBASE_EXPORT FineGridTristimulus {
     // beyond float's range becomes infinite, NaN stays NaN).
     void ToXYZ(const float* pSpectra, std::size_t alCount, float* pOut) const;
     void ToLab(const float* pSpectra, std::size_t alCount, float* pOut) const;
+    // Machines with AVX2 or AVX-512 give the same bits; without AVX2 (no
+    // fused multiply-add) the last bits may differ, by about 1e-16 relative.
     // The same with the spectra split over alThreads threads (0: one per
     // core), the calling thread one of them; identical results. Counts too
     // small to gain from a thread (about 600 000 values per thread) stay on
