@@ -244,19 +244,15 @@ std::array<double, 3> FineGridTristimulus::ToLab(const float* pValues) const {
     return CielabOf(ToXYZ(pValues), amWhite);
 }
 
-// In blocks of spectra, summed into doubles on the stack, then narrowed.
 template <bool kLab>
 void FineGridTristimulus::Convert(const float* pSpectra, std::size_t alCount, float* pOut) const {
-    constexpr std::size_t kBlock = 64;
-    const std::size_t n = amWavelengths.size();
-    std::array<double, 3 * kBlock> xyz;
-    for (std::size_t first = 0; first < alCount; first += kBlock) {
-        const std::size_t count = std::min(kBlock, alCount - first);
-        Sum(pSpectra + first * n, count, xyz.data());
-        if constexpr (kLab) CielabInPlace(xyz.data(), count, amWhite);
-        for (std::size_t i = 0; i < 3 * count; ++i)
-            pOut[3 * first + i] = static_cast<float>(xyz[i]);
+    if (kLab && !UsableWhite(amWhite)) {
+        std::fill(pOut, pOut + 3 * alCount, std::numeric_limits<float>::quiet_NaN());
+        return;
     }
+    TheKernels().convert(amWeights[0].data(), amWeights[1].data(), amWeights[2].data(),
+                         amWavelengths.size(), pSpectra, alCount, kLab ? amWhite.data() : nullptr,
+                         pOut);
 }
 
 template <bool kLab>
