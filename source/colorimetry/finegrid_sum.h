@@ -211,7 +211,9 @@ inline void StoreSumsOfTwo(const Lanes& a, const Lanes& b, double* xyz) {
     const Vec pairs0 = HalvesAdded<2>(quarters0, quarters1);
     const Vec pairs1 = HalvesAdded<2>(quarters2, quarters2);
     const Vec sums = HalvesAdded<1>(pairs0, pairs1);
-    std::memcpy(xyz, &sums, 6 * sizeof(double));
+    // Six lanes stored straight from the register: a copy of 48 bytes went
+    // through the stack, and its narrower loads waited for the wide store.
+    _mm512_mask_storeu_pd(xyz, 0x3F, reinterpret_cast<__m512d>(sums));
 }
 
 // Two neighbouring spectra of n >= kLanes values at a time, each step's
