@@ -260,9 +260,11 @@ std::string ImplausibleReason(long index, const T* spectrum, std::size_t bands, 
 }
 
 // Spectra converted and then checked at a time, so that a part with a bad
-// spectrum stops early and a search reads results the core has just
-// written; a multiple of the batch kernel's sixteen.
-constexpr std::size_t kCheckedPiece = 2048;
+// spectrum stops early; a multiple of the batch kernel's sixteen, and large
+// enough (1.5 MiB of results) that the batch writes them around the cache.
+// The kernels' range clears almost every piece, so a piece's results are
+// hardly ever read back.
+constexpr std::size_t kCheckedPiece = 1 << 17;
 
 // Spectra per call of a progress call-back: large enough that the call costs
 // nothing against the work, small enough for a bar to move.
@@ -375,7 +377,7 @@ py::array_t<float> SpectraTo(Quantity quantity, const py::object& spectra,
     const std::size_t count = input.count;
     float* out = result.mutable_data();
     // Each part is converted and checked by the thread that wrote it, a
-    // piece at a time, while the piece's results are still in the core's cache.
+    // piece at a time.
     std::atomic<long> implausible{-1};
     const auto convert = [&](const auto* in, std::size_t first, std::size_t n) {
         long bad = -1;

@@ -263,6 +263,47 @@ TEST(ColorBatch, ThreadSplitGivesTheSameResults) {
     EXPECT_GT(range.brightest, 100.0f);
 }
 
+// A call with 1 MiB of results or more writes them around the cache from
+// their first whole 64-byte line on: the same bits as calls of 1000 spectra
+// (through the cache), wherever the output starts, nothing before or after
+// it, and the range its results show.
+TEST(ColorBatch, LargeResultsWrittenAroundTheCacheKeepTheirBitsWhereverTheyStart) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    const std::vector<float> base = TestSpectra();
+    const std::size_t count = (1u << 20) / 12 + 1 + random() % 999;
+    std::vector<float> spectra(36 * count);
+    for (std::size_t i = 0; i < spectra.size(); ++i)
+        spectra[i] = base[(i + 36 * 977) % base.size()];
+    spectra[36 * (random() % count) + 7] = 40.0f;  // percentages somewhere
+    const std::vector<double> doubles(spectra.begin(), spectra.end());
+    const ColorBatch batch;
+    for (int round = 0; round < 4; ++round) {
+        const bool lab = round % 2, fromDoubles = round >= 2;
+        const std::size_t offset = random() % 16;  // floats before the output
+        SCOPED_TRACE(std::string(lab ? "Lab" : "XYZ") + (fromDoubles ? " of doubles" : "") +
+                     ", output at float " + std::to_string(offset));
+        auto convert = [&](std::size_t first, std::size_t n, float* out) {
+            return fromDoubles ? (lab ? batch.ToLab(&doubles[36 * first], n, out)
+                                      : batch.ToXYZ(&doubles[36 * first], n, out))
+                               : (lab ? batch.ToLab(&spectra[36 * first], n, out)
+                                      : batch.ToXYZ(&spectra[36 * first], n, out));
+        };
+        std::vector<float> small(3 * count), large(3 * count + 32, -1.0f);
+        for (std::size_t first = 0; first < count; first += 1000)
+            convert(first, std::min<std::size_t>(1000, count - first), &small[3 * first]);
+        const nxbase::BatchRange range = convert(0, count, &large[offset]);
+        ASSERT_EQ(std::memcmp(small.data(), &large[offset], small.size() * sizeof(float)), 0);
+        for (std::size_t i = 0; i < offset; ++i) ASSERT_EQ(large[i], -1.0f);
+        for (std::size_t i = offset + small.size(); i < large.size(); ++i)
+            ASSERT_EQ(large[i], -1.0f);
+        const nxbase::BatchRange model = RangeOfResults(small.data(), count, lab ? 0 : 1);
+        EXPECT_EQ(range.brightest, model.brightest);
+        EXPECT_EQ(range.allFinite, model.allFinite);
+    }
+}
+
 TEST(ColorBatch, StaysCieLabWhenObjectsAreSetToDin99) {
     const std::vector<float> spectra = TestSpectra();
     const ColorBatch batch;

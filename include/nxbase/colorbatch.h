@@ -79,7 +79,10 @@ class NXBASE_EXPORT ColorBatch {
     // XYZ (white Y = 100) of alCount spectra: pXYZ[3i + c] = 100 * S_c / sum_1,
     // S_c the weighted sum of spectrum i against table c. pSpectra and pXYZ
     // must not overlap. Every array form returns the BatchRange of its
-    // results.
+    // results. A call (or a thread's part) with 1 MiB of results or more
+    // (87 382 spectra) writes them around the cache, on machines with
+    // AVX-512: from memory that is up to a tenth faster, but the results are
+    // then not in the cache for whoever reads them next.
     BatchRange ToXYZ(const float* pSpectra, std::size_t alCount, float* pXYZ) const;
 
     // CIE 1976 L*a*b* (CIE 15:2004, formulas as in LABVector) of alCount

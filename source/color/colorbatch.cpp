@@ -14,6 +14,7 @@
 #include "nxbase/colorbatch.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <cstring>
 #include <limits>
 #include <mutex>
@@ -109,25 +110,47 @@ batch::Seen RunNarrow(const PaddedWeights& w, const double* src, std::size_t cou
 }
 
 template <bool kLab>
-batch::Seen RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const float* src,
+batch::Seen RunWide(const batch::WideForms& wide, const PaddedWeights& w, const float* src,
                     std::size_t count, float* out) {
     return (kLab ? wide.lab : wide.xyz)(w, src, count, out);
 }
 
 template <bool kLab>
-batch::Seen RunWide(const batch::WideKernels& wide, const PaddedWeights& w, const double* src,
+batch::Seen RunWide(const batch::WideForms& wide, const PaddedWeights& w, const double* src,
                     std::size_t count, float* out) {
     return (kLab ? wide.labDouble : wide.xyzDouble)(w, src, count, out);
 }
 
-// Sixteen spectra at a time where the machine can, the rest eight at a time.
+// Results of this many bytes or more are written around the cache: they
+// would not stay in a core's cache beside the twelve times as many bytes of
+// spectra streaming through it, and a store through the cache first reads
+// each line it writes: a twelfth more to read than the spectra alone.
+constexpr std::size_t kStreamFromBytes = std::size_t{1} << 20;
+
+// How many spectra's results come before the first 64-byte line boundary in
+// `out` (a line holds whole triples only every 16 spectra, so fewer than 16).
+std::size_t SpectraBeforeALine(const float* out) {
+    const auto address = reinterpret_cast<std::uintptr_t>(out);
+    std::size_t spectra = 0;
+    while ((address + spectra * 3 * sizeof(float)) % 64 != 0) ++spectra;
+    return spectra;
+}
+
+// Sixteen spectra at a time where the machine can, the rest eight at a time;
+// a large result from its first whole line on in whole lines around the
+// cache. Every kernel gives the same bits.
 template <bool kLab, class T>
 batch::Seen Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
     const Chosen& chosen = InUse();
-    if (chosen.wide.xyz == nullptr) return RunNarrow<kLab>(w, src, count, out);
-    const std::size_t wide = count / (2 * kLanes) * (2 * kLanes);
-    const batch::Seen seen = RunWide<kLab>(chosen.wide, w, src, wide, out);
-    return Merged(seen, RunNarrow<kLab>(w, src + wide * kSamples, count - wide, out + 3 * wide));
+    if (chosen.wide.cached.xyz == nullptr) return RunNarrow<kLab>(w, src, count, out);
+    const bool stream = count * 3 * sizeof(float) >= kStreamFromBytes;
+    const std::size_t head = stream ? SpectraBeforeALine(out) : 0;
+    batch::Seen seen = RunNarrow<kLab>(w, src, head, out);
+    const std::size_t wide = (count - head) / (2 * kLanes) * (2 * kLanes);
+    seen = Merged(seen, RunWide<kLab>(stream ? chosen.wide.streamed : chosen.wide.cached, w,
+                                      src + head * kSamples, wide, out + 3 * head));
+    const std::size_t done = head + wide;
+    return Merged(seen, RunNarrow<kLab>(w, src + done * kSamples, count - done, out + 3 * done));
 }
 
 }  // namespace

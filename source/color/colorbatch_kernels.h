@@ -33,11 +33,17 @@ struct NarrowKernels {
     void (*cbrt)(const float* in, std::size_t count, float* out);
 };
 // Sixteen spectra per step; count a multiple of sixteen.
-struct WideKernels {
+struct WideForms {
     Kernel xyz;
     Kernel lab;
     DoubleKernel xyzDouble;
     DoubleKernel labDouble;
+};
+// The `streamed` forms write whole 64-byte lines around the cache, for `out`
+// on a 64-byte boundary, and fence their stores before they return.
+struct WideKernels {
+    WideForms cached;
+    WideForms streamed;
 };
 
 // colorbatch_baseline.cpp: the compiler's default target.
