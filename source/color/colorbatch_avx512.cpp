@@ -122,7 +122,7 @@ template <bool kStream>
             _mm512_permutex2var_ps(v[0], _mm512_load_si512(kWideInterleave.xy[k]), v[1]);
         const __m512 triples =
             _mm512_permutex2var_ps(xy, _mm512_load_si512(kWideInterleave.z[k]), v[2]);
-        if (kStream) {
+        if constexpr (kStream) {
             _mm512_stream_ps(out + 16 * k, triples);
         } else {
             _mm512_storeu_ps(out + 16 * k, triples);
@@ -166,7 +166,7 @@ Seen RunWide(const PaddedWeights& w, const T* src, std::size_t count, float* out
     }
     // Streamed stores are weakly ordered: fenced, so that whoever is told
     // the results are done sees them.
-    if (kStream) _mm_sfence();
+    if constexpr (kStream) _mm_sfence();
     return watch.Result();
 }
 
