@@ -128,11 +128,12 @@ batch::Seen RunWide(const batch::WideForms& wide, const PaddedWeights& w, const 
 constexpr std::size_t kStreamFromBytes = std::size_t{1} << 20;
 
 // How many spectra's results come before the first 64-byte line boundary in
-// `out` (a line holds whole triples only every 16 spectra, so fewer than 16).
+// `out`: fewer than 16 (a line holds whole triples every 16 spectra), or 16
+// for an address no triple starts a line at (not a float's alignment).
 std::size_t SpectraBeforeALine(const float* out) {
     const auto address = reinterpret_cast<std::uintptr_t>(out);
     std::size_t spectra = 0;
-    while ((address + spectra * 3 * sizeof(float)) % 64 != 0) ++spectra;
+    while (spectra < 2 * kLanes && (address + spectra * 3 * sizeof(float)) % 64 != 0) ++spectra;
     return spectra;
 }
 
@@ -143,9 +144,11 @@ template <bool kLab, class T>
 batch::Seen Run(const PaddedWeights& w, const T* src, std::size_t count, float* out) {
     const Chosen& chosen = InUse();
     if (chosen.wide.cached.xyz == nullptr) return RunNarrow<kLab>(w, src, count, out);
-    const bool stream = count * 3 * sizeof(float) >= kStreamFromBytes;
-    const std::size_t head = stream ? SpectraBeforeALine(out) : 0;
-    batch::Seen seen = RunNarrow<kLab>(w, src, head, out);
+    const std::size_t before =
+        count * 3 * sizeof(float) >= kStreamFromBytes ? SpectraBeforeALine(out) : 2 * kLanes;
+    const bool stream = before < 2 * kLanes;
+    const std::size_t head = stream ? before : 0;
+    batch::Seen seen = head ? RunNarrow<kLab>(w, src, head, out) : kNothingSeen;
     const std::size_t wide = (count - head) / (2 * kLanes) * (2 * kLanes);
     seen = Merged(seen, RunWide<kLab>(stream ? chosen.wide.streamed : chosen.wide.cached, w,
                                       src + head * kSamples, wide, out + 3 * head));

@@ -1,7 +1,6 @@
 #include "nxbase/appsetti.h"
 
 #include <charconv>
-#include <cmath>
 #include <string>
 #include <string_view>
 #include <system_error>

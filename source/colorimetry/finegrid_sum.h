@@ -253,13 +253,19 @@ inline void SumTwo(const double* w0, const double* w1, const double* w2, std::si
 }
 #endif
 
+// Whether the last step of a spectrum of n values overlaps the one before
+// (Tail); a spectrum shorter than kLanes is summed from a padded copy.
+inline bool TailOverlaps(std::size_t n) {
+    return n >= kLanes && n % kLanes != 0;
+}
+
 // The weights hold zeros after the n-th value up to a multiple of kLanes, so
 // that a spectrum shorter than kLanes can be summed from a padded copy. The
 // tail's weights are made once per call of the kernel (TailOf).
 inline void SumSpectra(const double* w0, const double* w1, const double* w2, std::size_t n,
                        const Tail& tail, const float* spectra, std::size_t count, double* xyz) {
     const std::size_t whole = n / kLanes * kLanes;
-    const bool overlap = n >= kLanes && whole < n;
+    const bool overlap = TailOverlaps(n);
     std::size_t i = 0;
 #ifdef __AVX512F__
     if (n >= kLanes) {
@@ -291,8 +297,7 @@ inline void SumSpectra(const double* w0, const double* w1, const double* w2, std
 }
 
 inline Tail TailOf(const double* w0, const double* w1, const double* w2, std::size_t n) {
-    const bool overlap = n >= kLanes && n % kLanes != 0;
-    return Tail(w0, w1, w2, overlap ? n : kLanes);
+    return Tail(w0, w1, w2, TailOverlaps(n) ? n : kLanes);
 }
 
 inline void SumSpectra(const double* w0, const double* w1, const double* w2, std::size_t n,
@@ -392,9 +397,15 @@ inline void LabWithReciprocals(double* xyz, std::size_t count, const double* rec
     std::memcpy(xyz + 3 * i, rest, 3 * (count - i) * sizeof(double));
 }
 
+// The white's reciprocals, by which LabOfBlock multiplies.
+struct Reciprocals {
+    explicit Reciprocals(const double* white)
+        : of{1.0 / white[0], 1.0 / white[1], 1.0 / white[2]} {}
+    double of[3];
+};
+
 inline void LabOfTriples(double* xyz, std::size_t count, const double* white) {
-    const double reciprocal[3] = {1.0 / white[0], 1.0 / white[1], 1.0 / white[2]};
-    LabWithReciprocals(xyz, count, reciprocal);
+    LabWithReciprocals(xyz, count, Reciprocals(white).of);
 }
 
 // Spectra a block, each block summed, taken to CIELAB and narrowed before the
@@ -408,15 +419,13 @@ inline void ConvertSpectra(const double* w0, const double* w1, const double* w2,
                            const float* spectra, std::size_t count, const double* white,
                            float* out) {
     const Tail tail = TailOf(w0, w1, w2, n);
-    double reciprocal[3] = {};
-    if (white) {
-        for (int c = 0; c < 3; ++c) reciprocal[c] = 1.0 / white[c];
-    }
+    const double kNoWhite[3] = {1.0, 1.0, 1.0};
+    const Reciprocals reciprocal(white ? white : kNoWhite);
     double xyz[3 * kConvertBlock];
     for (std::size_t first = 0; first < count; first += kConvertBlock) {
         const std::size_t block = count - first < kConvertBlock ? count - first : kConvertBlock;
         SumSpectra(w0, w1, w2, n, tail, spectra + first * n, block, xyz);
-        if (white) LabWithReciprocals(xyz, block, reciprocal);
+        if (white) LabWithReciprocals(xyz, block, reciprocal.of);
         for (std::size_t i = 0; i < 3 * block; ++i) out[3 * first + i] = static_cast<float>(xyz[i]);
     }
 }
