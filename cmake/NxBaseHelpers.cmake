@@ -6,7 +6,7 @@ file(MAKE_DIRECTORY ${NXBASE_TEST_TMPDIR})
 function(nxbase_add_test name)
     cmake_parse_arguments(ARG "" "" "LABELS;LIBS" ${ARGN})
     add_executable(${name} ${ARG_UNPARSED_ARGUMENTS})
-    target_link_libraries(${name} PRIVATE nxbase GTest::gtest GTest::gtest_main ${ARG_LIBS})
+    target_link_libraries(${name} PRIVATE nxbase GTest::gtest GTest::gmock GTest::gtest_main ${ARG_LIBS})
     target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/tests)
     target_compile_definitions(${name} PRIVATE
         NXBASE_TEST_DATA_DIR="${PROJECT_SOURCE_DIR}/tests/data"

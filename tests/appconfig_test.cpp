@@ -255,8 +255,7 @@ TEST_F(AppConfigTest, VeltraGroupsAndChromaLinkApplicationsByIndex) {
     ScopedUserInterface scope(ui);
     EXPECT_EQ(VELTRAConfig::GetGroupName(static_cast<VELTRAiniGroup>(7)), "");
     ASSERT_EQ(ui->Boxes().size(), 1u);
-    EXPECT_NE(ui->Boxes()[0].text.find("\"Unknown VELTRAConfig group name\" == 0"),
-              std::string::npos);
+    EXPECT_THAT(ui->Boxes()[0].text, HasSubstr("\"Unknown VELTRAConfig group name\" == 0"));
 }
 
 TEST_F(AppConfigTest, SettingsReadDefaultsWithoutAUserFileAndRoundTripThroughIt) {

@@ -61,9 +61,9 @@ TEST(Check, DecliningToQuitReturnsWithTheAssertionLogged) {
     EXPECT_EQ(boxes[0].kind, UserInterface::BoxKind::kQuery);
     std::string expectedHead = "*****ASSERT*****\nCondition:\namStart <= amEnd\n failed\nfile: ";
     EXPECT_EQ(boxes[0].text.substr(0, expectedHead.size()), expectedHead);
-    EXPECT_NE(boxes[0].text.find("\n\nQuit application?"), std::string::npos);
+    EXPECT_THAT(boxes[0].text, HasSubstr("\n\nQuit application?"));
     std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
-    EXPECT_NE(log.find("amStart <= amEnd"), std::string::npos);
+    EXPECT_THAT(log, HasSubstr("amStart <= amEnd"));
 
     NX_ERROR("disk gone");
     EXPECT_EQ(ui->Boxes()[1].text.substr(0, 26), "*****ERROR*****\ndisk gone\n");

@@ -142,8 +142,7 @@ TEST(CMetryProvider, StatusDensitiesAreBuiltInAndTheNarrowBandOnesAreNot) {
         EXPECT_EQ(cm::DensityStandardRepository::Get(name)->GetName(), "Status E");
     }
     EXPECT_EQ(cm::DensityStandardRepository::GetDefault()->GetName(), "Status E");
-    EXPECT_NE(log.Text().find("Density standard \"DIN NB\" not available"), std::string::npos)
-        << log.Text();
+    EXPECT_THAT(log.Text(), HasSubstr("Density standard \"DIN NB\" not available")) << log.Text();
 }
 
 TEST_F(CMetryProviderInDataDir, InstalledIlluminantGoesThroughTheSameWeightPath) {
@@ -187,14 +186,13 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
         nxtest::WriteFile(Illuminant(c.name), c.text);
         std::string error;
         EXPECT_FALSE(cm::IlluminantRepository::Find(c.name, &error));
-        EXPECT_NE(error.find(c.expected), std::string::npos) << error;
-        EXPECT_NE(error.find(Illuminant(c.name)), std::string::npos) << error;
+        EXPECT_THAT(error, HasSubstr(c.expected)) << error;
+        EXPECT_THAT(error, HasSubstr(Illuminant(c.name))) << error;
         EXPECT_EQ(cm::IlluminantRepository::Get(c.name)->GetName(), "D50");
         EXPECT_FALSE(cm::CMetryFilter::Find(c.name, "2"));
     }
-    EXPECT_NE(
-        log.Text().find("Illuminant \"Text\" not available (" + Illuminant("Text") + ": line 3"),
-        std::string::npos)
+    EXPECT_THAT(log.Text(),
+                HasSubstr("Illuminant \"Text\" not available (" + Illuminant("Text") + ": line 3"))
         << log.Text();
     // A byte-order mark and CRLF line ends are accepted.
     nxtest::WriteFile(Illuminant("Bom"), "\xEF\xBB\xBFwavelength,value\r\n380,1\r\n780,1\r\n");
@@ -224,10 +222,10 @@ TEST_F(CMetryProviderInDataDir, InstalledDensityTableMakesAStandardExist) {
     nxtest::WriteFile(Density("spi"), "wavelength,red\n445,5\n455,5\n");
     std::string error;
     EXPECT_FALSE(cm::DensityStandardRepository::Find("SPI", &error));
-    EXPECT_NE(error.find("off the 10 nm grid"), std::string::npos) << error;
+    EXPECT_THAT(error, HasSubstr("off the 10 nm grid")) << error;
     nxtest::WriteFile(Density("status_i"), "wavelength,red\n400,-10\n410,-10\n");
     EXPECT_FALSE(cm::DensityStandardRepository::Find("Status I", &error));
-    EXPECT_NE(error.find("no response"), std::string::npos) << error;
+    EXPECT_THAT(error, HasSubstr("no response")) << error;
 }
 
 TEST(CMetryProvider, ConcurrentFirstUseOfAFilterComputesItOnce) {

@@ -338,8 +338,7 @@ TEST(CMetryFilter, AnIlluminantWithoutLightFallsBackToTheDefaultWithALogLine) {
     const CMetryFilter filter{Lichtart(IllumClass(dark)), Observer(OBSERVER_2DEG)};
     EXPECT_EQ(filter.GetIllum().GetName(), "D50");
     EXPECT_NEAR(filter.GetWeightSum(1), 100.0f, nxtest::kFloatAtHundred);
-    EXPECT_NE(log.Text().find("Illuminant \"Dark\" has no weights"), std::string::npos)
-        << log.Text();
+    EXPECT_THAT(log.Text(), HasSubstr("Illuminant \"Dark\" has no weights")) << log.Text();
 }
 
 namespace {

@@ -291,7 +291,7 @@ TEST(LABVector, Din99MatchesDoublePrecisionValuesAndInvertsBack) {
     EXPECT_NE(din[0], cie[0]);
     const LABVector back = din.GetCIELab();
     for (int i = 0; i < 3; ++i) EXPECT_NEAR(back[i], cie[i], kDinTolerance);
-    EXPECT_NE(String(din.ToString()).str().find("L99="), std::string::npos);
+    EXPECT_THAT(String(din.ToString()).str(), HasSubstr("L99="));
     LABVector::SetColorSpaceType(static_cast<LabColorSpaceType>(7));
     EXPECT_EQ(din.GetCIELab().Length(), 0.0f) << "unknown type gives zero";
 }

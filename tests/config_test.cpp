@@ -140,8 +140,8 @@ TEST(IniFile, AFileOfCommentsOnlyKeepsThemAboveTheFirstGroup) {
     ASSERT_TRUE(config.WriteKey("k", "v"));
     ASSERT_TRUE(config.WriteKey("k", "w"));
     EXPECT_EQ(ReadFile(path), once);
-    EXPECT_NE(once.find("; written by hand"), std::string::npos);
-    EXPECT_NE(once.find("# nothing set yet"), std::string::npos);
+    EXPECT_THAT(once, HasSubstr("; written by hand"));
+    EXPECT_THAT(once, HasSubstr("# nothing set yet"));
 
     // A file from Windows: CRLF lines, a comment after the last key.
     WriteFile(path, "[G]\r\nk = v\r\n; last\r\n; words\r\n");

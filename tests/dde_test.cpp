@@ -90,8 +90,8 @@ TEST_F(DdeTest, APokeReachesThePeerWithSenderCommandAndDataIntact) {
         "dbus-send --session --print-reply --dest=" + nxbase::DdeBusName("EchoPeer") + " " +
         nxbase::kDdeObjectPath + " " + nxbase::kDdeInterface +
         ".Connect string:VELTRAApplication string:";
-    EXPECT_NE(Shell(call + "EchoPeer").find("boolean true"), std::string::npos);
-    EXPECT_NE(Shell(call + "SomeoneElse").find("boolean false"), std::string::npos);
+    EXPECT_THAT(Shell(call + "EchoPeer"), HasSubstr("boolean true"));
+    EXPECT_THAT(Shell(call + "SomeoneElse"), HasSubstr("boolean false"));
     EXPECT_FALSE(dde->IsAppRunning(nxbase::kDdeService, "SomeoneElse"));
     EXPECT_FALSE(dde->IsAppRunning("OtherService", "EchoPeer"));
 
@@ -154,17 +154,15 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined
     EXPECT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [&] {
         return std::chrono::steady_clock::now() < until;
     })) << office->GetLastError();
-    EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
-                  .find("DDE is off: the session bus was lost"),
-              std::string::npos);
+    EXPECT_THAT(nxtest::ReadFile(LogFile::Instance()->GetFileName()),
+                HasSubstr("DDE is off: the session bus was lost"));
     // The bus comes back at its address: this process and the server join it again.
     ASSERT_TRUE(sandbox.StartBus());
     EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 20s));
     EXPECT_TRUE(RunUntil(
         [] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }, 20s));
-    EXPECT_NE(nxtest::ReadFile(LogFile::Instance()->GetFileName())
-                  .find("DDE is on again: the session bus is back"),
-              std::string::npos);
+    EXPECT_THAT(nxtest::ReadFile(LogFile::Instance()->GetFileName()),
+                HasSubstr("DDE is on again: the session bus is back"));
 }
 
 TEST_F(DdeTest, AnOfficeMadeWhileTheBusRestartsServesOnSocketsAndJoinsItLater) {
@@ -219,7 +217,7 @@ TEST_F(DdeTest, APokeSpeaksOnlyForTheConnectionThatOwnsItsName) {
         "dbus-send --session --print-reply --dest=" + nxbase::DdeBusName("LumaServer") + " " +
         nxbase::kDdeObjectPath + " " + nxbase::kDdeInterface +
         ".Poke string:LumaServer string:DISCONNECT array:byte:0x41,0x70,0x70,0x41,0x3a";
-    EXPECT_NE(Shell(spoof).find("boolean false"), std::string::npos);
+    EXPECT_THAT(Shell(spoof), HasSubstr("boolean false"));
     RunUntil([] { return false; }, 1500ms);
     EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
     ASSERT_TRUE(

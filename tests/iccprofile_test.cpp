@@ -151,7 +151,7 @@ TEST_F(IccTest, UnusableProfilesFallBackWithoutRaising) {
         ICCEngine* engine = ICCEngine::Instance();
         EXPECT_FALSE(ICCProfile::ProfileValid()) << path;
         EXPECT_FALSE(ICCProfile::ProfileEnabled()) << "a profile that cannot be loaded: " << path;
-        EXPECT_NE(engine->GetProblem().find(problem), std::string::npos)
+        EXPECT_THAT(engine->GetProblem(), HasSubstr(problem))
             << path << ": " << engine->GetProblem();
         double in[3] = {50, 0, 0}, out[3] = {-1, -1, -1};
         EXPECT_FALSE(engine->LabToRGB(in, out));

@@ -232,7 +232,7 @@ TEST_F(LanguageTest, ShortNameToCodeReportsNotImplemented) {
     ScopedUserInterface scoped(ui);
     EXPECT_EQ(Language::ShortLanguageNameToCountryCode("de"), 0);
     ASSERT_EQ(ui->Boxes().size(), 1u);
-    EXPECT_NE(ui->Boxes()[0].text.find("Not yet implemented"), std::string::npos);
+    EXPECT_THAT(ui->Boxes()[0].text, HasSubstr("Not yet implemented"));
 }
 
 TEST_F(LanguageTest, LocaleSetterRestoresTheCategory) {

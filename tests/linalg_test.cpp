@@ -132,70 +132,41 @@ TYPED_TEST(LinAlgTyped, EveryRoutineAgreesWithAPlainLoopOverRandomSizes) {
     }
 }
 
-TYPED_TEST(LinAlgTyped, DivisionByZeroYieldsInfinityNotATrap) {
+// Elimination pivots through index arrays (rows stay in memory), takes the
+// first of equal candidates, and refuses only an exactly zero pivot, leaving x.
+TYPED_TEST(LinAlgTyped, GaussElPivotsByIndexAndRefusesOnlyAnExactZeroPivot) {
     using T = TypeParam;
-    T a[2] = {1, -1};
-    T b[2] = {0, 0};
-    T d[2];
-    LinAlg::VdivV(d, a, b, 2);
-    EXPECT_TRUE(std::isinf(d[0]) && d[0] > 0);
-    EXPECT_TRUE(std::isinf(d[1]) && d[1] < 0);
-}
-
-TYPED_TEST(LinAlgTyped, GaussElPivotsThroughIndexArraysWithoutMovingRows) {
-    using T = TypeParam;
-    // [[0, 1], [1, 0]] x = (2, 3) needs a row swap.
-    T a[4] = {0, 1, 1, 0};
-    T b[2] = {2, 3};
-    T x[2] = {0, 0};
-    int singular = -1;
-    int rowStart[2];
-    int rowIndex[2];
+    T a[4] = {0, 1, 1, 0}, b[2] = {2, 3}, x[3] = {0, 0, 0};  // needs a row swap
+    int singular = -1, rowStart[3], rowIndex[3];
     LinAlg::GaussEl(b, a, x, 2, singular, rowStart, rowIndex);
     EXPECT_EQ(singular, 0);
     ExpectValues(x, {3, 2});
     ExpectValues(rowStart, {2, 0});
     ExpectValues(rowIndex, {1, 0});
-    // Rows stay where they were in memory.
-    EXPECT_EQ(a[0], T(0));
-    EXPECT_EQ(a[2], T(1));
-}
+    ExpectValues(a, {0, 1, 1, 0});
 
-TYPED_TEST(LinAlgTyped, GaussElKeepsFirstOfEqualPivotCandidates) {
-    using T = TypeParam;
-    // Column 0 has |-2| in row 1 and |2| in row 2: the first (row 1) wins.
-    T a[9] = {1, 1, 1, -2, 1, 0, 2, 0, 1};
-    T b[3] = {6, 0, 5};  // solution (1, 2, 3)
-    T x[3];
-    int singular = -1;
-    int rowStart[3];
-    int rowIndex[3];
-    LinAlg::GaussEl(b, a, x, 3, singular, rowStart, rowIndex);
+    // Column 0 has |-2| in row 1 and |2| in row 2: row 1 wins. Solution (1, 2, 3).
+    T a3[9] = {1, 1, 1, -2, 1, 0, 2, 0, 1}, b3[3] = {6, 0, 5};
+    LinAlg::GaussEl(b3, a3, x, 3, singular, rowStart, rowIndex);
     ASSERT_EQ(singular, 0);
     EXPECT_EQ(rowIndex[0], 1);
-    EXPECT_NEAR(x[0], T(1), kSolveToleranceF);
-    EXPECT_NEAR(x[1], T(2), kSolveToleranceF);
-    EXPECT_NEAR(x[2], T(3), kSolveToleranceF);
-}
+    for (int i = 0; i < 3; ++i) EXPECT_NEAR(x[i], T(i + 1), kSolveToleranceF);
 
-TYPED_TEST(LinAlgTyped, GaussElReportsOnlyAnExactZeroPivotAsSingular) {
-    using T = TypeParam;
-    // [[1, 2], [2, 4]]: the second column's remaining pivot is exactly 0.
-    T a[4] = {1, 2, 2, 4};
-    T b[2] = {1, 2};
-    T x[2] = {42, 43};
-    int singular = 0;
-    LinAlg::GaussEl(b, a, x, 2, singular);
+    T flat[4] = {1, 2, 2, 4}, bf[2] = {1, 2};  // the second pivot is exactly 0
+    x[0] = 42, x[1] = 43;
+    LinAlg::GaussEl(bf, flat, x, 2, singular);
     EXPECT_EQ(singular, 1);
-    ExpectValues(x, {42, 43});  // untouched
-
-    // A tiny but nonzero pivot is accepted.
-    T tiny[4] = {T(1e-30), 0, 0, 1};
-    T bt[2] = {T(2e-30), 5};
+    ExpectValues(x, {42, 43});
+    T tiny[4] = {T(1e-30), 0, 0, 1}, bt[2] = {T(2e-30), 5};
     LinAlg::GaussEl(bt, tiny, x, 2, singular);
     EXPECT_EQ(singular, 0);
     EXPECT_NEAR(x[0], T(2), kSolveToleranceF);
     EXPECT_EQ(x[1], T(5));
+
+    // Division by zero gives signed infinities, not a trap.
+    T one[2] = {1, -1}, zero[2] = {0, 0};
+    LinAlg::VdivV(x, one, zero, 2);
+    EXPECT_TRUE(std::isinf(x[0]) && x[0] > 0 && std::isinf(x[1]) && x[1] < 0);
 }
 
 // Random diagonally dominant systems up to 24 x 24 (beyond the short form's
@@ -230,44 +201,30 @@ int Fit(T* w, T* y, T* a, T* x, int m) {
     return ok;
 }
 
-TEST(LinAlg, LeastSquareFitRecoversALineFromWeightedObservations) {
-    // y = 2 + 3 t at t = 0..4, with one outlier that has weight 0.
-    double w[5] = {1, 1, 1, 1, 0};
-    double y[5] = {2, 5, 8, 11, 1000};
-    double a[10] = {1, 0, 1, 1, 1, 2, 1, 3, 1, 4};
-    double x[2] = {0, 0};
+// y = 2 + 3 t at t = 0..4 with an outlier of weight 0 (weights applied in
+// place); a square system ignores the weights; too few observations or equal
+// columns (singular normals) fail and compute nothing.
+TEST(LinAlg, LeastSquareFitWeighsObservationsAndRefusesUnderdeterminedOrSingularOnes) {
+    double w[5] = {1, 1, 1, 1, 0}, y[5] = {2, 5, 8, 11, 1000};
+    double a[10] = {1, 0, 1, 1, 1, 2, 1, 3, 1, 4}, x[3] = {0, 0, 0};
     EXPECT_EQ(Fit<2>(w, y, a, x, 5), 1);
     EXPECT_NEAR(x[0], 2.0, kSolveTolerance);
     EXPECT_NEAR(x[1], 3.0, kSolveTolerance);
-    // The weights were applied in place to A and y.
     EXPECT_EQ(y[4], 0.0);
     EXPECT_EQ(a[9], 0.0);
-}
 
-TEST(LinAlg, LeastSquareFitWithSquareSystemIgnoresWeights) {
-    float w[2] = {0, 0};  // would zero everything if used
-    float y[2] = {3, 4};
-    float a[4] = {1, 1, 1, -1};
-    float x[2];
-    EXPECT_EQ(Fit<2>(w, y, a, x, 2), 1);
-    EXPECT_NEAR(x[0], 3.5f, kSolveToleranceF);
-    EXPECT_NEAR(x[1], -0.5f, kSolveToleranceF);
-}
+    float wf[2] = {0, 0}, yf[2] = {3, 4}, af[4] = {1, 1, 1, -1}, xf[2];
+    EXPECT_EQ(Fit<2>(wf, yf, af, xf, 2), 1);
+    EXPECT_NEAR(xf[0], 3.5f, kSolveToleranceF);
+    EXPECT_NEAR(xf[1], -0.5f, kSolveToleranceF);
 
-TEST(LinAlg, LeastSquareFitFailsOnTooFewObservationsOrSingularNormals) {
-    double w[3] = {1, 1, 1};
-    double y[3] = {1, 2, 3};
-    double a[9] = {1, 2, 3, 4, 5, 6, 7, 8, 9};
-    double x[3] = {-5, -5, -5};
-    EXPECT_EQ(Fit<3>(w, y, a, x, 2), 0);
+    double w3[3] = {1, 1, 1}, y3[3] = {1, 2, 3}, a3[9] = {1, 2, 3, 4, 5, 6, 7, 8, 9};
+    x[0] = -5;
+    EXPECT_EQ(Fit<3>(w3, y3, a3, x, 2), 0);
     EXPECT_EQ(x[0], -5.0);
-    EXPECT_EQ(a[0], 1.0);  // nothing computed
-
-    // Two identical columns: A^T A is singular exactly.
-    double w2[3] = {1, 1, 1};
-    double y2[3] = {1, 2, 3};
-    double a2[6] = {1, 1, 2, 2, 4, 4};
-    EXPECT_EQ(Fit<2>(w2, y2, a2, x, 3), 0);
+    EXPECT_EQ(a3[0], 1.0);
+    double equal[6] = {1, 1, 2, 2, 4, 4};
+    EXPECT_EQ(Fit<2>(w3, y3, equal, x, 3), 0);
 }
 
 }  // namespace

@@ -133,7 +133,7 @@ TEST(Locale, ReadersAndWritersGiveTheSameBytesUnderADecimalCommaLocale) {
     ASSERT_TRUE(ProvideDecimalCommaLocale(dir, &why)) << why;
     std::setlocale(LC_ALL, "C");
     const std::string plain = ReadAndWriteEverything(dir);
-    ASSERT_NE(plain.find("1,dark skin,"), std::string::npos) << plain.substr(0, 400);
+    ASSERT_THAT(plain, HasSubstr("1,dark skin,")) << plain.substr(0, 400);
 
     // The C library and the C++ streams both take the German decimal comma,
     // as an application that follows the desktop's language does.

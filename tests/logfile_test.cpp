@@ -222,7 +222,7 @@ TEST_F(LogFileTest, StackTraceIsWrittenOnlyWhenEnabled) {
     log.SetLogOption("AvailableStack", true);
     log.LogAvailableStack("here");
     std::string all = nxtest::ReadFile(File("stack"));
-    EXPECT_NE(all.find("\nStackTrace:\n"), std::string::npos);
+    EXPECT_THAT(all, HasSubstr("\nStackTrace:\n"));
     EXPECT_TRUE(std::regex_search(all, std::regex(R"(AvailableStack: here \d+ bytes)")));
 }
 
@@ -280,7 +280,7 @@ TEST(LogFileInstance, IsCreatedOnceAndShared) {
     boost::shared_ptr<LogFile> first = LogFile::Instance();
     LogFile::CreateLogFile("ignored-second-name");
     EXPECT_EQ(first, LogFile::Instance());
-    EXPECT_NE(first->GetFileName().find(".log"), std::string::npos);
+    EXPECT_THAT(first->GetFileName(), HasSubstr(".log"));
 }
 
 TEST(LogFileInstance, CachedOptionFollowsEveryChangeAlsoUnderConcurrentReaders) {

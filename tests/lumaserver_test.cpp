@@ -351,7 +351,7 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     EXPECT_EQ(ids, (std::vector<std::string>{"1", "2", "3"}));
     // Nothing to measure is an error, not a success with no patches.
     EXPECT_FALSE(nxbase::MeasureWithLumaServer(*office, 0, &measured, &error));
-    EXPECT_NE(error.find("at least 1"), std::string::npos) << error;
+    EXPECT_THAT(error, HasSubstr("at least 1")) << error;
     EXPECT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
 }
 
@@ -376,18 +376,16 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
         run(usage, status);
         EXPECT_EQ(status, 2) << usage;
     }
-    EXPECT_NE(run("LumaServer NO_SUCH", status).find("not a message name: NO_SUCH"),
-              std::string::npos);
+    EXPECT_THAT(run("LumaServer NO_SUCH", status), HasSubstr("not a message name: NO_SUCH"));
     EXPECT_EQ(status, 2);
     // Every argument is checked before anything is sent: a bad --expect type
     // must not let the measurement run first.
     const std::string badType = run("--expect q LumaServer EXEC_MEASUREMENT", status);
     EXPECT_EQ(status, 2);
-    EXPECT_NE(badType.find("unknown type in --expect: \"q\""), std::string::npos) << badType;
-    EXPECT_EQ(badType.find("status"), std::string::npos) << badType;
-    EXPECT_NE(
-        run("--timeout 1 Nobody IS_READY", status).find("Nobody is not registered and not running"),
-        std::string::npos);
+    EXPECT_THAT(badType, HasSubstr("unknown type in --expect: \"q\"")) << badType;
+    EXPECT_THAT(badType, Not(HasSubstr("status"))) << badType;
+    EXPECT_THAT(run("--timeout 1 Nobody IS_READY", status),
+                HasSubstr("Nobody is not registered and not running"));
     EXPECT_EQ(status, 3);
     // A stopped server: --timeout bounds the whole exchange, CONNECT included.
     PostOffice::CreatePostOffice("Tester");
@@ -419,7 +417,7 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     char printed[4096] = {};
     EXPECT_GT(::read(output[0], printed, sizeof printed - 1), 0);
     ::close(output[0]);
-    EXPECT_NE(std::string(printed).find("nxmsg -> GET_DEVICE_TYPE"), std::string::npos) << printed;
+    EXPECT_THAT(std::string(printed), HasSubstr("nxmsg -> GET_DEVICE_TYPE")) << printed;
 }
 
 TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
@@ -429,11 +427,10 @@ TEST_F(LumaServerTest, NxcolorMeasuresTheChartThroughTheServer) {
         nxtest::Shell(NXBASE_BINARY_DIR "/tools/nxcolor --measure 3 -f csv -p 2");
     EXPECT_EQ(status, 0) << output;
     EXPECT_EQ(std::count(output.begin(), output.end(), '\n'), 4) << output;
-    EXPECT_NE(output.find("id,name,X,Y,Z,L*,a*,b*,C*,h\n"), std::string::npos) << output;
+    EXPECT_THAT(output, HasSubstr("id,name,X,Y,Z,L*,a*,b*,C*,h\n")) << output;
     // The emulator measures the built-in chart: dark skin's values, to the
     // 1e-5 the server's integers keep.
-    EXPECT_NE(output.find(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"), std::string::npos)
-        << output;
+    EXPECT_THAT(output, HasSubstr(",11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n")) << output;
 }
 
 // The server's highest resident memory so far, in KiB.
@@ -584,8 +581,7 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
     RunUntil([] { return false; }, 1s);
     EXPECT_LT(CpuSeconds(server) - before, 0.2) << "the accept loop spins";
     // The log cannot open its file without descriptors; stderr says it.
-    EXPECT_NE(nxtest::ReadFile(root + "/server.err").find("accepting a connection failed"),
-              std::string::npos);
+    EXPECT_THAT(nxtest::ReadFile(root + "/server.err"), HasSubstr("accepting a connection failed"));
     for (int fd : idle) ::close(fd);
     // The closed ones free their descriptors; a new peer is served.
     int client = RawClient("Later");
@@ -641,8 +637,7 @@ TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePe
     level << static_cast<unsigned char>(2);
     EXPECT_FALSE(PostOffice::Instance()->SendAndReceive("LumaServer", CONNECT, level, answer));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 2s);
-    EXPECT_NE(PostOffice::Instance()->GetLastError().find("exited with status 3"),
-              std::string::npos)
+    EXPECT_THAT(PostOffice::Instance()->GetLastError(), HasSubstr("exited with status 3"))
         << PostOffice::Instance()->GetLastError();
     EXPECT_EQ(nxtest::ReadLines(root + "/starts").size(), 1u);
 }

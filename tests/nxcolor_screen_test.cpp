@@ -84,7 +84,7 @@ TEST(NxcolorScreen, IccProfileAgreesWithTheFormulasAndBadOnesFallBack) {
     // A profile named on the command line that cannot be used is a usage
     // error, not a silent fallback.
     ASSERT_EQ(RunNxcolor("--rgb --format csv -i D65 --icc-profile " + junk, &out, &err), 2);
-    EXPECT_NE(err.find("ICC profile not used"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("ICC profile not used")) << err;
     EXPECT_TRUE(out.empty());
     EXPECT_EQ(RunNxcolor("--icc-profile", &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--report", &out, &err), 2);
@@ -94,10 +94,10 @@ TEST(NxcolorScreen, ReportDrawsOneSwatchCurveAndLabelPerSample) {
     nxtest::TempDir dir;
     std::string svg = dir.File("chart.svg"), out, err;
     ASSERT_EQ(RunNxcolor("--report " + svg, &out, &err), 0) << err;
-    EXPECT_NE(err.find("chart picture written to " + svg), std::string::npos);
+    EXPECT_THAT(err, HasSubstr("chart picture written to " + svg));
     std::string text = nxtest::ReadFile(svg);
     ASSERT_EQ(text.rfind("<?xml", 0), 0u);
-    EXPECT_NE(text.find("</svg>\n"), std::string::npos);
+    EXPECT_THAT(text, HasSubstr("</svg>\n"));
     auto count = [&](const std::string& needle) {
         std::size_t n = 0;
         for (std::size_t at = text.find(needle); at != std::string::npos;
@@ -108,8 +108,8 @@ TEST(NxcolorScreen, ReportDrawsOneSwatchCurveAndLabelPerSample) {
     EXPECT_EQ(count("<polyline class=\"curve\""), 24u);
     EXPECT_EQ(count("class=\"lab\">L* "), 24u);
     EXPECT_EQ(count("rx=\"6\" fill=\"#"), 24u);
-    EXPECT_NE(text.find(">1 dark skin<"), std::string::npos);
-    EXPECT_NE(text.find("24 samples"), std::string::npos);
+    EXPECT_THAT(text, HasSubstr(">1 dark skin<"));
+    EXPECT_THAT(text, HasSubstr("24 samples"));
     // Every curve has the 36 points of the spectrum.
     const std::regex points("points=\"([^\"]*)\"");
     for (auto it = std::sregex_iterator(text.begin(), text.end(), points);
@@ -138,9 +138,9 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     std::string svg = dir.File("x.svg");
     ASSERT_TRUE(nxcolor::WriteSvgReport(report, MeasuringCondition(), svg, &error)) << error;
     std::string text = nxtest::ReadFile(svg);
-    EXPECT_EQ(text.find("<script>"), std::string::npos);
-    EXPECT_NE(text.find("&lt;script&gt;&amp;x "), std::string::npos);
-    EXPECT_NE(text.find("a&lt;b&gt;&amp;&quot;c&quot;"), std::string::npos);
+    EXPECT_THAT(text, Not(HasSubstr("<script>")));
+    EXPECT_THAT(text, HasSubstr("&lt;script&gt;&amp;x "));
+    EXPECT_THAT(text, HasSubstr("a&lt;b&gt;&amp;&quot;c&quot;"));
 
     // Windows-1252 names (a Windows export's "gr\xFCn") and file names that
     // are not UTF-8 become UTF-8: the SVG is well-formed for an XML parser.
@@ -148,8 +148,8 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     report.rows[0].id = "gr\xFCn";
     ASSERT_TRUE(nxcolor::WriteSvgReport(report, MeasuringCondition(), svg, &error)) << error;
     text = nxtest::ReadFile(svg);
-    EXPECT_NE(text.find("gr\xC3\xBCn"), std::string::npos);
-    EXPECT_NE(text.find("messung-\xC3\xA9t\xC3\xA9.csv"), std::string::npos);
+    EXPECT_THAT(text, HasSubstr("gr\xC3\xBCn"));
+    EXPECT_THAT(text, HasSubstr("messung-\xC3\xA9t\xC3\xA9.csv"));
     if (std::system("python3 -c 'import xml.etree.ElementTree' 2>/dev/null") == 0) {
         EXPECT_EQ(
             std::system(
@@ -159,7 +159,7 @@ TEST(NxcolorScreen, ReportEscapesIdsAndFailsCleanlyOnAnUnwritablePath) {
     }
     EXPECT_FALSE(nxcolor::WriteSvgReport(report, MeasuringCondition(),
                                          dir.File("no/such/dir/x.svg"), &error));
-    EXPECT_NE(error.find("cannot write"), std::string::npos);
+    EXPECT_THAT(error, HasSubstr("cannot write"));
 }
 
 // The spectral plot of random reports: a line piece per run of finite

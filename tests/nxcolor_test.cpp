@@ -57,8 +57,7 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     nxcolor::Writers().at("csv")(report, csv);
     const std::string text = csv.str();
     EXPECT_EQ(text.substr(0, text.find('\n')), "id,name,X,Y,Z,L*,a*,b*,C*,h,L99,a99,b99");
-    EXPECT_NE(text.find("\n1,dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"),
-              std::string::npos)
+    EXPECT_THAT(text, HasSubstr("\n1,dark skin,11.805,10.328,5.166,38.424,13.688,14.422,"))
         << text.substr(0, 200);
     std::ostringstream aligned;
     nxcolor::Writers().at("table")(report, aligned);
@@ -67,9 +66,9 @@ TEST(NxcolorReport, WritesTableAndCsvWithoutLocale) {
     // finds the data format (colour fields, no spectral ones).
     std::ostringstream cgats;
     nxcolor::Writers().at("cgats")(report, cgats);
-    EXPECT_NE(cgats.str().find(
-                  "SAMPLE_ID SAMPLE_NAME XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"),
-              std::string::npos);
+    EXPECT_THAT(
+        cgats.str(),
+        HasSubstr("SAMPLE_ID SAMPLE_NAME XYZ_X XYZ_Y XYZ_Z LAB_L LAB_A LAB_B LAB_C LAB_H DIN99_L"));
     const auto back = nxcolor::ParseSpectra(cgats.str(), "out.cgats");
     ASSERT_EQ(back.errors.size(), 1u);
     EXPECT_EQ(back.errors[0].rfind("out.cgats: spectral fields missing", 0), 0u) << back.errors[0];
@@ -105,22 +104,22 @@ TEST(NxcolorProgram, ReportsBadFilesClearly) {
     std::string out;
     std::string err;
     EXPECT_EQ(RunNxcolor(bad, &out, &err), 1);
-    EXPECT_NE(err.find(bad + ":3: 3 fields, expected 38"), std::string::npos) << err;
-    EXPECT_NE(out.find("1 ok"), std::string::npos) << "the good row is still printed";
+    EXPECT_THAT(err, HasSubstr(bad + ":3: 3 fields, expected 38")) << err;
+    EXPECT_THAT(out, HasSubstr("1 ok")) << "the good row is still printed";
 
     EXPECT_EQ(RunNxcolor(dir.File("missing.csv"), &out, &err), 2);
-    EXPECT_NE(err.find("missing.csv: cannot open the file"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("missing.csv: cannot open the file")) << err;
     EXPECT_EQ(RunNxcolor(dir.path().string(), &out, &err), 2);
-    EXPECT_NE(err.find("is a directory"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("is a directory")) << err;
 
     const std::string grid = dir.File("grid.csv");
     std::ofstream(grid) << "id,r400,r390\n1,0.5,0.5\n";
     EXPECT_EQ(RunNxcolor(grid, &out, &err), 2);
-    EXPECT_NE(err.find("grid.csv:1: fewer than 3 spectral columns"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("grid.csv:1: fewer than 3 spectral columns")) << err;
     EXPECT_TRUE(out.empty());
 
     EXPECT_EQ(RunNxcolor("--illuminant D42", &out, &err), 2);
-    EXPECT_NE(err.find("unknown illuminant \"D42\""), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("unknown illuminant \"D42\"")) << err;
     EXPECT_EQ(RunNxcolor("--observer 7", &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--precision x", &out, &err), 2);
 }
@@ -137,14 +136,13 @@ TEST(NxcolorProgram, PrintsTheBuiltInChartUnderAChosenCondition) {
     const std::string grey = dir.File("grey.csv");
     std::ofstream(grey) << "grey," << Values(0.1f) << "\n";
     ASSERT_EQ(RunNxcolor(grey + " --density 'Status T' -p 3 -f csv", &out, &err), 0) << err;
-    EXPECT_NE(out.find(",D_RED,D_GREEN,D_BLUE\ngrey,"), std::string::npos) << out;
-    EXPECT_NE(out.find(",1.000,1.000,1.000\n"), std::string::npos) << out;
+    EXPECT_THAT(out, HasSubstr(",D_RED,D_GREEN,D_BLUE\ngrey,")) << out;
+    EXPECT_THAT(out, HasSubstr(",1.000,1.000,1.000\n")) << out;
     EXPECT_EQ(RunNxcolor("--density 'Status Q'", &out, &err), 2);
     ASSERT_EQ(RunNxcolor("--help", &out, &err), 0);
-    EXPECT_NE(out.find("Usage: nxcolor"), std::string::npos);
+    EXPECT_THAT(out, HasSubstr("Usage: nxcolor"));
     ASSERT_EQ(RunNxcolor("--format=csv -p 2", &out, &err), 0);
-    EXPECT_NE(out.find("\n1,dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"),
-              std::string::npos)
+    EXPECT_THAT(out, HasSubstr("\n1,dark skin,11.81,10.33,5.17,38.42,13.69,14.42,19.88,46.50\n"))
         << out.substr(0, 200);
 }
 
@@ -157,11 +155,11 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
     std::string out;
     std::string err;
     EXPECT_EQ(RunNxcolor(rows + " --fraction --xyy -f csv", &out, &err), 1);
-    EXPECT_NE(err.find(rows + ":2: value"), std::string::npos) << err;
-    EXPECT_NE(err.find(rows + ":3: every value is zero"), std::string::npos) << err;
-    EXPECT_EQ(out.find("inf"), std::string::npos) << out;
-    EXPECT_EQ(out.find("nan"), std::string::npos) << out;
-    EXPECT_NE(out.find("\n4,ok,"), std::string::npos) << out;
+    EXPECT_THAT(err, HasSubstr(rows + ":2: value")) << err;
+    EXPECT_THAT(err, HasSubstr(rows + ":3: every value is zero")) << err;
+    EXPECT_THAT(out, Not(HasSubstr("inf"))) << out;
+    EXPECT_THAT(out, Not(HasSubstr("nan"))) << out;
+    EXPECT_THAT(out, HasSubstr("\n4,ok,")) << out;
 
     // An installed illuminant of absurd power is normalised like any other:
     // finite colours, no inf or nan.
@@ -179,8 +177,8 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
         program + " -i HOT -f csv >" + dir.File("o") + " 2>" + dir.File("e");
     const int status = std::system(command.c_str());
     EXPECT_EQ(WEXITSTATUS(status), 0) << nxtest::ReadFile(dir.File("e"));
-    EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("inf"), std::string::npos);
-    EXPECT_EQ(nxtest::ReadFile(dir.File("o")).find("nan"), std::string::npos);
+    EXPECT_THAT(nxtest::ReadFile(dir.File("o")), Not(HasSubstr("inf")));
+    EXPECT_THAT(nxtest::ReadFile(dir.File("o")), Not(HasSubstr("nan")));
     EXPECT_EQ(std::system((program + " --list-illuminants | grep -qx 'HOT (installed)'").c_str()),
               0);
     // The same table named by its path.
@@ -190,7 +188,7 @@ TEST(NxcolorProgram, RejectsRowsThatGiveNoFiniteColourAndBoundsItsInput) {
 
     // Binary and endless input end in a clear error, not in exhausted memory.
     EXPECT_EQ(RunNxcolor("/dev/zero", &out, &err), 2);
-    EXPECT_NE(err.find("binary data"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("binary data")) << err;
     EXPECT_EQ(RunNxcolor("--icc-profile " + dir.File("missing.icc") + " --rgb", &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--icc-profile " + dir.File("missing.icc"), &out, &err), 2);
     EXPECT_EQ(RunNxcolor("-i D42", &out, &err), 2);
@@ -205,12 +203,11 @@ TEST(NxcolorProgram, ReadsOtherGridsScalesAndNames) {
     ASSERT_EQ(RunNxcolor(five + " -f csv -p 2 -i d50 -v", &out, &err), 0) << err;
     // A 5 nm file: colour summed at 5 nm (the 10 nm path gives 11.81,10.33,
     // 5.17,38.42,13.69,... for the same patch).
-    EXPECT_NE(out.find("\n1,dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"),
-              std::string::npos)
+    EXPECT_THAT(out, HasSubstr("\n1,dark skin,11.80,10.33,5.17,38.43,13.66,14.43,19.87,46.57\n"))
         << out;
-    EXPECT_NE(err.find("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's "
-                       "own interval"),
-              std::string::npos)
+    EXPECT_THAT(
+        err, HasSubstr("71 wavelengths 380..730 nm, as read, percent; colour summed at the file's "
+                       "own interval"))
         << err;
     std::string f2, fl2;
     ASSERT_EQ(RunNxcolor("-i f2 -f csv", &f2, &err), 0) << err;
@@ -230,9 +227,9 @@ TEST(NxcolorProgram, CgatsOutputReadsBackWithItsSpectraAndIds) {
                    &out, &err),
         0)
         << err;
-    EXPECT_NE(out.find("\nCREATED \""), std::string::npos);
-    EXPECT_NE(out.find("\nWEIGHTING_FUNCTION \"ILLUMINANT, D65\"\n"), std::string::npos);
-    EXPECT_NE(out.find("\nDENSITY_STANDARD \"Status T\"\n"), std::string::npos);
+    EXPECT_THAT(out, HasSubstr("\nCREATED \""));
+    EXPECT_THAT(out, HasSubstr("\nWEIGHTING_FUNCTION \"ILLUMINANT, D65\"\n"));
+    EXPECT_THAT(out, HasSubstr("\nDENSITY_STANDARD \"Status T\"\n"));
     // LittleCMS reads it: ids and names apart, spectra to 6 decimals.
     cmsHANDLE it8 = cmsIT8LoadFromFile(nullptr, written.c_str());
     ASSERT_NE(it8, nullptr);
@@ -301,14 +298,14 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
     std::string out;
     std::string err;
     EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " -f csv", &out, &err), 1);
-    EXPECT_NE(out.find("id,dL*,dC*,dH*,dE00\nB grey,-3."), std::string::npos) << out;
-    EXPECT_NE(out.find("\nA paper,0.00,0.00,0.00,0.00\n"), std::string::npos) << out;
-    EXPECT_NE(err.find("sample \"C x\" has no reference"), std::string::npos) << err;
-    EXPECT_NE(err.find("# 2 pairs: mean dE00 "), std::string::npos) << err;
+    EXPECT_THAT(out, HasSubstr("id,dL*,dC*,dH*,dE00\nB grey,-3.")) << out;
+    EXPECT_THAT(out, HasSubstr("\nA paper,0.00,0.00,0.00,0.00\n")) << out;
+    EXPECT_THAT(err, HasSubstr("sample \"C x\" has no reference")) << err;
+    EXPECT_THAT(err, HasSubstr("# 2 pairs: mean dE00 ")) << err;
     EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --tolerance 1", &out, &err),
               3);
-    EXPECT_NE(out.find("# worst: B grey ("), std::string::npos) << out;
-    EXPECT_NE(out.find("# 1 of 2 pairs above the tolerance 1.00"), std::string::npos) << out;
+    EXPECT_THAT(out, HasSubstr("# worst: B grey (")) << out;
+    EXPECT_THAT(out, HasSubstr("# 1 of 2 pairs above the tolerance 1.00")) << out;
     EXPECT_EQ(
         RunNxcolor("--compare " + reference + " " + sample + " --tolerance 5 --de ab", &out, &err),
         1);
@@ -316,7 +313,7 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
     EXPECT_EQ(RunNxcolor("--compare " + reference + " " + sample + " --by-order --de cmc -f csv",
                          &out, &err),
               1);
-    EXPECT_NE(out.find("id,dL*,dC*,dH*,dE CMC(2:1)\nB grey,-"), std::string::npos) << out;
+    EXPECT_THAT(out, HasSubstr("id,dL*,dC*,dH*,dE CMC(2:1)\nB grey,-")) << out;
     EXPECT_EQ(RunNxcolor("--compare " + reference, &out, &err), 2);
     EXPECT_EQ(RunNxcolor("--compare --de 77 " + reference + " " + sample, &out, &err), 2);
 
@@ -330,10 +327,10 @@ TEST(NxcolorProgram, ComparesSamplesWithTheirReferences) {
         file << "\n";
     }
     EXPECT_EQ(RunNxcolor("--compare " + reference + " " + strangers, &out, &err), 2);
-    EXPECT_NE(err.find("no sample of " + strangers + " has a reference"), std::string::npos) << err;
-    EXPECT_NE(err.find("... and 990 more"), std::string::npos) << err;
+    EXPECT_THAT(err, HasSubstr("no sample of " + strangers + " has a reference")) << err;
+    EXPECT_THAT(err, HasSubstr("... and 990 more")) << err;
     EXPECT_LT(std::count(err.begin(), err.end(), '\n'), 20) << err;
-    EXPECT_EQ(out.find("pairs"), std::string::npos) << out;
+    EXPECT_THAT(out, Not(HasSubstr("pairs"))) << out;
 }
 
 }  // namespace

@@ -43,17 +43,16 @@ TEST_F(NxregTest, RegistersTheServerAndPeersAndShowsThem) {
     EXPECT_EQ(version.out, "3.2\n");
     Result list = Run("list 'HKLM\\software\\k-lume'");
     EXPECT_EQ(list.status, 0);
-    EXPECT_NE(list.out.find("HKEY_LOCAL_MACHINE\\Software\\K-Lume\n"), std::string::npos)
-        << list.out;
-    EXPECT_NE(list.out.find("[ChromaLink]"), std::string::npos) << list.out;
-    EXPECT_NE(list.out.find("[LumaServer]"), std::string::npos) << list.out;
+    EXPECT_THAT(list.out, HasSubstr("HKEY_LOCAL_MACHINE\\Software\\K-Lume\n")) << list.out;
+    EXPECT_THAT(list.out, HasSubstr("[ChromaLink]")) << list.out;
+    EXPECT_THAT(list.out, HasSubstr("[LumaServer]")) << list.out;
 
     EXPECT_EQ(Run("set --dword 'HKCU\\Software\\K-Lume\\App\\Log' Startup 1").status, 0);
     EXPECT_EQ(Run("set 'HKCU\\Software\\K-Lume\\App\\Log' Language 0").status, 0);
     Result options = Run("log-options 'Software\\K-Lume\\App'");
     EXPECT_EQ(options.status, 0);
-    EXPECT_NE(options.out.find("Startup = 1  (enabled)"), std::string::npos) << options.out;
-    EXPECT_NE(options.out.find("Language = 0  (disabled)"), std::string::npos) << options.out;
+    EXPECT_THAT(options.out, HasSubstr("Startup = 1  (enabled)")) << options.out;
+    EXPECT_THAT(options.out, HasSubstr("Language = 0  (disabled)")) << options.out;
 }
 
 TEST_F(NxregTest, ExportDeleteImportRestoresTheKeys) {
@@ -63,8 +62,8 @@ TEST_F(NxregTest, ExportDeleteImportRestoresTheKeys) {
     const std::string file = dir.File("trip.reg");
     ASSERT_EQ(Run("export " + key + " " + file).status, 0);
     std::string text = nxtest::ReadFile(file);
-    EXPECT_NE(text.find("\"Quoted\"=\"a \\\"b\\\" c:\\\\d\""), std::string::npos) << text;
-    EXPECT_NE(text.find("\"Count\"=dword:00000010"), std::string::npos) << text;
+    EXPECT_THAT(text, HasSubstr("\"Quoted\"=\"a \\\"b\\\" c:\\\\d\"")) << text;
+    EXPECT_THAT(text, HasSubstr("\"Count\"=dword:00000010")) << text;
 
     EXPECT_EQ(Run("delete " + key + " Count").status, 0);
     EXPECT_EQ(Run("delete " + key + " Count").status, 1);
@@ -87,27 +86,25 @@ TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
     nxtest::WriteFile(bad, "REGEDIT4\n[HKCU\\Software\\K-Lume]\n\"a\"=\"1\"\n\"b\"=dword:xyz\n");
     Result import = Run("import " + bad);
     EXPECT_EQ(import.status, 3);
-    EXPECT_NE(import.out.find(bad + ":4: a dword needs"), std::string::npos) << import.out;
+    EXPECT_THAT(import.out, HasSubstr(bad + ":4: a dword needs")) << import.out;
     EXPECT_EQ(Run("get 'HKCU\\Software\\K-Lume' a").status, 1);  // nothing applied
 
     // The first line is checked before the rest is read, and what is read is
     // bounded: endless inputs are refused instead of filling the memory.
     Result zeros = Run("import /dev/zero");
     EXPECT_EQ(zeros.status, 3);
-    EXPECT_NE(zeros.out.find("/dev/zero:1: the first line must be REGEDIT4"), std::string::npos)
-        << zeros.out;
+    EXPECT_THAT(zeros.out, HasSubstr("/dev/zero:1: the first line must be REGEDIT4")) << zeros.out;
     Result binary = Run("import -", "printf '\\177ELF\\002\\001\\n...'");
     EXPECT_EQ(binary.status, 3);
-    EXPECT_NE(binary.out.find("<stdin>:1: the first line must be REGEDIT4"), std::string::npos)
-        << binary.out;
+    EXPECT_THAT(binary.out, HasSubstr("<stdin>:1: the first line must be REGEDIT4")) << binary.out;
     Result huge = Run("import -", "{ printf 'REGEDIT4\\n'; cat /dev/zero; }");
     EXPECT_EQ(huge.status, 3);
-    EXPECT_NE(huge.out.find("<stdin>: more than 64 MiB"), std::string::npos) << huge.out;
+    EXPECT_THAT(huge.out, HasSubstr("<stdin>: more than 64 MiB")) << huge.out;
 
     nxtest::WriteFile(dir.File("user.sqlite"), std::string(4096, '#'));
     Result corrupt = Run("get 'HKCU\\Software' a");
     EXPECT_EQ(corrupt.status, 3);
-    EXPECT_NE(corrupt.out.find(dir.File("user.sqlite")), std::string::npos) << corrupt.out;
+    EXPECT_THAT(corrupt.out, HasSubstr(dir.File("user.sqlite"))) << corrupt.out;
 }
 
 TEST_F(NxregTest, OutputsKeepLinksFifosAndDevicesAndFailuresAreReported) {
@@ -128,7 +125,7 @@ TEST_F(NxregTest, OutputsKeepLinksFifosAndDevicesAndFailuresAreReported) {
     std::filesystem::create_symlink(target, dir.File("link.reg"));
     ASSERT_EQ(Run("export " + key + " " + dir.File("link.reg")).status, 0);
     EXPECT_TRUE(std::filesystem::is_symlink(dir.File("link.reg")));
-    EXPECT_NE(nxtest::ReadFile(target).find("\"Name\"=\"value\""), std::string::npos);
+    EXPECT_THAT(nxtest::ReadFile(target), HasSubstr("\"Name\"=\"value\""));
     // A FIFO is written through.
     std::string fifo = dir.File("pipe.reg");
     ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
@@ -136,13 +133,13 @@ TEST_F(NxregTest, OutputsKeepLinksFifosAndDevicesAndFailuresAreReported) {
     std::thread reader([&] { received = nxtest::ReadFile(fifo); });
     EXPECT_EQ(Run("export " + key + " " + fifo).status, 0);
     reader.join();
-    EXPECT_NE(received.find("REGEDIT4"), std::string::npos);
+    EXPECT_THAT(received, HasSubstr("REGEDIT4"));
     struct stat fifoInfo {};
     ASSERT_EQ(::lstat(fifo.c_str(), &fifoInfo), 0);
     EXPECT_TRUE(S_ISFIFO(fifoInfo.st_mode));
     // Nothing is left beside the targets.
     for (const auto& entry : std::filesystem::directory_iterator(dir.path())) {
-        EXPECT_EQ(entry.path().filename().string().find(".XXX"), std::string::npos);
+        EXPECT_THAT(entry.path().filename().string(), Not(HasSubstr(".XXX")));
         EXPECT_NE(entry.path().filename().string().front(), '.') << entry.path();
     }
 }

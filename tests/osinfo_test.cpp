@@ -52,9 +52,9 @@ TEST_F(OSInfoTest, ARemoteSessionCountsAsTerminalServer) {
     for (const auto& entry : std::filesystem::directory_iterator(Dir().path())) {
         log += nxtest::ReadFile(entry.path().string());
     }
-    EXPECT_NE(log.find("TerminalServer: 0"), std::string::npos) << log;
-    EXPECT_NE(log.find("TerminalServer: 1"), std::string::npos) << log;
-    EXPECT_NE(log.find("Computername length: "), std::string::npos) << log;
+    EXPECT_THAT(log, HasSubstr("TerminalServer: 0")) << log;
+    EXPECT_THAT(log, HasSubstr("TerminalServer: 1")) << log;
+    EXPECT_THAT(log, HasSubstr("Computername length: ")) << log;
 }
 
 }  // namespace

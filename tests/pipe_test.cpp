@@ -372,7 +372,7 @@ TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 2900ms);
     EXPECT_LT(took, 3500ms);
-    EXPECT_NE(pipe->GetLastError().find("EchoPeer"), std::string::npos) << pipe->GetLastError();
+    EXPECT_THAT(pipe->GetLastError(), HasSubstr("EchoPeer")) << pipe->GetLastError();
     ::kill(peer, SIGCONT);
     pipe->SetReceiveFunction(Record);
     EXPECT_EQ(RoundTrip("goes on"), "goes on");
@@ -409,7 +409,7 @@ TEST_F(PipeTest, PeersThatNeverReadAreCappedTogether) {
     EXPECT_TRUE(pipe->Send("Deaf1", "IS_READY", big));
     EXPECT_TRUE(pipe->Send("Deaf2", "IS_READY", big));
     EXPECT_FALSE(pipe->Send("Deaf3", "IS_READY", big + "more"));
-    EXPECT_NE(pipe->GetLastError().find("outgoing frames of all channels"), std::string::npos)
+    EXPECT_THAT(pipe->GetLastError(), HasSubstr("outgoing frames of all channels"))
         << pipe->GetLastError();
     EXPECT_TRUE(pipe->HasChannel("Deaf1"));
     EXPECT_TRUE(pipe->HasChannel("Deaf2"));
@@ -427,8 +427,7 @@ TEST_F(PipeTest, AFailedWriteClosesOnlyItsChannelAndSaysWhy) {
     failing.failSends = 1;
     MyMemoryBlock none;
     EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
-    EXPECT_NE(pipe->GetLastError().find("Input/output error"), std::string::npos)
-        << pipe->GetLastError();
+    EXPECT_THAT(pipe->GetLastError(), HasSubstr("Input/output error")) << pipe->GetLastError();
     EXPECT_FALSE(pipe->HasChannel("EchoPeer"));
     // The next send opens a new channel to the peer, which still runs.
     EXPECT_EQ(RoundTrip("after"), "after");
@@ -464,17 +463,16 @@ TEST_F(PipeTest, ARefusedRuntimeDirectoryIsAnErrorTheUserSees) {
     ASSERT_EQ(::chmod(runtime.c_str(), 0755), 0);
     pipe = Pipe::CreatePipe("PipeTestClient");
     EXPECT_FALSE(pipe->IsListening());
-    EXPECT_NE(pipe->GetRefusal().find("open to other users"), std::string::npos)
-        << pipe->GetRefusal();
+    EXPECT_THAT(pipe->GetRefusal(), HasSubstr("open to other users")) << pipe->GetRefusal();
     MyMemoryBlock none;
     EXPECT_FALSE(pipe->Send("EchoPeer", "IS_READY", none));
-    EXPECT_NE(pipe->GetLastError().find("runtime directory refused"), std::string::npos)
+    EXPECT_THAT(pipe->GetLastError(), HasSubstr("runtime directory refused"))
         << pipe->GetLastError();
     // The server says so and ends instead of running without a socket.
     if (::access(NXBASE_BINARY_DIR "/tools/lumaserver", X_OK) != 0) return;  // tools not built
     const nxtest::ShellResult server = nxtest::Shell(NXBASE_BINARY_DIR "/tools/lumaserver");
     EXPECT_GT(server.status, 0);
-    EXPECT_NE(server.out.find("open to other users"), std::string::npos) << server.out;
+    EXPECT_THAT(server.out, HasSubstr("open to other users")) << server.out;
     ::chmod(runtime.c_str(), 0700);
 }
 
@@ -523,7 +521,7 @@ TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     EXPECT_EQ(pipe->ChannelCount(), channels);
     EXPECT_FALSE(pipe->HasChannel("Intruder"));
     std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
-    EXPECT_EQ(log.find("Intruder"), std::string::npos);
+    EXPECT_THAT(log, Not(HasSubstr("Intruder")));
 }
 
 }  // namespace

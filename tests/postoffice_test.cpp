@@ -139,7 +139,7 @@ TEST_F(PostOfficeTest, ConnectLevelsUnknownNamesAndTheDefaultHandler) {
     peer.Send("DISCONNECT", "");
     EXPECT_EQ(peer.Next(), Answer("ANSWER!DISCONNECT", std::string("\x00", 1)));
     EXPECT_EQ(office->GetConnectionCount(), 1);
-    EXPECT_NE(Log().find("Botschafent Handler (Message nr: GET_DEVICE_TYPE"), std::string::npos);
+    EXPECT_THAT(Log(), HasSubstr("Botschafent Handler (Message nr: GET_DEVICE_TYPE"));
 }
 
 TEST_F(PostOfficeTest, APeersLockRefusesOthersUntilItUnlocks) {
@@ -181,8 +181,8 @@ TEST_F(PostOfficeTest, APeersLockRefusesOthersUntilItUnlocks) {
     EXPECT_TRUE(office->LockApplication());
     office->UnlockApplication();
     std::string log = Log();
-    EXPECT_NE(log.find("Lock fail: String"), std::string::npos);
-    EXPECT_NE(log.find("Lock fail: App already locked"), std::string::npos);
+    EXPECT_THAT(log, HasSubstr("Lock fail: String"));
+    EXPECT_THAT(log, HasSubstr("Lock fail: App already locked"));
 }
 
 struct BusyHandler {
@@ -276,7 +276,7 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 1s);
     EXPECT_LT(took, 3s);
-    EXPECT_NE(Log().find("NXBASE_WAIT_TIMEOUT"), std::string::npos);
+    EXPECT_THAT(Log(), HasSubstr("NXBASE_WAIT_TIMEOUT"));
     // The loop still serves: another exchange works.
     EXPECT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
 }
@@ -309,8 +309,8 @@ TEST_F(PostOfficeTest, OneMisbehavingPeerNeitherEndsTheServerNorSpeaksForAnother
     RunUntil([] { return false; }, 1500ms);
     EXPECT_FALSE(Application::Get().IsQuitting());
     EXPECT_EQ(server->GetConnectionCount(), 1);
-    EXPECT_NE(Log().find("claims to come from LumaServer"), std::string::npos);
-    EXPECT_NE(Log().find("Disconnect from Bad ignored"), std::string::npos);
+    EXPECT_THAT(Log(), HasSubstr("claims to come from LumaServer"));
+    EXPECT_THAT(Log(), HasSubstr("Disconnect from Bad ignored"));
     // The server ends one second after its last peer disconnects.
     EXPECT_TRUE(server->IsLPMServer());
     EXPECT_EQ(server->GetAnzahlApp(), 0u);
@@ -319,7 +319,7 @@ TEST_F(PostOfficeTest, OneMisbehavingPeerNeitherEndsTheServerNorSpeaksForAnother
     ASSERT_TRUE(RunUntil([] { return Application::Get().IsQuitting(); }, 3s));
     EXPECT_GE(std::chrono::steady_clock::now() - start, 900ms);
     EXPECT_LT(std::chrono::steady_clock::now() - start, 2s);
-    EXPECT_NE(Log().find("No more connections - Closing application"), std::string::npos);
+    EXPECT_THAT(Log(), HasSubstr("No more connections - Closing application"));
 }
 
 struct StallingHandler {
@@ -380,10 +380,10 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
               "right peer");
     RunUntil([] { return false; }, 100ms);
     for (const char* from : {"Other", "Asked"}) {
-        EXPECT_NE(Log().find(
-                      std::string("Answer nobody waits for dropped: ANSWER!GET_APP_VERSION from ") +
-                      from),
-                  std::string::npos)
+        EXPECT_THAT(
+            Log(),
+            HasSubstr(std::string("Answer nobody waits for dropped: ANSWER!GET_APP_VERSION from ") +
+                      from))
             << from;
     }
 
@@ -486,8 +486,7 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
     EXPECT_EQ(TextOf(answer), "after");
     EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 0u);
     const std::string log = Log();
-    EXPECT_NE(log.find("Late answer dropped: ANSWER!GET_SW_VERSION from EchoPeer"),
-              std::string::npos);
+    EXPECT_THAT(log, HasSubstr("Late answer dropped: ANSWER!GET_SW_VERSION from EchoPeer"));
 
     // A lost channel empties the queue: the restarted peer's answers start afresh.
     got.clear();
@@ -520,7 +519,7 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
         auto start = std::chrono::steady_clock::now();
         EXPECT_FALSE(office->SendAndReceive(peer, GET_APP_VERSION, request, answer));
         EXPECT_LT(std::chrono::steady_clock::now() - start, 500ms) << peer;
-        EXPECT_NE(office->GetLastError().find(why), std::string::npos) << office->GetLastError();
+        EXPECT_THAT(office->GetLastError(), HasSubstr(why)) << office->GetLastError();
     }
     // Without $NXBASE_WAIT_TIMEOUT a wait for a silent peer has no limit, even
     // where nobody can abort it (a measurement may wait for an operator);
@@ -543,7 +542,7 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 1400ms);
     EXPECT_LT(took, 3s);
-    EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
+    EXPECT_THAT(office->GetLastError(), HasSubstr("quits")) << office->GetLastError();
     // Quit also ends the wait for a peer being started.
     Application::Get().ResetQuit();
     quit.SetTimeout(300);
@@ -551,7 +550,7 @@ TEST_F(PostOfficeTest, AStartThatFailsEndsTheSendAtOnceAndAWaitHasNoTimeLimitBut
     start = std::chrono::steady_clock::now();
     EXPECT_FALSE(office->SendAndReceive("SlowPeer", IS_APP_READY, request, answer));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1500ms);
-    EXPECT_NE(office->GetLastError().find("quits"), std::string::npos) << office->GetLastError();
+    EXPECT_THAT(office->GetLastError(), HasSubstr("quits")) << office->GetLastError();
 }
 
 TEST_F(PostOfficeTest, AnAsynchronousSendWaitsForAStartWithoutALongTurnOfTheLoop) {
@@ -577,7 +576,7 @@ TEST_F(PostOfficeTest, AnAsynchronousSendWaitsForAStartWithoutALongTurnOfTheLoop
         }
         ASSERT_TRUE(result) << peer;
         EXPECT_EQ(result->answered, *expected == '\0') << peer << ": " << result->error;
-        EXPECT_NE(result->error.find(expected), std::string::npos) << result->error;
+        EXPECT_THAT(result->error, HasSubstr(expected)) << result->error;
         EXPECT_LT(longestTurn.count(), 100) << peer;
         if (!result->answered) {
             EXPECT_LT(std::chrono::steady_clock::now() - start, 700ms);
@@ -688,10 +687,10 @@ TEST_F(PostOfficeTest, AStartedProgramGetsNoDescriptorButTheStandardOnes) {
     EXPECT_FALSE(office->SendAndReceive("FdLister", GET_DEVICE_NAME, request, answer));
     // ls's own: 0 to 2 and the directory it reads.
     std::string fds = nxtest::ReadFile(root + "/fds.txt");
-    ASSERT_NE(fds.find(" 0 -> "), std::string::npos) << fds;
-    EXPECT_EQ(fds.find("socket:"), std::string::npos) << fds;
-    EXPECT_EQ(fds.find("anon_inode"), std::string::npos) << fds;
-    EXPECT_EQ(fds.find(".lock"), std::string::npos) << fds;
+    ASSERT_THAT(fds, HasSubstr(" 0 -> ")) << fds;
+    EXPECT_THAT(fds, Not(HasSubstr("socket:"))) << fds;
+    EXPECT_THAT(fds, Not(HasSubstr("anon_inode"))) << fds;
+    EXPECT_THAT(fds, Not(HasSubstr(".lock"))) << fds;
 }
 
 int gForwarded = 0;
@@ -743,10 +742,9 @@ TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefuse
         sent = office->Send("Peer", IS_READY, none);
     }).join();
     EXPECT_EQ(sent, 0);
-    EXPECT_NE(office->GetLastError().find("another thread"), std::string::npos);
+    EXPECT_THAT(office->GetLastError(), HasSubstr("another thread"));
     ASSERT_FALSE(ui->Boxes().empty());
-    EXPECT_NE(ui->Boxes().back().text.find("PostOffice used from another thread"),
-              std::string::npos);
+    EXPECT_THAT(ui->Boxes().back().text, HasSubstr("PostOffice used from another thread"));
     EXPECT_EQ(peer.Next(300ms).first, "<none>");
 }
 

@@ -52,7 +52,7 @@ std::vector<std::string> AssertionConditions(const RecordingUserInterface& ui) {
         EXPECT_EQ(box.text.rfind(head, 0), 0u) << box.text;
         auto end = box.text.find("\n failed", head.size());
         conditions.push_back(box.text.substr(head.size(), end - head.size()));
-        EXPECT_NE(box.text.find("file: waitvisu\n"), std::string::npos) << box.text;
+        EXPECT_THAT(box.text, HasSubstr("file: waitvisu\n")) << box.text;
     }
     return conditions;
 }
@@ -301,7 +301,7 @@ TEST(TerminalProgressListener, DrawsOnlyOnTerminalsAndThrottles) {
     std::string out = nxtest::ReadFile(path);
     EXPECT_EQ(std::count(out.begin(), out.end(), '\r'), 11);  // 0, 0.1, ..., 1.0
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1);   // the line ends at 1
-    EXPECT_NE(out.find("100%"), std::string::npos);
+    EXPECT_THAT(out, HasSubstr("100%"));
 }
 
 }  // namespace

@@ -79,7 +79,7 @@ TEST_F(QtMeasureTest, MeasuresTheChartAsNxcolorDoesAndMarksTheThreeFarthestFromT
         std::string lab;
         for (int c = 2; c <= 4; ++c) lab += "," + table->item(rows, c)->text().toStdString();
         EXPECT_EQ(line.rfind(shown, 0), 0u) << line << " vs " << shown;
-        EXPECT_NE(line.find(lab + ","), std::string::npos) << line << " vs " << lab;
+        EXPECT_THAT(line, HasSubstr(lab + ",")) << line << " vs " << lab;
     }
     EXPECT_EQ(rows, 24);
     // Notices of every measured patch reached the window.

@@ -312,8 +312,8 @@ TEST_F(RegistryTest, CorruptFileGivesAnErrorNamingItAndStaysUntouched) {
         RegistryHandler::GetValue(HKEY_CURRENT_USER, "Log", "Startup");
         FAIL() << "no exception";
     } catch (const nxbase::RegistryError& error) {
-        EXPECT_NE(std::string(error.what()).find(file), std::string::npos) << error.what();
-        EXPECT_NE(std::string(error.what()).find("corrupt"), std::string::npos) << error.what();
+        EXPECT_THAT(std::string(error.what()), HasSubstr(file)) << error.what();
+        EXPECT_THAT(std::string(error.what()), HasSubstr("corrupt")) << error.what();
         EXPECT_EQ(error.GetKind(), nxbase::RegistryErrorKind::kCorrupt);
     }
     EXPECT_THROW(RegistryHandler::AddRegistryEntry(HKEY_CURRENT_USER, "Log", "Startup", "1"),
@@ -345,12 +345,11 @@ TEST_F(RegistryTest, Regedit4ExportImportRoundTripKeepsEscapesAndDwords) {
                          RegistryValue::Text("x", ""));
 
     std::string text = nxbase::ExportRegedit4(RegistryHive::LocalMachine, key);
-    EXPECT_NE(text.find("\"Count\"=dword:0000000a\n"), std::string::npos) << text;
-    EXPECT_NE(text.find("\"Max\"=dword:ffffffff\n"), std::string::npos) << text;
-    EXPECT_NE(text.find("\"Path\"=\"C:\\\\Program Files\\\\K-Lume\\\\\"\n"), std::string::npos)
-        << text;
-    EXPECT_NE(text.find("\"Quote\\\"d\"=\"say \\\"hi\\\"\"\n"), std::string::npos) << text;
-    EXPECT_NE(text.find("@=\"unnamed\"\n"), std::string::npos) << text;
+    EXPECT_THAT(text, HasSubstr("\"Count\"=dword:0000000a\n")) << text;
+    EXPECT_THAT(text, HasSubstr("\"Max\"=dword:ffffffff\n")) << text;
+    EXPECT_THAT(text, HasSubstr("\"Path\"=\"C:\\\\Program Files\\\\K-Lume\\\\\"\n")) << text;
+    EXPECT_THAT(text, HasSubstr("\"Quote\\\"d\"=\"say \\\"hi\\\"\"\n")) << text;
+    EXPECT_THAT(text, HasSubstr("@=\"unnamed\"\n")) << text;
     EXPECT_EQ(text.rfind("REGEDIT4\n", 0), 0u);
 
     ASSERT_TRUE(RegistryStore::DeleteKey(RegistryHive::LocalMachine, key));
@@ -529,9 +528,9 @@ TEST_F(RegistryTest, LogOptionsInTheUsersHiveReachANewLogFile) {
     logFile.WriteLog("from the registry", "Startup");
     logFile.WriteLog("not enabled", "Locale");
     std::string text = nxtest::ReadFile(dir.File("registry-options.log"));
-    EXPECT_NE(text.find("ThreadId: "), std::string::npos) << text;
-    EXPECT_NE(text.find("from the registry"), std::string::npos) << text;
-    EXPECT_EQ(text.find("not enabled"), std::string::npos) << text;
+    EXPECT_THAT(text, HasSubstr("ThreadId: ")) << text;
+    EXPECT_THAT(text, HasSubstr("from the registry")) << text;
+    EXPECT_THAT(text, Not(HasSubstr("not enabled"))) << text;
 }
 
 TEST_F(RegistryTest, AKeyHolderFreesNoHiveAndANullKeyIsRefused) {

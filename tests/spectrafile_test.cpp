@@ -45,7 +45,7 @@ SpectraTable Chart() {
 // The table holds exactly one error, and it says `expected`.
 void ExpectOnlyError(const SpectraTable& table, const std::string& expected) {
     ASSERT_EQ(table.errors.size(), 1u) << expected;
-    EXPECT_NE(table.errors[0].find(expected), std::string::npos) << table.errors[0];
+    EXPECT_THAT(table.errors[0], HasSubstr(expected)) << table.errors[0];
 }
 
 TEST(SpectraFile, ReadsCsvRowsAndReportsBadOnesWithTheirLine) {
@@ -126,10 +126,9 @@ TEST(SpectraFile, TakesAnyIncreasingGridAndNumericHeaders) {
         ASSERT_TRUE(t.errors.empty()) << t.errors[0];
         ASSERT_EQ(t.rows.size(), 1u);
         EXPECT_EQ(t.rows[0].values[7], 0.4512f);
-        EXPECT_NE(t.rows[0].id.find(", hell"), std::string::npos) << t.rows[0].id;
+        EXPECT_THAT(t.rows[0].id, HasSubstr(", hell")) << t.rows[0].id;
         ASSERT_FALSE(t.notes.empty());
-        EXPECT_NE(t.notes[0].find("eu.csv: CSV with fields separated by"), std::string::npos)
-            << t.notes[0];
+        EXPECT_THAT(t.notes[0], HasSubstr("eu.csv: CSV with fields separated by")) << t.notes[0];
     }
 
     for (const std::string& bad :
@@ -172,8 +171,7 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     ASSERT_EQ(detected.rows.size(), 1u);
     EXPECT_TRUE(detected.percent);
     EXPECT_EQ(detected.rows[0].values[3], 0.5f);
-    EXPECT_NE(detected.scaleNote.find("p.csv: read as percentages: 1 of 1 spectra"),
-              std::string::npos)
+    EXPECT_THAT(detected.scaleNote, HasSubstr("p.csv: read as percentages: 1 of 1 spectra"))
         << detected.scaleNote;
 
     // The whole file decides, never a vote among rows: a typo (50 for 0.50)
@@ -214,10 +212,10 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
     ExpectOnlyError(guessed, "d.csv: the scale is unclear: line 2 fits only percentages");
     const SpectraTable allDark =
         nxbase::ParseSpectraCsv(Header() + "\n2,e," + Values(0.9) + "\n", "a.csv");
-    EXPECT_NE(allDark.scaleNote.find(
-                  "read as reflectance factors (white = 1): no value is above 1.5 and the file "
-                  "does not give its scale; if it holds dark patches in percent, --percent"),
-              std::string::npos)
+    EXPECT_THAT(
+        allDark.scaleNote,
+        HasSubstr("read as reflectance factors (white = 1): no value is above 1.5 and the file "
+                  "does not give its scale; if it holds dark patches in percent, --percent"))
         << allDark.scaleNote;
     const SpectraTable told = nxbase::ParseSpectraCsv(dark, "d.csv", {SpectralScale::kPercent});
     EXPECT_EQ(told.rows.size(), 2u);
@@ -227,15 +225,13 @@ TEST(SpectraFile, ChoosesTheScaleFromTheFileOrTheValues) {
         nxbase::ParseSpectraCsv(percent, "p.csv", {SpectralScale::kFraction});
     EXPECT_TRUE(forced.rows.empty());
     ASSERT_EQ(forced.errors.size(), 1u);
-    EXPECT_NE(forced.errors[0].find("p.csv:2: value 50"), std::string::npos) << forced.errors[0];
+    EXPECT_THAT(forced.errors[0], HasSubstr("p.csv:2: value 50")) << forced.errors[0];
     // Readers for other users name the choices their way.
     SpectralReadOptions keyword;
     keyword.percentChoice = "scale=\"percent\"";
     keyword.fractionChoice = "scale=\"fraction\"";
-    EXPECT_NE(nxbase::ParseSpectraCsv(dark, "d.csv", keyword)
-                  .errors.at(0)
-                  .find("scale=\"percent\" or scale=\"fraction\" says which"),
-              std::string::npos);
+    EXPECT_THAT(nxbase::ParseSpectraCsv(dark, "d.csv", keyword).errors.at(0),
+                HasSubstr("scale=\"percent\" or scale=\"fraction\" says which"));
     // A fraction file stays as it is: 1.25 in the blue is a fluorescent
     // paper's brightener, not percent, and its Y stays below the limit.
     const std::string paper = Values(1.25, 11) + "," + Values(0.92, 25);
@@ -438,8 +434,8 @@ TEST(SpectraFile, ReadsEveryValueUnderItsOwnWavelengthOrRefuses) {
     ASSERT_EQ(headerless.rows.size(), 1u);
     EXPECT_EQ(headerless.rows[0].sampleId, "7");
     ASSERT_EQ(headerless.assumptions.size(), 1u);
-    EXPECT_NE(headerless.assumptions[0].find("n.csv:1: no header: the last 36 of the 37 fields"),
-              std::string::npos)
+    EXPECT_THAT(headerless.assumptions[0],
+                HasSubstr("n.csv:1: no header: the last 36 of the 37 fields"))
         << headerless.assumptions[0];
     EXPECT_EQ(nxbase::ParseSpectra("\xEF\xBB\xBF" + argyll(""), "b.ti3").rows.size(), 1u);
     std::string utf16 = "\xFF\xFE";
@@ -479,18 +475,18 @@ TEST(SpectraFile, StreamsAreBoundedAndAgreeWithText) {
     const nxbase::SpectralSet capped = nxbase::ReadSpectralStream(limited, "s", few);
     EXPECT_EQ(capped.samples.size(), 10u);
     ASSERT_EQ(capped.errors.size(), 1u);
-    EXPECT_NE(capped.errors[0].find("more than 10 spectra"), std::string::npos);
+    EXPECT_THAT(capped.errors[0], HasSubstr("more than 10 spectra"));
 
     std::istringstream binary(std::string(1 << 20, '\0'));
     const nxbase::SpectralSet zeros = nxbase::ReadSpectralStream(binary, "/dev/zero");
     EXPECT_TRUE(zeros.unusable);
     ASSERT_EQ(zeros.errors.size(), 1u);
-    EXPECT_NE(zeros.errors[0].find("binary data"), std::string::npos);
+    EXPECT_THAT(zeros.errors[0], HasSubstr("binary data"));
     // One endless line stops at the line limit instead of filling memory.
     std::istringstream endless(std::string(4 * nxbase::kMaxLineLength, '1'));
     const nxbase::SpectralSet line = nxbase::ReadSpectralStream(endless, "e");
     ASSERT_EQ(line.errors.size(), 1u);
-    EXPECT_NE(line.errors[0].find("line longer than"), std::string::npos);
+    EXPECT_THAT(line.errors[0], HasSubstr("line longer than"));
     // Errors are bounded too.
     std::string junk;
     for (int i = 0; i < 1000; ++i) junk += "x,1,2\n";

@@ -3,6 +3,7 @@
 #ifndef NXBASE_TESTS_TEST_UTIL_H_
 #define NXBASE_TESTS_TEST_UTIL_H_
 
+#include <gmock/gmock.h>
 #include <sys/wait.h>
 
 #include <cstdio>
@@ -16,6 +17,10 @@
 #include <vector>
 
 #include "nxbase/logfile.h"
+
+// Text checks read as what they check and print the whole text on failure.
+using ::testing::HasSubstr;
+using ::testing::Not;
 
 namespace nxtest {
 

@@ -121,7 +121,7 @@ TEST(Thread, ExceptionInBodyIsLoggedAndTheThreadEnds) {
     worker.KillThread();
     EXPECT_TRUE(worker.IsFinished());
     std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
-    EXPECT_NE(log.find("!!! Thread Exception: boom"), std::string::npos);
+    EXPECT_THAT(log, HasSubstr("!!! Thread Exception: boom"));
 }
 
 // Runs until asked to stop and counts its runs; ends its thread itself.
@@ -184,8 +184,8 @@ TEST(Thread, DestroyingARunningThreadIsReportedWithItsName) {
     }
     auto boxes = ui->Boxes();
     ASSERT_EQ(boxes.size(), 1u);
-    EXPECT_NE(boxes[0].text.find("*****ASSERT*****"), std::string::npos);
-    EXPECT_NE(boxes[0].text.find("\"careless\" destroyed while running"), std::string::npos);
+    EXPECT_THAT(boxes[0].text, HasSubstr("*****ASSERT*****"));
+    EXPECT_THAT(boxes[0].text, HasSubstr("\"careless\" destroyed while running"));
 }
 
 // A read that a signal interrupts (its handler installed without
