@@ -3,7 +3,6 @@
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -163,21 +162,13 @@ TEST_F(AppConfigTest, WholeFileWritesKeepHardLinksAndTheFilesOwner) {
         ASSERT_EQ(::chown(data.c_str(), 65534, 65534), 0);
     }
     ASSERT_EQ(::chmod(closed.c_str(), 0555), 0);
-    const pid_t child = ::fork();
-    ASSERT_GE(child, 0);
-    if (child == 0) {
-        if (::geteuid() == 0 && (::setgid(65534) != 0 || ::setuid(65534) != 0)) ::_exit(2);
-        try {
-            nxbase::WriteWholeFile(data, "new\n");
-        } catch (const std::exception&) {
-            ::_exit(1);
-        }
-        ::_exit(0);
-    }
-    int status = -1;
-    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    const int code = nxtest::InChild([&] {
+        if (!nxtest::DropRoot()) return 2;
+        nxbase::WriteWholeFile(data, "new\n");  // a throw exits 125
+        return 0;
+    });
     ::chmod(closed.c_str(), 0755);
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    EXPECT_EQ(code, 0);
     EXPECT_EQ(ReadFile(data), "new\n");
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(closed),
                             std::filesystem::directory_iterator()),

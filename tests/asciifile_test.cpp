@@ -1,9 +1,6 @@
 #include "nxbase/asciifile.h"
 
 #include <gtest/gtest.h>
-#include <signal.h>
-#include <sys/resource.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <charconv>
@@ -375,24 +372,17 @@ TEST_F(ASCIIFileTest, WriteFailuresAreLatchedAndNeverThrowNorLeaveHalfFiles) {
     // and the failure latched.
     {
         const std::string limited = dir.File("limited.dat");
-        const pid_t child = ::fork();
-        ASSERT_GE(child, 0);
-        if (child == 0) {
-            ::signal(SIGXFSZ, SIG_IGN);
-            struct rlimit limit {
-                1000, 1000
-            };
-            ::setrlimit(RLIMIT_FSIZE, &limit);
-            ASCIIFileImpl file(String(limited), false);
-            for (int i = 0; i < 10; ++i) {
-                file.PutString("Line", String(std::string(295, 'a' + i)));
-                file.CheckOutError();
-            }
-            ::_exit(file.GetError() ? 0 : 1);
-        }
-        int status = 0;
-        ASSERT_EQ(::waitpid(child, &status, 0), child);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "the failure was not latched";
+        EXPECT_EQ(nxtest::InChild([&] {
+                      nxtest::LimitFileSize(1000);
+                      ASCIIFileImpl file(String(limited), false);
+                      for (int i = 0; i < 10; ++i) {
+                          file.PutString("Line", String(std::string(295, 'a' + i)));
+                          file.CheckOutError();
+                      }
+                      return file.GetError() ? 0 : 1;
+                  }),
+                  0)
+            << "the failure was not latched";
         const std::string written = nxtest::ReadFile(limited);
         EXPECT_EQ(written.size(), 3u * 301u);
         EXPECT_EQ(written.back(), '\n');

@@ -3,9 +3,7 @@
 
 #include <gtest/gtest.h>
 #include <signal.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <boost/make_shared.hpp>
@@ -28,13 +26,6 @@ namespace {
 using nxtest::ReadFile;
 using nxtest::TempDir;
 using nxtest::WriteFile;
-
-// Waits for a forked child and answers its exit code, -1 when it did not exit.
-int WaitExit(pid_t pid) {
-    int status = 0;
-    if (::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
-    return WEXITSTATUS(status);
-}
 
 // Keys of a group as "name=value" in file order.
 std::vector<std::string> Keys(Config& config, const char* group) {
@@ -243,9 +234,7 @@ TEST(IniFile, TwoProcessesWritingAThousandKeysEachLoseNone) {
     EXPECT_EQ(before.ReadKey("P1_0", "none"), "none");
     std::vector<pid_t> children;
     for (int p = 0; p < 2; ++p) {
-        pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
+        children.push_back(nxtest::Fork([&] {
             Config config(path);
             config.SetGroup(p == 0 ? "Shared" : "shared");
             bool ok = true;
@@ -253,11 +242,10 @@ TEST(IniFile, TwoProcessesWritingAThousandKeysEachLoseNone) {
                 std::string key = "P" + std::to_string(p) + "_" + std::to_string(i);
                 ok = config.WriteKey(key, std::to_string(i)) && ok;
             }
-            ::_exit(ok ? 0 : 1);
-        }
-        children.push_back(pid);
+            return ok ? 0 : 1;
+        }));
     }
-    for (pid_t pid : children) EXPECT_EQ(WaitExit(pid), 0);
+    for (pid_t pid : children) EXPECT_EQ(nxtest::WaitExit(pid), 0);
     EXPECT_EQ(before.ReadKey("P1_0", "none"), "0");
     Config config(path);
     config.SetGroup("Shared");
@@ -275,9 +263,7 @@ TEST(IniFile, AWriterKilledMidLoopLeavesTheOldOrTheNewFile) {
     const std::string path = dir.File("killed.ini");
     WriteFile(path, "[Loop]\nCounter = start\n");
     for (int round = 0; round < 5; ++round) {
-        pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
+        const pid_t pid = nxtest::Fork([&] {
             Config config(path);
             config.SetGroup("Loop");
             // Each write also grows a long value, so writes take a while.
@@ -285,11 +271,11 @@ TEST(IniFile, AWriterKilledMidLoopLeavesTheOldOrTheNewFile) {
                 config.WriteKey("Counter", std::to_string(i));
                 config.WriteKey("K" + std::to_string(i % 300), std::string(200, 'a' + i % 26));
             }
-        }
+            return 0;
+        });
         std::this_thread::sleep_for(std::chrono::milliseconds(30 + 17 * round));
         ::kill(pid, SIGKILL);
-        int status = 0;
-        ::waitpid(pid, &status, 0);
+        nxtest::WaitExit(pid);
 
         // A complete file: every line a group header or a full key line, and
         // the whole file as this writer would have saved it.
@@ -321,27 +307,22 @@ TEST(IniFile, AFailedWriteKeepsTheOldFileAndReportsALine) {
     const std::string before = ReadFile(path);
 
     // A file-size limit makes the temporary file's write fail halfway.
-    pid_t pid = ::fork();
-    ASSERT_GE(pid, 0);
-    if (pid == 0) {
-        ::signal(SIGXFSZ, SIG_IGN);
-        struct rlimit limit {
-            64, 64
-        };
-        ::setrlimit(RLIMIT_FSIZE, &limit);
-        std::vector<std::string> reported;
-        Config::SetErrorSink([&](const std::string& line) { reported.push_back(line); });
-        Config config(path);
-        config.SetGroup("G");
-        bool wrote = config.WriteKey("Key", std::string(500, 'x'));
-        // Nothing but the file and its lock is left in the directory.
-        bool cleaned = std::distance(std::filesystem::directory_iterator(dir.path()),
-                                     std::filesystem::directory_iterator()) == 2;
-        bool logged = reported.size() == 1 &&
+    EXPECT_EQ(nxtest::InChild([&] {
+                  nxtest::LimitFileSize(64);
+                  std::vector<std::string> reported;
+                  Config::SetErrorSink([&](const std::string& line) { reported.push_back(line); });
+                  Config config(path);
+                  config.SetGroup("G");
+                  bool wrote = config.WriteKey("Key", std::string(500, 'x'));
+                  // Nothing but the file and its lock is left in the directory.
+                  bool cleaned = std::distance(std::filesystem::directory_iterator(dir.path()),
+                                               std::filesystem::directory_iterator()) == 2;
+                  bool logged =
+                      reported.size() == 1 &&
                       reported[0].find("Cannot write configuration file \"" + path + "\"") == 0;
-        ::_exit(!wrote && cleaned && logged ? 0 : 1);
-    }
-    EXPECT_EQ(WaitExit(pid), 0);
+                  return !wrote && cleaned && logged ? 0 : 1;
+              }),
+              0);
     EXPECT_EQ(ReadFile(path), before);
 }
 
@@ -356,27 +337,20 @@ TEST(IniConfigStore, AnUnwritableDirectoryKeepsTheOldFileAndLogsTheFailure) {
     ::chmod((path + ".lock").c_str(), 0666);
     ::chmod(path.c_str(), 0444);  // a writable file would be rewritten in place
 
-    pid_t pid = ::fork();
-    ASSERT_GE(pid, 0);
-    if (pid == 0) {
-        // Root writes anywhere: drop to an unprivileged user first.
-        if (::geteuid() == 0 && (::setgid(65534) != 0 || ::setuid(65534) != 0)) ::_exit(2);
-        if (::geteuid() != 0) ::chmod(dir.path().c_str(), 0555);
-        auto recorder = boost::make_shared<nxtest::RecordingLog>();
-        LogFile::Instance()->AddLogListener(recorder);
-        IniConfig child(path);
-        child.WriteKey("G", "Key", "new");
-        bool logged = false;
-        for (const auto& line : recorder->lines) {
-            if (line.find("|Cannot write configuration file \"" + path + "\"") !=
-                std::string::npos) {
-                logged = true;
-            }
-        }
-        bool unchanged = child.ReadKey("G", "Key", "") == "old";
-        ::_exit(logged && unchanged ? 0 : 1);
-    }
-    EXPECT_EQ(WaitExit(pid), 0);
+    EXPECT_EQ(nxtest::InChild([&] {
+                  if (!nxtest::DropRoot()) return 2;  // root writes anywhere
+                  ::chmod(dir.path().c_str(), 0555);
+                  auto recorder = boost::make_shared<nxtest::RecordingLog>();
+                  LogFile::Instance()->AddLogListener(recorder);
+                  IniConfig child(path);
+                  child.WriteKey("G", "Key", "new");
+                  const std::string failure = "|Cannot write configuration file \"" + path;
+                  const bool logged = std::any_of(
+                      recorder->lines.begin(), recorder->lines.end(),
+                      [&](const std::string& line) { return line.find(failure) != line.npos; });
+                  return logged && child.ReadKey("G", "Key", "") == "old" ? 0 : 1;
+              }),
+              0);
     ::chmod(dir.path().c_str(), 0700);
     EXPECT_EQ(ReadFile(path), before);
 }

@@ -1,14 +1,12 @@
 #include "nxbase/logfile.h"
 
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <boost/make_shared.hpp>
-#include <csignal>
 #include <map>
 #include <regex>
 #include <set>
@@ -192,25 +190,18 @@ TEST_F(LogFileTest, ForeignOrOpenDirectoriesAndPlantedSymlinksAreNotUsed) {
 
 TEST_F(LogFileTest, AShortWriteCountsAsFailedAndListenersHearOfIt) {
     // A child process with a tiny file-size limit: the line is cut short.
-    pid_t child = ::fork();
-    ASSERT_GE(child, 0);
-    if (child == 0) {
-        ::signal(SIGXFSZ, SIG_IGN);
+    const int told = nxtest::InChild([] {
         LogFile log("full");
         auto listener = boost::make_shared<nxtest::RecordingLog>();
         log.AddLogListener(listener);
-        struct rlimit limit {};
-        limit.rlim_cur = limit.rlim_max = 200;
-        ::setrlimit(RLIMIT_FSIZE, &limit);
+        nxtest::LimitFileSize(200);
         log.WriteLog(std::string(400, 'y').c_str(), "");
-        bool told = listener->lines.size() == 2 &&
-                    listener->lines[1].find("!!! Log write failed") != std::string::npos;
-        ::_exit(told ? 0 : 1);
-    }
-    int status = 0;
-    ::waitpid(child, &status, 0);
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0) << "the listeners were not told of the failed write";
+        return listener->lines.size() == 2 &&
+                       listener->lines[1].find("!!! Log write failed") != std::string::npos
+                   ? 0
+                   : 1;
+    });
+    EXPECT_EQ(told, 0) << "the listeners were not told of the failed write";
 }
 
 TEST_F(LogFileTest, StackTraceIsWrittenOnlyWhenEnabled) {

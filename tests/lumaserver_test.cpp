@@ -192,20 +192,17 @@ TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPee
 }
 
 TEST_F(LumaServerTest, APeerThatDiesCountsAsDisconnectedAndFreesTheLock) {
-    pid_t child = ::fork();
-    if (child == 0) {
-        nxtest::LoopOfItsOwn();
-        PostOffice* office = PostOffice::CreatePostOffice("Crasher");
-        MyMemoryBlock level, lock, answer;
-        level << static_cast<unsigned char>(2);
-        lock << static_cast<unsigned char>(0);
-        bool ok = office->SendAndReceive("LumaServer", CONNECT, level, answer) &&
-                  office->SendAndReceive("LumaServer", LOCK, lock, answer);
-        ::_exit(ok ? 0 : 1);  // no UNLOCK, no DISCONNECT
-    }
-    int status = -1;
-    ::waitpid(child, &status, 0);
-    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    ASSERT_EQ(nxtest::InChild([] {
+                  nxtest::LoopOfItsOwn();
+                  PostOffice* office = PostOffice::CreatePostOffice("Crasher");
+                  MyMemoryBlock level, lock, answer;
+                  level << static_cast<unsigned char>(2);
+                  lock << static_cast<unsigned char>(0);
+                  bool ok = office->SendAndReceive("LumaServer", CONNECT, level, answer) &&
+                            office->SendAndReceive("LumaServer", LOCK, lock, answer);
+                  return ok ? 0 : 1;  // no UNLOCK, no DISCONNECT
+              }),
+              0);
     // Nobody else is connected: the server ends about a second later.
     auto deadline = std::chrono::steady_clock::now() + 5s;
     while (nxtest::ProcessRunning(serverExecutable) &&
@@ -403,12 +400,11 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     // A listener prints what comes and answers with the default handler.
     int output[2];
     ASSERT_EQ(::pipe(output), 0);
-    pid_t listener = ::fork();
-    if (listener == 0) {
+    const pid_t listener = nxtest::Fork([&] {
         ::dup2(output[1], 1);
         ::execl(NXBASE_BINARY_DIR "/tools/nxmsg", "nxmsg", "--listen", "Listener", nullptr);
-        ::_exit(127);
-    }
+        return 127;
+    });
     ::close(output[1]);
     ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("Listener"); }, 5s));
     EXPECT_EQ(run("--timeout 5 Listener GET_DEVICE_TYPE", status), "status 2\nbytes  02\n");
@@ -469,12 +465,11 @@ bool SendAll(int fd, const std::string& bytes) {
 }
 
 TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) {
-    pid_t server = ::fork();
-    if (server == 0) {
-        std::string program = root + "/bin/" + serverExecutable;
+    const std::string program = root + "/bin/" + serverExecutable;
+    const pid_t server = nxtest::Fork([&] {
         ::execl(program.c_str(), program.c_str(), nullptr);
-        ::_exit(127);
-    }
+        return 127;
+    });
     Reaper reaper{server};
     ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     long base = HighWaterKiB(server);
@@ -498,8 +493,7 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
     // closes channels rather than hold all of it, and serves the others.
     std::vector<pid_t> peers;
     for (int i = 0; i < 8; ++i) {
-        pid_t peer = ::fork();
-        if (peer == 0) {
+        peers.push_back(nxtest::Fork([&] {
             int fd = RawClient("Partial" + std::to_string(i));
             std::string head = nxbase::EncodeFrame(std::string()).substr(0, 0);
             std::uint32_t length = nxbase::kMaxFrameLength;
@@ -508,9 +502,8 @@ TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) 
             char byte;
             while (sent && ::recv(fd, &byte, 1, 0) > 0) {
             }
-            ::_exit(0);  // closed by the server
-        }
-        peers.push_back(peer);
+            return 0;  // closed by the server
+        }));
     }
     struct PeersReaper {
         std::vector<pid_t>& peers;
@@ -558,17 +551,16 @@ double CpuSeconds(pid_t pid) {
 }
 
 TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed) {
-    pid_t server = ::fork();
-    if (server == 0) {
+    const std::string program = root + "/bin/" + serverExecutable;
+    const pid_t server = nxtest::Fork([&] {
         int errors = ::open((root + "/server.err").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
         ::dup2(errors, 2);
         ::close(errors);
         rlimit limit{24, 24};
         ::setrlimit(RLIMIT_NOFILE, &limit);
-        std::string program = root + "/bin/" + serverExecutable;
         ::execl(program.c_str(), program.c_str(), nullptr);
-        ::_exit(127);
-    }
+        return 127;
+    });
     Reaper reaper{server};
     ASSERT_TRUE(RunUntil([] { return nxtest::Accepts(nxbase::RequestSocketPath("LumaServer")); }));
     std::vector<int> idle;
@@ -597,12 +589,11 @@ TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePe
     // A process of the server's name elsewhere does not count as the server.
     std::filesystem::create_directories(root + "/decoy");
     std::filesystem::copy_file("/bin/sleep", root + "/decoy/" + serverExecutable);
-    pid_t decoy = ::fork();
-    if (decoy == 0) {
-        std::string program = root + "/decoy/" + serverExecutable;
+    const std::string program = root + "/decoy/" + serverExecutable;
+    const pid_t decoy = nxtest::Fork([&] {
         ::execl(program.c_str(), program.c_str(), "30", nullptr);
-        ::_exit(127);
-    }
+        return 127;
+    });
     Reaper decoyReaper{decoy};
     PostOffice::CreatePostOffice("Tester");
     Connect();
@@ -647,38 +638,29 @@ TEST_F(LumaServerTest, FourClientProcessesLoseNoAnswerAndGetNoneTwice) {
     constexpr int kRounds = 10000;
     pid_t children[kClients];
     for (int c = 0; c < kClients; ++c) {
-        children[c] = ::fork();
-        if (children[c] != 0) continue;
-        nxtest::LoopOfItsOwn();
-        int failures = 0;
-        try {
+        children[c] = nxtest::Fork([&] {
+            nxtest::LoopOfItsOwn();
             PostOffice* office = PostOffice::CreatePostOffice(String("Soak" + std::to_string(c)));
             MyMemoryBlock level, answer;
             level << static_cast<unsigned char>(2);
-            if (!office->SendAndReceive("LumaServer", CONNECT, level, answer)) ::_exit(90);
+            if (!office->SendAndReceive("LumaServer", CONNECT, level, answer)) return 90;
             const int messages[3] = {GET_SERIE_NR, GET_DEVICE_TYPE, GET_APP_VERSION};
             const char* expected[3] = {"00454d552d3030303100", "000100", "00332e3000"};
+            int failures = 0;
             for (int i = 0; i < kRounds; ++i) {
                 MyMemoryBlock request, reply;
                 request << i;
-                if (!office->SendAndReceive("LumaServer", messages[i % 3], request, reply) ||
-                    Hex(reply) != expected[i % 3]) {
-                    ++failures;
-                }
+                failures +=
+                    !office->SendAndReceive("LumaServer", messages[i % 3], request, reply) ||
+                    Hex(reply) != expected[i % 3];
             }
             MyMemoryBlock none;
             office->Send("LumaServer", DISCONNECT, none);
             NxSingleton::DeleteAllSingleton();
-        } catch (...) {
-            ::_exit(91);
-        }
-        ::_exit(failures == 0 ? 0 : 1);
+            return failures == 0 ? 0 : 1;
+        });
     }
-    for (pid_t child : children) {
-        int status = 0;
-        ::waitpid(child, &status, 0);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    }
+    for (pid_t child : children) EXPECT_EQ(nxtest::WaitExit(child), 0);
 }
 
 // The spectrum answer against a model of it: decoded only when whole, of 36

@@ -94,6 +94,14 @@ inline bool RunUntil(const std::function<bool()>& done,
     return true;
 }
 
+// Runs the loop until the child `pid` ends; answers its exit code, -1 when
+// it did not exit or not within `limit`.
+inline int ExitWhileLooping(pid_t pid, std::chrono::milliseconds limit = std::chrono::seconds(10)) {
+    int status = 0;
+    if (!RunUntil([&] { return ::waitpid(pid, &status, WNOHANG) == pid; }, limit)) return -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
 // The id of a process whose executable has the file name `name`, or 0.
 inline pid_t FindProcess(const std::string& name) {
     DIR* proc = ::opendir("/proc");

@@ -210,14 +210,11 @@ TEST_F(PipeTest, APeerIsStartedOnDemandAndFramesOfEverySizeComeBackIntact) {
 
     // A second process under a name that is taken fails to listen and leaves
     // ours alone.
-    int status = 0;
-    pid_t twin = ::fork();
-    if (twin == 0) {
-        ::execl(NXBASE_PIPE_PEER, NXBASE_PIPE_PEER, "PipeTestClient", nullptr);
-        ::_exit(127);
-    }
-    ::waitpid(twin, &status, 0);
-    EXPECT_FALSE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    EXPECT_NE(nxtest::InChild([] {
+                  ::execl(NXBASE_PIPE_PEER, NXBASE_PIPE_PEER, "PipeTestClient", nullptr);
+                  return 127;
+              }),
+              0);
     EXPECT_EQ(RoundTrip("still here"), "still here");
 }
 
@@ -482,11 +479,10 @@ TEST_F(PipeTest, AListenerAcceptsTheMomentItsSocketAppears) {
     for (int round = 0; round < 20; ++round) {
         const std::string name = "Racer" + std::to_string(round);
         const std::string path = nxbase::RequestSocketPath(name);
-        pid_t peer = ::fork();
-        if (peer == 0) {
+        const pid_t peer = nxtest::Fork([&] {
             ::execl(NXBASE_PIPE_PEER, NXBASE_PIPE_PEER, name.c_str(), nullptr);
-            ::_exit(127);
-        }
+            return 127;
+        });
         auto deadline = std::chrono::steady_clock::now() + 10s;
         while (!std::filesystem::exists(path) && std::chrono::steady_clock::now() < deadline) {
         }
@@ -503,21 +499,16 @@ TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     ::chmod(runtime.c_str(), 0711);
     ::chmod(pipe->GetSocketPath().c_str(), 0666);
     std::size_t channels = pipe->ChannelCount();
-    pid_t child = ::fork();
-    if (child == 0) {
-        if (::setgid(65534) != 0 || ::setuid(65534) != 0) ::_exit(3);
+    const pid_t child = nxtest::Fork([&] {
+        if (!nxtest::DropRoot()) return 3;
         const int fd = nxtest::ConnectUnix(pipe->GetSocketPath());
-        if (fd < 0) ::_exit(4);
+        if (fd < 0) return 4;
         std::string request = nxbase::EncodeFrame("Intruder_1");
         (void)!::send(fd, request.data(), request.size(), MSG_NOSIGNAL);
         char reply[64];
-        ssize_t n = ::recv(fd, reply, sizeof reply, 0);  // closed without a reply
-        ::_exit(n <= 0 ? 0 : 5);
-    }
-    int status = -1;
-    ASSERT_TRUE(RunUntil([&] { return ::waitpid(child, &status, WNOHANG) == child; }));
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0);
+        return ::recv(fd, reply, sizeof reply, 0) <= 0 ? 0 : 5;  // closed without a reply
+    });
+    EXPECT_EQ(nxtest::ExitWhileLooping(child), 0);
     EXPECT_EQ(pipe->ChannelCount(), channels);
     EXPECT_FALSE(pipe->HasChannel("Intruder"));
     std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());

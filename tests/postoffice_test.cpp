@@ -389,26 +389,24 @@ TEST_F(PostOfficeTest, AnAnswerCountsOnlyFromThePeerAskedAndNoOtherIsKept) {
 
     // A flood of answers nobody asked for is dropped, not stored.
     long before = ResidentKiB();
-    pid_t flooder = ::fork();
-    if (flooder == 0) {
+    const pid_t flooder = nxtest::Fork([&] {
         // Blocking calls only: the child must not run the parent's event loop,
         // whose epoll instance it shares.
         const int fd = nxtest::ConnectUnix(path);
-        if (fd < 0) ::_exit(1);
+        if (fd < 0) return 1;
         std::string bytes = nxbase::EncodeFrame("Flooder_1");
         char reply[256];
         if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0 ||
             ::recv(fd, reply, sizeof reply, 0) <= 0)
-            ::_exit(2);
+            return 2;
         bytes = nxbase::EncodeFrame(
             nxbase::MessageBody("Flooder", "ANSWER!GET_APP_VERSION", std::string(4096, 'a')));
         for (int i = 0; i < 20000; ++i) {
-            if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) ::_exit(3);
+            if (::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) return 3;
         }
-        ::_exit(0);
-    }
-    int status = 0;
-    ASSERT_TRUE(RunUntil([&] { return ::waitpid(flooder, &status, WNOHANG) == flooder; }, 20s));
+        return 0;
+    });
+    ASSERT_EQ(nxtest::ExitWhileLooping(flooder, 20s), 0);
     RunUntil([] { return !Pipe::Instance()->HasChannel("Flooder"); }, 5s);
     if (!nxtest::kSanitized) {
         EXPECT_LT(ResidentKiB() - before, 16 * 1024) << "80 MB of unsolicited answers";
@@ -592,8 +590,7 @@ TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
     // A child that ends its copy, one that sends through it, one that makes
     // its own post office: the parent stays reachable and keeps its channels.
     for (int kind = 0; kind < 3; ++kind) {
-        pid_t child = ::fork();
-        if (child == 0) {
+        const pid_t child = nxtest::Fork([&] {
             int code = 0;
             if (kind == 0) NxSingleton::DeleteAllSingleton();
             if (kind == 1) {
@@ -613,11 +610,9 @@ TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
                            : 3;
                 NxSingleton::DeleteAllSingleton();
             }
-            ::_exit(code);
-        }
-        int status = -1;
-        ASSERT_TRUE(RunUntil([&] { return ::waitpid(child, &status, WNOHANG) == child; }));
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "child " << kind;
+            return code;
+        });
+        EXPECT_EQ(nxtest::ExitWhileLooping(child), 0) << "child " << kind;
         EXPECT_TRUE(std::filesystem::exists(socket)) << "child " << kind;
         EXPECT_TRUE(nxbase::IsApplicationRunning("Host")) << "child " << kind;
         RawPeer visitor("Visitor", socket);

@@ -1,7 +1,6 @@
 #include "nxbase/registry.h"
 
 #include <gtest/gtest.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -162,34 +161,21 @@ TEST_F(RegistryTest, TwoProcessesWritingOneHiveLoseNoKey) {
                          RegistryValue::Text("x", "1"));
     pid_t children[kProcesses];
     for (int p = 0; p < kProcesses; ++p) {
-        children[p] = ::fork();
-        ASSERT_GE(children[p], 0);
-        if (children[p] == 0) {
-            int status = 0;
-            try {
-                for (int i = 0; i < kKeysEach; ++i) {
-                    std::string key =
-                        "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
-                    RegistryStore::Write(RegistryHive::CurrentUser, key,
-                                         RegistryValue::Text("V", std::to_string(i)));
-                    // The machine's hive does not exist yet: both create it.
-                    if (i % kMachineEvery == 0) {
-                        RegistryStore::Write(RegistryHive::LocalMachine, key,
-                                             RegistryValue::Dword("V", i));
-                    }
-                }
-            } catch (const std::exception& error) {
-                std::fprintf(stderr, "child %d: %s\n", p, error.what());
-                status = 1;
+        children[p] = nxtest::Fork([&] {
+            for (int i = 0; i < kKeysEach; ++i) {
+                std::string key =
+                    "Software\\K-Lume\\P" + std::to_string(p) + "\\K" + std::to_string(i);
+                RegistryStore::Write(RegistryHive::CurrentUser, key,
+                                     RegistryValue::Text("V", std::to_string(i)));
+                // The machine's hive does not exist yet: both create it.
+                if (i % kMachineEvery == 0)
+                    RegistryStore::Write(RegistryHive::LocalMachine, key,
+                                         RegistryValue::Dword("V", i));
             }
-            ::_exit(status);
-        }
+            return 0;
+        });
     }
-    for (pid_t child : children) {
-        int status = 0;
-        ASSERT_EQ(::waitpid(child, &status, 0), child);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-    }
+    for (pid_t child : children) EXPECT_EQ(nxtest::WaitExit(child), 0);
     for (int p = 0; p < kProcesses; ++p) {
         std::string parent = "Software\\K-Lume\\P" + std::to_string(p);
         ASSERT_EQ(RegistryStore::SubKeys(RegistryHive::CurrentUser, parent).size(),
@@ -224,24 +210,13 @@ TEST_F(RegistryTest, ProcessesCreatingOneFreshHiveAtOnceAllSucceed) {
         nxtest::ScopedEnv hive("NXBASE_USER_REGISTRY", file);
         pid_t children[kProcesses];
         for (int p = 0; p < kProcesses; ++p) {
-            children[p] = ::fork();
-            if (children[p] == 0) {
-                int code = 0;
-                try {
-                    RegistryStore::Write(RegistryHive::CurrentUser, "Software\\Race",
-                                         RegistryValue::Dword("p" + std::to_string(p), 1));
-                } catch (const std::exception& e) {
-                    std::fprintf(stderr, "round %d process %d: %s\n", round, p, e.what());
-                    code = 1;
-                }
-                ::_exit(code);
-            }
+            children[p] = nxtest::Fork([&] {
+                RegistryStore::Write(RegistryHive::CurrentUser, "Software\\Race",
+                                     RegistryValue::Dword("p" + std::to_string(p), 1));
+                return 0;
+            });
         }
-        for (pid_t child : children) {
-            int status = 0;
-            ::waitpid(child, &status, 0);
-            if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) ++failures;
-        }
+        for (pid_t child : children) failures += nxtest::WaitExit(child) != 0;
         EXPECT_EQ(RegistryStore::Values(RegistryHive::CurrentUser, "Software\\Race").size(),
                   static_cast<std::size_t>(kProcesses));
     }
@@ -259,27 +234,16 @@ TEST_F(RegistryTest, TheMachineHiveKeepsNoSideFilesAndReadsFromAReadOnlyPlace) {
     ::chmod(file.c_str(), 0444);
     ::chmod(dir.File("machine").c_str(), 0555);
     ::chmod(dir.path().c_str(), 0755);
-    pid_t child = ::fork();
-    if (child == 0) {
-        if (::geteuid() == 0 && ::setuid(65534) != 0) ::_exit(3);  // a user without rights
-        if (::access(file.c_str(), R_OK) != 0) ::_exit(4);         // the build tree is closed to it
-        int code = 1;
-        try {
-            auto value = RegistryStore::Read(RegistryHive::LocalMachine,
-                                             "Software\\K-Lume\\LumaServer", "Version");
-            code = value && value->ToString() == "3.0" ? 0 : 2;
-        } catch (const std::exception& e) {
-            std::fprintf(stderr, "%s\n", e.what());
-        }
-        ::_exit(code);
-    }
-    int status = 0;
-    ::waitpid(child, &status, 0);
+    const int code = nxtest::InChild([&] {
+        if (!nxtest::DropRoot()) return 3;                // a user without rights
+        if (::access(file.c_str(), R_OK) != 0) return 4;  // the build tree is closed to it
+        auto value = RegistryStore::Read(RegistryHive::LocalMachine, "Software\\K-Lume\\LumaServer",
+                                         "Version");
+        return value && value->ToString() == "3.0" ? 0 : 2;
+    });
     ::chmod(dir.File("machine").c_str(), 0755);
-    ASSERT_TRUE(WIFEXITED(status));
-    if (WEXITSTATUS(status) == 4)
-        GTEST_SKIP() << "the test directory is not readable by user 65534";
-    EXPECT_EQ(WEXITSTATUS(status), 0);
+    if (code == 4) GTEST_SKIP() << "the test directory is not readable by user 65534";
+    EXPECT_EQ(code, 0);
 }
 
 TEST_F(RegistryTest, ThreadsWritingAndReadingShareNothingButTheFile) {

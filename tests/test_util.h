@@ -4,12 +4,16 @@
 #define NXBASE_TESTS_TEST_UTIL_H_
 
 #include <gmock/gmock.h>
+#include <signal.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <iterator>
 #include <optional>
 #include <sstream>
@@ -114,6 +118,48 @@ inline ShellResult Shell(const std::string& command) {
     const int status = ::pclose(pipe);
     result.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     return result;
+}
+
+// Runs `body` in a forked child that exits with the code it returns; one
+// that throws prints what it threw and exits 125 (the child must never
+// return into the test). Answers the child's id.
+inline pid_t Fork(const std::function<int()>& body) {
+    const pid_t pid = ::fork();
+    if (pid != 0) return pid;
+    int code = 125;
+    try {
+        code = body();
+    } catch (const std::exception& error) {
+        std::fprintf(stderr, "child %d: %s\n", static_cast<int>(::getpid()), error.what());
+    } catch (...) {
+    }
+    ::_exit(code);
+}
+
+// Waits for a child and answers its exit code, -1 when it did not exit.
+inline int WaitExit(pid_t pid) {
+    int status = 0;
+    if (pid < 0 || ::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
+    return WEXITSTATUS(status);
+}
+
+// Runs `body` in a child process and answers its exit code.
+inline int InChild(const std::function<int()>& body) {
+    return WaitExit(Fork(body));
+}
+
+// In a child: becomes the unprivileged user "nobody" when running as root,
+// for checks that root's rights would pass. False when that fails.
+inline bool DropRoot() {
+    return ::geteuid() != 0 || (::setgid(65534) == 0 && ::setuid(65534) == 0);
+}
+
+// In a child: files cannot grow beyond `bytes`; a write past it fails
+// instead of raising SIGXFSZ.
+inline void LimitFileSize(rlim_t bytes) {
+    ::signal(SIGXFSZ, SIG_IGN);
+    const rlimit limit{bytes, bytes};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
 }
 
 inline std::string ShellOutput(const std::string& command) {

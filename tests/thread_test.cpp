@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 #include <pthread.h>
 #include <signal.h>
-#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -271,8 +270,7 @@ TEST(RunInParts, AForkedChildServesItsOwnCalls) {
             });
     });
     std::this_thread::sleep_for(20ms);
-    const pid_t child = ::fork();
-    if (child == 0) {
+    const pid_t child = nxtest::Fork([] {
         // Slow parts, so that a helper surely takes some: two threads work.
         std::vector<std::atomic<int>> done(100000);
         std::mutex mutex;
@@ -285,8 +283,8 @@ TEST(RunInParts, AForkedChildServesItsOwnCalls) {
         });
         const bool once =
             std::all_of(done.begin(), done.end(), [](const auto& d) { return d == 1; });
-        ::_exit(once ? (workers.size() == 2 ? 0 : 2) : 1);
-    }
+        return once ? (workers.size() == 2 ? 0 : 2) : 1;
+    });
     stop = true;
     busy.join();
     int status = -1;
