@@ -9,6 +9,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -18,6 +19,7 @@
 #include <optional>
 #include <sstream>
 #include <string>
+#include <system_error>
 #include <vector>
 
 #include "nxbase/logfile.h"
@@ -122,10 +124,12 @@ inline ShellResult Shell(const std::string& command) {
 
 // Runs `body` in a forked child that exits with the code it returns; one
 // that throws prints what it threw and exits 125 (the child must never
-// return into the test). Answers the child's id.
+// return into the test). Answers the child's id, never -1: a failed fork
+// throws, so that no caller signals -1 (every process it may reach).
 inline pid_t Fork(const std::function<int()>& body) {
     const pid_t pid = ::fork();
-    if (pid != 0) return pid;
+    if (pid < 0) throw std::system_error(errno, std::generic_category(), "fork");
+    if (pid > 0) return pid;
     int code = 125;
     try {
         code = body();
@@ -139,7 +143,7 @@ inline pid_t Fork(const std::function<int()>& body) {
 // Waits for a child and answers its exit code, -1 when it did not exit.
 inline int WaitExit(pid_t pid) {
     int status = 0;
-    if (pid < 0 || ::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
+    if (::waitpid(pid, &status, 0) != pid || !WIFEXITED(status)) return -1;
     return WEXITSTATUS(status);
 }
 
