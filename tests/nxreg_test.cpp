@@ -38,21 +38,19 @@ TEST_F(NxregTest, RegistersTheServerAndPeersAndShowsThem) {
         EXPECT_EQ(Run(set).status, 0) << set;
     }
 
-    Result version = Run("get 'hklm\\software\\k-lume\\lumaserver' VERSION");
+    const Result version = Run("get 'hklm\\software\\k-lume\\lumaserver' VERSION");
     EXPECT_EQ(version.status, 0);
     EXPECT_EQ(version.out, "3.2\n");
-    Result list = Run("list 'HKLM\\software\\k-lume'");
-    EXPECT_EQ(list.status, 0);
-    EXPECT_THAT(list.out, HasSubstr("HKEY_LOCAL_MACHINE\\Software\\K-Lume\n")) << list.out;
-    EXPECT_THAT(list.out, HasSubstr("[ChromaLink]")) << list.out;
-    EXPECT_THAT(list.out, HasSubstr("[LumaServer]")) << list.out;
+    const Result list = Run("list 'HKLM\\software\\k-lume'");
+    for (const char* part :
+         {"HKEY_LOCAL_MACHINE\\Software\\K-Lume\n", "[ChromaLink]", "[LumaServer]"})
+        EXPECT_THAT(list, nxtest::Exits(0, part));
 
     EXPECT_EQ(Run("set --dword 'HKCU\\Software\\K-Lume\\App\\Log' Startup 1").status, 0);
     EXPECT_EQ(Run("set 'HKCU\\Software\\K-Lume\\App\\Log' Language 0").status, 0);
-    Result options = Run("log-options 'Software\\K-Lume\\App'");
-    EXPECT_EQ(options.status, 0);
-    EXPECT_THAT(options.out, HasSubstr("Startup = 1  (enabled)")) << options.out;
-    EXPECT_THAT(options.out, HasSubstr("Language = 0  (disabled)")) << options.out;
+    const Result options = Run("log-options 'Software\\K-Lume\\App'");
+    EXPECT_THAT(options, nxtest::Exits(0, "Startup = 1  (enabled)"));
+    EXPECT_THAT(options, nxtest::Exits(0, "Language = 0  (disabled)"));
 }
 
 TEST_F(NxregTest, ExportDeleteImportRestoresTheKeys) {
@@ -84,27 +82,20 @@ TEST_F(NxregTest, BadUsageAndBadFilesGiveClearErrorsAndExitCodes) {
 
     const std::string bad = dir.File("bad.reg");
     nxtest::WriteFile(bad, "REGEDIT4\n[HKCU\\Software\\K-Lume]\n\"a\"=\"1\"\n\"b\"=dword:xyz\n");
-    Result import = Run("import " + bad);
-    EXPECT_EQ(import.status, 3);
-    EXPECT_THAT(import.out, HasSubstr(bad + ":4: a dword needs")) << import.out;
+    EXPECT_THAT(Run("import " + bad), nxtest::Exits(3, bad + ":4: a dword needs"));
     EXPECT_EQ(Run("get 'HKCU\\Software\\K-Lume' a").status, 1);  // nothing applied
 
     // The first line is checked before the rest is read, and what is read is
     // bounded: endless inputs are refused instead of filling the memory.
-    Result zeros = Run("import /dev/zero");
-    EXPECT_EQ(zeros.status, 3);
-    EXPECT_THAT(zeros.out, HasSubstr("/dev/zero:1: the first line must be REGEDIT4")) << zeros.out;
-    Result binary = Run("import -", "printf '\\177ELF\\002\\001\\n...'");
-    EXPECT_EQ(binary.status, 3);
-    EXPECT_THAT(binary.out, HasSubstr("<stdin>:1: the first line must be REGEDIT4")) << binary.out;
-    Result huge = Run("import -", "{ printf 'REGEDIT4\\n'; cat /dev/zero; }");
-    EXPECT_EQ(huge.status, 3);
-    EXPECT_THAT(huge.out, HasSubstr("<stdin>: more than 64 MiB")) << huge.out;
+    EXPECT_THAT(Run("import /dev/zero"),
+                nxtest::Exits(3, "/dev/zero:1: the first line must be REGEDIT4"));
+    EXPECT_THAT(Run("import -", "printf '\\177ELF\\002\\001\\n...'"),
+                nxtest::Exits(3, "<stdin>:1: the first line must be REGEDIT4"));
+    EXPECT_THAT(Run("import -", "{ printf 'REGEDIT4\\n'; cat /dev/zero; }"),
+                nxtest::Exits(3, "<stdin>: more than 64 MiB"));
 
     nxtest::WriteFile(dir.File("user.sqlite"), std::string(4096, '#'));
-    Result corrupt = Run("get 'HKCU\\Software' a");
-    EXPECT_EQ(corrupt.status, 3);
-    EXPECT_THAT(corrupt.out, HasSubstr(dir.File("user.sqlite"))) << corrupt.out;
+    EXPECT_THAT(Run("get 'HKCU\\Software' a"), nxtest::Exits(3, dir.File("user.sqlite")));
 }
 
 TEST_F(NxregTest, OutputsKeepLinksFifosAndDevicesAndFailuresAreReported) {

@@ -166,6 +166,13 @@ inline void LimitFileSize(rlim_t bytes) {
     ::setrlimit(RLIMIT_FSIZE, &limit);
 }
 
+// Matches a ShellResult that exited with `status` and printed `part`; a
+// failure shows the whole output.
+MATCHER_P2(Exits, status, part, "exits " + ::testing::PrintToString(status)) {
+    *result_listener << "exit status " << arg.status << ", output:\n" << arg.out;
+    return arg.status == status && arg.out.find(part) != std::string::npos;
+}
+
 inline std::string ShellOutput(const std::string& command) {
     return Shell(command).out;
 }
