@@ -189,7 +189,7 @@ TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {
         EXPECT_TRUE(RunUntil([&] { return nxtest::Accepts(socket); }, 5s)) << person;
     }
     RunUntil([] { return false; }, 300ms);
-    EXPECT_EQ(Shell("pgrep -c -x " + Exe(server)), "2\n");
+    EXPECT_EQ(nxtest::ProcessesNamed(Exe(server)).size(), 2u);
     Shell("pkill -f " + server);
     // The server's bus name held by somebody else: it serves on its socket.
     auto holder = sdbus::createSessionBusConnection(nxbase::DdeBusName("LumaServer"));

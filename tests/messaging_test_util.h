@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstdint>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
@@ -102,26 +103,33 @@ inline int ExitWhileLooping(pid_t pid, std::chrono::milliseconds limit = std::ch
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-// The id of a process whose executable has the file name `name`, or 0.
-inline pid_t FindProcess(const std::string& name) {
+// The ids of the processes whose executable has the file name `name` (the
+// whole name: the kernel's process name, which pgrep -x compares, is cut to
+// 15 characters); `most` ends the search early.
+inline std::vector<pid_t> ProcessesNamed(const std::string& name, std::size_t most = SIZE_MAX) {
+    std::vector<pid_t> found;
     DIR* proc = ::opendir("/proc");
-    if (proc == nullptr) return 0;
-    pid_t found = 0;
+    if (proc == nullptr) return found;
     char target[4096];
     while (dirent* entry = ::readdir(proc)) {
+        if (found.size() >= most) break;
         std::string link = std::string("/proc/") + entry->d_name + "/exe";
         ssize_t n = ::readlink(link.c_str(), target, sizeof target - 1);
         if (n <= 0) continue;
         std::string path(target, static_cast<std::size_t>(n));
         if (path.size() > 10 && path.compare(path.size() - 10, 10, " (deleted)") == 0)
             path.resize(path.size() - 10);
-        if (path.substr(path.rfind('/') + 1) == name) {
-            found = static_cast<pid_t>(std::atoi(entry->d_name));
-            break;
-        }
+        if (path.substr(path.rfind('/') + 1) == name)
+            found.push_back(static_cast<pid_t>(std::atoi(entry->d_name)));
     }
     ::closedir(proc);
     return found;
+}
+
+// The id of a process whose executable has the file name `name`, or 0.
+inline pid_t FindProcess(const std::string& name) {
+    const std::vector<pid_t> found = ProcessesNamed(name, 1);
+    return found.empty() ? 0 : found[0];
 }
 
 inline bool ProcessRunning(const std::string& name) {
