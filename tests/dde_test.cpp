@@ -190,7 +190,9 @@ TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {
     }
     RunUntil([] { return false; }, 300ms);
     EXPECT_EQ(nxtest::ProcessesNamed(Exe(server)).size(), 2u);
+    // Both gone before the name is taken: a server still ending holds it.
     Shell("pkill -f " + server);
+    ASSERT_TRUE(RunUntil([&] { return nxtest::ProcessesNamed(Exe(server)).empty(); }, 5s));
     // The server's bus name held by somebody else: it serves on its socket.
     auto holder = sdbus::createSessionBusConnection(nxbase::DdeBusName("LumaServer"));
     ASSERT_EQ(std::system((server + " &").c_str()), 0);
