@@ -273,8 +273,12 @@ TEST_F(AppConfigTest, SettingsReadDefaultsWithoutAUserFileAndRoundTripThroughIt)
     EXPECT_EQ(user->ReadKey("Settings", "MetamerieTL2"), "FL11");
 
     // The whole value as a decimal number, a "+" allowed: else the default.
-    for (const auto& [text, part] :
-         {std::pair{"1.25", 1.25}, {"+0.75", 0.75}, {"0.5x", 0.5}, {"1,25", 0.5}, {"", 0.5}}) {
+    for (const auto& [text, part] : {std::pair{"1.25", 1.25},
+                                     {"+0.75", 0.75},
+                                     {"0.5x", 0.5},
+                                     {"1,25", 0.5},
+                                     {"+-0.5", 0.5},
+                                     {"", 0.5}}) {
         user->WriteKey("Settings", "DirectLightPart", text);
         settings->LoadProperties();
         EXPECT_DOUBLE_EQ(settings->GetDirectLightPart(), part) << text;

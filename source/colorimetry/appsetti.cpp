@@ -21,7 +21,10 @@ constexpr double kDefaultDirectLightPart = 0.5;
 // The whole text as a decimal number without locale, an optional "+" first
 // (a hand-edited file may carry one); `fallback` when it is not one.
 double ParseDouble(std::string_view text, double fallback) {
-    if (!text.empty() && text.front() == '+') text.remove_prefix(1);
+    if (!text.empty() && text.front() == '+') {
+        text.remove_prefix(1);
+        if (!text.empty() && text.front() == '-') return fallback;  // "+-0.5" is no number
+    }
     double value = fallback;
     return StringHelpers::ParseDecimal(text, value) ? value : fallback;
 }
