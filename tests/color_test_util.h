@@ -3,11 +3,9 @@
 #ifndef NXBASE_TESTS_COLOR_TEST_UTIL_H_
 #define NXBASE_TESTS_COLOR_TEST_UTIL_H_
 
-#include <array>
 #include <charconv>
 #include <cstdlib>
 #include <limits>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -67,19 +65,15 @@ struct CsvRow {
 // unparsable number becomes NaN (and fails the comparisons that read it).
 inline std::vector<CsvRow> ReadPatchCsv(const std::string& asPath) {
     std::vector<CsvRow> rows;
-    const std::vector<std::string> lines = ReadLines(asPath);
-    for (std::size_t i = 1; i < lines.size(); ++i) {  // after the header
-        if (lines[i].empty()) continue;
-        std::stringstream fields(lines[i]);
-        CsvRow row;
-        std::getline(fields, row.id, ',');
-        std::getline(fields, row.name, ',');
-        for (std::string field; std::getline(fields, field, ',');) {
+    for (const std::vector<std::string>& fields : ReadCsvRows(asPath)) {
+        CsvRow& row = rows.emplace_back();
+        row.id = fields.at(0);
+        row.name = fields.at(1);
+        for (std::size_t i = 2; i < fields.size(); ++i) {
             double v = std::numeric_limits<double>::quiet_NaN();
-            std::from_chars(field.data(), field.data() + field.size(), v);
+            std::from_chars(fields[i].data(), fields[i].data() + fields[i].size(), v);
             row.values.push_back(v);
         }
-        rows.push_back(row);
     }
     return rows;
 }

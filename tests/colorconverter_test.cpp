@@ -5,7 +5,6 @@
 
 #include <atomic>
 #include <cmath>
-#include <fstream>
 #include <map>
 #include <thread>
 #include <tuple>

@@ -8,7 +8,6 @@
 #include <boost/make_shared.hpp>
 #include <cstdlib>
 #include <memory>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -20,20 +19,6 @@ namespace nxtest {
 
 inline std::string ColorimetryData(const std::string& name) {
     return std::string(NXBASE_TEST_DATA_DIR) + "/colorimetry/" + name;
-}
-
-// The rows of a CSV file below the header, split at ",".
-inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path) {
-    std::vector<std::vector<std::string>> rows;
-    const std::vector<std::string> lines = ReadLines(path);
-    for (std::size_t i = 1; i < lines.size(); ++i) {
-        if (lines[i].empty()) continue;
-        std::vector<std::string> fields;
-        std::istringstream in(lines[i]);
-        for (std::string field; std::getline(in, field, ',');) fields.push_back(field);
-        rows.push_back(fields);
-    }
-    return rows;
 }
 
 inline double ToDouble(const std::string& text) {

@@ -8,10 +8,8 @@
 
 #include <boost/make_shared.hpp>
 #include <chrono>
-#include <cstdio>
 #include <map>
 #include <optional>
-#include <set>
 #include <string>
 #include <thread>
 #include <vector>

@@ -11,7 +11,6 @@
 #include <unistd.h>
 
 #include <cstdio>
-#include <thread>
 
 #include "messaging_test_util.h"
 #include "nxbase/logfile.h"
@@ -38,8 +37,7 @@ class DdeTest : public ::testing::Test {
     void SetUp() override {
         if (!sandbox.StartBus()) GTEST_SKIP() << "no dbus-daemon";
         sandbox.RegisterAbsentServer();
-        peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "ddepeer");
-        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peer);
+        peer = sandbox.AddPeer("EchoPeer", NXBASE_PIPE_PEER, "ddepeer");
         server = sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "ddeserver");
         gReceived.clear();
         Application::Get().ResetQuit();
@@ -48,14 +46,7 @@ class DdeTest : public ::testing::Test {
         NxSingleton::DeleteAllSingleton();
         Pipe::DeletePipe();
         Pipe::SetSocketListening(true);
-        for (const std::string& program : {peer, server}) {
-            if (!program.empty()) Shell("pkill -f " + program);
-        }
-        while (::waitpid(-1, nullptr, WNOHANG) > 0) {
-        }
-        sandbox.StopBus();
     }
-    std::string Exe(const std::string& path) { return path.substr(path.rfind('/') + 1); }
     nxtest::MessagingSandbox sandbox{"dde"};
     std::string peer, server;
 };
@@ -127,7 +118,7 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
     // Killed: the next send fails (its registered path does not exist), and
     // the loop goes on.
     Shell("pkill -9 -f " + server);
-    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(Exe(server)); }, 5s));
+    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(server); }, 5s));
     // Pokes are one way: the bus must have seen the death (the name freed)
     // before a send can know.
     ASSERT_TRUE(RunUntil(
@@ -149,11 +140,10 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined
     sandbox.StopBus();
     EXPECT_TRUE(RunUntil([] { return !DDE::Instance()->IsActive(); }, 5s));
     RunUntil([] { return false; }, 300ms);
-    EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
-    auto until = std::chrono::steady_clock::now() + 5s;
-    EXPECT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, [&] {
-        return std::chrono::steady_clock::now() < until;
-    })) << office->GetLastError();
+    EXPECT_TRUE(nxtest::ProcessRunning(server));
+    EXPECT_TRUE(
+        office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, nxtest::For(5s)))
+        << office->GetLastError();
     EXPECT_THAT(nxtest::ReadFile(LogFile::Instance()->GetFileName()),
                 HasSubstr("DDE is off: the session bus was lost"));
     // The bus comes back at its address: this process and the server join it again.
@@ -189,19 +179,18 @@ TEST_F(DdeTest, TwoPeopleOnOneBusEachRunAServerAndATakenNameLeavesTheSockets) {
         EXPECT_TRUE(RunUntil([&] { return nxtest::Accepts(socket); }, 5s)) << person;
     }
     RunUntil([] { return false; }, 300ms);
-    EXPECT_EQ(nxtest::ProcessesNamed(Exe(server)).size(), 2u);
+    EXPECT_EQ(nxtest::ProcessesNamed(server).size(), 2u);
     // Both gone before the name is taken: a server still ending holds it.
     Shell("pkill -f " + server);
-    ASSERT_TRUE(RunUntil([&] { return nxtest::ProcessesNamed(Exe(server)).empty(); }, 5s));
+    ASSERT_TRUE(RunUntil([&] { return nxtest::ProcessesNamed(server).empty(); }, 5s));
     // The server's bus name held by somebody else: it serves on its socket.
     auto holder = sdbus::createSessionBusConnection(nxbase::DdeBusName("LumaServer"));
     ASSERT_EQ(std::system((server + " &").c_str()), 0);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
     MyMemoryBlock request, answer;
-    auto until = std::chrono::steady_clock::now() + 5s;
-    EXPECT_TRUE(office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer,
-                                       [&] { return std::chrono::steady_clock::now() < until; }));
+    EXPECT_TRUE(
+        office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, nxtest::For(5s)));
 }
 
 TEST_F(DdeTest, APokeSpeaksOnlyForTheConnectionThatOwnsItsName) {
@@ -221,7 +210,7 @@ TEST_F(DdeTest, APokeSpeaksOnlyForTheConnectionThatOwnsItsName) {
         ".Poke string:LumaServer string:DISCONNECT array:byte:0x41,0x70,0x70,0x41,0x3a";
     EXPECT_THAT(Shell(spoof), HasSubstr("boolean false"));
     RunUntil([] { return false; }, 1500ms);
-    EXPECT_TRUE(nxtest::ProcessRunning(Exe(server)));
+    EXPECT_TRUE(nxtest::ProcessRunning(server));
     ASSERT_TRUE(
         office->SendAndReceive("LumaServer", GET_DEVICE_NAME, level, answer, [] { return true; }));
 }

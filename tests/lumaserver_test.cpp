@@ -12,16 +12,14 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <iterator>
 #include <optional>
 #include <random>
 #include <sstream>
-#include <thread>
 
+#include "color_test_util.h"
 #include "messaging_test_util.h"
 #include "nxbase/lumaclient.h"
 #include "nxbase/pipe.h"
@@ -38,14 +36,7 @@ using namespace std::chrono_literals;
 using nxtest::RunUntil;
 
 std::string Hex(const MyMemoryBlock& block) {
-    static const char kDigits[] = "0123456789abcdef";
-    std::string hex;
-    for (long i = 0; i < block.Len(); ++i) {
-        unsigned char c = static_cast<unsigned char>(block.GetDatenZeiger()[i]);
-        hex += kDigits[c >> 4];
-        hex += kDigits[c & 15];
-    }
-    return hex;
+    return nxtest::Hex(nxtest::Bytes(block));
 }
 
 std::string HexOf(const std::string& text) {
@@ -68,29 +59,8 @@ struct Notices {
 
 class LumaServerTest : public ::testing::Test {
   protected:
-    void SetUp() override {
-        root = sandbox.root();
-        std::string server =
-            sandbox.CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", "lumaserver");
-        serverExecutable = server.substr(server.rfind('/') + 1);
-        ASSERT_EQ(
-            std::system((root + "/bin/" + serverExecutable + " --register >/dev/null").c_str()), 0);
-        Application::Get().ResetQuit();
-    }
-    void TearDown() override {
-        if (PostOffice::IsInitialized() && Pipe::Instance()->HasChannel("LumaServer")) {
-            MyMemoryBlock none;
-            PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);
-        }
-        NxSingleton::DeleteAllSingleton();
-        auto deadline = std::chrono::steady_clock::now() + 5s;
-        while (nxtest::ProcessRunning(serverExecutable) &&
-               std::chrono::steady_clock::now() < deadline) {
-            std::this_thread::sleep_for(20ms);
-        }
-        while (::waitpid(-1, nullptr, WNOHANG) > 0) {
-        }
-    }
+    void SetUp() override { Application::Get().ResetQuit(); }
+    void TearDown() override { NxSingleton::DeleteAllSingleton(); }
     MyMemoryBlock Ask(int message, MyMemoryBlock request = MyMemoryBlock()) {
         MyMemoryBlock answer;
         EXPECT_TRUE(PostOffice::Instance()->SendAndReceive("LumaServer", message, request, answer))
@@ -104,14 +74,14 @@ class LumaServerTest : public ::testing::Test {
     }
 
     nxtest::MessagingSandbox sandbox{"luma"};
-    std::string root, serverExecutable;
+    const std::string root = sandbox.root(), lumaserver = sandbox.AddServer();
 };
 
 TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
-    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_FALSE(nxtest::ProcessRunning(lumaserver));
     Connect();  // starts the server on demand
-    EXPECT_TRUE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_TRUE(nxtest::ProcessRunning(lumaserver));
     for (int message : {IS_APP_READY, CANCEL_REQUEST, EXEC_WHITE_MEASUREMENT}) {
         EXPECT_EQ(Hex(Ask(message)), "00") << nxbase::MessageName(message);
     }
@@ -124,16 +94,7 @@ TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
     EXPECT_EQ(Hex(Ask(MOVE_HOME)), "02");         // not supported
 
     // The chart's patches in turn, and the first again after the last.
-    std::vector<std::vector<std::string>> chart;
-    for (const std::string& line : nxtest::ReadLines(
-             NXBASE_SOURCE_DIR "/tools/nxcolor/data/colorchecker_babelcolor_average.csv")) {
-        if (line.empty() || line[0] == '#' || !std::isdigit(static_cast<unsigned char>(line[0])))
-            continue;
-        std::vector<std::string> fields;
-        std::stringstream in(line);
-        for (std::string field; std::getline(in, field, ',');) fields.push_back(field);
-        chart.push_back(fields);
-    }
+    const std::vector<nxtest::CsvRow> chart = nxtest::ReadPatchCsv(nxtest::ChartPath());
     ASSERT_EQ(chart.size(), 24u);
     for (int i = 0; i < 25; ++i) {
         MyMemoryBlock measured = Ask(EXEC_MEASUREMENT);
@@ -149,14 +110,10 @@ TEST_F(LumaServerTest, EveryMessageIsAnsweredByteForByte) {
         spectrum >> status >> spectrumId >> count;
         EXPECT_EQ(spectrumId, id);
         ASSERT_EQ(count, 36);
-        const std::vector<std::string>& row = chart[static_cast<std::size_t>(i % 24)];
-        for (int k = 0; k < 36; ++k) {
+        for (double expected : chart[static_cast<std::size_t>(i % 24)].values) {
             int value = 0;
             spectrum >> value;
-            double expected = std::stod(row[row.size() - 36 + static_cast<std::size_t>(k)]);
-            EXPECT_EQ(value, static_cast<int>(std::lround(
-                                 static_cast<double>(static_cast<float>(expected)) * 100000.0)))
-                << i << " " << k;
+            EXPECT_EQ(value, std::lround(static_cast<float>(expected) * 100000.0)) << i;
         }
         EXPECT_FALSE(spectrum.ReadPastEnd());
         EXPECT_EQ(spectrum.Remaining(), 0);
@@ -185,7 +142,7 @@ TEST_F(LumaServerTest, NoticesGoToSubscribersOnlyAndTheServerEndsAfterTheLastPee
     MyMemoryBlock none;
     ASSERT_TRUE(office->Send("LumaServer", DISCONNECT, none));
     auto start = std::chrono::steady_clock::now();
-    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
+    ASSERT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(lumaserver); }, 5s));
     auto took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took, 900ms);
     EXPECT_LT(took, 3s);
@@ -204,16 +161,11 @@ TEST_F(LumaServerTest, APeerThatDiesCountsAsDisconnectedAndFreesTheLock) {
               }),
               0);
     // Nobody else is connected: the server ends about a second later.
-    auto deadline = std::chrono::steady_clock::now() + 5s;
-    while (nxtest::ProcessRunning(serverExecutable) &&
-           std::chrono::steady_clock::now() < deadline) {
-        std::this_thread::sleep_for(20ms);
-    }
-    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_TRUE(nxtest::WaitFor([&] { return !nxtest::ProcessRunning(lumaserver); }));
 }
 
 TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
-    std::string command = root + "/bin/" + serverExecutable + " --trigger-every 50 &";
+    std::string command = lumaserver + " --trigger-every 50 &";
     ASSERT_EQ(std::system(command.c_str()), 0);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     Notices notices;
@@ -233,14 +185,14 @@ TEST_F(LumaServerTest, TheTriggerKeyNotifiesWithoutARequest) {
     ASSERT_TRUE(nxbase::MeasureWithLumaServer(*office, 1, &measured, &error)) << error;
     std::size_t before = notices.received.size();
     RunUntil([] { return false; }, 1500ms);
-    EXPECT_TRUE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_TRUE(nxtest::ProcessRunning(lumaserver));
     EXPECT_GT(notices.received.size(), before + 5);
 }
 
 TEST_F(LumaServerTest, AnIdleServerSleeps) {
     PostOffice::CreatePostOffice("Tester");
     Connect();  // started on demand, with its check for being unused
-    pid_t server = nxtest::FindProcess(serverExecutable);
+    pid_t server = nxtest::FindProcess(lumaserver);
     ASSERT_NE(server, 0);
     const std::string status = "/proc/" + std::to_string(server) + "/status";
     RunUntil([] { return false; }, 300ms);
@@ -304,7 +256,7 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     // Blocking: killed after patch 8, the measurement fails at patch 9 and
     // what came before stays; neither the next request nor the cleanup
     // starts a server, which would measure from the first patch again.
-    KillAtPatch killer(serverExecutable, 8, 24);
+    KillAtPatch killer(lumaserver, 8, 24);
     std::vector<nxbase::MeasuredSpectrum> measured;
     std::string error;
     EXPECT_FALSE(nxbase::MeasureWithLumaServer(*office, 24, &measured, &error, &killer));
@@ -312,7 +264,7 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     ASSERT_EQ(measured.size(), 8u);
     EXPECT_EQ(measured[7].id, "8 purplish blue");
     RunUntil([] { return false; }, 300ms);
-    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_FALSE(nxtest::ProcessRunning(lumaserver));
 
     // Asynchronous: the same, a call-back per patch.
     std::vector<std::string> ids;
@@ -331,7 +283,7 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     EXPECT_EQ(*done, "LumaServer was lost at patch 6 of 24");
     EXPECT_EQ(ids, (std::vector<std::string>{"1", "2", "3", "4", "5"}));
     RunUntil([] { return false; }, 300ms);
-    EXPECT_FALSE(nxtest::ProcessRunning(serverExecutable));
+    EXPECT_FALSE(nxtest::ProcessRunning(lumaserver));
 
     // Undisturbed, it measures every patch in turn and releases the server.
     ids.clear();
@@ -349,7 +301,7 @@ TEST_F(LumaServerTest, AServerLostMidMeasurementFailsItAndIsNotStartedAgain) {
     // Nothing to measure is an error, not a success with no patches.
     EXPECT_FALSE(nxbase::MeasureWithLumaServer(*office, 0, &measured, &error));
     EXPECT_THAT(error, HasSubstr("at least 1")) << error;
-    EXPECT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(serverExecutable); }, 5s));
+    EXPECT_TRUE(RunUntil([&] { return !nxtest::ProcessRunning(lumaserver); }, 5s));
 }
 
 TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
@@ -387,7 +339,7 @@ TEST_F(LumaServerTest, NxmsgSendsTypedValuesAndPrintsTheAnswer) {
     // A stopped server: --timeout bounds the whole exchange, CONNECT included.
     PostOffice::CreatePostOffice("Tester");
     Connect();
-    pid_t server = nxtest::FindProcess(serverExecutable);
+    pid_t server = nxtest::FindProcess(lumaserver);
     ASSERT_NE(server, 0);
     ::kill(server, SIGSTOP);
     auto start = std::chrono::steady_clock::now();
@@ -465,9 +417,8 @@ bool SendAll(int fd, const std::string& bytes) {
 }
 
 TEST_F(LumaServerTest, LargeFramesAreHeldAtMostTwiceAndPartlyReadOnesAreCapped) {
-    const std::string program = root + "/bin/" + serverExecutable;
     const pid_t server = nxtest::Fork([&] {
-        ::execl(program.c_str(), program.c_str(), nullptr);
+        ::execl(lumaserver.c_str(), lumaserver.c_str(), nullptr);
         return 127;
     });
     Reaper reaper{server};
@@ -551,14 +502,13 @@ double CpuSeconds(pid_t pid) {
 }
 
 TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed) {
-    const std::string program = root + "/bin/" + serverExecutable;
     const pid_t server = nxtest::Fork([&] {
         int errors = ::open((root + "/server.err").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
         ::dup2(errors, 2);
         ::close(errors);
         rlimit limit{24, 24};
         ::setrlimit(RLIMIT_NOFILE, &limit);
-        ::execl(program.c_str(), program.c_str(), nullptr);
+        ::execl(lumaserver.c_str(), lumaserver.c_str(), nullptr);
         return 127;
     });
     Reaper reaper{server};
@@ -588,8 +538,9 @@ TEST_F(LumaServerTest, OutOfDescriptorsTheServerBacksOffAndServesAgainOnceFreed)
 TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePerSend) {
     // A process of the server's name elsewhere does not count as the server.
     std::filesystem::create_directories(root + "/decoy");
-    std::filesystem::copy_file("/bin/sleep", root + "/decoy/" + serverExecutable);
-    const std::string program = root + "/decoy/" + serverExecutable;
+    const std::string program =
+        root + "/decoy/" + std::filesystem::path(lumaserver).filename().string();
+    std::filesystem::copy_file("/bin/sleep", program);
     const pid_t decoy = nxtest::Fork([&] {
         ::execl(program.c_str(), program.c_str(), "30", nullptr);
         return 127;
@@ -614,7 +565,7 @@ TEST_F(LumaServerTest, StartOnDemandSeesOnlyThisUsersServerAndStartsAtMostOncePe
         NxSingleton::DeleteAllSingleton();
         PostOffice::CreatePostOffice("Tester");
     };
-    reRegister("exec " + root + "/bin/" + serverExecutable + " \"$@\"");
+    reRegister("exec " + lumaserver + " \"$@\"");
     Connect();
     EXPECT_EQ(nxtest::ReadLines(root + "/starts").size(), 1u);
     PostOffice::Instance()->Send("LumaServer", DISCONNECT, none);

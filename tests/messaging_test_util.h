@@ -22,6 +22,7 @@
 #include <string>
 #include <vector>
 
+#include "nxbase/mymemblo.h"
 #include "nxbase/registry.h"
 #include "test_util.h"
 #include "toolkit/application.h"
@@ -87,12 +88,17 @@ inline long ProcStatusField(const std::string& path, const std::string& field) {
 // Runs the loop until `done` or `limit`; false on the time-out.
 inline bool RunUntil(const std::function<bool()>& done,
                      std::chrono::milliseconds limit = std::chrono::seconds(10)) {
-    auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!done()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
-        Application::Get().RunOneFor(std::chrono::milliseconds(10));
-    }
-    return true;
+    return Until(done, limit, [] { Application::Get().RunOneFor(std::chrono::milliseconds(10)); });
+}
+
+// The bytes of a memory block, and a block holding `bytes`.
+inline std::string Bytes(const MyMemoryBlock& block) {
+    return std::string(block.GetDatenZeiger(), static_cast<std::size_t>(block.Len()));
+}
+inline MyMemoryBlock Block(const std::string& bytes) {
+    MyMemoryBlock block(static_cast<long>(bytes.size()));
+    block.Put(bytes.data(), static_cast<long>(bytes.size()));
+    return block;
 }
 
 // Runs the loop until the child `pid` ends; answers its exit code, -1 when
@@ -103,10 +109,11 @@ inline int ExitWhileLooping(pid_t pid, std::chrono::milliseconds limit = std::ch
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-// The ids of the processes whose executable has the file name `name` (the
-// whole name: the kernel's process name, which pgrep -x compares, is cut to
-// 15 characters); `most` ends the search early.
-inline std::vector<pid_t> ProcessesNamed(const std::string& name, std::size_t most = SIZE_MAX) {
+// The ids of the processes whose executable has the file name of `program`
+// (the whole name: the kernel's process name, which pgrep -x compares, is cut
+// to 15 characters); `most` ends the search early.
+inline std::vector<pid_t> ProcessesNamed(const std::string& program, std::size_t most = SIZE_MAX) {
+    const std::string name = program.substr(program.rfind('/') + 1);
     std::vector<pid_t> found;
     DIR* proc = ::opendir("/proc");
     if (proc == nullptr) return found;
@@ -126,14 +133,14 @@ inline std::vector<pid_t> ProcessesNamed(const std::string& name, std::size_t mo
     return found;
 }
 
-// The id of a process whose executable has the file name `name`, or 0.
-inline pid_t FindProcess(const std::string& name) {
-    const std::vector<pid_t> found = ProcessesNamed(name, 1);
+// The id of a process whose executable has the file name of `program`, or 0.
+inline pid_t FindProcess(const std::string& program) {
+    const std::vector<pid_t> found = ProcessesNamed(program, 1);
     return found.empty() ? 0 : found[0];
 }
 
-inline bool ProcessRunning(const std::string& name) {
-    return FindProcess(name) != 0;
+inline bool ProcessRunning(const std::string& program) {
+    return FindProcess(program) != 0;
 }
 
 // A directory under /tmp (short: socket paths are limited to 108 bytes) that
@@ -160,6 +167,7 @@ class MessagingSandbox {
     }
     ~MessagingSandbox() {
         StopBus();
+        EndPrograms();
         env_.clear();
         std::error_code ignored;
         std::filesystem::remove_all(root_, ignored);
@@ -186,7 +194,36 @@ class MessagingSandbox {
     std::string CopyProgram(const std::string& program, const std::string& base) {
         std::string copy = root_ + "/bin/" + base + std::to_string(::getpid());
         std::filesystem::copy_file(program, copy);
+        programs_.push_back(copy);
         return copy;
+    }
+    // A copy of `program` registered as the application `id`; answers its path.
+    std::string AddPeer(const std::string& id, const std::string& program,
+                        const std::string& base) {
+        const std::string copy = CopyProgram(program, base);
+        Register("Software\\K-Lume\\ChromaLink\\Applications", id.c_str(), copy);
+        return copy;
+    }
+    // A copy of lumaserver that registered itself as LumaServer; answers its path.
+    std::string AddServer(const std::string& base = "lumaserver") {
+        const std::string copy = CopyProgram(NXBASE_BINARY_DIR "/tools/lumaserver", base);
+        EXPECT_EQ(std::system((copy + " --register >/dev/null").c_str()), 0) << copy;
+        return copy;
+    }
+    // Ends the copies still running, as the sandbox does when it goes, and
+    // reaps the test's ended children. A peer left running would hold the
+    // test's output open.
+    void EndPrograms() const {
+        const auto running = [this] {
+            bool any = false;
+            for (const std::string& program : programs_) {
+                for (pid_t pid : ProcessesNamed(program)) any = ::kill(pid, SIGKILL) == 0 || any;
+            }
+            return any;
+        };
+        WaitFor([&] { return !running(); });
+        while (::waitpid(-1, nullptr, WNOHANG) > 0) {
+        }
     }
 
     // A private D-Bus session bus at <root>/bus, the process's session bus
@@ -205,10 +242,7 @@ class MessagingSandbox {
         }
         if (!busSet_) Env("DBUS_SESSION_BUS_ADDRESS", "unix:path=" + socket);
         busSet_ = true;
-        const auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-        while (!std::filesystem::exists(socket) && std::chrono::steady_clock::now() < until)
-            ::usleep(1000);
-        return std::filesystem::exists(socket);
+        return WaitFor([&] { return std::filesystem::exists(socket); });
     }
     void StopBus() {
         if (bus_ <= 0) return;
@@ -221,6 +255,7 @@ class MessagingSandbox {
   private:
     std::string root_;
     std::vector<std::unique_ptr<ScopedEnv>> env_;
+    std::vector<std::string> programs_;
     pid_t bus_ = -1;
     bool busSet_ = false;
 };

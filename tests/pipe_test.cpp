@@ -12,7 +12,6 @@
 
 #include <cstring>
 #include <filesystem>
-#include <functional>
 #include <random>
 #include <thread>
 
@@ -36,35 +35,17 @@ void Record(VELTRAEvent& event) {
     gReceived.push_back(event);
 }
 
-std::string Hex(const std::string& bytes) {
-    static const char kDigits[] = "0123456789abcdef";
-    std::string hex;
-    for (unsigned char c : bytes) {
-        hex += kDigits[c >> 4];
-        hex += kDigits[c & 15];
-        hex += ' ';
-    }
-    return hex;
-}
-
-std::string BytesOf(const MyMemoryBlock& block) {
-    return std::string(block.GetDatenZeiger(), static_cast<std::size_t>(block.Len()));
-}
-
-MyMemoryBlock BlockOf(const std::string& bytes) {
-    MyMemoryBlock block(static_cast<long>(bytes.size()));
-    block.Put(bytes.data(), static_cast<long>(bytes.size()));
-    return block;
-}
-
+using nxtest::Block;
+using nxtest::Bytes;
+using nxtest::Hex;
 using nxtest::RunUntil;
 
 TEST(PipeWire, FramesAndTheHandshakeByteForByte) {
     std::string stuffed = nxbase::EncodeBytes("\x00\x01\x02", 3);
     EXPECT_EQ(Hex(nxbase::EncodeFrame(nxbase::MessageBody("App", "LOCK", stuffed))),
-              "0e 00 00 00 41 70 70 00 4c 4f 43 4b 00 01 0a 01 01 02 ");
-    EXPECT_EQ(Hex(nxbase::EncodeFrame("App_42")), "06 00 00 00 41 70 70 5f 34 32 ");
-    EXPECT_EQ(Hex(nxbase::EncodeFrame(std::string(300, 'x')).substr(0, 4)), "2c 01 00 00 ");
+              "0e000000417070004c4f434b00010a010102");
+    EXPECT_EQ(Hex(nxbase::EncodeFrame("App_42")), "060000004170705f3432");
+    EXPECT_EQ(Hex(nxbase::EncodeFrame(std::string(300, 'x')).substr(0, 4)), "2c010000");
     {
         nxtest::ScopedEnv user("USERNAME", "");
         EXPECT_EQ(nxbase::PipeName("PipeRequest-LumaServer"), "PipeRequest-LumaServer");
@@ -108,11 +89,7 @@ TEST(PipeWire, TheFrameReaderTakesBytesInAnyPiecesAndRefusesHugeLengths) {
 class PipeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        root = sandbox.root();
-        runtime = sandbox.runtime();
-        peerProgram = sandbox.CopyProgram(NXBASE_PIPE_PEER, "echopeer");
         sandbox.RegisterAbsentServer();
-        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peerProgram);
         applications = std::make_unique<PostOfficeApplications>("PipeTestClient");
         pipe = Pipe::CreatePipe("PipeTestClient");
         pipe->SetReceiveFunction(Record);
@@ -134,23 +111,16 @@ class PipeTest : public ::testing::Test {
         }
         Pipe::DeletePipe();
         NxSingleton::DeleteAllSingleton();
-        // A peer nobody told to quit would hold the test's output open.
-        if (pid_t peer = nxtest::FindProcess(peerProgram.substr(peerProgram.rfind('/') + 1))) {
-            ::kill(peer, SIGKILL);
-        }
-        for (int i = 0; i < 100 && ::waitpid(-1, nullptr, WNOHANG) >= 0; ++i) {
-            std::this_thread::sleep_for(20ms);
-        }
     }
 
     // Sends `data` as GET_DEVICE_NAME to the echo peer and waits for the echo.
     std::string RoundTrip(const std::string& data) {
         std::size_t before = gReceived.size();
-        MyMemoryBlock block = BlockOf(data);
+        MyMemoryBlock block = Block(data);
         nxbase::EncodeBlock(block);
         if (!pipe->Send("EchoPeer", "GET_DEVICE_NAME", block)) return "<send failed>";
         if (!RunUntil([&] { return gReceived.size() > before; })) return "<no answer>";
-        return BytesOf(gReceived.back().GetData());
+        return Bytes(gReceived.back().GetData());
     }
 
     // A raw connection to our own request socket, handshake done.
@@ -170,7 +140,8 @@ class PipeTest : public ::testing::Test {
     }
 
     nxtest::MessagingSandbox sandbox{"pipe"};
-    std::string root, runtime, peerProgram;
+    const std::string root = sandbox.root(), runtime = sandbox.runtime(),
+                      peerProgram = sandbox.AddPeer("EchoPeer", NXBASE_PIPE_PEER, "echopeer");
     std::unique_ptr<PostOfficeApplications> applications;
     Pipe* pipe = nullptr;
 };
@@ -298,7 +269,7 @@ TEST_F(PipeTest, RandomStreamsArriveWholeAndEveryEndIsSeen) {
             << sent.size() << " frames, channel " << (pipe->HasChannel(name) ? "open" : "closed");
         std::vector<std::string> got;
         for (const VELTRAEvent& e : gReceived)
-            if (e.GetSender() == name) got.push_back(BytesOf(e.GetData()));
+            if (e.GetSender() == name) got.push_back(Bytes(e.GetData()));
         EXPECT_TRUE(got == sent) << "round " << round;
         if (ending != 2) ::close(fd);
         ASSERT_TRUE(RunUntil([&] { return !pipe->HasChannel(name); })) << "round " << round;
@@ -354,7 +325,7 @@ TEST_F(PipeTest, AConnectionMustSayWhoItIsAndAStoppedPeerNeverBlocksTheLoop) {
     // A peer stopped before it could answer the handshake: the caller's
     // keep-waiting function ends the wait when it says so, not the transport.
     ASSERT_EQ(RoundTrip("start it"), "start it");
-    pid_t peer = nxtest::FindProcess(peerProgram.substr(peerProgram.rfind('/') + 1));
+    pid_t peer = nxtest::FindProcess(peerProgram);
     ASSERT_GT(peer, 0);
     ASSERT_EQ(::kill(peer, SIGSTOP), 0);
     Pipe::DeletePipe();  // a fresh transport must open a new channel

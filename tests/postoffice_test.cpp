@@ -8,10 +8,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <iostream>
 #include <thread>
 
@@ -42,6 +40,12 @@ class RawPeer {
     ~RawPeer() { ::close(fd_); }
 
     void Send(const std::string& command, const std::string& data) { SendAs(name_, command, data); }
+    // Sends `command` and answers the next frame's command and data.
+    std::pair<std::string, std::string> Ask(const std::string& command,
+                                            const std::string& data = "") {
+        Send(command, data);
+        return Next();
+    }
     // A frame whose sender field names `sender`, whoever this peer is.
     void SendAs(const std::string& sender, const std::string& command, const std::string& data) {
         std::string stuffed = nxbase::EncodeBytes(data.data(), data.size());
@@ -78,24 +82,14 @@ class RawPeer {
 class PostOfficeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        root = sandbox.root();
         sandbox.Env("NXBASE_LOG_OPTIONS", "Communication,ApplicationLock");
-        std::string peer = sandbox.CopyProgram(NXBASE_PIPE_PEER, "popeer");
-        peerExecutable = peer.substr(peer.rfind('/') + 1);
         sandbox.RegisterAbsentServer();
-        sandbox.Register("Software\\K-Lume\\ChromaLink\\Applications", "EchoPeer", peer);
         Application::Get().ResetQuit();
     }
     void TearDown() override {
-        if (PostOffice::IsInitialized() && Pipe::Instance()->HasChannel("EchoPeer")) {
-            MyMemoryBlock none;
-            Pipe::Instance()->Send("EchoPeer", "QUIT", none);
-            RunUntil([] { return !Pipe::Instance()->HasChannel("EchoPeer"); }, 5s);
-        }
         NxSingleton::DeleteAllSingleton();
-        // A peer nobody told to quit would hold the test's output open.
-        if (pid_t peer = nxtest::FindProcess(peerExecutable)) ::kill(peer, SIGKILL);
-        while (::waitpid(-1, nullptr, 0) > 0) {
+        sandbox.EndPrograms();
+        while (::waitpid(-1, nullptr, 0) > 0) {  // the scripts' children too
         }
         Application::Get().ResetQuit();
     }
@@ -109,7 +103,8 @@ class PostOfficeTest : public ::testing::Test {
     }
 
     nxtest::MessagingSandbox sandbox{"po"};
-    std::string root, peerExecutable;
+    const std::string root = sandbox.root(),
+                      echoPeer = sandbox.AddPeer("EchoPeer", NXBASE_PIPE_PEER, "popeer");
     std::shared_ptr<RecordingUserInterface> ui = std::make_shared<RecordingUserInterface>();
     ScopedUserInterface scopedUi{ui};
 };
@@ -131,13 +126,10 @@ TEST_F(PostOfficeTest, ConnectLevelsUnknownNamesAndTheDefaultHandler) {
     peer.Send("CONNECT", std::string("\x00\x02", 2));  // level 0: the next byte counts
     EXPECT_EQ(peer.Next(), Answer("ANSWER!CONNECT", "\x02"));
     EXPECT_EQ(office->GetConnectionCount(), 2);
-    peer.Send("NO_SUCH_MESSAGE", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!NO_SUCH_MESSAGE", "\x01"));
+    EXPECT_EQ(peer.Ask("NO_SUCH_MESSAGE"), Answer("ANSWER!NO_SUCH_MESSAGE", "\x01"));
     peer.Send("ANSWER!NO_SUCH_MESSAGE", "");  // never answered back
-    peer.Send("GET_DEVICE_TYPE", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
-    peer.Send("DISCONNECT", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!DISCONNECT", std::string("\x00", 1)));
+    EXPECT_EQ(peer.Ask("GET_DEVICE_TYPE"), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    EXPECT_EQ(peer.Ask("DISCONNECT"), Answer("ANSWER!DISCONNECT", std::string("\x00", 1)));
     EXPECT_EQ(office->GetConnectionCount(), 1);
     EXPECT_THAT(Log(), HasSubstr("Botschafent Handler (Message nr: GET_DEVICE_TYPE"));
 }
@@ -146,25 +138,22 @@ TEST_F(PostOfficeTest, APeersLockRefusesOthersUntilItUnlocks) {
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
     RawPeer other("Other", Pipe::Instance()->GetSocketPath());
-    peer.Send("LOCK", "\x01");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!LOCK", std::string("\x00", 1)));
+    EXPECT_EQ(peer.Ask("LOCK", "\x01"), Answer("ANSWER!LOCK", std::string("\x00", 1)));
     EXPECT_EQ(office->GetLockOwner(), "Peer");
     EXPECT_EQ(office->GetLockCount(), 1);
-    other.Send("GET_DEVICE_TYPE", "");
-    EXPECT_EQ(other.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x01"));  // locked by Peer
-    peer.Send("GET_DEVICE_TYPE", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));  // the owner is served
+    EXPECT_EQ(other.Ask("GET_DEVICE_TYPE"),
+              Answer("ANSWER!GET_DEVICE_TYPE", "\x01"));  // locked by Peer
+    EXPECT_EQ(peer.Ask("GET_DEVICE_TYPE"),
+              Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));  // the owner is served
     {
         ApplicationLockHolder holder("while locked");
         EXPECT_FALSE(holder.Lock());
     }
-    peer.Send("UNLOCK", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!UNLOCK", std::string("\x00", 1)));
+    EXPECT_EQ(peer.Ask("UNLOCK"), Answer("ANSWER!UNLOCK", std::string("\x00", 1)));
     EXPECT_EQ(office->GetLockOwner(), "0");
     EXPECT_EQ(ui->Events(), (std::vector<std::string>{"wait 1", "enable 0", "wait 0", "enable 1"}));
     // UNLOCK without LOCK drives the count below zero and leaves the owner.
-    peer.Send("UNLOCK", "");
-    EXPECT_EQ(peer.Next().first, "ANSWER!UNLOCK");
+    EXPECT_EQ(peer.Ask("UNLOCK").first, "ANSWER!UNLOCK");
     EXPECT_EQ(office->GetLockCount(), -1);
     EXPECT_EQ(office->GetLockOwner(), "0");
 
@@ -256,8 +245,7 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
     // before its descriptors, its socket and name lock among them.
     RunUntil(
         [&] {
-            return !nxtest::ProcessRunning(peerExecutable) &&
-                   !nxbase::IsApplicationRunning("EchoPeer");
+            return !nxtest::ProcessRunning(echoPeer) && !nxbase::IsApplicationRunning("EchoPeer");
         },
         5s);
     // The next send starts it again.
@@ -265,9 +253,8 @@ TEST_F(PostOfficeTest, ALostOrSilentPeerEndsTheWaitAndTheLoopGoesOn) {
 
     // A peer that never answers: the keep-waiting function ends the wait ...
     start = std::chrono::steady_clock::now();
-    auto stopAt = start + 200ms;
-    EXPECT_FALSE(office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer,
-                                        [&] { return std::chrono::steady_clock::now() < stopAt; }));
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", IS_APP_READY, request, answer, nxtest::For(200ms)));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
     // ... and without one, the time-out of a handler that cannot ask a person.
     nxtest::ScopedEnv timeout("NXBASE_WAIT_TIMEOUT", "1");
@@ -285,13 +272,11 @@ TEST_F(PostOfficeTest, OneMisbehavingPeerNeitherEndsTheServerNorSpeaksForAnother
     PostOffice* server = PostOffice::CreatePostOffice("LumaServer");
     const std::string path = Pipe::Instance()->GetSocketPath();
     RawPeer good("Good", path);
-    good.Send("CONNECT", "\x02");
-    ASSERT_EQ(good.Next().second, "\x02");
+    ASSERT_EQ(good.Ask("CONNECT", "\x02").second, "\x02");
     {
         RawPeer bad("Bad", path);
         bad.Send("DISCONNECT", "");  // never connected
-        bad.Send("CONNECT", "\x02");
-        EXPECT_EQ(bad.Next().second, "\x02");
+        EXPECT_EQ(bad.Ask("CONNECT", "\x02").second, "\x02");
         bad.Send("DISCONNECT", "");
         bad.Send("DISCONNECT", "");  // a second one from the same peer
         // Frames claiming to come from another application, the server
@@ -473,10 +458,9 @@ TEST_F(PostOfficeTest, EveryAnswerGoesToItsOwnRequestAndALateOneToNobody) {
     ASSERT_TRUE(
         office->SendAndReceive("EchoPeer", GET_SW_VERSION, next, answer, [] { return true; }));
     EXPECT_EQ(TextOf(answer), "on time");
-    auto stopAt = std::chrono::steady_clock::now() + 50ms;
     MyMemoryBlock slow = Late(300, "slow");
-    EXPECT_FALSE(office->SendAndReceive("EchoPeer", GET_SW_VERSION, slow, answer,
-                                        [&] { return std::chrono::steady_clock::now() < stopAt; }));
+    EXPECT_FALSE(
+        office->SendAndReceive("EchoPeer", GET_SW_VERSION, slow, answer, nxtest::For(50ms)));
     EXPECT_EQ(office->GetOutstandingCount("EchoPeer", GET_SW_VERSION), 1u);
     next = Late(0, "after");
     ASSERT_TRUE(
@@ -603,11 +587,10 @@ TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
             if (kind == 2) {
                 PostOffice* own = PostOffice::CreatePostOffice("Child");
                 MyMemoryBlock none, reply;
-                auto until = std::chrono::steady_clock::now() + 3s;
-                code = own->SendAndReceive("EchoPeer", GET_DEVICE_NAME, none, reply,
-                                           [&] { return std::chrono::steady_clock::now() < until; })
-                           ? 0
-                           : 3;
+                code =
+                    own->SendAndReceive("EchoPeer", GET_DEVICE_NAME, none, reply, nxtest::For(3s))
+                        ? 0
+                        : 3;
                 NxSingleton::DeleteAllSingleton();
             }
             return code;
@@ -616,12 +599,10 @@ TEST_F(PostOfficeTest, AForkedChildLeavesItsParentsPostOfficeAlone) {
         EXPECT_TRUE(std::filesystem::exists(socket)) << "child " << kind;
         EXPECT_TRUE(nxbase::IsApplicationRunning("Host")) << "child " << kind;
         RawPeer visitor("Visitor", socket);
-        visitor.Send("GET_DEVICE_TYPE", "");
-        EXPECT_EQ(visitor.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02")) << "child " << kind;
-        auto until = std::chrono::steady_clock::now() + 3s;
+        EXPECT_EQ(visitor.Ask("GET_DEVICE_TYPE"), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"))
+            << "child " << kind;
         EXPECT_TRUE(
-            office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer,
-                                   [&] { return std::chrono::steady_clock::now() < until; }))
+            office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer, nxtest::For(3s)))
             << "child " << kind << ": " << office->GetLastError();
     }
 }
@@ -706,25 +687,21 @@ TEST_F(PostOfficeTest, AReceiveFunctionForwardsOrFiltersAndOtherThreadsAreRefuse
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     RawPeer peer("Peer", Pipe::Instance()->GetSocketPath());
     EXPECT_EQ(office->ChangeReceiveFunction(Forward), &PostOffice::DummyReceiveFunction);
-    peer.Send("GET_DEVICE_TYPE", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    EXPECT_EQ(peer.Ask("GET_DEVICE_TYPE"), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
     EXPECT_EQ(gForwarded, 1);
     office->ChangeReceiveFunction(DropDeviceTypeRequests);
     peer.Send("GET_DEVICE_TYPE", "");
     EXPECT_EQ(peer.Next(300ms).first, "<none>");
-    peer.Send("IS_READY", "");
-    EXPECT_EQ(peer.Next().first, "ANSWER!IS_READY");
+    EXPECT_EQ(peer.Ask("IS_READY").first, "ANSWER!IS_READY");
     // A function that chains to the one it replaced reaches the post office.
     gPrevious = office->ChangeReceiveFunction(&PostOffice::DummyReceiveFunction);
     gPrevious = office->ChangeReceiveFunction(Chain);
-    peer.Send("GET_DEVICE_TYPE", "");
-    EXPECT_EQ(peer.Next(), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
+    EXPECT_EQ(peer.Ask("GET_DEVICE_TYPE"), Answer("ANSWER!GET_DEVICE_TYPE", "\x02"));
     office->ChangeReceiveFunction(&PostOffice::DummyReceiveFunction);
     // A peer that says DISCONNECT and goes needs no answer, and the user no box.
     {
         RawPeer leaving("Leaving", Pipe::Instance()->GetSocketPath());
-        leaving.Send("CONNECT", "\x02");
-        EXPECT_EQ(leaving.Next().second, "\x02");
+        EXPECT_EQ(leaving.Ask("CONNECT", "\x02").second, "\x02");
         leaving.Send("DISCONNECT", "");
     }
     RunUntil([] { return !Pipe::Instance()->HasChannel("Leaving"); }, 2s);

@@ -10,7 +10,6 @@
 #include <QTableWidget>
 #include <QTest>
 #include <QTimer>
-#include <cstdio>
 #include <fstream>
 #include <sstream>
 
@@ -134,7 +133,7 @@ TEST_F(QtMeasureTest, SurvivesTheServerKilledMidMeasurementAndTheNextMeasurement
     pid_t killed = 0;
     QObject::connect(progress, &QProgressBar::valueChanged, [&](int value) {
         if (value <= 0 || killed != 0) return;
-        killed = nxtest::FindProcess(gui.serverExecutable);
+        killed = nxtest::FindProcess(gui.server);
         if (killed != 0) ::kill(killed, SIGKILL);
     });
     Click("measure");
@@ -152,7 +151,7 @@ TEST_F(QtMeasureTest, SurvivesTheServerKilledMidMeasurementAndTheNextMeasurement
     ASSERT_TRUE(ProcessUntil([&] { return !window->IsMeasuring(); }));
     EXPECT_EQ(window->Status().toStdString(), "Measured 3 patches.");
     EXPECT_EQ(window->Lab().size(), 3u);
-    EXPECT_NE(nxtest::FindProcess(gui.serverExecutable), killed);
+    EXPECT_NE(nxtest::FindProcess(gui.server), killed);
 }
 
 }  // namespace

@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 
 #include <boost/make_shared.hpp>
-#include <limits>
 #include <random>
 #include <stdexcept>
 #include <string>

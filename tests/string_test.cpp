@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <clocale>
-#include <locale>
 #include <random>
 #include <string>
 

@@ -10,6 +10,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -19,6 +20,7 @@
 #include <optional>
 #include <sstream>
 #include <string>
+#include <string_view>
 #include <system_error>
 #include <vector>
 
@@ -182,6 +184,51 @@ inline std::vector<std::string> ReadLines(const std::string& path) {
     std::istringstream in(ReadFile(path));
     for (std::string line; std::getline(in, line);) lines.push_back(line);
     return lines;
+}
+
+// The rows of a CSV file below its header, split at ",".
+inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path) {
+    std::vector<std::vector<std::string>> rows;
+    const std::vector<std::string> lines = ReadLines(path);
+    for (std::size_t i = 1; i < lines.size(); ++i) {
+        if (lines[i].empty()) continue;
+        std::istringstream in(lines[i]);
+        rows.emplace_back();
+        for (std::string field; std::getline(in, field, ',');) rows.back().push_back(field);
+    }
+    return rows;
+}
+
+// Bytes as lower-case hexadecimal pairs, `between` after each pair.
+inline std::string Hex(std::string_view bytes, const char* between = "") {
+    static const char kDigits[] = "0123456789abcdef";
+    std::string hex;
+    for (unsigned char c : bytes) hex += std::string{kDigits[c >> 4], kDigits[c & 15]} + between;
+    return hex;
+}
+
+// Calls `step` until `done` or `limit`; false on the time-out. `step` runs
+// an event loop for a moment, or only sleeps.
+inline bool Until(const std::function<bool()>& done, std::chrono::milliseconds limit,
+                  const std::function<void()>& step) {
+    const auto deadline = std::chrono::steady_clock::now() + limit;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        step();
+    }
+    return true;
+}
+
+// A keep-waiting function that says go on for `limit` from now.
+inline std::function<bool()> For(std::chrono::milliseconds limit) {
+    const auto until = std::chrono::steady_clock::now() + limit;
+    return [until] { return std::chrono::steady_clock::now() < until; };
+}
+
+// Waits, without running any loop, until `done` or `limit`.
+inline bool WaitFor(const std::function<bool()>& done,
+                    std::chrono::milliseconds limit = std::chrono::seconds(5)) {
+    return Until(done, limit, [] { ::usleep(10000); });
 }
 
 inline void WriteFile(const std::string& path, const std::string& bytes) {
