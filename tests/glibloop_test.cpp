@@ -15,17 +15,14 @@ using namespace std::chrono_literals;
 
 // Iterates the default context until `done` or `limit`; false on the time-out.
 bool IterateUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-    auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!done()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
+    return nxtest::Until(done, limit, [] {
         // A short time-out bounds each sleep, so that `done` is asked again.
         guint limit = g_timeout_add(
             10, [](gpointer) -> gboolean { return G_SOURCE_REMOVE; }, nullptr);
         g_main_context_iteration(nullptr, TRUE);
         if (GSource* left = g_main_context_find_source_by_id(nullptr, limit))
             g_source_destroy(left);
-    }
-    return true;
+    });
 }
 
 class GlibLoopTest : public ::testing::Test {

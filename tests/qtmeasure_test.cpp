@@ -44,12 +44,9 @@ class QtMeasureTest : public ::testing::Test {
         window->findChild<QSpinBox*>(QStringLiteral("patches"))->setValue(count);
     }
     bool ProcessUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = 10s) {
-        auto deadline = std::chrono::steady_clock::now() + limit;
-        while (!done()) {
-            if (std::chrono::steady_clock::now() > deadline) return false;
+        return nxtest::Until(done, limit, [] {
             QCoreApplication::processEvents(QEventLoop::WaitForMoreEvents, 20);
-        }
-        return true;
+        });
     }
 
     nxtest::GuiSandbox gui;

@@ -199,11 +199,11 @@ inline std::vector<std::vector<std::string>> ReadCsvRows(const std::string& path
     return rows;
 }
 
-// Bytes as lower-case hexadecimal pairs, `between` after each pair.
-inline std::string Hex(std::string_view bytes, const char* between = "") {
+// Bytes as lower-case hexadecimal pairs.
+inline std::string Hex(std::string_view bytes) {
     static const char kDigits[] = "0123456789abcdef";
     std::string hex;
-    for (unsigned char c : bytes) hex += std::string{kDigits[c >> 4], kDigits[c & 15]} + between;
+    for (unsigned char c : bytes) hex += {kDigits[c >> 4], kDigits[c & 15]};
     return hex;
 }
 
