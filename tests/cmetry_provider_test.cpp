@@ -170,6 +170,7 @@ TEST_F(CMetryProviderInDataDir, BadIlluminantFilesAreRejectedWithFileAndLine) {
     };
     const Case cases[] = {
         {"Text", "wavelength,value\n380,1\n390,abc\n", "line 3: not a number: abc"},
+        {"Signs", "wavelength,value\n+380,1\n390,+-1\n", "line 3: not a number: +-1"},
         {"Short", "wavelength,value\n380,1\n390\n", "line 3: wrong number of fields"},
         {"Order", "wavelength,value\n390,1\n380,2\n", "line 3: wavelengths not strictly"},
         {"Header", "nm,value\n380,1\n390,2\n", "line 1: header must start with wavelength"},

@@ -157,6 +157,7 @@ TEST(StringHelpers, ParsersTakeExactlyWholeFieldsOverRandomText) {
     const std::string alphabet = "0123456789.-+eE x,";
     const std::regex integer("-?[0-9]+");
     const std::regex decimal("-?([0-9]+\\.?[0-9]*|\\.[0-9]+)([eE][-+]?[0-9]+)?");
+    const std::regex signedDecimal("[-+]?([0-9]+\\.?[0-9]*|\\.[0-9]+)([eE][-+]?[0-9]+)?");
     for (int round = 0; round < 20000; ++round) {
         std::string text;
         const int length = static_cast<int>(random() % 12);
@@ -182,6 +183,12 @@ TEST(StringHelpers, ParsersTakeExactlyWholeFieldsOverRandomText) {
             std::regex_match(text, decimal) && !outOfRange && std::isfinite(modelDecimal);
         ASSERT_EQ(StringHelpers::ParseDecimal(text, d), decimalOk) << "\"" << text << "\"";
         EXPECT_EQ(d, decimalOk ? modelDecimal : 7.0) << text;
+        // Where a "+" may lead, it is one sign like "-", never one before it.
+        const bool plusOk =
+            std::regex_match(text, signedDecimal) && !outOfRange && std::isfinite(modelDecimal);
+        d = 7.0;
+        ASSERT_EQ(toolkit::ParseWholeDecimal(text, d, true), plusOk) << "\"" << text << "\"";
+        EXPECT_EQ(d, plusOk ? modelDecimal : 7.0) << text;
         // Other bases: the same text with some digits turned into letters.
         const int base = round % 3 == 0 ? 16 : round % 3 == 1 ? 8 : 2;
         for (char& c : text)

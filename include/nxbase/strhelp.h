@@ -51,7 +51,8 @@ class NXBASE_EXPORT StringHelpers {
     // ParseDecimal, decimal digits, a "." and an exponent. False, with the
     // value untouched, for anything else: blanks, "+", an empty field, a
     // value out of range (beyond the largest double, or so small it would
-    // read as 0; a subnormal is taken), NaN or infinity.
+    // read as 0; a subnormal is taken), NaN or infinity. These are
+    // toolkit::ParseWholeInteger and ParseWholeDecimal (toolkit/string.h).
     static bool ParseInteger(std::string_view asText, long long& axValue, int alBase = 10);
     static bool ParseDecimal(std::string_view asText, double& axValue);
 

@@ -1,10 +1,7 @@
 #include "csvtable.h"
 
-#include <charconv>
-#include <cmath>
-#include <system_error>
-
 #include "toolkit/fileio.h"
+#include "toolkit/string.h"
 
 namespace klume {
 namespace cmetry {
@@ -52,14 +49,6 @@ std::vector<std::string_view> SplitFields(std::string_view line) {
         start = comma + 1;
         if (fields.size() > kMaxTableColumns) return fields;
     }
-}
-
-bool ParseNumber(std::string_view field, double& value) {
-    if (field.empty()) return false;
-    if (field.front() == '+') field.remove_prefix(1);
-    const char* end = field.data() + field.size();
-    const auto result = std::from_chars(field.data(), end, value);
-    return result.ec == std::errc() && result.ptr == end && std::isfinite(value);
 }
 
 }  // namespace
@@ -112,7 +101,7 @@ bool ParseCsvTable(std::string_view text, const std::string& source, std::size_t
             return Fail(error, source, lineNumber, "more rows than the limit", line);
         }
         double wavelength = 0.0;
-        if (!ParseNumber(fields[0], wavelength)) {
+        if (!toolkit::ParseWholeDecimal(fields[0], wavelength, true)) {
             return Fail(error, source, lineNumber, "not a number", fields[0]);
         }
         if (!table.wavelengths.empty() && !(wavelength > table.wavelengths.back())) {
@@ -120,7 +109,7 @@ bool ParseCsvTable(std::string_view text, const std::string& source, std::size_t
         }
         for (std::size_t c = 1; c < fields.size(); ++c) {
             double value = 0.0;
-            if (!ParseNumber(fields[c], value)) {
+            if (!toolkit::ParseWholeDecimal(fields[c], value, true)) {
                 return Fail(error, source, lineNumber, "not a number", fields[c]);
             }
             table.values[c - 1].push_back(value);

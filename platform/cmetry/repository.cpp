@@ -12,6 +12,7 @@
 #include "csvtable.h"
 #include "embedded.h"
 #include "objects.h"
+#include "toolkit/string.h"
 
 namespace klume {
 namespace cmetry {
@@ -80,11 +81,12 @@ const BuiltIns& GetBuiltIns() {
         BuiltIns b;
         for (int i = 0; i < embedded::kObserversCount; ++i) {
             const embedded::EmbeddedTable& t = embedded::kObservers[i];
-            const int field = std::atoi(t.key);
+            long long field = 0;
+            toolkit::ParseWholeInteger(t.key, field);
             const std::string description =
                 field == 2 ? "CIE 1931 2 degree standard colorimetric observer"
                            : "CIE 1964 10 degree supplementary standard colorimetric observer";
-            b.observers[t.key] = detail::MakeObserver(t, description, field);
+            b.observers[t.key] = detail::MakeObserver(t, description, static_cast<int>(field));
             b.observerNames.push_back(t.key);
         }
         for (int i = 0; i < embedded::kIlluminantsCount; ++i) {

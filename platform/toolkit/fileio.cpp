@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "toolkit/eintr.h"
+#include "toolkit/string.h"
 
 namespace toolkit {
 
@@ -219,9 +220,9 @@ mode_t DefaultMode() {
     std::ifstream status("/proc/self/status");
     std::string line;
     while (std::getline(status, line)) {
-        if (line.rfind("Umask:", 0) == 0) {
-            return static_cast<mode_t>(0666 & ~std::strtoul(line.c_str() + 6, nullptr, 8));
-        }
+        long long mask = 0;
+        if (line.rfind("Umask:\t", 0) == 0 && toolkit::ParseWholeInteger(line.substr(7), mask, 8))
+            return static_cast<mode_t>(0666 & ~mask);
     }
     const mode_t mask = ::umask(0);  // kernels before 4.7 do not list it
     ::umask(mask);

@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <charconv>
+#include <cmath>
 #include <ostream>
+#include <system_error>
 
 String::String(const char* text) : text_(text ? text : "") {
     Clip();
@@ -322,6 +324,28 @@ std::string Utf8ToWindows1252(std::string_view utf8) {
         at += length == 0 ? MalformedLength(utf8, at) : length;
     }
     return out;
+}
+
+bool ParseWholeInteger(std::string_view text, long long& value, int base) {
+    long long parsed = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), parsed, base);
+    if (text.empty() || error != std::errc() || end != text.data() + text.size()) return false;
+    value = parsed;
+    return true;
+}
+
+bool ParseWholeDecimal(std::string_view text, double& value, bool plus) {
+    if (plus && !text.empty() && text.front() == '+') {
+        text.remove_prefix(1);
+        if (!text.empty() && text.front() == '-') return false;
+    }
+    double parsed = 0.0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), parsed);
+    if (text.empty() || error != std::errc() || end != text.data() + text.size() ||
+        !std::isfinite(parsed))
+        return false;
+    value = parsed;
+    return true;
 }
 
 }  // namespace toolkit

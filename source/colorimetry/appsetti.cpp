@@ -7,7 +7,7 @@
 #include <utility>
 
 #include "nxbase/appconfig.h"
-#include "nxbase/strhelp.h"
+#include "toolkit/string.h"
 
 namespace {
 
@@ -21,12 +21,8 @@ constexpr double kDefaultDirectLightPart = 0.5;
 // The whole text as a decimal number without locale, an optional "+" first
 // (a hand-edited file may carry one); `fallback` when it is not one.
 double ParseDouble(std::string_view text, double fallback) {
-    if (!text.empty() && text.front() == '+') {
-        text.remove_prefix(1);
-        if (!text.empty() && text.front() == '-') return fallback;  // "+-0.5" is no number
-    }
     double value = fallback;
-    return StringHelpers::ParseDecimal(text, value) ? value : fallback;
+    return toolkit::ParseWholeDecimal(text, value, true) ? value : fallback;
 }
 
 std::string FormatFixed2(double value) {

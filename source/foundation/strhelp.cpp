@@ -142,23 +142,11 @@ std::string StringHelpers::Shortest(double axValue) {
 }
 
 bool StringHelpers::ParseInteger(std::string_view asText, long long& axValue, int alBase) {
-    long long value = 0;
-    const auto [end, error] =
-        std::from_chars(asText.data(), asText.data() + asText.size(), value, alBase);
-    if (asText.empty() || error != std::errc() || end != asText.data() + asText.size())
-        return false;
-    axValue = value;
-    return true;
+    return toolkit::ParseWholeInteger(asText, axValue, alBase);
 }
 
 bool StringHelpers::ParseDecimal(std::string_view asText, double& axValue) {
-    double value = 0.0;
-    const auto [end, error] = std::from_chars(asText.data(), asText.data() + asText.size(), value);
-    if (asText.empty() || error != std::errc() || end != asText.data() + asText.size() ||
-        !std::isfinite(value))
-        return false;
-    axValue = value;
-    return true;
+    return toolkit::ParseWholeDecimal(asText, axValue);
 }
 
 // ---------------------------------------------------------------- GString

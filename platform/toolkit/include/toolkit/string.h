@@ -120,6 +120,16 @@ NXBASE_EXPORT bool IsValidUtf8(std::string_view text);
 // else read as Windows-1252 (what Windows programs export).
 NXBASE_EXPORT std::string EightBitToUtf8(std::string_view text);
 
+// A whole field as a number, whatever the locale: an optional "-" (for a
+// decimal with `plus`, a "+" instead), digits of `base` (2 to 36; letters in
+// either case, no "0x") and, for a decimal, decimal digits, a "." and an
+// exponent. False, with `value` untouched, for anything else: blanks, an
+// empty field, a sign after a sign, a value out of range (beyond the largest
+// double, or so small it would read as 0; a subnormal is taken), NaN or
+// infinity. Every layer reads its whole-field numbers with these.
+NXBASE_EXPORT bool ParseWholeInteger(std::string_view text, long long& value, int base = 10);
+NXBASE_EXPORT bool ParseWholeDecimal(std::string_view text, double& value, bool plus = false);
+
 }  // namespace toolkit
 
 #endif  // TOOLKIT_STRING_H_
