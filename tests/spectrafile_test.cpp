@@ -59,22 +59,24 @@ TEST(SpectraFile, ReadsCsvRowsAndReportsBadOnesWithTheirLine) {
     EXPECT_EQ(chart.resampling, "as read");
     EXPECT_FALSE(chart.percent);
 
-    const std::string text =
-        Header() + "\n" + "1,good," + Values(0.5) + "\n" + "2,short," + Values(0.5, 30) + "\n" +
-        "3,text,0.1,abc," + Values(0.5, 34) + "\n" + "4,nan," + Values(0.5, 35) + ",nan\n" +
-        "5,\"quoted, name\"," + Values(0.25) + "\r\n" + "6,huge,1e300," + Values(0.5, 35) + "\n" +
-        "7,wild,900," + Values(0.5, 35) + "\n" + "8,black," + Values(0.0) + "\n";
+    const std::string text = Header() + "\n" + "1,good," + Values(0.5) + "\n" + "2,short," +
+                             Values(0.5, 30) + "\n" + "3,text,0.1,abc," + Values(0.5, 34) + "\n" +
+                             "4,nan," + Values(0.5, 35) + ",nan\n" + "5,\"quoted, name\"," +
+                             Values(0.25) + "\r\n" + "6,huge,1e300," + Values(0.5, 35) + "\n" +
+                             "7,wild,900," + Values(0.5, 35) + "\n" + "8,black," + Values(0.0) +
+                             "\n" + "9,signs,+-0.5," + Values(0.5, 35) + "\n";
     const SpectraTable table = nxbase::ParseSpectraCsv(text, "bad.csv", {SpectralScale::kFraction});
     ASSERT_EQ(table.rows.size(), 2u);
     EXPECT_EQ(table.rows[1].id, "5 quoted, name");
     EXPECT_EQ(table.rows[1].values[35], 0.25f) << "CR of CR LF removed";
-    ASSERT_EQ(table.errors.size(), 6u);
+    ASSERT_EQ(table.errors.size(), 7u);
     EXPECT_EQ(table.errors[0], "bad.csv:3: 32 fields, expected 38");
     EXPECT_EQ(table.errors[1], "bad.csv:4: field 4 (390 nm): \"abc\" is not a number");
     EXPECT_EQ(table.errors[2], "bad.csv:5: field 38 (730 nm): \"nan\" is not a number");
     EXPECT_EQ(table.errors[3], "bad.csv:7: field 3 (380 nm): \"1e300\" is out of range");
-    EXPECT_EQ(table.errors[4].rfind("bad.csv:8: value 900", 0), 0u) << table.errors[4];
-    EXPECT_EQ(table.errors[5], "bad.csv:9: every value is zero");
+    EXPECT_EQ(table.errors[4], "bad.csv:10: field 3 (380 nm): \"+-0.5\" is not a number");
+    EXPECT_EQ(table.errors[5].rfind("bad.csv:8: value 900", 0), 0u) << table.errors[5];
+    EXPECT_EQ(table.errors[6], "bad.csv:9: every value is zero");
 }
 
 TEST(SpectraFile, TakesAnyIncreasingGridAndNumericHeaders) {

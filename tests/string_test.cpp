@@ -3,7 +3,10 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <clocale>
+#include <cmath>
+#include <cstdlib>
 #include <random>
 #include <string>
 
@@ -39,12 +42,31 @@ TEST(String, TokensCountSeparatorsPlusOneAndEmptyTextHasNone) {
 TEST(String, NumbersAreReadWithoutLocale) {
     EXPECT_TRUE(String("0123").IsNumeric());
     for (const char* text : {"", "-1", "1.5"}) EXPECT_FALSE(String(text).IsNumeric()) << text;
-    EXPECT_EQ(String("  -42x").ToLong(), -42);
-    EXPECT_EQ(String("junk").ToLong(), 0);
     const char* previous = std::setlocale(LC_NUMERIC, "de_DE.UTF-8");
     EXPECT_DOUBLE_EQ(String("2.5").ToDouble(), 2.5);
     EXPECT_EQ(String::CreateFromInt(-1234567), "-1234567");
     if (previous) std::setlocale(LC_NUMERIC, "C");
+}
+
+// The leading number against the C library under the "C" locale, which
+// reads the same grammar: blanks, one sign, digits, for decimals a "." and
+// an exponent; the rest of the text ignored. Beyond a double's range
+// ToDouble answers 0.
+TEST(String, LeadingNumbersReadAsTheCLibraryReadsThemOverRandomText) {
+    const unsigned seed = std::random_device{}();
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    std::mt19937 random(seed);
+    const std::string alphabet = "0123456789+- .eEz";
+    for (int round = 0; round < 20000; ++round) {
+        std::string text;
+        for (int i = static_cast<int>(random() % 10); i > 0; --i)
+            text += alphabet[random() % (random() % 2 ? 10 : alphabet.size())];
+        EXPECT_EQ(String(text).ToLong(), std::strtol(text.c_str(), nullptr, 10)) << text;
+        errno = 0;
+        const double model = std::strtod(text.c_str(), nullptr);
+        EXPECT_EQ(String(text).ToDouble(), errno == ERANGE && std::isinf(model) ? 0.0 : model)
+            << text;
+    }
 }
 
 TEST(String, EditingKeepsBoundsSafe) {

@@ -150,21 +150,27 @@ bool String::IsNumeric() const {
            std::all_of(text_.begin(), text_.end(), [](char c) { return c >= '0' && c <= '9'; });
 }
 
+namespace {
+
+// Where the number that leads `text` starts: after blanks and a "+", which
+// takes no "-" after it ("+-5" is no number).
+std::size_t NumberStart(const std::string& text) {
+    std::size_t at = text.find_first_not_of(" \t");
+    if (at != std::string::npos && text[at] == '+' && text.compare(at + 1, 1, "-") != 0) ++at;
+    return at == std::string::npos ? text.size() : at;
+}
+
+}  // namespace
+
 long String::ToLong() const {
-    std::size_t at = text_.find_first_not_of(" \t");
-    if (at == std::string::npos) return 0;
-    if (text_[at] == '+') ++at;
     long value = 0;
-    std::from_chars(text_.data() + at, text_.data() + text_.size(), value);
+    std::from_chars(text_.data() + NumberStart(text_), text_.data() + text_.size(), value);
     return value;
 }
 
 double String::ToDouble() const {
-    std::size_t at = text_.find_first_not_of(" \t");
-    if (at == std::string::npos) return 0.0;
-    if (text_[at] == '+') ++at;
     double value = 0.0;
-    std::from_chars(text_.data() + at, text_.data() + text_.size(), value);
+    std::from_chars(text_.data() + NumberStart(text_), text_.data() + text_.size(), value);
     return value;
 }
 

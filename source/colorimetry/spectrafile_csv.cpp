@@ -7,6 +7,7 @@
 #include "nxbase/spectrafile.h"
 #include "nxbase/strhelp.h"
 #include "spectrafile_parse.h"
+#include "toolkit/string.h"
 
 namespace nxbase {
 namespace {
@@ -86,9 +87,7 @@ void UseDecimalPoints(std::vector<std::string>& fields) {
 namespace detail {
 
 bool ParseNumber(std::string_view text, double* value) {
-    text = Trim(text);
-    if (!text.empty() && text.front() == '+') text.remove_prefix(1);
-    return StringHelpers::ParseDecimal(text, *value);
+    return toolkit::ParseWholeDecimal(Trim(text), *value, true);
 }
 
 double WavelengthOf(std::string_view field) {

@@ -11,7 +11,8 @@
 namespace nxbase {
 
 namespace detail {
-// A finite decimal number ("." separator, optional leading "+"), whole field.
+// A finite decimal number ("." separator, one optional sign, "+" included),
+// whole field.
 bool ParseNumber(std::string_view text, double* value);
 // The wavelength a spectral column name gives: a decimal number after one of
 // the prefixes SPECTRAL_NM_, SPECTRAL_NM, SPECTRAL_, SPEC_, SPEC, NM, R_, R or

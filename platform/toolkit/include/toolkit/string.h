@@ -72,9 +72,10 @@ class NXBASE_EXPORT String {
 
     // True for a non-empty text of ASCII digits only.
     bool IsNumeric() const;
-    // Leading decimal integer (optional sign, blanks skipped); 0 when none.
+    // The decimal integer that leads the text after blanks, with one optional
+    // sign ("+-5" has none); 0 when none.
     long ToLong() const;
-    // Decimal number read with "." whatever the locale; 0 when none.
+    // The same for a decimal number, read with "." whatever the locale.
     double ToDouble() const;
 
     bool EqualsIgnoreCaseAscii(const String& other) const;
