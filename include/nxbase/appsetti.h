@@ -22,8 +22,8 @@ class NXBASE_EXPORT NxSetting : public NxSingleton {
 
     // Reads the four keys from the user configuration; does nothing unless
     // UserConfig::IsInitialized(). A "DirectLightPart" that is not wholly a
-    // finite decimal number without locale (a leading "+" allowed; "0.5x" or
-    // "1,25" is not) reads as 0.5; the display is EYE exactly when the text
+    // finite decimal number without locale (one sign, "+" allowed; "+-0.5",
+    // "0.5x" or "1,25" is not) reads as 0.5; the display is EYE exactly when the text
     // is "Eye".
     void LoadProperties();
     // Writes the four keys to the user configuration (the direct-light part

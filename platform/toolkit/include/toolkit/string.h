@@ -75,7 +75,8 @@ class NXBASE_EXPORT String {
     // The decimal integer that leads the text after blanks, with one optional
     // sign ("+-5" has none); 0 when none.
     long ToLong() const;
-    // The same for a decimal number, read with "." whatever the locale.
+    // The same for a decimal number, read with "." whatever the locale; also 0
+    // beyond a double's range ("1e999"), which the caller cannot tell from "0".
     double ToDouble() const;
 
     bool EqualsIgnoreCaseAscii(const String& other) const;
