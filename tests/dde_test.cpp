@@ -12,6 +12,7 @@
 
 #include <cstdio>
 
+#include "log_test_util.h"
 #include "messaging_test_util.h"
 #include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
@@ -22,6 +23,10 @@ namespace {
 
 using namespace std::chrono_literals;
 using nxtest::RunUntil;
+
+// A test here reads what DDE logged.
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
 
 std::vector<VELTRAEvent> gReceived;
 void Record(VELTRAEvent& event) {
@@ -129,6 +134,7 @@ TEST_F(DdeTest, AServerReachedOnlyByDdeAnswersAsOverSocketsAndADeadOneFailsTheSe
 }
 
 TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined) {
+    nxtest::LogSince log;
     ASSERT_EQ(std::system((server + " &").c_str()), 0);
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     ASSERT_TRUE(RunUntil([] { return nxbase::IsApplicationRunning("LumaServer"); }));
@@ -144,15 +150,13 @@ TEST_F(DdeTest, ABusThatGoesAwayTurnsDdeOffTheSocketsServeOnAndItsReturnIsJoined
     EXPECT_TRUE(
         office->SendAndReceive("LumaServer", GET_DEVICE_NAME, request, answer, nxtest::For(5s)))
         << office->GetLastError();
-    EXPECT_THAT(nxtest::ReadFile(LogFile::Instance()->GetFileName()),
-                HasSubstr("DDE is off: the session bus was lost"));
+    EXPECT_THAT(log.Text(), HasSubstr("DDE is off: the session bus was lost"));
     // The bus comes back at its address: this process and the server join it again.
     ASSERT_TRUE(sandbox.StartBus());
     EXPECT_TRUE(RunUntil([] { return DDE::Instance()->IsActive(); }, 20s));
     EXPECT_TRUE(RunUntil(
         [] { return DDE::Instance()->IsAppRunning(nxbase::kDdeService, "LumaServer"); }, 20s));
-    EXPECT_THAT(nxtest::ReadFile(LogFile::Instance()->GetFileName()),
-                HasSubstr("DDE is on again: the session bus is back"));
+    EXPECT_THAT(log.Text(), HasSubstr("DDE is on again: the session bus is back"));
 }
 
 TEST_F(DdeTest, AnOfficeMadeWhileTheBusRestartsServesOnSocketsAndJoinsItLater) {

@@ -15,6 +15,7 @@
 #include <random>
 #include <thread>
 
+#include "log_test_util.h"
 #include "messaging_test_util.h"
 #include "nxbase/language.h"
 #include "nxbase/logfile.h"
@@ -28,6 +29,10 @@
 namespace {
 
 using namespace std::chrono_literals;
+
+// A test here reads what the pipe logged.
+::testing::Environment* const kLogDir =
+    ::testing::AddGlobalTestEnvironment(new nxtest::LogDirEnvironment);
 
 std::vector<VELTRAEvent> gReceived;
 
@@ -464,6 +469,7 @@ TEST_F(PipeTest, AListenerAcceptsTheMomentItsSocketAppears) {
 }
 
 TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
+    nxtest::LogSince log;
     if (::geteuid() != 0) GTEST_SKIP() << "needs root to act as another user";
     // Let user 65534 reach the socket, so that only the credential check stands.
     ::chmod(root.c_str(), 0711);
@@ -482,8 +488,7 @@ TEST_F(PipeTest, APeerOfAnotherUserIsRefusedBeforeAnyByteIsRead) {
     EXPECT_EQ(nxtest::ExitWhileLooping(child), 0);
     EXPECT_EQ(pipe->ChannelCount(), channels);
     EXPECT_FALSE(pipe->HasChannel("Intruder"));
-    std::string log = nxtest::ReadFile(LogFile::Instance()->GetFileName());
-    EXPECT_THAT(log, Not(HasSubstr("Intruder")));
+    EXPECT_THAT(log.Text(), Not(HasSubstr("Intruder")));
 }
 
 }  // namespace

@@ -13,6 +13,7 @@
 #include <iostream>
 #include <thread>
 
+#include "log_test_util.h"
 #include "messaging_test_util.h"
 #include "nxbase/applock.h"
 #include "nxbase/language.h"
@@ -27,6 +28,10 @@ namespace {
 using namespace std::chrono_literals;
 
 using nxtest::RunUntil;
+
+// Tests here read what the post office logged.
+::testing::Environment* const kLogDir = ::testing::AddGlobalTestEnvironment(
+    new nxtest::LogDirEnvironment("Communication,ApplicationLock"));
 
 // A peer speaking the wire protocol by hand on a connection to the post office.
 class RawPeer {
@@ -82,7 +87,6 @@ class RawPeer {
 class PostOfficeTest : public ::testing::Test {
   protected:
     void SetUp() override {
-        sandbox.Env("NXBASE_LOG_OPTIONS", "Communication,ApplicationLock");
         sandbox.RegisterAbsentServer();
         Application::Get().ResetQuit();
     }
@@ -93,7 +97,7 @@ class PostOfficeTest : public ::testing::Test {
         }
         Application::Get().ResetQuit();
     }
-    std::string Log() { return nxtest::ReadFile(LogFile::Instance()->GetFileName()); }
+    std::string Log() { return ownLog.Text(); }
     // Registers `id` as a peer whose program is the shell script `body`.
     void RegisterScript(const char* id, const std::string& file, const std::string& body,
                         std::filesystem::perms perms = std::filesystem::perms::owner_all) {
@@ -103,6 +107,7 @@ class PostOfficeTest : public ::testing::Test {
     }
 
     nxtest::MessagingSandbox sandbox{"po"};
+    nxtest::LogSince ownLog;
     const std::string root = sandbox.root(),
                       echoPeer = sandbox.AddPeer("EchoPeer", NXBASE_PIPE_PEER, "popeer");
     std::shared_ptr<RecordingUserInterface> ui = std::make_shared<RecordingUserInterface>();
