@@ -2,6 +2,7 @@
 // process: the protocol messages, the lock, the queue, waiting for answers.
 #include "nxbase/postoffice.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
@@ -659,19 +660,35 @@ TEST_F(PostOfficeTest, DestroyingThePostOfficeEndsTheWaitsOnIt) {
     EXPECT_FALSE(std::filesystem::exists(sandbox.runtime() + "/PipeRequest-Tester"));
 }
 
+// Neither a program the post office starts nor one the application starts
+// itself (std::system: fork and exec, nothing closed) holds the library's
+// sockets, loop descriptors or locks; the first does not get the
+// application's own descriptors either.
 TEST_F(PostOfficeTest, AStartedProgramGetsNoDescriptorButTheStandardOnes) {
     RegisterScript("FdLister", "fdlister", "ls -l /proc/self/fd > " + root + "/fds.txt\n");
+    // What this process was handed by whoever started it is not the library's.
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+        const int fd = std::stoi(entry.path().filename().string());
+        if (fd > 2) ::fcntl(fd, F_SETFD, FD_CLOEXEC);
+    }
     PostOffice* office = PostOffice::CreatePostOffice("Tester");
     MyMemoryBlock request, answer;
     ASSERT_TRUE(office->SendAndReceive("EchoPeer", GET_DEVICE_NAME, request, answer));
     RawPeer accepted("Accepted", Pipe::Instance()->GetSocketPath());  // an accepted channel
+    const int own = ::open((root + "/own.txt").c_str(), O_WRONLY | O_CREAT, 0600);  // inherited
+    ASSERT_GE(own, 0);
     EXPECT_FALSE(office->SendAndReceive("FdLister", GET_DEVICE_NAME, request, answer));
+    ASSERT_EQ(std::system(("ls -l /proc/self/fd > " + root + "/system.txt").c_str()), 0);
+    ::close(own);
     // ls's own: 0 to 2 and the directory it reads.
-    std::string fds = nxtest::ReadFile(root + "/fds.txt");
-    ASSERT_THAT(fds, HasSubstr(" 0 -> ")) << fds;
-    EXPECT_THAT(fds, Not(HasSubstr("socket:"))) << fds;
-    EXPECT_THAT(fds, Not(HasSubstr("anon_inode"))) << fds;
-    EXPECT_THAT(fds, Not(HasSubstr(".lock"))) << fds;
+    for (const char* listing : {"/fds.txt", "/system.txt"}) {
+        std::string fds = nxtest::ReadFile(root + listing);
+        ASSERT_THAT(fds, HasSubstr(" 0 -> ")) << fds;
+        for (const char* kind : {"socket:", "anon_inode", ".lock"})
+            EXPECT_THAT(fds, Not(HasSubstr(kind))) << listing << fds;
+    }
+    EXPECT_THAT(nxtest::ReadFile(root + "/system.txt"), HasSubstr("own.txt"));
+    EXPECT_THAT(nxtest::ReadFile(root + "/fds.txt"), Not(HasSubstr("own.txt")));
 }
 
 int gForwarded = 0;
