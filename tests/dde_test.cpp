@@ -14,7 +14,6 @@
 
 #include "log_test_util.h"
 #include "messaging_test_util.h"
-#include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/pipe.h"
 #include "nxbase/postoffice.h"

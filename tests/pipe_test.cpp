@@ -18,7 +18,6 @@
 #include "log_test_util.h"
 #include "messaging_test_util.h"
 #include "nxbase/language.h"
-#include "nxbase/logfile.h"
 #include "nxbase/msgcat.h"
 #include "nxbase/poapps.h"
 #include "nxbase/registry.h"

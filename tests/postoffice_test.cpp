@@ -18,7 +18,6 @@
 #include "messaging_test_util.h"
 #include "nxbase/applock.h"
 #include "nxbase/language.h"
-#include "nxbase/logfile.h"
 #include "nxbase/pipe.h"
 #include "nxbase/registry.h"
 #include "test_util.h"
